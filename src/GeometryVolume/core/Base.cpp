@@ -1,0 +1,47 @@
+#include "GeometryVolume/core/Base.h"
+
+#include "GeometryVolume/core/LoggerHooks.h"
+#include "GeometryVolume/core/Streaming.h"
+
+#include <ostream>
+#include <utility>
+
+namespace VLN {
+
+namespace {
+void registerBase(Base const* base) {
+  if (auto const* hooks = loggerHooks()) hooks->baseBuilt(base);
+}
+} // namespace
+
+Base::Base() { registerBase(this); }
+Base::Base(Ostil::String name)
+    : m_name(std::move(name)) {
+  registerBase(this);
+}
+Base::Base(Base const& other)
+    : m_name(other.m_name) {
+  registerBase(this);
+}
+
+Base& Base::operator=(Base const& other) {
+  if (this != &other) m_name = other.m_name;
+  return *this;
+}
+
+Base::~Base() {
+  if (auto const* hooks = loggerHooks()) hooks->baseDestroyed(this);
+}
+
+void Base::dump(std::ostream& os) const { os << Streaming::pad(os) << "name = " << m_name << '\n' << '\n'; }
+
+void Base::memUse(std::uint64_t& used, std::uint64_t& allocated, bool) const {
+  used = sizeof(Base);
+  allocated = sizeof(Base);
+}
+
+void Base::copyTo(Base& target) const {
+  if (&target != this) target.m_name = m_name;
+}
+
+} // namespace VLN

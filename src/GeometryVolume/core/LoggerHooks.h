@@ -1,0 +1,44 @@
+// What the library tells the object logger. The logger itself lives elsewhere and installs its table while it
+// is enabled; with no table each hook costs one test.
+#pragma once
+
+#include "GeometryVolume/core/Export.h"
+
+#include <atomic>
+
+namespace VLN {
+
+class Base;
+
+struct LoggerHooks {
+  void (*baseBuilt)(Base const*);
+  void (*baseDestroyed)(Base const*);
+  void (*pointerAllocated)(void const* block, Base const* owner);
+  void (*pointerDeAllocated)(void const* block, Base const* owner);
+  void (*pointerReAllocated)(void const* from, void const* to);
+  bool (*isDumpInProgress)();
+};
+
+namespace Internal {
+/// Null while logging is off. Readers only test and call: the table is never freed.
+extern VLN_API std::atomic<LoggerHooks const*> g_loggerHooks;
+} // namespace Internal
+
+inline LoggerHooks const* loggerHooks() { return Internal::g_loggerHooks.load(std::memory_order_relaxed); }
+
+inline bool loggingEnabled() { return loggerHooks() != nullptr; }
+inline bool loggerDumpInProgress() {
+  auto const* hooks = loggerHooks();
+  return hooks && hooks->isDumpInProgress();
+}
+inline void pointerAllocated(void const* block, Base const* owner) {
+  if (auto const* hooks = loggerHooks()) hooks->pointerAllocated(block, owner);
+}
+inline void pointerDeAllocated(void const* block, Base const* owner) {
+  if (auto const* hooks = loggerHooks()) hooks->pointerDeAllocated(block, owner);
+}
+inline void pointerReAllocated(void const* from, void const* to) {
+  if (auto const* hooks = loggerHooks()) hooks->pointerReAllocated(from, to);
+}
+
+} // namespace VLN

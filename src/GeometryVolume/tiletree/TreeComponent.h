@@ -1,0 +1,42 @@
+// TileTree3D::Component: a component that counts tiles and elements of a tree, by depth and by tile.
+#pragma once
+
+#include "GeometryVolume/core/Component.h"
+#include "GeometryVolume/tiletree/TreeIndex.h"
+
+namespace VLN::TileTree3D {
+
+/// Containers, topologies and channels. The order of the virtual operations is fixed:
+/// destructor, dump, memUse, copyTo, size, empty, update, elementCount(depth), elementCount(tile), tileCount.
+class VLN_API Component : public VLN::Component {
+public:
+  using VLN::Component::Component;
+  Component() = default;
+  Component(Component const&) = default;
+  Component& operator=(Component const&) = default;
+  ~Component() override;
+
+  void dump(std::ostream& os) const override { VLN::Component::dump(os); }
+  void memUse(std::uint64_t& used, std::uint64_t& allocated, bool notShared) const override {
+    VLN::Component::memUse(used, allocated, notShared);
+    used += sizeof(m_owner), allocated += sizeof(m_owner);
+  }
+  void copyTo(Ostil::Ptr<VLN::Component>& target) const override;
+  std::uint64_t size() const override = 0;
+  void update(VLN::Component const& source) override = 0;
+  /// Elements of one depth; -1 gives the total. Depths that the tree does not have answer 0.
+  virtual std::int64_t elementCount(int depth) const = 0;
+  /// Elements of one tile. Unchecked.
+  virtual int elementCount(TreeIndex const& tile) const = 0;
+  /// Tiles of one depth; -1 gives the total. Depths that the tree does not have answer 0.
+  virtual std::int64_t tileCount(int depth) const = 0;
+
+  /// Name of the tree component that this component belongs to.
+  Ostil::String const& owner() const { return m_owner; }
+  void setOwner(Ostil::String const& name) { m_owner = name; }
+
+private:
+  Ostil::String m_owner;
+};
+
+} // namespace VLN::TileTree3D

@@ -1,0 +1,9 @@
+#pragma once
+
+#include <string>
+
+namespace Ostil {
+
+using String = std::string;
+
+} // namespace Ostil

@@ -1,0 +1,7 @@
+#include "Velorn/ExceptionMessage.h"
+
+namespace VLN {
+
+char const* const exceptionMessage = "the job was cancelled";
+
+} // namespace VLN
