@@ -20,6 +20,8 @@
 
 namespace VLN::TileTree3D {
 
+__extension__ using DoubleWord = unsigned __int128;
+
 template <int TileWidth, int TileDataWidth, int, int> struct Traits {
   static constexpr int kTileWidth = TileWidth;
   static constexpr int kTileDataWidth = TileDataWidth;
@@ -78,7 +80,7 @@ public:
     if constexpr (kTW == 2)
       return offset >> divider;
     else
-      return static_cast<std::uint32_t>((static_cast<unsigned __int128>(offset) * divider) >> 64);
+      return static_cast<std::uint32_t>((static_cast<DoubleWord>(offset) * divider) >> 64);
   }
   /// Offset of a coordinate of the domain from its low end.
   static constexpr std::uint32_t offset(std::int32_t c) {
