@@ -20,15 +20,21 @@ template <int Depths> void TreeCounts<Depths>::takeElements(Component const& sou
   elementCountTotal = 0;
   for (int d = 0; d < Depths; ++d) {
     auto const depth = static_cast<std::size_t>(d);
-    std::int64_t sum = 0;
-    for (std::int64_t n = 0; n < tileCounts[depth]; ++n) {
-      auto const elements =
-          std::max(static_cast<std::uint32_t>(source.elementCount(TreeIndex{n, d})), atLeast);
-      elementsPerTile[depth][static_cast<std::size_t>(n)] = elements;
-      sum += elements;
-    }
-    elementCounts[depth] = sum;
-    elementCountTotal += sum;
+    auto& tiles = elementsPerTile[depth];
+    std::int64_t const known = source.tileCount(d); // the source may cover fewer depths
+    elementCounts[depth] = parallelReduce(
+        0, tileCounts[depth], 4096, std::int64_t(0),
+        [&](std::int64_t begin, std::int64_t end) {
+          std::int64_t sum = 0;
+          for (std::int64_t n = begin; n < end; ++n) {
+            int const elements = n < known ? source.elementCount(TreeIndex{n, d}) : 0;
+            sum += tiles[static_cast<std::size_t>(n)] =
+                std::max(static_cast<std::uint32_t>(elements), atLeast);
+          }
+          return sum;
+        },
+        [](std::int64_t x, std::int64_t y) { return x + y; });
+    elementCountTotal += elementCounts[depth];
   }
 }
 
