@@ -194,9 +194,7 @@ template <class TraitsT> void Container<TraitsT>::tilesAdded() {
   clearAccessorAccelerationStructure();
 }
 
-template <class TraitsT>
-void Container<TraitsT>::tilesRemoved(
-    std::vector<std::vector<std::pair<std::int64_t, std::int64_t>>> const* moves) {
+template <class TraitsT> void Container<TraitsT>::tilesRemoved(TileMoves const* moves) {
   tilesAdded();
   if (!moves) return;
   for (int d = 0; d <= kMaxDepth && d < static_cast<int>(moves->size()); ++d) {

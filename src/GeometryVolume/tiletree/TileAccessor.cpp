@@ -11,8 +11,9 @@ TreeIndex ConstTileAccessorOf<TraitsT>::findAncestor(int i, int j, int k, int de
   while (at.depth >= 0) {
     TileType const& t = m_container->tile(at);
     auto const serves = [&](TreeIndex const& candidate) {
-      return candidate.depth >= 0 && candidate.depth <= depth &&
-             m_container->tile(candidate).contains(i, j, k);
+      if (candidate.depth < 0 || candidate.depth > depth) return false;
+      TileType const& c = m_container->tile(candidate);
+      return c.valid() && c.contains(i, j, k);
     };
     if (serves(at)) return at;
     if (table && t.valid()) {
@@ -137,6 +138,36 @@ template <class TraitsT> void TileAccessorOf<TraitsT>::addTiles(int3 const& min,
         addTile(static_cast<int>(i), static_cast<int>(j), static_cast<int>(k), depth);
     }
   }
+}
+
+template <class TraitsT> void TileAccessorOf<TraitsT>::rereadCursor() {
+  ContainerT const& tree = *m_mutableContainer;
+  if (this->m_depth >= 0 && this->m_index < tree.tileCount(this->m_depth) &&
+      tree.tile(this->m_index, this->m_depth).valid())
+    this->moveTo(tree.tile(this->m_index, this->m_depth));
+  else
+    this->resetCursor();
+}
+
+template <class TraitsT>
+void TileAccessorOf<TraitsT>::removeTile(TreeIndex const& at, bool withBranch, TileMoves* moves) {
+  m_mutableContainer->removeTile(at, withBranch, moves);
+  rereadCursor();
+}
+
+template <class TraitsT>
+void TileAccessorOf<TraitsT>::removeTiles(TileIndexLists const& lists, bool withBranch, TileMoves* moves) {
+  TileIndexLists copy = lists;
+  m_mutableContainer->removeTiles(copy, withBranch, moves);
+  rereadCursor();
+}
+
+template <class TraitsT>
+void TileAccessorOf<TraitsT>::removeTiles(std::vector<std::int64_t> const& indices, int depth,
+                                          bool withBranch, TileMoves* moves) {
+  TileIndexLists lists(static_cast<std::size_t>(TraitsT::kDepths));
+  if (TraitsT::isDepth(depth)) lists[static_cast<std::size_t>(depth)] = indices;
+  removeTiles(lists, withBranch, moves);
 }
 
 #define VLN_INSTANTIATE(TraitsT)                                                                             \

@@ -101,13 +101,17 @@ protected:
     m_corner = t.tijk(), m_depth = t.depth(), m_index = t.index();
     return t;
   }
+  void resetCursor() const { m_corner = {0, 0, 0}, m_depth = kNoDepth, m_index = -1; }
   /// The start of the walk: from the cursor to a tile at or above `depth` that holds the point; invalid when
   /// the walk leaves the tree.
   TreeIndex findAncestor(int i, int j, int k, int depth) const;
 
+  /// Depth of a cursor without a tile: it equals no depth that can be asked for.
+  static constexpr std::int32_t kNoDepth = INT32_MIN;
+
   ContainerT const* m_container = nullptr;
   mutable int3 m_corner{0, 0, 0};
-  mutable std::int32_t m_depth = -2; // matches no depth that can be asked for
+  mutable std::int32_t m_depth = kNoDepth;
   mutable std::int64_t m_index = -1;
 };
 
@@ -130,8 +134,27 @@ public:
   TileType const& addTile(int3 const& min, int3 const& max);
   /// Adds the tiles of a depth over a box, its max exclusive. Positions out of the domain are left out.
   void addTiles(int3 const& min, int3 const& max, int depth);
+  /// Adds the tiles that hold the listed points, by depth, all at once: existing ones are left, new ones lie
+  /// in Morton order, branch sizes are right afterwards. Parents are found, not made: list them too.
+  /// @param newTiles If given, the corner of every tile made is appended to the list of its depth.
+  /// @cost One array growth and one lookup pass a depth; runs in parallel.
+  void addTiles(typename ContainerT::TileLists const& points,
+                typename ContainerT::TileLists* newTiles = nullptr) {
+    m_mutableContainer->addTilesInBulk(points, newTiles);
+  }
+
+  // Removal. With the container's compaction on, indices of other tiles may change: `moves` tells how.
+  /// Removes one tile or its branch. A root without its branch goes only when no two of its children are
+  /// adjacent; another tile always goes with its branch. Refusal is silent: ask the tile's valid().
+  void removeTile(TreeIndex const& at, bool withBranch, TileMoves* moves = nullptr);
+  void removeTiles(TileIndexLists const& lists, bool withBranch, TileMoves* moves = nullptr);
+  void removeTiles(std::vector<std::int64_t> const& indices, int depth, bool withBranch,
+                   TileMoves* moves = nullptr);
 
 private:
+  /// Reads the cursor's tile again at its index, or resets the cursor when there is none.
+  void rereadCursor();
+
   friend class Container<TraitsT>;
 
   explicit TileAccessorOf(ContainerT& container)
