@@ -5,7 +5,7 @@
 #include <sstream>
 #include <string>
 
-namespace Test {
+namespace Support {
 
 class CaptureStream {
 public:
@@ -23,4 +23,4 @@ private:
   std::streambuf* m_old;
 };
 
-} // namespace Test
+} // namespace Support

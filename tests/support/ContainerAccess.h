@@ -10,8 +10,7 @@ struct ContainerTestAccess {
   template <class T> static auto& editData(Container<T>& tree) {
     return const_cast<ContainerData<T>&>(*tree.getData());
   }
-  template <class T>
-  static TreeIndex tileIndex(Container<T> const& tree, int3 const& p, int depth) {
+  template <class T> static TreeIndex tileIndex(Container<T> const& tree, int3 const& p, int depth) {
     return tree.tileIndex(p.x, p.y, p.z, depth);
   }
   template <class T> static auto const& tile(Container<T> const& tree, int3 const& p, int depth) {
@@ -82,13 +81,12 @@ struct ContainerTestAccess {
 
 } // namespace VLN::TileTree3D
 
-namespace Test {
+namespace Support {
 
 using Access = VLN::TileTree3D::ContainerTestAccess;
 
 /// A tile whose protected operations are open.
-template <class TraitsT, int N = TraitsT::kTileSize>
-struct OpenTile : VLN::TileTree3D::Tile<TraitsT, N> {
+template <class TraitsT, int N = TraitsT::kTileSize> struct OpenTile : VLN::TileTree3D::Tile<TraitsT, N> {
   using Base = VLN::TileTree3D::Tile<TraitsT, N>;
   using Base::init;
   using Base::m_branchSize;
@@ -104,4 +102,4 @@ struct OpenTile : VLN::TileTree3D::Tile<TraitsT, N> {
   }
 };
 
-} // namespace Test
+} // namespace Support

@@ -7,7 +7,7 @@
 
 #include <string>
 
-namespace Test {
+namespace Support {
 
 using Shapes = ::testing::Types<VLN::TileTree3D::PowerOfTwoTraits, VLN::TileTree3D::OddTraits>;
 
@@ -17,9 +17,9 @@ struct ShapeNames {
   }
 };
 
-} // namespace Test
+} // namespace Support
 
 /// Declares a test suite that runs for both shapes; its tests name the shape TypeParam.
 #define VLN_SHAPE_SUITE(Suite)                                                                               \
   template <class> class Suite : public ::testing::Test {};                                                  \
-  TYPED_TEST_SUITE(Suite, ::Test::Shapes, ::Test::ShapeNames)
+  TYPED_TEST_SUITE(Suite, ::Support::Shapes, ::Support::ShapeNames)

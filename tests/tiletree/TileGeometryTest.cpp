@@ -10,7 +10,7 @@
 #include <vector>
 
 using namespace VLN::TileTree3D;
-using Test::OpenTile;
+using Support::OpenTile;
 using Box = bbox<int3, int>;
 
 VLN_SHAPE_SUITE(TileGeometry);
@@ -19,7 +19,8 @@ namespace {
 
 /// The tile of a depth that holds a point.
 template <class T> OpenTile<T> tileAt(int i, int j, int k, int depth) {
-  return OpenTile<T>(T::align(i, depth), T::align(j, depth), T::align(k, depth), depth, 0, depth > 0 ? 0 : -1);
+  return OpenTile<T>(T::align(i, depth), T::align(j, depth), T::align(k, depth), depth, 0,
+                     depth > 0 ? 0 : -1);
 }
 
 } // namespace

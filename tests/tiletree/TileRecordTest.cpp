@@ -11,7 +11,7 @@
 #include <vector>
 
 using namespace VLN::TileTree3D;
-using Test::OpenTile;
+using Support::OpenTile;
 
 VLN_SHAPE_SUITE(TileRecord);
 
@@ -223,11 +223,15 @@ TYPED_TEST(TileRecord, DumpNamesEachFieldBehindTheAddress) {
   std::ostringstream address, table;
   address << static_cast<void const*>(&t);
   table << static_cast<void const*>(t.children());
-  std::vector<std::string> const expected = {
-      " this->m_depth: 4",  " this->m_parent: 3", " this->m_index: 8",
-      " this->m_tijk.x: 0", " this->m_tijk.y: 1", " this->m_tijk.z: 2",
-      " this->m_valid: 1",  " this->children() = " + table.str(),
-      " this->m_branchSize = " + std::to_string(T::kTileSize)};
+  std::vector<std::string> const expected = {" this->m_depth: 4",
+                                             " this->m_parent: 3",
+                                             " this->m_index: 8",
+                                             " this->m_tijk.x: 0",
+                                             " this->m_tijk.y: 1",
+                                             " this->m_tijk.z: 2",
+                                             " this->m_valid: 1",
+                                             " this->children() = " + table.str(),
+                                             " this->m_branchSize = " + std::to_string(T::kTileSize)};
   for (std::size_t n = 0; n < expected.size(); ++n) EXPECT_EQ(lines[n + 1], address.str() + expected[n]);
 }
 
