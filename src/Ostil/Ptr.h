@@ -54,6 +54,8 @@ public:
   void clone(void const* held, void*& outObject, ControlBlock*& outBlock) const override {
     if constexpr (std::is_copy_constructible_v<T>) {
       auto* copy = new InplaceBlock(m_object);
+      // A class whose copies share parts with their source says here how a clone becomes independent.
+      if constexpr (requires(T & object) { object.separateClone(); }) copy->object()->separateClone();
       auto const offset = static_cast<char const*>(held) - reinterpret_cast<char const*>(&m_object);
       outObject = reinterpret_cast<char*>(copy->object()) + offset;
       outBlock = copy;
