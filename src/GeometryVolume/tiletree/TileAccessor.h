@@ -30,7 +30,7 @@ public:
   /// @cost A hit on the cursor's tile costs one unsigned test an axis; other lookups walk up to a common
   /// ancestor.
   TileType const& tile(int i, int j, int k, int depth, bool exact) const {
-    if (depth == m_depth && holds(i, j, k)) return current();
+    if (depth >= 0 && depth == m_depth && holds(i, j, k)) return current();
     return exact ? tileImpl<true>(i, j, k, depth) : tileImpl<false>(i, j, k, depth);
   }
   TileType const& tile(int3 const& p, int depth, bool exact) const {
@@ -107,7 +107,7 @@ protected:
 
   ContainerT const* m_container = nullptr;
   mutable int3 m_corner{0, 0, 0};
-  mutable std::int32_t m_depth = -2; // matches no depth that can be asked for
+  mutable std::int32_t m_depth = -1; // none; negative depths never match
   mutable std::int64_t m_index = -1;
 };
 
