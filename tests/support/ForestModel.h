@@ -12,8 +12,8 @@
 
 namespace Support {
 
-using VLN::TileTree3D::VoxelCoord;
 using Velorn::Math::int3;
+using VLN::TileTree3D::VoxelCoord;
 
 template <class TraitsT> class ForestModel {
 public:
@@ -82,9 +82,8 @@ public:
   }
   /// Tiles in the branch of a tile, itself included.
   Wide branch(VoxelCoord const& tile) const {
-    return std::count_if(m_tiles.begin(), m_tiles.end(), [&](auto const& t) {
-      return t.depth >= tile.depth && holds(tile, t.ijk());
-    });
+    return std::count_if(m_tiles.begin(), m_tiles.end(),
+                         [&](auto const& t) { return t.depth >= tile.depth && holds(tile, t.ijk()); });
   }
 
   /// The tile of `depth` that holds a point, with all tiles between it and what stands above and below it.

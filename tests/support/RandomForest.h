@@ -24,6 +24,8 @@ public:
 
   ContainerT& tree() { return m_tree; }
   Model const& model() const { return m_model; }
+  /// No tile lies above this depth.
+  int minDepth() const { return m_minDepth; }
   int pick(int low, int high) { return std::uniform_int_distribution<int>(low, high)(m_random); }
 
   int3 anyPoint() {
@@ -47,8 +49,7 @@ public:
     int3 q = p;
     for (int a = 0; a < 3; ++a) {
       std::int64_t const c = p[a] + std::uniform_int_distribution<std::int64_t>(-2 * w, 2 * w)(m_random);
-      q[a] = static_cast<int>(
-          std::clamp<std::int64_t>(c, TraitsT::kMinTileCoord, TraitsT::kMaxTileCoord));
+      q[a] = static_cast<int>(std::clamp<std::int64_t>(c, TraitsT::kMinTileCoord, TraitsT::kMaxTileCoord));
     }
     return q;
   }

@@ -51,9 +51,7 @@ template <class T> void expectSameShape(Forest<T>& forest) {
           int3 const corner = t.childTIJK(t.childIJK(slot));
           VoxelCoord const child{corner.x, corner.y, corner.z, d + 1};
           ASSERT_EQ(t.isLeaf(slot), !model.has(child)) << t.voxelCoord() << " slot " << slot;
-          if (!t.isLeaf(slot)) {
-            ASSERT_EQ(tree.tile(t.childTreeIndex(slot)).voxelCoord(), child);
-          }
+          if (!t.isLeaf(slot)) { ASSERT_EQ(tree.tile(t.childTreeIndex(slot)).voxelCoord(), child); }
         }
       }
     }
@@ -118,9 +116,7 @@ template <class T> void expectSameNeighbors(Forest<T>& forest) {
           << t.voxelCoord() << " direction " << dir;
       TreeIndex const at = accessor.treeIndexNeighbor(t, direction);
       ASSERT_EQ(at.valid(), expected.has_value());
-      if (expected) {
-        ASSERT_EQ(tree.tile(at).voxelCoord(), *expected);
-      }
+      if (expected) { ASSERT_EQ(tree.tile(at).voxelCoord(), *expected); }
       if (auto const* table = tree.neighborData()) {
         ASSERT_EQ((*table)[static_cast<std::size_t>(t.depth())][static_cast<std::size_t>(t.index())]
                           [static_cast<std::size_t>(dir)],
