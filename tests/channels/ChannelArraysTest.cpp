@@ -92,7 +92,9 @@ TEST(ChannelArrays, NegativeWrongSizesChangeNothing) {
   channel.setChannelData(0, type<int>(), flat);
   EXPECT_TRUE(unchanged());
 
-  auto const nested = [&] { return Ostil::staticCast<NestedArrays<float>>(channel.channelData(3, type<float>())); };
+  auto const nested = [&] {
+    return Ostil::staticCast<NestedArrays<float>>(channel.channelData(3, type<float>()));
+  };
   auto shortDepths = nested();
   (*(*(*shortDepths)[0])[0])[0] = -1;
   shortDepths->removeLast();
