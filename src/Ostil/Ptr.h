@@ -163,6 +163,14 @@ public:
     shared.block()->clone(shared.get(), object, m_block);
     m_object = static_cast<T*>(object);
   }
+  /// A handle on an object that `shared`'s other owners keep: the one exception to sole ownership, for makers that
+  /// have just stored what they made.
+  static MutablePtr shareWith(Ptr<T> shared) {
+    MutablePtr handle;
+    handle.m_object = shared.get(), handle.m_block = shared.block();
+    shared.forget();
+    return handle;
+  }
   MutablePtr(MutablePtr&& other) noexcept
       : m_object(std::exchange(other.m_object, nullptr))
       , m_block(std::exchange(other.m_block, nullptr)) {}
