@@ -1,0 +1,22 @@
+# One Google Benchmark binary bench_<name> for each source of bench/. A source may write its own
+# main; otherwise it gets the library's.
+vln_glob(sources bench/*.cpp)
+foreach(source IN LISTS sources)
+  get_filename_component(name "${source}" NAME_WE)
+  set(target bench_${name})
+  add_executable(${target} "${source}")
+  vln_target(${target})
+  set_target_properties(${target} PROPERTIES RUNTIME_OUTPUT_DIRECTORY "${PROJECT_BINARY_DIR}/bench")
+  target_include_directories(${target} PRIVATE "${PROJECT_SOURCE_DIR}/bench")
+  target_link_libraries(${target} PRIVATE
+    GeometryVolume TBB::tbb benchmark::benchmark benchmark::benchmark_main)
+  if(TARGET GeometryVolumeInterop)
+    target_link_libraries(${target} PRIVATE GeometryVolumeInterop)
+  endif()
+  if(OpenVDB_FOUND)
+    target_link_libraries(${target} PRIVATE OpenVDB::openvdb)
+  endif()
+  if(NanoVDB_FOUND)
+    target_link_libraries(${target} PRIVATE NanoVDB::nanovdb)
+  endif()
+endforeach()

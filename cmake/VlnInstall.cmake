@@ -1,0 +1,51 @@
+# Install rules and the CMake package. Headers go by glob: every *.h of a room except the
+# implementation headers *Impl.h. scripts/check_install compares the outcome with
+# cmake/install_manifest.txt.
+include(CMakePackageConfigHelpers)
+
+set(include_dir "${CMAKE_INSTALL_INCLUDEDIR}/GeometryVolume")
+set(package_dir "${CMAKE_INSTALL_LIBDIR}/cmake/GeometryVolume")
+
+install(TARGETS GeometryVolume EXPORT GeometryVolumeTargets
+  RUNTIME DESTINATION "${CMAKE_INSTALL_BINDIR}"
+  LIBRARY DESTINATION "${CMAKE_INSTALL_LIBDIR}"
+  ARCHIVE DESTINATION "${CMAKE_INSTALL_LIBDIR}")
+install(EXPORT GeometryVolumeTargets NAMESPACE GeometryVolume:: DESTINATION "${package_dir}")
+
+set(rooms Ostil Velorn vljemalloc GeometryVolume)
+if(TARGET GeometryVolumeInterop)
+  list(APPEND rooms Interop)
+  install(TARGETS GeometryVolumeInterop EXPORT GeometryVolumeInteropTargets
+    RUNTIME DESTINATION "${CMAKE_INSTALL_BINDIR}"
+    LIBRARY DESTINATION "${CMAKE_INSTALL_LIBDIR}"
+    ARCHIVE DESTINATION "${CMAKE_INSTALL_LIBDIR}")
+  install(EXPORT GeometryVolumeInteropTargets NAMESPACE GeometryVolume:: DESTINATION "${package_dir}")
+  install(FILES "${PROJECT_SOURCE_DIR}/cmake/FindOpenVDB.cmake" DESTINATION "${package_dir}")
+endif()
+foreach(room IN LISTS rooms)
+  if(IS_DIRECTORY "${PROJECT_SOURCE_DIR}/src/${room}")
+    # Only headers are matched, so folders without one must not be made.
+    file(GLOB_RECURSE headers CONFIGURE_DEPENDS RELATIVE "${PROJECT_SOURCE_DIR}/src"
+      "${PROJECT_SOURCE_DIR}/src/${room}/*.h")
+    list(FILTER headers EXCLUDE REGEX "Impl\\.h$")
+    foreach(header IN LISTS headers)
+      get_filename_component(folder "${header}" DIRECTORY)
+      install(FILES "${PROJECT_SOURCE_DIR}/src/${header}" DESTINATION "${include_dir}/${folder}")
+    endforeach()
+  endif()
+endforeach()
+install(FILES "${VLN_GENERATED_DIR}/GeometryVolume/core/ElementTypesConfig.h"
+  DESTINATION "${include_dir}/GeometryVolume/core")
+if(TARGET vln)
+  install(TARGETS vln RUNTIME DESTINATION "${CMAKE_INSTALL_BINDIR}")
+endif()
+
+configure_package_config_file("${PROJECT_SOURCE_DIR}/cmake/GeometryVolumeConfig.cmake.in"
+  "${PROJECT_BINARY_DIR}/GeometryVolumeConfig.cmake"
+  INSTALL_DESTINATION "${package_dir}" NO_CHECK_REQUIRED_COMPONENTS_MACRO)
+write_basic_package_version_file("${PROJECT_BINARY_DIR}/GeometryVolumeConfigVersion.cmake"
+  VERSION ${PROJECT_VERSION} COMPATIBILITY SameMinorVersion)
+install(FILES
+  "${PROJECT_BINARY_DIR}/GeometryVolumeConfig.cmake"
+  "${PROJECT_BINARY_DIR}/GeometryVolumeConfigVersion.cmake"
+  DESTINATION "${package_dir}")

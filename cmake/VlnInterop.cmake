@@ -1,0 +1,19 @@
+# GeometryVolumeInterop: traffic with other formats. OpenVDB stays out of its interface, so a
+# program that links the shared library needs OpenVDB at run time only.
+vln_glob(sources src/Interop/*.cpp)
+if(sources)
+  vln_glob(headers src/Interop/*.h)
+  add_library(GeometryVolumeInterop ${sources} ${headers})
+  add_library(GeometryVolume::GeometryVolumeInterop ALIAS GeometryVolumeInterop)
+  vln_target(GeometryVolumeInterop)
+  target_link_libraries(GeometryVolumeInterop PUBLIC GeometryVolume PRIVATE OpenVDB::openvdb)
+  if(PNG_FOUND)
+    target_link_libraries(GeometryVolumeInterop PRIVATE PNG::PNG)
+  endif()
+  set_target_properties(GeometryVolumeInterop PROPERTIES
+    VERSION ${PROJECT_VERSION}
+    SOVERSION ${PROJECT_VERSION_MAJOR}.${PROJECT_VERSION_MINOR}
+    INSTALL_RPATH "$ORIGIN")
+else()
+  message(STATUS "src/Interop has no source yet: no target GeometryVolumeInterop")
+endif()

@@ -1,0 +1,67 @@
+# One GoogleTest binary test_<room> for each folder of tests/ that holds a source, with the label
+# <room>. tests/support is for shared helper headers, tests/package is a project of its own.
+include(GoogleTest)
+
+if(NOT VLN_TEST_DATA_DIR)
+  set(candidates "${PROJECT_SOURCE_DIR}/../shared/data")
+  execute_process(COMMAND git rev-parse --path-format=absolute --git-common-dir
+    WORKING_DIRECTORY "${PROJECT_SOURCE_DIR}" OUTPUT_VARIABLE common ERROR_QUIET
+    OUTPUT_STRIP_TRAILING_WHITESPACE)
+  if(common)
+    list(APPEND candidates "${common}/../../shared/data")
+  endif()
+  set(vln_test_data "")
+  foreach(candidate IN LISTS candidates)
+    if(IS_DIRECTORY "${candidate}" AND NOT vln_test_data)
+      get_filename_component(vln_test_data "${candidate}" ABSOLUTE)
+    endif()
+  endforeach()
+else()
+  set(vln_test_data "${VLN_TEST_DATA_DIR}")
+endif()
+if(NOT vln_test_data)
+  message(STATUS "No ../shared/data: tests on real input files will be skipped")
+endif()
+
+vln_folders(rooms tests)
+list(REMOVE_ITEM rooms support package)
+foreach(room IN LISTS rooms)
+  vln_glob(sources tests/${room}/*.cpp)
+  vln_glob(templates tests/${room}/*.cpp.in)
+  vln_expand_templates(generated ${templates})
+  if(room STREQUAL "interop" AND NOT TARGET GeometryVolumeInterop)
+    continue()
+  endif()
+  if(room STREQUAL "vln" AND NOT TARGET vln)
+    continue()
+  endif()
+
+  set(target test_${room})
+  add_executable(${target} ${sources} ${generated})
+  vln_target(${target})
+  target_include_directories(${target} PRIVATE
+    "${PROJECT_SOURCE_DIR}/tests" "${PROJECT_SOURCE_DIR}/tests/${room}")
+  target_compile_definitions(${target} PRIVATE
+    "VLN_TEST_DATA_DIR=\"${vln_test_data}\"" "VLN_TEST_ALLOCATOR=\"${VLN_ALLOCATOR}\"")
+  target_link_libraries(${target} PRIVATE
+    GeometryVolume TBB::tbb Threads::Threads GTest::gmock GTest::gtest GTest::gtest_main)
+  if(room STREQUAL "interop" OR room STREQUAL "vln")
+    target_link_libraries(${target} PRIVATE GeometryVolumeInterop OpenVDB::openvdb)
+    if(PNG_FOUND)
+      target_link_libraries(${target} PRIVATE PNG::PNG)
+    endif()
+    if(nlohmann_json_FOUND)
+      target_link_libraries(${target} PRIVATE nlohmann_json::nlohmann_json)
+    endif()
+  endif()
+  if(room STREQUAL "vln")
+    target_compile_definitions(${target} PRIVATE "VLN_PROGRAM=\"$<TARGET_FILE:vln>\"")
+    add_dependencies(${target} vln)
+  endif()
+  # PRE_TEST: the list is asked for when ctest starts, not at the end of every link.
+  gtest_discover_tests(${target}
+    TEST_PREFIX "${room}."
+    DISCOVERY_MODE PRE_TEST
+    DISCOVERY_TIMEOUT 60
+    PROPERTIES LABELS "${room}" TIMEOUT 600)
+endforeach()

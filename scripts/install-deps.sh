@@ -1,0 +1,43 @@
+#!/bin/sh
+# Installs the Debian packages that the build, the tests and the checks need. Asks nothing; when
+# all is there it does nothing and calls no network.
+set -eu
+
+packages="
+  g++ binutils cmake ninja-build ccache git ca-certificates python3
+  libtbb-dev libjemalloc-dev libnanovdb-dev
+  libopenvdb-dev libopenvdb-tools libboost-iostreams-dev libimath-dev
+  libcli11-dev nlohmann-json3-dev libpng-dev libfmt-dev
+  libgtest-dev libgmock-dev libbenchmark-dev
+  clang-format-14
+"
+
+if ! command -v dpkg-query >/dev/null 2>&1; then
+  echo "install-deps: this is not a Debian system; install the counterparts of:" >&2
+  echo $packages >&2
+  exit 1
+fi
+
+missing=
+for package in $packages; do
+  if [ "$(dpkg-query -W -f='${db:Status-Status}' "$package" 2>/dev/null || true)" != installed ]; then
+    missing="$missing $package"
+  fi
+done
+if [ -z "$missing" ]; then
+  echo "install-deps: all packages are there"
+  exit 0
+fi
+
+echo "install-deps: installing$missing"
+as_root=
+if [ "$(id -u)" != 0 ]; then
+  if ! command -v sudo >/dev/null 2>&1; then
+    echo "install-deps: neither root nor sudo; as root run: apt-get install$missing" >&2
+    exit 1
+  fi
+  as_root=sudo
+fi
+$as_root apt-get update -qq </dev/null
+# shellcheck disable=SC2086
+$as_root env DEBIAN_FRONTEND=noninteractive apt-get install -y -q --no-install-recommends $missing </dev/null
