@@ -41,3 +41,12 @@ function(vln_folders out parent)
   list(REMOVE_DUPLICATES names)
   set(${out} "${names}" PARENT_SCOPE)
 endfunction()
+
+# vln_uses_openvdb(TARGET): for a target whose sources include OpenVDB's headers. They need default
+# visibility: std::call_once of OpenVDB's own functions may be bound to the copy compiled here, and
+# that copy must then set the variables of the process, not hidden ones of this target.
+function(vln_uses_openvdb target)
+  target_link_libraries(${target} PRIVATE OpenVDB::openvdb)
+  set_target_properties(${target} PROPERTIES
+    CXX_VISIBILITY_PRESET default VISIBILITY_INLINES_HIDDEN OFF)
+endfunction()
