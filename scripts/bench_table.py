@@ -97,7 +97,8 @@ def main():
 
     print("# Benchmarks\n\nWritten by `scripts/bench.sh`; do not edit.\n")
     print(f"- date: {now:%Y-%m-%d}, commit {output('git', 'rev-parse', '--short=12', 'HEAD') or 'unknown'}")
-    print(f"- machine: {first_match('/proc/cpuinfo', r'model name\s*:\s*(.*)')}, "
+    processor = first_match("/proc/cpuinfo", r"model name\s*:\s*(.*)")
+    print(f"- machine: {processor}, "
           f"{context.get('num_cpus', '?')} cores, {memory:.0f} GiB, {platform.system()} {platform.release()}")
     print(f"- compiler: {compiler}, {build_type}: `{flags}`")
     print(f"- versions: {versions}")

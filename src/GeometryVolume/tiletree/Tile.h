@@ -280,7 +280,10 @@ public:
   /// Writes the fields, and a line for each failed check; the checks are looser than those of isOK().
   void dump(std::ostream& os) const;
 
-  /// Makes this record a live tile. Only the tree's own code calls it.
+protected:
+  template <class> friend class Container;
+
+  /// Makes this record a live tile.
   void init(std::int64_t parent, int i, int j, int k, int depth, std::int64_t index) {
     this->m_tijk = {i, j, k};
     this->m_depth = depth;

@@ -15,9 +15,12 @@
 #pragma once
 
 #include <array>
+#include <cstddef>
 #include <cstdint>
 
 namespace VLN::TileTree3D {
+
+__extension__ using DoubleWord = unsigned __int128;
 
 template <int TileWidth, int TileDataWidth, int, int> struct Traits {
   static constexpr int kTileWidth = TileWidth;
@@ -63,14 +66,41 @@ public:
   }
 
   /// Corner coordinate of the tile of depth `d` that holds coordinate `c`.
-  /// @pre `c` lies in the domain.
+  /// @pre `c` lies in the domain, `d` in 0..kMaxDepth.
   static constexpr std::int32_t align(std::int32_t c, int d) {
-    std::uint32_t const u = static_cast<std::uint32_t>(c) - static_cast<std::uint32_t>(kMinTileCoord);
-    std::uint32_t const w = static_cast<std::uint32_t>(width(d));
-    return static_cast<std::int32_t>(u - u % w + static_cast<std::uint32_t>(kMinTileCoord));
+    std::uint32_t const aligned = quotient(offset(c), d) * static_cast<std::uint32_t>(width(d));
+    return static_cast<std::int32_t>(aligned + static_cast<std::uint32_t>(kMinTileCoord));
+  }
+
+  /// Quotient of an offset from kMinTileCoord and the width of depth `d`, for d in 0..kMaxDepth.
+  /// @formula A shift by the width's logarithm, or the high word of the product with ceil(2^64 / width),
+  /// which is exact for every 32-bit dividend and divisor above 1.
+  static constexpr std::uint32_t quotient(std::uint32_t offset, int d) {
+    auto const& divider = kDividers[static_cast<std::size_t>(d)];
+    if constexpr (kTW == 2)
+      return offset >> divider;
+    else
+      return static_cast<std::uint32_t>((static_cast<DoubleWord>(offset) * divider) >> 64);
+  }
+  /// Offset of a coordinate of the domain from its low end.
+  static constexpr std::uint32_t offset(std::int32_t c) {
+    return static_cast<std::uint32_t>(c) - static_cast<std::uint32_t>(kMinTileCoord);
   }
 
 private:
+  static constexpr auto kDividers = [] {
+    std::array<std::uint64_t, static_cast<std::size_t>(kMaxDepth + 1)> divider{};
+    std::uint64_t w = static_cast<std::uint64_t>(kDomainWidth);
+    for (auto& entry : divider) {
+      if constexpr (kTW == 2) {
+        for (std::uint64_t v = w; v > 1; v /= 2) ++entry;
+      } else {
+        entry = UINT64_MAX / w + 1; // w is odd and above 1, so it never divides 2^64
+      }
+      w /= static_cast<std::uint64_t>(kTW);
+    }
+    return divider;
+  }();
   static constexpr auto kWidths = [] {
     std::array<std::int32_t, static_cast<std::size_t>(kMaxDepth + 5)> w{};
     std::int32_t value = kDomainWidth;

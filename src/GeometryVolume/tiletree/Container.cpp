@@ -1,0 +1,246 @@
+#include "GeometryVolume/tiletree/Container.h"
+
+#include "GeometryVolume/core/Const.h"
+#include "GeometryVolume/core/Streaming.h"
+#include "GeometryVolume/tiletree/Consistency.h"
+#include "GeometryVolume/tiletree/ContainerScratchImpl.h"
+#include "GeometryVolume/tiletree/ContainerTilesImpl.h"
+#include "GeometryVolume/tiletree/DerivedCaches.h"
+#include "GeometryVolume/tiletree/TileHalo.h"
+#include "GeometryVolume/tiletree/TraversalEngine.h"
+
+#include <ostream>
+
+namespace VLN::TileTree3D {
+
+namespace {
+
+Ostil::String nameOrDefault(Ostil::String const& name) {
+  return name.empty() ? Const::TileTreeContainerName : name;
+}
+
+template <class V> void toWorld(bbox<int3, int> const& box, double voxelSize, bbox<V>& out) {
+  using S = typename V::Scalar;
+  out = {};
+  if (box.empty()) return;
+  auto const scale = [&](int c) { return static_cast<S>(static_cast<S>(c) * static_cast<S>(voxelSize)); };
+  out.min = {scale(box.min.x), scale(box.min.y), scale(box.min.z)};
+  out.max = {scale(box.max.x), scale(box.max.y), scale(box.max.z)};
+}
+
+} // namespace
+
+template <class TraitsT>
+Container<TraitsT>::Container()
+    : Container(Ostil::String(), 1.0f) {}
+
+template <class TraitsT>
+Container<TraitsT>::Container(Ostil::String const& name, float voxelSize)
+    : Component(nameOrDefault(name))
+    , m_data(Ostil::makePtr<Data>()) {
+  setVoxelSize(voxelSize);
+}
+
+template <class TraitsT>
+Container<TraitsT>::Container(Container const& other)
+    : Component(other)
+    , m_data(other.m_data) {
+  cloneData();
+}
+
+template <class TraitsT> Container<TraitsT>& Container<TraitsT>::operator=(Container const& other) {
+  if (this == &other) return *this;
+  Component::operator=(other);
+  m_data = other.m_data;
+  cloneData();
+  return *this;
+}
+
+template <class TraitsT> Container<TraitsT>::~Container() = default;
+
+template <class TraitsT> void Container<TraitsT>::cloneData() {
+  if (!m_data.unique()) m_data = Ostil::makePtr<Data>(*m_data);
+}
+
+template <class TraitsT> void Container<TraitsT>::copyTo(Ostil::Ptr<VLN::Component>& target) const {
+  if (target.get() == this) return;
+  auto copy = Ostil::makePtr<Container>(name(), voxelSize());
+  copy->m_data = Ostil::makePtr<Data>(*m_data);
+  target = copy;
+  Component::copyTo(target);
+}
+
+template <class TraitsT> std::uint64_t Container<TraitsT>::size() const {
+  return static_cast<std::uint64_t>(tileCount(-1)) * kTileSize;
+}
+template <class TraitsT> bool Container<TraitsT>::empty() const { return size() == 0; }
+template <class TraitsT> void Container<TraitsT>::update(VLN::Component const&) {}
+template <class TraitsT> std::int64_t Container<TraitsT>::elementCount(int depth) const {
+  return tileCount(depth) * TraitsT::kTileDataSize;
+}
+template <class TraitsT> int Container<TraitsT>::elementCount(TreeIndex const&) const {
+  return TraitsT::kTileDataSize;
+}
+
+template <class TraitsT>
+void Container<TraitsT>::memUse(std::uint64_t& used, std::uint64_t& allocated, bool notShared) const {
+  Component::memUse(used, allocated, notShared);
+  used += sizeof(m_data), allocated += sizeof(m_data);
+  std::uint64_t dataUsed = 0, dataAllocated = 0;
+  m_data->memUse(dataUsed, dataAllocated);
+  auto const sharers = notShared ? std::uint64_t(1) : static_cast<std::uint64_t>(m_data.useCount());
+  used += dataUsed / sharers, allocated += dataAllocated / sharers;
+}
+
+template <class TraitsT> std::uint64_t Container<TraitsT>::memUsage() const {
+  std::int64_t records = rootCount() + 1 + tileCount(-1);
+  for (int d = 0; d <= kMaxDepth; ++d) records += m_data->tiles(d).capacity() - m_data->tiles(d).size();
+  return static_cast<std::uint64_t>(records) * sizeof(TileType);
+}
+
+template <class TraitsT> void Container<TraitsT>::dump(std::ostream& os) const {
+  Component::dump(os);
+  auto const pad = Streaming::pad(os);
+  os << pad << "tileCount {\n";
+  for (int d = 0; d <= kMaxDepth; ++d) os << pad << d << ": " << tileCount(d) << '\n';
+  os << pad << "}\n" << pad << "roots size {" << rootCount() << "}\n";
+
+  auto const writeTile = [&](char const* kind, TreeIndex const& at) {
+    TileType const& t = tile(at);
+    os << pad << kind << at.depth << ", " << at.index << "] = {tijk = " << t.ti() << ' ' << t.tj() << ' '
+       << t.tk() << ", width = " << t.tileVoxelWidth() << ", parent = " << t.parentIndex();
+    if (t.children()) {
+      os << ", children = { ";
+      for (int slot = 0; slot < kTileSize; ++slot) os << t.childIndex(slot) << ' ';
+      os << '}';
+    } else {
+      os << ", children = nullptr";
+    }
+    os << "}\n";
+  };
+  for (auto const& root : m_data->m_roots) writeTile("root[", root.second);
+  for (int d = 0; d <= kMaxDepth; ++d) {
+    for (std::int64_t n = 0; n < tileCount(d); ++n) writeTile("tile[", {n, d});
+  }
+}
+
+template <class TraitsT> void Container<TraitsT>::setVoxelSize(float size) {
+  if (m_data->m_voxelSize == size) return;
+  m_data->m_voxelSize = size;
+  m_data->m_voxelSizeInv = size > 0 ? 1.0f / size : 1.0f;
+}
+
+template <class TraitsT> void Container<TraitsT>::setMaxRelativeRefinementError(float error) {
+  m_data->m_maxRelativeRefinementError = error < 0 ? 0.0f : error;
+}
+
+template <class TraitsT> float Container<TraitsT>::worldSpaceTileVoxelDiagonal(int d) const {
+  return static_cast<float>(tileVoxelWidth(d)) * voxelSize() * 1.732051f;
+}
+
+template <class TraitsT> void Container<TraitsT>::tileSpaceBounds(bbox<int3, int>& box) const {
+  box = {};
+  for (auto const& root : m_data->m_roots) tile(root.second).tileSpaceBounds(box);
+}
+
+template <class TraitsT> void Container<TraitsT>::tileSpaceBounds(int d, bbox<int3, int>& box) const {
+  using Box = bbox<int3, int>;
+  auto const& tiles = m_data->tiles(d);
+  box = parallelReduce(
+      0, tiles.size(), 16384, Box{},
+      [&](std::int64_t begin, std::int64_t end) {
+        Box part;
+        for (std::int64_t n = begin; n < end; ++n) {
+          if (tiles[n].valid()) tiles[n].tileSpaceBounds(part);
+        }
+        return part;
+      },
+      [](Box a, Box const& b) {
+        if (!b.empty()) a.grow(b.min), a.grow(b.max);
+        return a;
+      });
+}
+
+template <class TraitsT> void Container<TraitsT>::worldSpaceBounds(bbox<float3>& box) const {
+  bbox<int3, int> bounds;
+  tileSpaceBounds(bounds);
+  toWorld(bounds, voxelSize(), box);
+}
+template <class TraitsT> void Container<TraitsT>::worldSpaceBounds(int d, bbox<float3>& box) const {
+  bbox<int3, int> bounds;
+  tileSpaceBounds(d, bounds);
+  toWorld(bounds, voxelSize(), box);
+}
+template <class TraitsT> void Container<TraitsT>::worldSpaceBounds(bbox<double3>& box) const {
+  bbox<int3, int> bounds;
+  tileSpaceBounds(bounds);
+  toWorld(bounds, voxelSize(), box);
+}
+template <class TraitsT> void Container<TraitsT>::worldSpaceBounds(int d, bbox<double3>& box) const {
+  bbox<int3, int> bounds;
+  tileSpaceBounds(d, bounds);
+  toWorld(bounds, voxelSize(), box);
+}
+
+// --- Traversal ---
+
+template <class TraitsT>
+void Container<TraitsT>::traverse(VisitorType& visitor, TraversalMode mode,
+                                  TraversalRange const& range) const {
+  TraversalEngine<true, TraitsT>::run(*this, visitor, mode, range, VisitorResults::kKeepCopies);
+}
+template <class TraitsT>
+void Container<TraitsT>::traverse(VisitorType& visitor, TraversalMode mode, TraversalRange const& range) {
+  TraversalEngine<false, TraitsT>::run(*this, visitor, mode, range, VisitorResults::kKeepCopies);
+}
+template <class TraitsT>
+void Container<TraitsT>::reduce(VisitorType& visitor, TraversalMode mode, TraversalRange const& range) const {
+  TraversalEngine<true, TraitsT>::run(*this, visitor, mode, range, VisitorResults::kJoin);
+}
+template <class TraitsT>
+void Container<TraitsT>::reduce(VisitorType& visitor, TraversalMode mode, TraversalRange const& range) {
+  TraversalEngine<false, TraitsT>::run(*this, visitor, mode, range, VisitorResults::kJoin);
+}
+template <class TraitsT> void Container<TraitsT>::setBranchSizes() {
+  BranchSizeVisitor<TraitsT> visitor(*m_data);
+  traverse(visitor, kParallelBottomUp);
+}
+template <class TraitsT> bool Container<TraitsT>::checkBranchSizes(bool verbose) const {
+  return TileTree3D::checkBranchSizes(*this, verbose);
+}
+template <class TraitsT> bool Container<TraitsT>::checkConsistency(bool verbose) const {
+  return TileTree3D::checkConsistency(*this, verbose);
+}
+
+// --- Derived caches ---
+
+template <class TraitsT> void Container<TraitsT>::buildAccessorAccelerationStructure(int maxDepth) {
+  buildAccelerationGrid(*this, *m_data, maxDepth);
+}
+template <class TraitsT> void Container<TraitsT>::precomputeTileNeighbors() {
+  m_data->m_neighbors = computeTileNeighbors(*this);
+}
+template <class TraitsT> void Container<TraitsT>::precomputeTileHalos() {
+  m_data->m_halos = computeTileHalos(*this);
+}
+template <class TraitsT> void Container<TraitsT>::precomputeCompressedTileHalos() {
+  m_data->m_compressedHalos = computeCompressedTileHalos(*this);
+}
+template <class TraitsT> TileHalo<TraitsT> const* Container<TraitsT>::tileHalo(TreeIndex const& at) const {
+  if (!m_data->m_halos) return nullptr;
+  return &(*m_data->m_halos)[static_cast<std::size_t>(at.depth)][static_cast<std::size_t>(at.index)];
+}
+template <class TraitsT>
+TileHaloVisitor<TraitsT> Container<TraitsT>::tileHaloVisitor(TreeIndex const& at) const {
+  if (!m_data->m_compressedHalos) return {};
+  auto const& records = m_data->m_compressedHalos->records[static_cast<std::size_t>(at.depth)];
+  return {records[static_cast<std::size_t>(at.index)], m_data->m_haloCompression};
+}
+template <class TraitsT> int Container<TraitsT>::tileSpaceMaxTileDistance() const {
+  return maxTileDistance(*this);
+}
+
+#define VLN_INSTANTIATE(TraitsT) template class VLN_API Container<TraitsT>;
+VLN_FOR_EACH_SHAPE(VLN_INSTANTIATE)
+
+} // namespace VLN::TileTree3D

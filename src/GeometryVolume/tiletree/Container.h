@@ -1,0 +1,252 @@
+// Container: the tree itself, a named component that owns all tiles of one volume.
+//
+// Tiles lie by depth in dense arrays and refer to each other by index; a TreeIndex stays valid when the tree
+// grows, a reference to a tile does not. The tree is a forest: a root is any tile without a parent, at any
+// depth.
+//
+//   depth d   | tile | tile | tile | ...          parent index up, child indices down
+//   depth d+1 | tile | tile | tile | tile | ...
+//
+// A container holds no field values: channels hang off it and are told of changes by the update protocol.
+#pragma once
+
+#include "GeometryVolume/tiletree/ContainerData.h"
+#include "GeometryVolume/tiletree/TreeComponent.h"
+#include "GeometryVolume/tiletree/Visitor.h"
+#include "Ostil/Array.h"
+
+namespace VLN::TileTree3D {
+
+template <class TraitsT> class ConstTileAccessorOf;
+template <class TraitsT> class TileAccessorOf;
+template <class Reference, class Pointer, class ContainerT> class TileIteratorBase;
+template <class TraitsT> class ConstVoxelIterator;
+template <class TraitsT> class TileHaloVisitor;
+template <class TraitsT> class NeighborSearch;
+template <bool IsConst, class TraitsT> class TraversalEngine;
+
+/// @threads Structural change belongs to one thread; reads may run concurrently while nothing changes.
+template <class TraitsT> class VLN_API Container : public Component {
+public:
+  using TraitsType = TraitsT;
+  using TileType = Tile<TraitsT, TraitsT::kTileSize>;
+  using Data = ContainerData<TraitsT>;
+  using Roots = typename Data::Roots;
+  using ConstTileAccessor = ConstTileAccessorOf<TraitsT>;
+  using TileAccessor = TileAccessorOf<TraitsT>;
+  using VisitorType = Visitor<Container>;
+  using TileIterator = TileIteratorBase<TileType&, TileType*, Container>;
+  using ConstTileIterator = TileIteratorBase<TileType const&, TileType const*, Container const>;
+  using VoxelIterator = ConstVoxelIterator<TraitsT>;
+  using Counts = typename Data::Counts;
+  /// Corners of tiles by depth.
+  using TileLists = Dense1D::FixedArray<Ostil::Array<int3>, static_cast<std::size_t>(TraitsT::kDepths)>;
+
+  static constexpr int kTW = TraitsT::kTW;
+  static constexpr int kTileWidth = TraitsT::kTW;
+  static constexpr int kTDW = TraitsT::kTDW;
+  static constexpr int kTileSize = TraitsT::kTileSize;
+  static constexpr int kMaxDepth = TraitsT::kMaxDepth;
+  static constexpr int kMaxParallelDepth = TraitsT::kMaxParallelDepth;
+  static constexpr int kDepthFirstMaxParallelDepth = TraitsT::kDepthFirstMaxParallelDepth;
+  static constexpr int kMinTileCoord = TraitsT::kMinTileCoord;
+  static constexpr int kMaxTileCoord = TraitsT::kMaxTileCoord;
+
+  /// An empty name becomes Const::TileTreeContainerName.
+  Container();
+  Container(Ostil::String const& name, float voxelSize);
+  /// The copy has its own data and shares the tile arrays until either is changed.
+  Container(Container const& other);
+  Container& operator=(Container const& other);
+  ~Container() override;
+
+  // Component
+  void dump(std::ostream& os) const override;
+  void memUse(std::uint64_t& used, std::uint64_t& allocated, bool notShared) const override;
+  void copyTo(Ostil::Ptr<VLN::Component>& target) const override;
+  /// Number of voxels: tiles x kTileSize.
+  std::uint64_t size() const override;
+  bool empty() const override;
+  /// Nothing: a tree follows no other component.
+  void update(VLN::Component const& source) override;
+  std::int64_t elementCount(int depth) const override;
+  int elementCount(TreeIndex const& tile) const override;
+  std::int64_t tileCount(int depth) const override {
+    if (depth == -1) return m_data->m_tileCountTotal;
+    return TraitsT::isDepth(depth) ? m_data->m_tileCounts[static_cast<std::size_t>(depth)] : 0;
+  }
+  /// A quick estimate of the memory of the tile records. @cost Constant.
+  std::uint64_t memUsage() const;
+
+  // Tiles
+  /// Array access, unchecked.
+  TileType const& tile(TreeIndex const& at) const { return m_data->tiles(at.depth)[at.index]; }
+  TileType const& tile(std::int64_t index, int depth) const { return m_data->tiles(depth)[index]; }
+  /// The n-th tile counted across depths from depth 0 upward; the invalid tile beyond the last.
+  TileType const& tile(std::int64_t n) const;
+  /// Position of a tile across depths.
+  std::int64_t tileIndex(TreeIndex const& at) const;
+  /// What every failed lookup returns: not valid, depth -1.
+  TileType const& invalidTile() const { return m_data->m_invalidTile; }
+  ConstTileAccessor tileAccessor() const;
+  TileAccessor tileAccessor();
+
+  std::int64_t rootCount() const { return static_cast<std::int64_t>(m_data->m_roots.size()); }
+  std::int64_t rootCount(int depth) const { return m_data->m_rootCounts[static_cast<std::size_t>(depth)]; }
+  typename Roots::const_iterator cbeginRoots() const { return m_data->m_roots.cbegin(); }
+  typename Roots::const_iterator cendRoots() const { return m_data->m_roots.cend(); }
+
+  // Shape
+  static constexpr int depth() { return kMaxDepth; }
+  static constexpr int maxDepth() { return kMaxDepth; }
+  static int tileWidth(int) { return kTW; }
+  static int tileSize(int) { return kTileSize; }
+  static int tileDataWidth(int) { return kTDW; }
+  static int tileDataSize(int) { return TraitsT::kTileDataSize; }
+  static int tileVoxelWidth(int d) { return TileType::tileVoxelWidth(d); }
+  static int voxelWidth(int d) { return TileType::voxelWidth(d); }
+  static int voxelDataWidth(int d) { return TileType::voxelDataWidth(d); }
+  std::int64_t voxelCount(int d) const { return tileCount(d) * kTileSize; }
+  std::int64_t voxelDataCount(int d) const { return tileCount(d) * TraitsT::kTileDataSize; }
+
+  // World
+  /// World length of one tile-space unit.
+  float voxelSize() const { return m_data->m_voxelSize; }
+  /// @edges A size that is not above 0 stores an inverse of 1.
+  void setVoxelSize(float size);
+  float3 toTileSpace(float3 const& world) const { return world * m_data->m_voxelSizeInv; }
+  float3 toWorldSpace(float3 const& tile) const { return tile * m_data->m_voxelSize; }
+  float worldSpaceTileVoxelDiagonal(int d) const;
+  /// Box of the roots, or of all tiles of a depth. @edges An empty tree gives the empty box.
+  void tileSpaceBounds(bbox<int3, int>& box) const;
+  void tileSpaceBounds(int d, bbox<int3, int>& box) const;
+  void worldSpaceBounds(bbox<float3>& box) const;
+  void worldSpaceBounds(int d, bbox<float3>& box) const;
+  void worldSpaceBounds(bbox<double3>& box) const;
+  void worldSpaceBounds(int d, bbox<double3>& box) const;
+
+  // Iteration: all tiles, or all voxels, depth by depth in index order; `n` items are skipped
+  TileIterator beginTiles(std::int64_t n = 0);
+  TileIterator endTiles();
+  ConstTileIterator beginTiles(std::int64_t n = 0) const { return cbeginTiles(n); }
+  ConstTileIterator endTiles() const { return cendTiles(); }
+  ConstTileIterator cbeginTiles(std::int64_t n = 0) const;
+  ConstTileIterator cendTiles() const;
+  VoxelIterator begin(std::int64_t n = 0) const { return cbegin(n); }
+  VoxelIterator end() const { return cend(); }
+  VoxelIterator cbegin(std::int64_t n = 0) const;
+  VoxelIterator cend() const;
+
+  // Traversal
+  /// Drives `visitor` over the tree. See TraversalMode for orders.
+  /// @error Parallel modes throw std::runtime_error(VLN::exceptionMessage) when the host cancels the job.
+  void traverse(VisitorType& visitor, TraversalMode mode, TraversalRange const& range = {}) const;
+  void traverse(VisitorType& visitor, TraversalMode mode, TraversalRange const& range = {});
+  /// As traverse(), and joins the workers' results into `visitor`, in an order that does not depend on the
+  /// threads.
+  void reduce(VisitorType& visitor, TraversalMode mode, TraversalRange const& range = {}) const;
+  void reduce(VisitorType& visitor, TraversalMode mode, TraversalRange const& range = {});
+  /// Whether each stored branch size is that of its branch. The verbose form reports on standard error.
+  bool checkBranchSizes(bool verbose) const;
+  /// Whether the records of the tree agree with each other. The verbose form reports on standard error.
+  bool checkConsistency(bool verbose) const;
+
+  // Derived caches: built on demand, dropped by every change of the tree
+  /// Dense grid of tile indices for fast entry: at the deepest depth up to `maxDepth` whose tiles span at
+  /// most 64 cells on each axis. @cost Linear in the tiles of the depths tried.
+  void buildAccessorAccelerationStructure(int maxDepth);
+  void clearAccessorAccelerationStructure();
+  /// 27 neighbours of each tile. @cost 432 bytes and 27 lookups a tile.
+  void precomputeTileNeighbors();
+  void clearPrecomputedTileNeighbors();
+  /// Null without the table.
+  typename Data::NeighborTable const* neighborData() const { return m_data->m_neighbors.get(); }
+  void precomputeTileHalos();
+  void clearTileHalos();
+  TileHalo<TraitsT> const* tileHalo(TreeIndex const& at) const;
+  void precomputeCompressedTileHalos();
+  void clearCompressedTileHalos();
+  /// Reads a compressed halo; an ended visitor without the table.
+  TileHaloVisitor<TraitsT> tileHaloVisitor(TreeIndex const& at) const;
+  /// Largest number of tiles across the bounds of any depth; 0 for an empty tree.
+  int tileSpaceMaxTileDistance() const;
+
+  // Scratch containers for parallel builders
+  /// Hands out a private container; it begins with one tile at depth 0 unless `keepEmpty` is not 0.
+  Container* threadLocalContainer(int keepEmpty);
+  /// Takes a scratch container back, without the tiles that it gained.
+  void freeThreadLocalContainer(Container* scratch);
+  /// Takes all handed-out containers back, truncated from the first depth that `lists` names, or from the
+  /// first depth at which they gained tiles when it names none.
+  void clearThreadLocalData(TileLists const* lists);
+
+  /// Value that the container carries for its callers; a negative one is stored as 0.
+  float maxRelativeRefinementError() const { return m_data->m_maxRelativeRefinementError; }
+  void setMaxRelativeRefinementError(float error);
+  bool compactOnRemoval() const { return m_data->m_compactOnRemoval; }
+  void setCompactOnRemoval(bool on) { m_data->m_compactOnRemoval = on; }
+
+  // Sharing
+  std::int64_t dataUseCount() const { return m_data.useCount(); }
+  /// Makes the data exclusive to this container.
+  void cloneData();
+  bool sharesTiles(Container const& other) const { return m_data->m_tiles == other.m_data->m_tiles; }
+
+protected:
+  friend class ConstTileAccessorOf<TraitsT>;
+  friend class TileAccessorOf<TraitsT>;
+  friend class NeighborSearch<TraitsT>;
+  friend class TraversalEngine<false, TraitsT>;
+  friend class TraversalEngine<true, TraitsT>;
+  friend struct ContainerTestAccess;
+
+  Data const* getData() const { return m_data.get(); }
+
+  // Lookup
+  /// The deepest tile at or above `depth` that holds the point; invalid when there is none.
+  TreeIndex tileIndex(int i, int j, int k, int depth) const;
+  TileType const& tile(int i, int j, int k, int depth) const;
+  /// Follows child slots from a tile towards a point of the domain until `depth` or an empty slot.
+  TreeIndex descend(TreeIndex at, int i, int j, int k, int depth) const;
+
+  // Change. Tiles are named by index, since growth moves the records.
+  TileType& editTile(TreeIndex const& at) { return m_data->editTiles(at.depth)[at.index]; }
+  TreeIndex addTile(VoxelCoord const& at) { return addTile(at.i, at.j, at.k, at.depth); }
+  TreeIndex addTile(int i, int j, int k, int depth);
+  /// Hangs `child` below `parent`, making the tiles between; returns the size of the branch that the parent
+  /// gained, 0 when it went below an existing child.
+  std::int64_t insertChild(TreeIndex parent, TreeIndex child);
+  /// A new live tile without parent at the aligned corner.
+  TreeIndex makeTile(int i, int j, int k, int depth);
+  std::int64_t allocateTile(int depth, TileType*& out);
+  void allocateTiles(int depth, std::int64_t n);
+  /// Sets the count of the depth. The caller restores the total.
+  void resize(std::int64_t n, int depth);
+  std::int64_t tileCapacity(int depth) const { return m_data->tiles(depth).capacity(); }
+  void reallocateTile(std::int64_t dst, std::int64_t src, int depth);
+  void addRoot(TileType const& tile);
+  void removeRoot(TileType const& tile);
+  /// Drops the derived caches after the tree grew.
+  void tilesAdded();
+  /// Drops them after tiles went; `moves` names, for each depth, what compaction did.
+  void tilesRemoved(std::vector<std::vector<std::pair<std::int64_t, std::int64_t>>> const* moves);
+  void setBranchSizes();
+
+  AffinityPartitioner& affinityPartitioner(int d) const {
+    return *m_data->m_affinityPartitioners[static_cast<std::size_t>(d)];
+  }
+  int incrementAffinityPartitionerUseCount() const { return m_data->m_affinityUseCount.fetch_add(1); }
+  int decrementAffinityPartitionerUseCount() const { return m_data->m_affinityUseCount.fetch_sub(1); }
+
+private:
+  void truncate(int depth);
+  void returnThreadLocal(int fromDepth);
+  void roots(std::vector<TreeIndex>& out) const;
+
+  Ostil::Ptr<Data> m_data;
+};
+
+} // namespace VLN::TileTree3D
+
+#include "GeometryVolume/tiletree/TileAccessor.h"
+#include "GeometryVolume/tiletree/TileIterator.h"

@@ -1,0 +1,95 @@
+#include "GeometryVolume/tiletree/ContainerData.h"
+
+#include "GeometryVolume/tiletree/Container.h"
+#include "GeometryVolume/tiletree/TileHalo.h"
+
+#include <iostream>
+
+namespace VLN::TileTree3D {
+
+template <class TraitsT>
+ContainerData<TraitsT>::ContainerData()
+    : m_tiles(Ostil::makePtr<UpperArrays>())
+    , m_tilesMaxDepth(Ostil::makePtr<Array>()) {
+  for (auto& partitioner : m_affinityPartitioners) partitioner = std::make_unique<AffinityPartitioner>();
+  linkArrays();
+}
+
+template <class TraitsT>
+ContainerData<TraitsT>::ContainerData(ContainerData const& b)
+    : m_tiles(b.m_tiles)
+    , m_tilesMaxDepth(b.m_tilesMaxDepth)
+    , m_neighbors(b.m_neighbors)
+    , m_halos(b.m_halos)
+    , m_compressedHalos(b.m_compressedHalos)
+    , m_roots(b.m_roots)
+    , m_rootCounts(b.m_rootCounts)
+    , m_tileCounts(b.m_tileCounts)
+    , m_tileCountTotal(b.m_tileCountTotal)
+    , m_gridSize(b.m_gridSize)
+    , m_gridTable(b.m_gridTable)
+    , m_gridOrigin(b.m_gridOrigin)
+    , m_gridExtent(b.m_gridExtent)
+    , m_gridDepth(b.m_gridDepth)
+    , m_gridCellWidth(b.m_gridCellWidth)
+    , m_voxelSize(b.m_voxelSize)
+    , m_voxelSizeInv(b.m_voxelSizeInv)
+    , m_maxRelativeRefinementError(b.m_maxRelativeRefinementError)
+    , m_compactOnRemoval(b.m_compactOnRemoval) {
+  for (auto& partitioner : m_affinityPartitioners) partitioner = std::make_unique<AffinityPartitioner>();
+  linkArrays();
+}
+
+template <class TraitsT> ContainerData<TraitsT>::~ContainerData() = default;
+
+template <class TraitsT> void ContainerData<TraitsT>::linkArrays() {
+  for (std::size_t d = 0; d < kMaxDepth; ++d) m_arrays[d] = &(*m_tiles)[d];
+  m_arrays[kMaxDepth] = m_tilesMaxDepth.get();
+}
+
+template <class TraitsT> void ContainerData<TraitsT>::cloneTiles() {
+  if (!m_tiles.unique()) m_tiles = Ostil::makePtr<UpperArrays>(*m_tiles);
+  if (!m_tilesMaxDepth.unique()) m_tilesMaxDepth = Ostil::makePtr<Array>(*m_tilesMaxDepth);
+  linkArrays();
+}
+
+template <class TraitsT>
+void ContainerData<TraitsT>::memUse(std::uint64_t& used, std::uint64_t& allocated) const {
+  auto const warnIfShared = [](auto const& shared, char const* name) {
+    if (!shared.unique())
+      std::cerr << "Container::Data.memUse(): Warning: '" << name
+                << "' not unique (use count = " << shared.useCount() << ")" << std::endl;
+  };
+  warnIfShared(m_tiles, "m_tiles");
+  warnIfShared(m_tilesMaxDepth, "m_tilesMaxDepth");
+
+  used = allocated = sizeof(ContainerData);
+  for (int d = 0; d < kDepths; ++d) {
+    Array const& array = tiles(d);
+    std::uint64_t bytes = sizeof(Array);
+    for (TileType const& tile : array) {
+      std::uint64_t record = 0, same = 0;
+      tile.memUse(record, same);
+      bytes += record;
+    }
+    used += bytes;
+    allocated += bytes + static_cast<std::uint64_t>(array.capacity() - array.size()) * sizeof(TileType);
+  }
+  used += m_gridTable.size() * sizeof(std::int64_t);
+  allocated += m_gridTable.capacity() * sizeof(std::int64_t);
+  used += m_allThreadLocal.size() * sizeof(m_allThreadLocal[0]);
+  allocated += m_allThreadLocal.capacity() * sizeof(m_allThreadLocal[0]);
+  for (auto const& scratch : m_allThreadLocal) {
+    std::uint64_t scratchUsed = 0, scratchAllocated = 0;
+    scratch->memUse(scratchUsed, scratchAllocated, true);
+    used += scratchUsed, allocated += scratchAllocated;
+  }
+  constexpr std::uint64_t kBookkeepingEntry = 232;
+  used += m_threadLocalCounts.size() * kBookkeepingEntry;
+  allocated += m_threadLocalCounts.size() * kBookkeepingEntry;
+}
+
+#define VLN_INSTANTIATE(TraitsT) template struct ContainerData<TraitsT>;
+VLN_FOR_EACH_SHAPE(VLN_INSTANTIATE)
+
+} // namespace VLN::TileTree3D

@@ -1,0 +1,113 @@
+// Scratch containers: private trees that parallel builders fill without locks. Included by Container.cpp
+// alone.
+#pragma once
+
+#include "GeometryVolume/tiletree/Container.h"
+
+#include <utility>
+
+namespace VLN::TileTree3D {
+
+/// First tile of a new scratch container.
+inline constexpr VoxelCoord kScratchStart{0, 0, 0, 0};
+
+template <class TraitsT> Container<TraitsT>* Container<TraitsT>::threadLocalContainer(int keepEmpty) {
+  Container* scratch = nullptr;
+  bool isNew = false;
+  {
+    std::lock_guard const lock(m_data->m_threadLocalFreeMutex);
+    auto& idle = m_data->m_freeThreadLocal;
+    if (!idle.empty()) {
+      scratch = idle.front();
+      idle.erase(idle.begin());
+    } else {
+      auto made = Ostil::makePtr<Container>("voxel_tile_tree_thread_local", voxelSize());
+      scratch = made.get();
+      m_data->m_allThreadLocal.push_back(std::move(made));
+      isNew = true;
+    }
+  }
+  if (isNew && keepEmpty == 0) scratch->addTile(kScratchStart);
+  Counts counts{};
+  for (int d = 0; d <= kMaxDepth; ++d) counts[static_cast<std::size_t>(d)] = scratch->tileCount(d);
+  std::lock_guard const lock(m_data->m_threadLocalMapMutex);
+  m_data->m_threadLocalCounts[scratch] = counts;
+  return scratch;
+}
+
+namespace Internal {
+
+/// First depth at which a scratch container differs from what it was when it was handed out; -1 when at none.
+template <class ContainerT>
+int firstChangedDepth(ContainerT const& scratch, typename ContainerT::Counts const& counts) {
+  for (int d = 0; d <= ContainerT::kMaxDepth; ++d) {
+    if (scratch.tileCount(d) != counts[static_cast<std::size_t>(d)]) return d;
+  }
+  return -1;
+}
+
+} // namespace Internal
+
+template <class TraitsT> void Container<TraitsT>::freeThreadLocalContainer(Container* scratch) {
+  Counts counts{};
+  {
+    std::lock_guard const lock(m_data->m_threadLocalMapMutex);
+    auto const entry = m_data->m_threadLocalCounts.find(scratch);
+    if (entry == m_data->m_threadLocalCounts.end()) return;
+    counts = entry->second;
+    m_data->m_threadLocalCounts.erase(entry);
+  }
+  int const changed = Internal::firstChangedDepth(*scratch, counts);
+  if (changed >= 0) scratch->truncate(changed);
+  std::lock_guard const lock(m_data->m_threadLocalFreeMutex);
+  m_data->m_freeThreadLocal.push_back(scratch);
+}
+
+template <class TraitsT> void Container<TraitsT>::clearThreadLocalData(TileLists const* lists) {
+  int from = -1;
+  for (int d = 0; lists && from < 0 && d <= kMaxDepth; ++d) {
+    if (!(*lists)[static_cast<std::size_t>(d)].empty()) from = d;
+  }
+  returnThreadLocal(from);
+}
+
+template <class TraitsT> void Container<TraitsT>::returnThreadLocal(int fromDepth) {
+  std::map<Container*, Counts> handedOut;
+  {
+    std::lock_guard const lock(m_data->m_threadLocalMapMutex);
+    handedOut.swap(m_data->m_threadLocalCounts);
+  }
+  for (auto const& [scratch, counts] : handedOut) {
+    int const from = fromDepth >= 0 ? fromDepth : Internal::firstChangedDepth(*scratch, counts);
+    if (from >= 0) scratch->truncate(from);
+    std::lock_guard const lock(m_data->m_threadLocalFreeMutex);
+    m_data->m_freeThreadLocal.push_back(scratch);
+  }
+}
+
+template <class TraitsT> void Container<TraitsT>::truncate(int depth) {
+  m_data->detachTiles();
+  tilesAdded();
+  if (depth > 0) {
+    auto& parents = m_data->editTiles(depth - 1);
+    parallelFor(0, parents.size(),
+                [&](std::int64_t begin, std::int64_t end) {
+                  for (std::int64_t n = begin; n < end; ++n) {
+                    if (parents[n].children()) parents[n].initData();
+                  }
+                },
+                {.grain = 4096});
+  }
+  for (int d = depth; d <= kMaxDepth; ++d) {
+    auto const at = static_cast<std::size_t>(d);
+    m_data->m_tileCountTotal -= m_data->m_tileCounts[at];
+    m_data->m_tileCounts[at] = 0;
+    m_data->editTiles(d).clear();
+    if (m_data->m_rootCounts[at] > 0) {
+      m_data->m_rootCounts[at] = 0;
+      std::erase_if(m_data->m_roots, [&](auto const& root) { return root.first.depth == d; });
+    }
+  }
+}
+
+} // namespace VLN::TileTree3D

@@ -1,0 +1,229 @@
+#include "GeometryVolume/tiletree/DerivedCaches.h"
+
+#include "GeometryVolume/tiletree/TileHalo.h"
+
+#include <cmath>
+
+namespace VLN::TileTree3D {
+
+namespace {
+
+/// Cells of the acceleration grid along an axis at most.
+constexpr std::uint32_t kMaxGridCells = 64;
+
+/// max - min, defined for the empty box too, whose extent wraps to 2.
+std::uint32_t extent(bbox<int3, int> const& box, int axis) {
+  return static_cast<std::uint32_t>(box.max[axis]) - static_cast<std::uint32_t>(box.min[axis]);
+}
+
+/// Runs `body(tile)` for each live tile of a depth, with an accessor for each range.
+template <class TraitsT, class Body>
+void forEachLiveTile(Container<TraitsT> const& tree, int depth, Body const& body) {
+  parallelFor(0, tree.tileCount(depth),
+              [&](std::int64_t begin, std::int64_t end) {
+                auto accessor = tree.tileAccessor();
+                for (std::int64_t n = begin; n < end; ++n) {
+                  if (tree.tile(n, depth).valid()) body(tree.tile(n, depth), accessor);
+                }
+              },
+              {.grain = 256});
+}
+
+/// Appends fields of a few bits each, from the low end of each byte.
+class BitWriter {
+public:
+  void write(std::uint32_t value, int bits) {
+    for (int b = 0; b < bits; ++b, ++m_bit) {
+      if (m_bit % 8 == 0) m_bytes.push_back(0);
+      m_bytes.back() = static_cast<std::uint8_t>(m_bytes.back() | (value >> b & 1) << (m_bit % 8));
+    }
+  }
+  std::vector<std::uint8_t> const& bytes() const { return m_bytes; }
+
+private:
+  std::vector<std::uint8_t> m_bytes;
+  int m_bit = 0;
+};
+
+template <class TraitsT>
+TileHalo<TraitsT> haloOf(typename Container<TraitsT>::TileType const& tile,
+                         ConstTileAccessorOf<TraitsT> const& accessor) {
+  TileHalo<TraitsT> halo{};
+  for (int n = 0; n < kNeighborCount; ++n) {
+    auto const at = static_cast<std::size_t>(n);
+    halo.neighbors[at] = accessor.treeIndexNeighbor(tile, static_cast<NeighborDirection>(n));
+    bool const found = halo.neighbors[at].valid();
+    halo.levelDifference[at] = static_cast<std::int8_t>(found ? tile.depth() - halo.neighbors[at].depth : -1);
+  }
+  return halo;
+}
+
+template <class TraitsT>
+std::vector<std::uint8_t> packHalo(typename Container<TraitsT>::TileType const& tile,
+                                   TileHalo<TraitsT> const& halo, HaloCompression const& table) {
+  std::uint32_t sameDepth = 0, coarser = 0;
+  for (int n = 0; n < kNeighborCount; ++n) {
+    int const levels = n == kNeighborSelf ? -1 : halo.levelDifference[static_cast<std::size_t>(n)];
+    sameDepth += levels == 0;
+    coarser += levels > 0;
+  }
+  BitWriter out;
+  out.write(sameDepth, table.sameDepthBits);
+  out.write(coarser, table.coarserBits);
+  for (int n = 0; n < kNeighborCount; ++n) {
+    if (n != kNeighborSelf && halo.levelDifference[static_cast<std::size_t>(n)] == 0)
+      out.write(static_cast<std::uint32_t>(n), 5);
+  }
+  for (int n = 0; n < kNeighborCount; ++n) {
+    int const levels = halo.levelDifference[static_cast<std::size_t>(n)];
+    if (levels <= 0) continue;
+    out.write(static_cast<std::uint32_t>(n), 5);
+    out.write(static_cast<std::uint32_t>(levels > 3 ? 0 : levels), 2);
+    int const weight = nearestHaloWeight(haloWeight<TraitsT>(tile, n, levels));
+    out.write(static_cast<std::uint32_t>(weight), table.weightBits);
+  }
+  return out.bytes();
+}
+
+} // namespace
+
+template <class TraitsT>
+float haloWeight(Tile<TraitsT, TraitsT::kTileSize> const& tile, int direction, int levels) {
+  int3 const d = neighborOffset(direction);
+  std::int64_t const fine = tile.voxelDataWidth();
+  std::int64_t const coarse = Container<TraitsT>::voxelDataWidth(tile.depth() - levels);
+  double weight = 1.0;
+  for (int a = 0; a < 3; ++a) {
+    std::int64_t const sample = d[a] < 0 ? -1 : d[a] > 0 ? TraitsT::kTDW : 0;
+    std::int64_t const position = std::int64_t(tile.tijk()[a]) - TraitsT::kMinTileCoord + fine * sample;
+    std::int64_t const within = ((position % coarse) + coarse) % coarse;
+    weight *= 1.0 - static_cast<double>(within) / static_cast<double>(coarse);
+  }
+  return static_cast<float>(weight);
+}
+
+template <class TraitsT>
+void buildAccelerationGrid(Container<TraitsT> const& tree, ContainerData<TraitsT>& data, int maxDepth) {
+  for (int d = std::min(maxDepth, TraitsT::kMaxDepth); d >= 1; --d) {
+    if (tree.tileCount(d) == 0) continue;
+    bbox<int3, int> box;
+    tree.tileSpaceBounds(d, box);
+    if (box.empty()) continue;
+    auto const w = static_cast<std::uint32_t>(TraitsT::width(d));
+    std::uint32_t const largest = std::max({extent(box, 0), extent(box, 1), extent(box, 2)});
+    if (largest / w > kMaxGridCells) continue;
+
+    data.m_gridDepth = d;
+    data.m_gridOrigin = box.min;
+    data.m_gridCellWidth = static_cast<std::int32_t>(w);
+    std::size_t cells = 1;
+    for (int a = 0; a < 3; ++a) {
+      data.m_gridExtent[a] = static_cast<int>(extent(box, a));
+      data.m_gridSize[static_cast<std::size_t>(a)] = static_cast<std::int32_t>(extent(box, a) / w);
+      cells *= extent(box, a) / w;
+    }
+    data.m_gridTable.assign(cells, -1);
+    for (std::int64_t n = 0; n < tree.tileCount(d); ++n) {
+      auto const& tile = tree.tile(n, d);
+      if (!tile.valid()) continue;
+      std::size_t at = 0;
+      for (int a = 2; a >= 0; --a) {
+        auto const cell =
+            (static_cast<std::uint32_t>(tile.tijk()[a]) - static_cast<std::uint32_t>(box.min[a])) / w;
+        at = at * static_cast<std::size_t>(data.m_gridSize[static_cast<std::size_t>(a)]) + cell;
+      }
+      data.m_gridTable[at] = n;
+    }
+    return;
+  }
+}
+
+template <class TraitsT>
+std::shared_ptr<typename ContainerData<TraitsT>::NeighborTable const>
+computeTileNeighbors(Container<TraitsT> const& tree) {
+  auto table = std::make_shared<typename ContainerData<TraitsT>::NeighborTable>();
+  for (int d = 0; d <= TraitsT::kMaxDepth; ++d) {
+    auto& records = (*table)[static_cast<std::size_t>(d)];
+    records.resize(static_cast<std::size_t>(tree.tileCount(d)));
+    forEachLiveTile(tree, d, [&](auto const& tile, auto const& accessor) {
+      records[static_cast<std::size_t>(tile.index())] = haloOf<TraitsT>(tile, accessor).neighbors;
+    });
+  }
+  return table;
+}
+
+template <class TraitsT>
+std::shared_ptr<typename ContainerData<TraitsT>::HaloTable const>
+computeTileHalos(Container<TraitsT> const& tree) {
+  auto table = std::make_shared<typename ContainerData<TraitsT>::HaloTable>();
+  for (int d = 0; d <= TraitsT::kMaxDepth; ++d) {
+    auto& records = (*table)[static_cast<std::size_t>(d)];
+    records.resize(static_cast<std::size_t>(tree.tileCount(d)));
+    forEachLiveTile(tree, d, [&](auto const& tile, auto const& accessor) {
+      records[static_cast<std::size_t>(tile.index())] = haloOf<TraitsT>(tile, accessor);
+    });
+  }
+  return table;
+}
+
+template <class TraitsT>
+std::shared_ptr<typename ContainerData<TraitsT>::CompressedHaloTable const>
+computeCompressedTileHalos(Container<TraitsT> const& tree) {
+  constexpr std::int64_t kChunk = 1024; // tiles whose records share one block of bytes
+  auto table = std::make_shared<typename ContainerData<TraitsT>::CompressedHaloTable>();
+  HaloCompression const compression;
+  for (int d = 0; d <= TraitsT::kMaxDepth; ++d) {
+    auto& records = table->records[static_cast<std::size_t>(d)];
+    std::int64_t const count = tree.tileCount(d);
+    records.resize(static_cast<std::size_t>(count));
+    std::size_t const firstBlock = table->storage.size();
+    table->storage.resize(firstBlock + static_cast<std::size_t>(chunkCount(0, count, kChunk)));
+    parallelChunks(0, count, kChunk, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+      auto accessor = tree.tileAccessor();
+      auto& block = table->storage[firstBlock + static_cast<std::size_t>(chunk)];
+      std::vector<std::size_t> starts;
+      for (std::int64_t n = begin; n < end; ++n) {
+        starts.push_back(block.size());
+        auto const& tile = tree.tile(n, d);
+        // A dead tile has an empty record.
+        auto const bytes = tile.valid()
+                               ? packHalo<TraitsT>(tile, haloOf<TraitsT>(tile, accessor), compression)
+                               : std::vector<std::uint8_t>{0, 0};
+        block.insert(block.end(), bytes.begin(), bytes.end());
+      }
+      starts.push_back(block.size());
+      for (std::int64_t n = begin; n < end; ++n) {
+        auto const at = static_cast<std::size_t>(n - begin);
+        records[static_cast<std::size_t>(n)] = {block.data() + starts[at],
+                                                static_cast<std::uint32_t>(starts[at + 1] - starts[at])};
+      }
+    });
+  }
+  return table;
+}
+
+template <class TraitsT> int maxTileDistance(Container<TraitsT> const& tree) {
+  if (tree.tileCount(-1) == 0) return 0;
+  double largest = 0;
+  for (int d = 0; d <= TraitsT::kMaxDepth; ++d) {
+    bbox<int3, int> box;
+    tree.tileSpaceBounds(d, box);
+    double const x = extent(box, 0), y = extent(box, 1), z = extent(box, 2);
+    largest = std::max(largest, std::ceil(std::sqrt(x * x + y * y + z * z) / TraitsT::width(d)));
+  }
+  return static_cast<int>(largest);
+}
+
+#define VLN_INSTANTIATE(T)                                                                                   \
+  template float haloWeight<T>(Tile<T, T::kTileSize> const&, int, int);                                      \
+  template void buildAccelerationGrid(Container<T> const&, ContainerData<T>&, int);                          \
+  template std::shared_ptr<typename ContainerData<T>::NeighborTable const> computeTileNeighbors(             \
+      Container<T> const&);                                                                                  \
+  template std::shared_ptr<typename ContainerData<T>::HaloTable const> computeTileHalos(                     \
+      Container<T> const&);                                                                                  \
+  template std::shared_ptr<typename ContainerData<T>::CompressedHaloTable const> computeCompressedTileHalos( \
+      Container<T> const&);                                                                                  \
+  template int maxTileDistance(Container<T> const&);
+VLN_FOR_EACH_SHAPE(VLN_INSTANTIATE)
+
+} // namespace VLN::TileTree3D

@@ -1,0 +1,26 @@
+// Builders of what a container derives from its tiles to speed lookups up. Each runs alone, with no change of
+// the tree.
+#pragma once
+
+#include "GeometryVolume/tiletree/Container.h"
+
+namespace VLN::TileTree3D {
+
+template <class TraitsT>
+void buildAccelerationGrid(Container<TraitsT> const& tree, ContainerData<TraitsT>& data, int maxDepth);
+
+template <class TraitsT>
+std::shared_ptr<typename ContainerData<TraitsT>::NeighborTable const>
+computeTileNeighbors(Container<TraitsT> const& tree);
+
+template <class TraitsT>
+std::shared_ptr<typename ContainerData<TraitsT>::HaloTable const>
+computeTileHalos(Container<TraitsT> const& tree);
+
+template <class TraitsT>
+std::shared_ptr<typename ContainerData<TraitsT>::CompressedHaloTable const>
+computeCompressedTileHalos(Container<TraitsT> const& tree);
+
+template <class TraitsT> int maxTileDistance(Container<TraitsT> const& tree);
+
+} // namespace VLN::TileTree3D

@@ -1,0 +1,67 @@
+// TileArray: the growable array that holds the tiles of one depth.
+#pragma once
+
+#include <algorithm>
+#include <cstdint>
+#include <cstring>
+#include <memory>
+#include <new>
+
+namespace VLN::TileTree3D {
+
+/// Like a vector of tiles, except that growth moves the records bitwise: a tile owns nothing but its child
+/// table, so that a record may change its address without cloning the table.
+template <class TileT> class TileArray {
+public:
+  TileArray() = default;
+  TileArray(TileArray const& other) {
+    reserve(other.m_size);
+    std::uninitialized_copy(other.begin(), other.end(), m_tiles);
+    m_size = other.m_size;
+  }
+  TileArray& operator=(TileArray const&) = delete;
+  ~TileArray() { clear(); }
+
+  std::int64_t size() const { return m_size; }
+  std::int64_t capacity() const { return m_capacity; }
+  TileT& operator[](std::int64_t i) { return m_tiles[i]; }
+  TileT const& operator[](std::int64_t i) const { return m_tiles[i]; }
+  TileT* begin() { return m_tiles; }
+  TileT* end() { return m_tiles + m_size; }
+  TileT const* begin() const { return m_tiles; }
+  TileT const* end() const { return m_tiles + m_size; }
+
+  void reserve(std::int64_t capacity) {
+    if (capacity <= m_capacity) return;
+    auto* room = static_cast<TileT*>(::operator new(static_cast<std::size_t>(capacity) * sizeof(TileT)));
+    if (m_size > 0)
+      std::memcpy(static_cast<void*>(room), static_cast<void const*>(m_tiles),
+                  static_cast<std::size_t>(m_size) * sizeof(TileT));
+    ::operator delete(m_tiles);
+    m_tiles = room;
+    m_capacity = capacity;
+  }
+  /// Growing value-constructs records, shrinking frees the child tables of the dropped ones.
+  void resize(std::int64_t n) {
+    if (n < m_size) {
+      std::destroy(m_tiles + n, m_tiles + m_size);
+    } else {
+      if (n > m_capacity) reserve(std::max(n, m_capacity + m_capacity / 2));
+      std::uninitialized_value_construct(m_tiles + m_size, m_tiles + n);
+    }
+    m_size = n;
+  }
+  void clear() {
+    std::destroy(m_tiles, m_tiles + m_size);
+    ::operator delete(m_tiles);
+    m_tiles = nullptr;
+    m_size = m_capacity = 0;
+  }
+
+private:
+  TileT* m_tiles = nullptr;
+  std::int64_t m_size = 0;
+  std::int64_t m_capacity = 0;
+};
+
+} // namespace VLN::TileTree3D
