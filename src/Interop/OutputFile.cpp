@@ -92,6 +92,8 @@ void OutputFile::commit() {
   m_committed = true;
 }
 
+void checkOutput(std::string const& path) { OutputFile const probe(path); }
+
 void removeUnfinishedOutput() noexcept {
   if (hasUnfinished.load()) unlink(unfinished);
 }

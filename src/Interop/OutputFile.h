@@ -34,6 +34,10 @@ private:
   bool m_committed = false;
 };
 
+/// Tells whether a file of that name could be written, before the work that leads to it.
+/// @error FileError when it could not.
+VLN_API void checkOutput(std::string const& path);
+
 /// Removes the temporary file that is being written, if there is one. Made for signal handlers: it calls
 /// nothing but unlink.
 VLN_API void removeUnfinishedOutput() noexcept;

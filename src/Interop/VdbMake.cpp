@@ -166,7 +166,7 @@ void checkCount(std::int64_t voxels) {
 
 void makeCloud(std::string const& path, std::int64_t voxels, Progress const& progress) {
   checkCount(voxels);
-  OutputFile early(path); // a name that cannot be written is known before the work
+  checkOutput(path);
   openvdb::initialize();
   CloudShape const shape;
   // Two rounds: the share of a box that the cloud fills hardly depends on the resolution.
@@ -187,7 +187,7 @@ void makeCloud(std::string const& path, std::int64_t voxels, Progress const& pro
 
 void makeTorus(std::string const& path, std::int64_t voxels, Progress const& progress) {
   checkCount(voxels);
-  OutputFile early(path);
+  checkOutput(path);
   openvdb::initialize();
   constexpr double kHalfWidth = 3, kTube = 0.4;
   constexpr double pi = 3.14159265358979323846;

@@ -95,8 +95,8 @@ GridSummary join(GridSummary a, GridSummary const& b) {
   return a;
 }
 
-// Whether a quarter block of a leaf can go: see the rule in VdbImport.h. A coarser tile at the place holds the
-// block's own values; without one a reader finds the background.
+// Whether a quarter block of a leaf can go: see the rule in VdbImport.h. A coarser tile at the place holds
+// the block's own values; without one a reader finds the background.
 bool isSpare(Leaf const& leaf, Coord const& corner, bool underTile, float background) {
   float const first = underTile ? leaf.getValue(corner) : background;
   for (int i = 0; i < 4; ++i)
