@@ -1,0 +1,53 @@
+#include "GeometryVolume/topology/TreeCounts.h"
+
+#include "GeometryVolume/core/Parallel.h"
+#include "GeometryVolume/tiletree/Traits.h"
+
+#include <algorithm>
+
+namespace VLN::TileTree3D {
+
+template <int Depths> void TreeCounts<Depths>::takeTiles(Component const& tree, std::uint32_t newElements) {
+  tileCountTotal = tree.tileCount(-1);
+  for (int d = 0; d < Depths; ++d) {
+    auto const depth = static_cast<std::size_t>(d);
+    tileCounts[depth] = tree.tileCount(d);
+    elementsPerTile[depth].resize(static_cast<std::size_t>(tileCounts[depth]), newElements);
+  }
+}
+
+template <int Depths> void TreeCounts<Depths>::takeElements(Component const& source, std::uint32_t atLeast) {
+  elementCountTotal = 0;
+  for (int d = 0; d < Depths; ++d) {
+    auto const depth = static_cast<std::size_t>(d);
+    auto& tiles = elementsPerTile[depth];
+    std::int64_t const known = source.tileCount(d); // the source may cover fewer depths
+    elementCounts[depth] = parallelReduce(
+        0, tileCounts[depth], 4096, std::int64_t(0),
+        [&](std::int64_t begin, std::int64_t end) {
+          std::int64_t sum = 0;
+          for (std::int64_t n = begin; n < end; ++n) {
+            int const elements = n < known ? source.elementCount(TreeIndex{n, d}) : 0;
+            sum += tiles[static_cast<std::size_t>(n)] =
+                std::max(static_cast<std::uint32_t>(elements), atLeast);
+          }
+          return sum;
+        },
+        [](std::int64_t x, std::int64_t y) { return x + y; });
+    elementCountTotal += elementCounts[depth];
+  }
+}
+
+template <int Depths>
+void TreeCounts<Depths>::addMemory(std::uint64_t& used, std::uint64_t& allocated) const {
+  used += sizeof(*this), allocated += sizeof(*this);
+  for (auto const& tiles : elementsPerTile) {
+    used += tiles.size() * sizeof(std::uint32_t);
+    allocated += tiles.capacity() * sizeof(std::uint32_t);
+  }
+}
+
+template struct TreeCounts<PowerOfTwoTraits::kDepths>;
+template struct TreeCounts<OddTraits::kDepths>;
+
+} // namespace VLN::TileTree3D
