@@ -103,10 +103,13 @@ void printJson(VdbImport const& content) {
 
 // 1234567 as "1,234,567".
 std::string grouped(std::int64_t n) {
-  std::string digits = std::to_string(n);
-  for (int at = static_cast<int>(digits.size()) - 3; at > (n < 0 ? 1 : 0); at -= 3)
-    digits.insert(static_cast<std::size_t>(at), ",");
-  return digits;
+  std::string const digits = std::to_string(n);
+  std::string text;
+  for (std::size_t at = 0; at < digits.size(); ++at) {
+    if (at > 0 && digits[at - 1] != '-' && (digits.size() - at) % 3 == 0) text += ',';
+    text += digits[at];
+  }
+  return text;
 }
 
 std::string number(double value) { return fmt::format("{:.6g}", value); }
