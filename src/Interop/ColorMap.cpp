@@ -66,9 +66,9 @@ std::array<Rgb, 256> divergingTable() {
   return table;
 }
 
-std::string label(double value) {
+std::string label(double value, bool open = false) {
   char text[32];
-  std::snprintf(text, sizeof text, "%.3g", value == 0 ? 0.0 : value);
+  std::snprintf(text, sizeof text, open ? ">%.3g" : "%.3g", value == 0 ? 0.0 : value);
   return text;
 }
 
@@ -105,7 +105,7 @@ Rgb ColorMap::color(double value) const {
   return colorTable(m_kind)[static_cast<std::size_t>(std::lround(255 * t))];
 }
 
-Image ColorMap::scale(int height, int textScale) const {
+Image ColorMap::scale(int height, int textScale, bool open) const {
   Rgb const ink{40, 40, 40};
   int const bar = 12 * textScale, tick = 4 * textScale, gap = 3 * textScale;
   int const half = Image::textHeight(textScale) / 2 + 1;
@@ -113,9 +113,9 @@ Image ColorMap::scale(int height, int textScale) const {
   // As many ticks as leave some room between their labels.
   int const steps = height >= 16 * 2 * half ? 8 : height >= 8 * 2 * half ? 4 : 2;
 
+  auto labelAt = [&](int n) { return label(m_low + (m_high - m_low) * n / steps, open && n == steps); };
   int widest = 0;
-  for (int n = 0; n <= steps; ++n)
-    widest = std::max(widest, Image::textWidth(label(m_low + (m_high - m_low) * n / steps), textScale));
+  for (int n = 0; n <= steps; ++n) widest = std::max(widest, Image::textWidth(labelAt(n), textScale));
   Image image(bar + tick + gap + widest, height);
 
   int const top = half, bottom = height - 1 - half; // rows of the high and the low end
@@ -126,8 +126,7 @@ Image ColorMap::scale(int height, int textScale) const {
   for (int n = 0; n <= steps; ++n) {
     int const y = bottom - static_cast<int>(std::lround(double(bottom - top) * n / steps));
     image.fill(bar, y, bar + tick, y + 1, ink);
-    image.text(bar + tick + gap, y - Image::textHeight(textScale) / 2,
-               label(m_low + (m_high - m_low) * n / steps), ink, textScale);
+    image.text(bar + tick + gap, y - Image::textHeight(textScale) / 2, labelAt(n), ink, textScale);
   }
   return image;
 }

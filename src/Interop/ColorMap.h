@@ -30,8 +30,9 @@ public:
   /// For what is no number.
   static Rgb notANumber() { return {255, 0, 255}; }
 
-  /// A vertical bar of all colours, the high end on top, with ticks and the values at them.
-  Image scale(int height, int textScale = 1) const;
+  /// A vertical bar of all colours, the high end on top, with ticks and the values at them. `open` marks the
+  /// high end with ">": it also stands for larger values.
+  Image scale(int height, int textScale = 1, bool open = false) const;
 
 private:
   Kind m_kind;

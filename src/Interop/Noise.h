@@ -8,14 +8,11 @@
 namespace VLN::Interop {
 
 inline std::uint32_t latticeHash(std::int32_t i, std::int32_t j, std::int32_t k, std::uint32_t seed) {
-  std::uint32_t h = seed;
-  for (std::int32_t c : {i, j, k}) {
-    h ^= static_cast<std::uint32_t>(c) * 0x9e3779b1u;
-    h = (h ^ h >> 15) * 0x85ebca77u;
-    h = (h ^ h >> 13) * 0xc2b2ae3du;
-    h ^= h >> 16;
-  }
-  return h;
+  std::uint32_t h = seed * 0x27d4eb2fu ^ static_cast<std::uint32_t>(i) * 0x9e3779b1u ^
+                    static_cast<std::uint32_t>(j) * 0x85ebca77u ^ static_cast<std::uint32_t>(k) * 0xc2b2ae3du;
+  h = (h ^ h >> 15) * 0x2c1b3c6du;
+  h = (h ^ h >> 12) * 0x297a2d39u;
+  return h ^ h >> 15;
 }
 
 /// One octave: a smooth field of about -1..1 that is zero at the whole numbers.

@@ -104,16 +104,22 @@ Slice drawSlice(VdbVolume const& volume, std::string const& name, SliceOptions c
               },
               {.grain = 8});
 
-  Slice slice{Image(1, 1), plane.at * volume.voxelSize, 0, 0, 0};
-  bool any = false;
+  Slice slice{Image(1, 1), plane.at * volume.voxelSize, 0, 0, 0, 0};
+  std::vector<float> numbers;
   for (Sample const& s : samples) {
     slice.drawn += s.found;
-    if (!s.found || !std::isfinite(s.value)) continue;
-    double const v = s.value;
-    slice.low = any ? std::min(slice.low, v) : v, slice.high = any ? std::max(slice.high, v) : v, any = true;
+    if (s.found && std::isfinite(s.value)) numbers.push_back(s.value);
   }
-
-  ColorMap const map = ColorMap::forRange(slice.low, slice.high);
+  if (!numbers.empty()) {
+    auto const [low, high] = std::minmax_element(numbers.begin(), numbers.end());
+    slice.low = *low, slice.high = slice.top = *high;
+    if (slice.low >= 0 || slice.high <= 0) {
+      auto const nth = numbers.begin() + static_cast<std::ptrdiff_t>(0.995 * double(numbers.size() - 1));
+      std::nth_element(numbers.begin(), nth, numbers.end());
+      if (*nth > slice.low) slice.top = *nth;
+    }
+  }
+  ColorMap const map = ColorMap::forRange(slice.low, slice.top);
   Image picture(plane.width, plane.height, kNoTile);
   parallelFor(0, plane.height,
               [&](std::int64_t begin, std::int64_t end) {
@@ -129,7 +135,8 @@ Slice drawSlice(VdbVolume const& volume, std::string const& name, SliceOptions c
 
   int const textScale = options.size >= 700 ? 2 : 1;
   int const margin = 8 * textScale;
-  Image const scale = map.scale(std::clamp(plane.height, 60 * textScale, 400 * textScale), textScale);
+  Image const scale =
+      map.scale(std::clamp(plane.height, 60 * textScale, 400 * textScale), textScale, slice.top < slice.high);
   slice.image = Image(plane.width + scale.width() + 3 * margin,
                       std::max(plane.height, scale.height()) + 2 * margin, kPaper);
   slice.image.paste(picture, margin, (slice.image.height() - plane.height) / 2);

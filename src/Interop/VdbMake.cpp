@@ -114,13 +114,16 @@ public:
     }
     return std::min(best, (p.z + 0.22) * 1.5);
   }
-  static double noise(Point const& p) { return 0.2 * fractalNoise(p.x * 3.1, p.y * 3.1, p.z * 3.1, 6, 11u); }
-  static constexpr double kNoise = 0.4;
+  static double noise(Point const& p) {
+    return std::clamp(0.3 * fractalNoise(p.x * 2.7, p.y * 2.7, p.z * 2.7, 6, 11u), -kNoise, kNoise);
+  }
+  static constexpr double kNoise = 0.36;
+  static constexpr double kSteep = 2.5;
   /// At most 1; positive inside. The noise is computed only where it matters.
   double density(Point const& p) const {
     double const depth = smooth(p);
-    if (depth <= -kNoise || 3 * (depth - kNoise) >= 1) return depth > 0 ? 1.0 : 0.0;
-    return std::min(1.0, 3 * (depth + noise(p)));
+    if (depth <= -kNoise || kSteep * (depth - kNoise) >= 1) return depth > 0 ? 1.0 : 0.0;
+    return std::min(1.0, kSteep * (depth + noise(p)));
   }
 
 private:
@@ -169,12 +172,12 @@ void makeCloud(std::string const& path, std::int64_t voxels, Progress const& pro
   checkOutput(path);
   openvdb::initialize();
   CloudShape const shape;
-  // Two rounds: the share of a box that the cloud fills hardly depends on the resolution.
+  // The share of a box that the cloud fills hardly depends on the resolution, so a coarse cloud tells the
+  // scale of a fine one.
   double scale = 40;
-  for (double size : {80000.0, 500000.0}) {
-    double const wanted = std::min(size, double(voxels));
+  for (double size : {20000.0, 150000.0}) {
     auto const count = double(cloudGrid(shape, scale, {})->activeVoxelCount());
-    scale *= std::cbrt(wanted / count);
+    scale *= std::cbrt(std::min(size, double(voxels)) / count);
   }
   auto const count = double(cloudGrid(shape, scale, {})->activeVoxelCount());
   scale *= std::cbrt(double(voxels) / count);
