@@ -109,7 +109,7 @@ VdbVolume buildVolume(Group const& group, Progress const& progress, double from,
 
   auto object = TileTree3D::Command::createVoxelVLN<VdbTraits>(kVdbContainerName, kVdbTopologyName,
                                                                static_cast<float>(volume.voxelSize),
-                                                               static_cast<TileTree3D::VoxelOffsetType>(7));
+                                                               TileTree3D::kVoxelOffsetCorner);
   auto container = object->extractComponent<Container>(kVdbContainerName);
   tell(progress, "building the tree", from);
   addTiles(*container, tileCorners(group.grids, rootDepth(group.summaries)));

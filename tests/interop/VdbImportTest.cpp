@@ -68,7 +68,7 @@ TEST(VdbImportTest, AssemblesAnObject) {
   auto const channel = volume.object->component<FloatChannel>("density");
   ASSERT_TRUE(tree && topology && channel);
   EXPECT_EQ(tree->voxelSize(), 0.5f);
-  EXPECT_EQ(int(topology->offsetType()), 7);
+  EXPECT_EQ(topology->offsetType(), VLN::TileTree3D::kVoxelOffsetCorner);
   EXPECT_EQ(topology->voxelSize(), 0.5f);
   EXPECT_EQ(topology->getTargetName(), "voxel_tile_tree");
   EXPECT_EQ(topology->tileCount(-1), tree->tileCount(-1));
