@@ -62,12 +62,16 @@ VdbFile readWhole(std::string const& path) {
   return file;
 }
 
+std::string memoryReason(std::uint64_t bytes) {
+  return "is damaged, or needs more than " + std::to_string(bytes / kMB) + " MB of memory";
+}
+
 // The reason why readWhole() failed, from inside a catch block.
 std::string currentReason(std::uint64_t memoryBytes) {
   try {
     throw;
   } catch (FileError const& error) { return error.reason(); } catch (std::bad_alloc const&) {
-    return "is damaged, or needs more than " + std::to_string(memoryBytes / kMB) + " MB of memory";
+    return memoryReason(memoryBytes);
   } catch (std::length_error const&) {
     return "is damaged: it claims a size that cannot be";
   } catch (std::ios::failure const&) {
@@ -120,9 +124,19 @@ void writeAll(int fd, std::string const& text) {
   }
 }
 
+// Out of memory in the child: an exception would need memory on its way, so the verdict is given at once.
+int verdictEnd = -1;
+std::string memoryVerdict;
+void onNoMemory() {
+  writeAll(verdictEnd, memoryVerdict);
+  _exit(0);
+}
+
 // The child's whole life. It writes "ok", or the reason why not, and never returns.
 [[noreturn]] void runChild(std::string const& path, VdbReadLimits const& limits, Memory const& start,
                            int fd) {
+  verdictEnd = fd, memoryVerdict = memoryReason(limits.memoryBytes);
+  std::set_new_handler(onNoMemory);
   // A sanitizer reserves address space by the terabyte; there the parent's watch over resident memory is the
   // only bound.
   if (start.space < (std::uint64_t(1) << 40))
@@ -164,7 +178,7 @@ std::string watchChild(int fd, pid_t child, VdbReadLimits const& limits, Memory 
     }
     clock_gettime(CLOCK_MONOTONIC, &now);
     if (memoryOf(process.c_str()).resident > start.resident + limits.memoryBytes)
-      reason = "is damaged, or needs more than " + std::to_string(limits.memoryBytes / kMB) + " MB of memory";
+      reason = memoryReason(limits.memoryBytes);
     else if (double(now.tv_sec - begin.tv_sec) > patience)
       reason = "cannot be read in " + std::to_string(static_cast<long>(patience)) + " s";
     if (reason) {

@@ -181,10 +181,17 @@ void info(InfoOptions const& options) {
     ProgressBar bar;
     content = importVdb(options.file, options.limits, bar.progress());
   }
-  if (options.json)
+  if (options.json) {
     printJson(content);
-  else
+    // The report has no place for it.
+    for (auto const& volume : content.volumes)
+      if (!volume.transform.empty())
+        std::cerr << fmt::format("vln: {}: note: the transform is {}; world positions leave out all but the "
+                                 "voxel size\n",
+                                 content.file, volume.transform);
+  } else {
     printTables(content);
+  }
 }
 
 } // namespace Vln
