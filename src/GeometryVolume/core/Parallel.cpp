@@ -95,6 +95,18 @@ void parallelSortPositions(std::uint64_t* order, std::int64_t n,
   });
 }
 
+void parallelSort(SortRecord* records, std::int64_t n) {
+  auto const less = [](SortRecord const& a, SortRecord const& b) {
+    if (a.high != b.high) return a.high < b.high;
+    return a.low != b.low ? a.low < b.low : a.value < b.value;
+  };
+  constexpr std::int64_t kParallelFrom = 500;
+  if (n < kParallelFrom)
+    std::sort(records, records + n, less);
+  else
+    tbb::this_task_arena::isolate([&] { tbb::parallel_sort(records, records + n, less); });
+}
+
 void withThreads(int threads, FunctionRef<void()> body) {
   tbb::task_arena arena(threads);
   arena.execute([&] { body(); });

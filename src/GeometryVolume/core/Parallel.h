@@ -77,6 +77,15 @@ T parallelReduce(std::int64_t begin, std::int64_t end, std::int64_t grain, T ide
 VLN_API void parallelSortPositions(std::uint64_t* order, std::int64_t n,
                                    FunctionRef<bool(std::uint64_t, std::uint64_t)> less);
 
+/// A 128-bit key with a value that sorts along.
+struct SortRecord {
+  std::uint64_t high, low;
+  std::int64_t value;
+};
+/// Sorts by key and then by value: the result does not depend on the number of threads.
+/// @cost Serial below 500 records.
+VLN_API void parallelSort(SortRecord* records, std::int64_t n);
+
 /// Runs `body` with at most `threads` threads of the scheduler (the calling one included).
 VLN_API void withThreads(int threads, FunctionRef<void()> body);
 /// Number of threads that a loop started here may use.

@@ -3,6 +3,8 @@
 #include "GeometryVolume/core/Const.h"
 #include "GeometryVolume/core/Streaming.h"
 #include "GeometryVolume/tiletree/Consistency.h"
+#include "GeometryVolume/tiletree/ContainerRefineImpl.h"
+#include "GeometryVolume/tiletree/ContainerRemoveImpl.h"
 #include "GeometryVolume/tiletree/ContainerScratchImpl.h"
 #include "GeometryVolume/tiletree/ContainerTilesImpl.h"
 #include "GeometryVolume/tiletree/DerivedCaches.h"

@@ -25,6 +25,11 @@ template <class TraitsT> class TileHaloVisitor;
 template <class TraitsT> class NeighborSearch;
 template <bool IsConst, class TraitsT> class TraversalEngine;
 
+/// For each depth, indices of tiles.
+using TileIndexLists = std::vector<std::vector<std::int64_t>>;
+/// For each depth, the (destination, source) pairs of a compaction.
+using TileMoves = std::vector<std::vector<std::pair<std::int64_t, std::int64_t>>>;
+
 /// @threads Structural change belongs to one thread; reads may run concurrently while nothing changes.
 template <class TraitsT> class VLN_API Container : public Component {
 public:
@@ -171,6 +176,24 @@ public:
   /// Largest number of tiles across the bounds of any depth; 0 for an empty tree.
   int tileSpaceMaxTileDistance() const;
 
+  // Bulk change. Channels are not told: run the update protocol afterwards.
+  /// Makes this tree a superset of each source. Former roots hang below new tiles that hold them.
+  /// @param newTiles If given, the corner of every tile made is appended to the list of its depth.
+  /// @param setBranchSizesAtEnd Else branch sizes are stale afterwards.
+  /// @error std::runtime_error(VLN::exceptionMessage) when the host cancels the job; the depths finished so
+  /// far stay.
+  /// @cost Linear in the sources' tiles, each with a lookup near the previous one.
+  void refine(std::vector<Container const*> const& sources, TileLists* newTiles, bool setBranchSizesAtEnd);
+  /// Fills the holes of dead tiles. `moves` tells what went where.
+  void compact(TileMoves* moves = nullptr);
+  /// Reorders the tiles: the tile at index i of depth d goes to perms[d][i]. An empty permutation leaves its
+  /// depth.
+  /// @pre kMaxDepth + 1 lists, each empty or a permutation of the depth's tiles.
+  void permute(std::vector<std::int64_t> const* perms);
+  /// Permutations, old index to new, that put each depth's tiles into Morton order.
+  void computeMortonPermutations(std::vector<std::vector<std::int64_t>>& perms) const;
+  void sortIntoMortonOrder(std::vector<std::vector<std::int64_t>>* permutations = nullptr);
+
   // Scratch containers for parallel builders
   /// Hands out a private container; it begins with one tile at depth 0 unless `keepEmpty` is not 0.
   Container* threadLocalContainer(int keepEmpty);
@@ -207,7 +230,11 @@ protected:
   TreeIndex tileIndex(int i, int j, int k, int depth) const;
   TileType const& tile(int i, int j, int k, int depth) const;
   /// Follows child slots from a tile towards a point of the domain until `depth` or an empty slot.
-  TreeIndex descend(TreeIndex at, int i, int j, int k, int depth) const;
+  /// With `path`, the index of each tile below the first is kept under its depth.
+  TreeIndex descend(TreeIndex at, int i, int j, int k, int depth, std::int64_t* path = nullptr) const;
+  /// Where a search begins: the tile of the acceleration grid, or the root, that holds the point at or above
+  /// `depth`; invalid when there is none.
+  TreeIndex entry(int i, int j, int k, int depth) const;
 
   // Change. Tiles are named by index, since growth moves the records.
   TileType& editTile(TreeIndex const& at) { return m_data->editTiles(at.depth)[at.index]; }
@@ -229,8 +256,16 @@ protected:
   /// Drops the derived caches after the tree grew.
   void tilesAdded();
   /// Drops them after tiles went; `moves` names, for each depth, what compaction did.
-  void tilesRemoved(std::vector<std::vector<std::pair<std::int64_t, std::int64_t>>> const* moves);
+  void tilesRemoved(TileMoves const* moves);
   void setBranchSizes();
+  void refineInternal(Container const& source, bool last, TileLists* newTiles);
+  /// Removes one tile or its branch. A root without its branch goes only when no two of its children are
+  /// adjacent; another tile always goes with its branch. Dead and unknown tiles are left alone.
+  void removeTile(TreeIndex const& at, bool withBranch, TileMoves* moves = nullptr);
+  /// Removes many; `lists` becomes what went, sorted.
+  void removeTiles(TileIndexLists& lists, bool withBranch, TileMoves* moves = nullptr);
+  /// Adds the tiles of many corners, in Morton order of each depth, and sets all branch sizes.
+  void addTilesInBulk(TileLists const& corners, TileLists* newTiles);
 
   AffinityPartitioner& affinityPartitioner(int d) const {
     return *m_data->m_affinityPartitioners[static_cast<std::size_t>(d)];
@@ -239,9 +274,18 @@ protected:
   int decrementAffinityPartitionerUseCount() const { return m_data->m_affinityUseCount.fetch_sub(1); }
 
 private:
+  /// Indices n whose corner has no tile at `depth`; a null corner is left out.
+  std::vector<std::int64_t> findMissing(std::int64_t count, int depth,
+                                        FunctionRef<int3 const*(std::int64_t)> cornerAt) const;
+  /// Makes the tiles of distinct aligned corners that do not exist yet.
+  void createTiles(std::vector<int3> const& corners, int depth, TileLists* newTiles);
+  /// Hangs roots deeper than `depth` below roots of `depth` that hold them.
+  void adoptDeeperRoots(int depth, TileLists* newTiles);
+  /// Takes a tile or its branch out of the tree; returns how many tiles died.
+  std::int64_t unlinkTile(TreeIndex const& at, bool withBranch, TileIndexLists& removed);
+  void compact(TileIndexLists& lists, TileMoves& moves);
   void truncate(int depth);
   void returnThreadLocal(int fromDepth);
-  void roots(std::vector<TreeIndex>& out) const;
 
   Ostil::Ptr<Data> m_data;
 };

@@ -51,6 +51,15 @@ public:
     }
     m_size = n;
   }
+  /// Moves the record at i to perm[i], bitwise.
+  void permute(std::int64_t const* perm) {
+    auto* room = static_cast<TileT*>(::operator new(static_cast<std::size_t>(m_size) * sizeof(TileT)));
+    for (std::int64_t i = 0; i < m_size; ++i)
+      std::memcpy(static_cast<void*>(room + perm[i]), static_cast<void const*>(m_tiles + i), sizeof(TileT));
+    ::operator delete(m_tiles);
+    m_tiles = room;
+    m_capacity = m_size;
+  }
   void clear() {
     std::destroy(m_tiles, m_tiles + m_size);
     ::operator delete(m_tiles);

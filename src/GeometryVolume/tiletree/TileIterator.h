@@ -1,6 +1,7 @@
 // Iterators over all tiles and over all voxels of a container, depth by depth in index order.
 #pragma once
 
+#include "GeometryVolume/tiletree/Container.h"
 #include "GeometryVolume/tiletree/Voxel.h"
 
 #include <cstddef>

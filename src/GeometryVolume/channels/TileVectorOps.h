@@ -1,0 +1,72 @@
+// Growth and trimming of a tile's element vector.
+//
+// The standard library's own growth is never used: capacities follow one rule on every platform, and a static
+// vector must not grow into the slot of the tile behind it.
+#pragma once
+
+#include "GeometryVolume/pools/TileDataAllocator.h"
+
+#include <algorithm>
+#include <cstddef>
+#include <stdexcept>
+
+namespace VLN::TileTree3D::Internal {
+
+/// Whether a vector on this allocator can take `capacity` further elements without leaving its block.
+template <class T> bool hasRoom(TileDataAllocator<T> const& a, std::size_t capacity) {
+  return !a.isStatic() || a.used() + static_cast<std::int64_t>(capacity) <= a.limit();
+}
+
+/// Puts the elements of `v` into a new buffer, each through the allocator's construct. The allocator keeps
+/// its state; a static one whose block has no such room left is replaced by one of default state.
+template <class T> void rebuffer(TileVector<T>& v, std::size_t capacity) {
+  auto const a = v.get_allocator();
+  TileVector<T> fresh(hasRoom(a, capacity) ? a : TileDataAllocator<T>());
+  fresh.reserve(capacity);
+  for (T& element : v) fresh.emplace_back(element);
+  v.swap(fresh);
+}
+
+/// Raises the capacity to exactly `wanted`.
+/// @error std::length_error beyond the largest size.
+template <class T> void reserveVector(TileVector<T>& v, std::size_t wanted) {
+  if (wanted > v.max_size()) throw std::length_error("a tile cannot reach this size");
+  if (hasRoom(v.get_allocator(), wanted))
+    v.reserve(wanted);
+  else
+    rebuffer(v, wanted);
+}
+
+/// Makes room for `wanted` elements in all: by half the capacity, or to what is wanted.
+/// @pre `wanted` exceeds the capacity and is at most the largest size.
+template <class T> void growCapacity(TileVector<T>& v, std::size_t wanted) {
+  std::size_t const next = std::max(wanted, std::min(v.capacity() + v.capacity() / 2, v.max_size()));
+  reserveVector(v, next);
+}
+
+/// Room for one more element.
+/// @error std::length_error when the vector has reached its largest size.
+template <class T> void growForPush(TileVector<T>& v) {
+  if (v.size() < v.capacity()) return;
+  if (v.size() >= v.max_size()) throw std::length_error("a tile has reached its largest size");
+  growCapacity(v, v.size() + 1);
+}
+
+/// Drops the tail, or appends copies of `value`.
+/// @error std::length_error beyond the largest size.
+template <class T> void resizeVector(TileVector<T>& v, std::size_t n, T value) {
+  if (n > v.max_size()) throw std::length_error("a tile cannot reach this size");
+  if (n > v.capacity()) growCapacity(v, n);
+  v.resize(n, value);
+}
+
+/// As resizeVector(), for a vector that must grow: a static one that has no room moves out of its block.
+template <class T> void resizeOutOfBlock(TileVector<T>& v, std::size_t n, T value) {
+  if (n > v.max_size()) rebuffer(v, std::max(n, v.capacity() + v.capacity() / 2));
+  resizeVector(v, n, value);
+}
+
+/// Brings the capacity down to the size.
+template <class T> void trimVector(TileVector<T>& v) { rebuffer(v, v.size()); }
+
+} // namespace VLN::TileTree3D::Internal

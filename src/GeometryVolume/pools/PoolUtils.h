@@ -1,0 +1,42 @@
+// PoolUtils: how much memory there is, for pools that keep some of it free.
+#pragma once
+
+#include "GeometryVolume/core/Export.h"
+#include "Ostil/String.h"
+
+#include <cstdint>
+
+namespace VLN::TileTree3D::PoolUtils {
+
+/// @units Bytes.
+struct MemoryStats {
+  std::uint64_t totalPhysical;
+  std::uint64_t availablePhysical;
+};
+
+/// Physical memory of the machine, narrowed by the control group when one is set.
+/// @error false when there are no figures; `out` is then as it was. That is so when the system does not
+/// tell, and when the control group's directory is missing or holds a file that is no number.
+/// @threads Any thread.
+VLN_API bool getMemoryStats(MemoryStats& out);
+
+/// @units 1 MB = 1,048,576 bytes.
+VLN_API float toMB(std::uint64_t bytes);
+
+/// Whether VELORN_ENABLE_VLN_POOL_UTILS_LOGGING held a number other than 0 at load. Nothing in this library
+/// reads it; the pools have log switches of their own.
+VLN_API bool loggingEnabled();
+
+/// Directory of the control group whose limit and usage narrow getMemoryStats(); empty for none. At load it
+/// is the value of VELORN_CGROUP_PATH.
+///
+///   version 2:  memory.max ("max": no limit), memory.current
+///   version 1:  memory.limit_in_bytes, memory.usage_in_bytes
+///
+/// A directory without a limit narrows nothing.
+VLN_API Ostil::String cgroupPath();
+/// Names another control group.
+/// @threads Any thread; a call of getMemoryStats() that runs already keeps the old one.
+VLN_API void setCgroupPath(Ostil::String const& path);
+
+} // namespace VLN::TileTree3D::PoolUtils

@@ -1,0 +1,230 @@
+// Removal of tiles, filling of the holes that it leaves, and reordering. Included by Container.cpp alone.
+//
+//   | a | X | b | X | c | d |      tiles at removed indices 1 and 3
+//   | a | d | b | c |              holes are filled from the end of the array; every referrer is told
+#pragma once
+
+#include "GeometryVolume/tiletree/Container.h"
+#include "GeometryVolume/tiletree/Morton.h"
+
+namespace VLN::TileTree3D {
+
+namespace Internal {
+
+/// Records the tiles of a branch and invalidates each after its children.
+template <class TraitsT> class RemoveTileVisitor final : public Visitor<Container<TraitsT>> {
+public:
+  using TileType = typename Container<TraitsT>::TileType;
+
+  explicit RemoveTileVisitor(TileIndexLists& removed)
+      : m_removed(removed) {
+    this->setBeginTileOverridden(false);
+  }
+  using Visitor<Container<TraitsT>>::endTile;
+  void endTile(TileType& tile) override {
+    m_removed[static_cast<std::size_t>(tile.depth())].push_back(tile.index());
+    tile.invalidate();
+    ++m_count;
+  }
+  RemoveTileVisitor* clone() const override { return new RemoveTileVisitor(m_removed); }
+  std::int64_t count() const { return m_count; }
+
+private:
+  TileIndexLists& m_removed;
+  std::int64_t m_count = 0;
+};
+
+/// Whether two occupied slots lie within one step of each other on each axis.
+template <class TileType> bool hasAdjacentChildren(TileType const& tile) {
+  for (auto a = tile.begin(); a != tile.end(); ++a) {
+    for (auto b = tile.begin(); b != tile.end(); ++b) {
+      int3 const d = TileType::childIJK(*a) - TileType::childIJK(*b);
+      if (*a != *b && std::abs(d.x) <= 1 && std::abs(d.y) <= 1 && std::abs(d.z) <= 1) return true;
+    }
+  }
+  return false;
+}
+
+} // namespace Internal
+
+template <class TraitsT>
+std::int64_t Container<TraitsT>::unlinkTile(TreeIndex const& at, bool withBranch, TileIndexLists& removed) {
+  if (!TraitsT::isDepth(at.depth) || at.index < 0 || at.index >= tileCount(at.depth) || !tile(at).valid())
+    return 0;
+  m_data->detachTiles();
+  TileType& t = editTile(at);
+  if (t.isRoot()) {
+    if (!withBranch && Internal::hasAdjacentChildren(t)) return 0;
+    removeRoot(t);
+    if (!withBranch) {
+      for (auto child = t.begin(); child != t.end(); ++child) {
+        TileType& c = editTile(child.treeIndex());
+        c.setParentIndex(-1);
+        addRoot(c);
+      }
+      t.invalidate();
+      removed[static_cast<std::size_t>(at.depth)].push_back(at.index);
+      return 1;
+    }
+  } else {
+    std::int64_t const branch = t.branchSize();
+    TreeIndex above = t.parentTreeIndex();
+    editTile(above).childIndex(t) = -1;
+    for (; above.index >= 0; above = tile(above).parentTreeIndex())
+      editTile(above).setBranchSize(tile(above).branchSize() - branch);
+  }
+  if (t.isLeaf()) {
+    t.invalidate();
+    removed[static_cast<std::size_t>(at.depth)].push_back(at.index);
+    return 1;
+  }
+  Internal::RemoveTileVisitor<TraitsT> visitor(removed);
+  traverse(visitor, kDepthFirst, {.start = at});
+  return visitor.count();
+}
+
+template <class TraitsT>
+void Container<TraitsT>::removeTile(TreeIndex const& at, bool withBranch, TileMoves* moves) {
+  TileIndexLists lists(static_cast<std::size_t>(kMaxDepth) + 1);
+  if (TraitsT::isDepth(at.depth)) lists[static_cast<std::size_t>(at.depth)].push_back(at.index);
+  removeTiles(lists, withBranch, moves);
+}
+
+template <class TraitsT>
+void Container<TraitsT>::removeTiles(TileIndexLists& lists, bool withBranch, TileMoves* moves) {
+  TileIndexLists removed(static_cast<std::size_t>(kMaxDepth) + 1);
+  std::int64_t count = 0;
+  for (int d = 0; d <= kMaxDepth && d < static_cast<int>(lists.size()); ++d) {
+    for (std::int64_t const index : lists[static_cast<std::size_t>(d)])
+      count += unlinkTile({index, d}, withBranch, removed);
+  }
+  // Refused and dead entries have left the lists; branches have joined them.
+  lists = std::move(removed);
+  TileMoves ownMoves;
+  TileMoves& made = moves ? *moves : ownMoves;
+  made.assign(static_cast<std::size_t>(kMaxDepth) + 1, {});
+  if (count == 0) return;
+  m_data->m_tileCountTotal -= count;
+  if (compactOnRemoval()) compact(lists, made);
+  tilesRemoved(&made);
+}
+
+template <class TraitsT> void Container<TraitsT>::compact(TileMoves* moves) {
+  TileIndexLists dead(static_cast<std::size_t>(kMaxDepth) + 1);
+  for (int d = 0; d <= kMaxDepth; ++d) {
+    for (std::int64_t n = 0; n < tileCount(d); ++n) {
+      if (!tile(n, d).valid()) dead[static_cast<std::size_t>(d)].push_back(n);
+    }
+  }
+  TileMoves ownMoves;
+  TileMoves& made = moves ? *moves : ownMoves;
+  made.assign(static_cast<std::size_t>(kMaxDepth) + 1, {});
+  compact(dead, made);
+  tilesRemoved(&made);
+}
+
+template <class TraitsT> void Container<TraitsT>::compact(TileIndexLists& lists, TileMoves& moves) {
+  m_data->detachTiles();
+  for (int d = 0; d <= kMaxDepth; ++d) {
+    auto& holes = lists[static_cast<std::size_t>(d)];
+    if (holes.empty()) continue;
+    std::sort(holes.begin(), holes.end());
+    holes.erase(std::unique(holes.begin(), holes.end()), holes.end());
+    auto const& tiles = m_data->tiles(d);
+    auto& made = moves[static_cast<std::size_t>(d)];
+    // Dead tiles at the very end go without a move, also those that an earlier removal left behind.
+    std::int64_t last = tiles.size() - 1;
+    auto const dropDead = [&] {
+      while (last >= 0 && !tiles[last].valid()) --last;
+    };
+    dropDead();
+    for (std::int64_t const hole : holes) {
+      if (hole >= last) break;
+      made.emplace_back(hole, last--);
+      dropDead();
+    }
+    std::vector<std::uint8_t> movedRoots(made.size());
+    parallelFor(0, static_cast<std::int64_t>(made.size()), [&](std::int64_t begin, std::int64_t end) {
+      for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+        auto const [dst, src] = made[n];
+        reallocateTile(dst, src, d);
+        TileType& t = editTile({dst, d});
+        t.setIndex(dst);
+        if (t.isRoot())
+          movedRoots[n] = 1;
+        else
+          editTile(t.parentTreeIndex()).childIndex(t) = dst;
+        for (auto child = t.begin(); child != t.end(); ++child)
+          editTile(child.treeIndex()).setParentIndex(dst);
+      }
+    });
+    resize(last + 1, d);
+    for (std::size_t n = 0; n < made.size(); ++n) {
+      if (movedRoots[n]) m_data->m_roots[tile(made[n].first, d).voxelCoord()] = {made[n].first, d};
+    }
+  }
+}
+
+template <class TraitsT> void Container<TraitsT>::permute(std::vector<std::int64_t> const* perms) {
+  tilesAdded();
+  m_data->detachTiles();
+  auto const mapped = [&](std::int64_t index, int d) {
+    auto const& perm = perms[static_cast<std::size_t>(d)];
+    return index < 0 || perm.empty() ? index : perm[static_cast<std::size_t>(index)];
+  };
+  auto const permuted = [&](int d) {
+    return TraitsT::isDepth(d) && !perms[static_cast<std::size_t>(d)].empty();
+  };
+  // Each depth rewrites only its own records, from the permutations of the depths above and below.
+  parallelFor(0, kMaxDepth + 1, [&](std::int64_t firstDepth, std::int64_t lastDepth) {
+    for (int d = static_cast<int>(firstDepth); d < static_cast<int>(lastDepth); ++d) {
+      if (!permuted(d - 1) && !permuted(d) && !permuted(d + 1)) continue;
+      auto& tiles = m_data->editTiles(d);
+      if (permuted(d)) tiles.permute(perms[static_cast<std::size_t>(d)].data());
+      parallelFor(0, tiles.size(),
+                  [&](std::int64_t begin, std::int64_t end) {
+                    for (std::int64_t n = begin; n < end; ++n) {
+                      TileType& t = tiles[n];
+                      t.setIndex(n);
+                      t.setParentIndex(d > 0 ? mapped(t.parentIndex(), d - 1) : t.parentIndex());
+                      for (auto child = t.begin(); child != t.end(); ++child)
+                        t.childIndex(*child) = mapped(t.childIndex(*child), d + 1);
+                    }
+                  },
+                  {.grain = 1024});
+    }
+  });
+  for (auto& [at, index] : m_data->m_roots) index.index = mapped(index.index, index.depth);
+}
+
+template <class TraitsT>
+void Container<TraitsT>::computeMortonPermutations(std::vector<std::vector<std::int64_t>>& perms) const {
+  perms.assign(static_cast<std::size_t>(kMaxDepth) + 1, {});
+  parallelFor(0, kMaxDepth + 1, [&](std::int64_t firstDepth, std::int64_t lastDepth) {
+    for (int d = static_cast<int>(firstDepth); d < static_cast<int>(lastDepth); ++d) {
+      auto const& tiles = m_data->tiles(d);
+      std::vector<SortRecord> order(static_cast<std::size_t>(tiles.size()));
+      parallelFor(0, tiles.size(),
+                  [&](std::int64_t begin, std::int64_t end) {
+                    for (std::int64_t n = begin; n < end; ++n)
+                      order[static_cast<std::size_t>(n)] = mortonRecord<TraitsT>(tiles[n].tijk(), n);
+                  },
+                  {.grain = 1024});
+      parallelSort(order.data(), tiles.size());
+      auto& perm = perms[static_cast<std::size_t>(d)];
+      perm.resize(order.size());
+      for (std::size_t n = 0; n < order.size(); ++n)
+        perm[static_cast<std::size_t>(order[n].value)] = static_cast<std::int64_t>(n);
+    }
+  });
+}
+
+template <class TraitsT>
+void Container<TraitsT>::sortIntoMortonOrder(std::vector<std::vector<std::int64_t>>* permutations) {
+  std::vector<std::vector<std::int64_t>> own;
+  auto& perms = permutations ? *permutations : own;
+  computeMortonPermutations(perms);
+  permute(perms.data());
+}
+
+} // namespace VLN::TileTree3D

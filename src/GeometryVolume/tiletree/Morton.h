@@ -1,0 +1,32 @@
+// Morton keys of tile corners.
+//
+//   low word:  bit b of i, j, k (b in 0..15)  at bit 3b, 3b+1, 3b+2
+//   high word: bits 16..31 in the same way
+#pragma once
+
+#include "GeometryVolume/core/Parallel.h"
+#include "GeometryVolume/tiletree/Tile.h"
+
+namespace VLN::TileTree3D {
+
+/// Spreads 16 bits so that each is followed by two zeros.
+constexpr std::uint64_t spreadBits(std::uint64_t v) {
+  v &= 0xffff;
+  v = (v | v << 16) & 0x0000ff0000ffull;
+  v = (v | v << 8) & 0x00f00f00f00full;
+  v = (v | v << 4) & 0x0c30c30c30c3ull;
+  v = (v | v << 2) & 0x249249249249ull;
+  return v;
+}
+
+/// The key of a corner, with a value that sorts along.
+template <class TraitsT> constexpr SortRecord mortonRecord(int3 const& corner, std::int64_t value) {
+  std::uint64_t const i = TraitsT::offset(corner.x), j = TraitsT::offset(corner.y),
+                      k = TraitsT::offset(corner.z);
+  auto const word = [&](int shift) {
+    return spreadBits(i >> shift) | spreadBits(j >> shift) << 1 | spreadBits(k >> shift) << 2;
+  };
+  return {word(16), word(0), value};
+}
+
+} // namespace VLN::TileTree3D
