@@ -27,8 +27,11 @@ struct Memory {
 
 Memory memoryOf(VLN::Object const& object) {
   Memory memory;
-  for (auto const& name : object.componentRange())
-    object.component(name)->memUse(memory.used, memory.allocated, true);
+  for (auto const& name : object.componentRange()) {
+    Memory one;
+    object.component(name)->memUse(one.used, one.allocated, true);
+    memory.used += one.used, memory.allocated += one.allocated;
+  }
   return memory;
 }
 
