@@ -30,7 +30,7 @@ public:
   /// @cost A hit on the cursor's tile costs one unsigned test an axis; other lookups walk up to a common
   /// ancestor.
   TileType const& tile(int i, int j, int k, int depth, bool exact) const {
-    if (depth == m_depth && holds(i, j, k)) return current();
+    if (depth >= 0 && depth == m_depth && holds(i, j, k)) return current();
     return exact ? tileImpl<true>(i, j, k, depth) : tileImpl<false>(i, j, k, depth);
   }
   TileType const& tile(int3 const& p, int depth, bool exact) const {
@@ -101,17 +101,14 @@ protected:
     m_corner = t.tijk(), m_depth = t.depth(), m_index = t.index();
     return t;
   }
-  void resetCursor() const { m_corner = {0, 0, 0}, m_depth = kNoDepth, m_index = -1; }
+  void resetCursor() const { m_corner = {0, 0, 0}, m_depth = -1, m_index = -1; }
   /// The start of the walk: from the cursor to a tile at or above `depth` that holds the point; invalid when
   /// the walk leaves the tree.
   TreeIndex findAncestor(int i, int j, int k, int depth) const;
 
-  /// Depth of a cursor without a tile: it equals no depth that can be asked for.
-  static constexpr std::int32_t kNoDepth = INT32_MIN;
-
   ContainerT const* m_container = nullptr;
   mutable int3 m_corner{0, 0, 0};
-  mutable std::int32_t m_depth = kNoDepth;
+  mutable std::int32_t m_depth = -1; // none; negative depths never match
   mutable std::int64_t m_index = -1;
 };
 
