@@ -32,14 +32,15 @@ TreeIndex ConstTileAccessorOf<TraitsT>::findAncestor(int i, int j, int k, int de
   return {};
 }
 
+template <class TraitsT> auto ConstTileAccessorOf<TraitsT>::noTile() const -> TileType const& {
+  static TileType const none;
+  return m_container ? m_container->invalidTile() : none;
+}
+
 template <class TraitsT>
 template <bool Exact>
 auto ConstTileAccessorOf<TraitsT>::tileImpl(int i, int j, int k, int depth) const -> TileType const& {
-  if (!m_container) {
-    static TileType const none;
-    return none;
-  }
-  if (depth < 0 || !TraitsT::inDomain(i, j, k)) return m_container->invalidTile();
+  if (!m_container || depth < 0 || !TraitsT::inDomain(i, j, k)) return noTile();
   TreeIndex at = findAncestor(i, j, k, depth);
   at = at.valid() ? m_container->descend(at, i, j, k, depth) : m_container->tileIndex(i, j, k, depth);
   if (!at.valid()) return m_container->invalidTile();
@@ -50,6 +51,7 @@ auto ConstTileAccessorOf<TraitsT>::tileImpl(int i, int j, int k, int depth) cons
 template <class TraitsT>
 auto ConstTileAccessorOf<TraitsT>::tileNeighbor(TileType const& t, NeighborDirection n) const
     -> TileType const& {
+  if (t.depth() < 0 || t.index() < 0) return noTile();
   if (auto const* table = m_container->neighborData()) {
     TreeIndex const at = (*table)[static_cast<std::size_t>(t.depth())][static_cast<std::size_t>(t.index())]
                                  [static_cast<std::size_t>(n)];
@@ -72,6 +74,7 @@ auto ConstTileAccessorOf<TraitsT>::tileNeighbor(TileType const& t, int di, int d
 template <class TraitsT>
 void ConstTileAccessorOf<TraitsT>::tileNeighbors(TileType const& t, std::vector<TreeIndex>& list, int depth,
                                                  bool recursive) const {
+  if (!t.valid()) return;
   NeighborSearch<TraitsT> search(*this, list);
   if (recursive)
     search.aroundLeafVoxels(t);

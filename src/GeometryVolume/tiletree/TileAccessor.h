@@ -49,13 +49,12 @@ public:
   TileType const& tile(std::int64_t n) const { return m_container->tile(n); }
   TileType const& tile(std::int64_t index, int depth) const { return m_container->tile(index, depth); }
 
-  /// The tile found last; the invalid tile of a fresh accessor.
-  TileType const& current() const {
-    return m_depth >= 0 ? m_container->tile(m_index, m_depth) : m_container->invalidTile();
-  }
+  /// The tile found last; an invalid tile of a fresh accessor.
+  TileType const& current() const { return m_depth >= 0 ? m_container->tile(m_index, m_depth) : noTile(); }
 
   // Neighbours
   /// The tile next to `t` at its depth, or the deepest one above that holds the place; the invalid tile else.
+  /// @edges The invalid tile has no neighbours.
   TileType const& tileNeighbor(TileType const& t, NeighborDirection n) const;
   /// The tile at `t`'s corner plus (di, dj, dk) tile widths of `depth`.
   TileType const& tileNeighbor(TileType const& t, int di, int dj, int dk, int depth, bool exact) const;
@@ -85,6 +84,8 @@ protected:
   explicit ConstTileAccessorOf(ContainerT const& container)
       : m_container(&container) {}
 
+  /// The container's invalid tile, and one of the library's own without a container.
+  TileType const& noTile() const;
   /// The search behind a miss of the cursor.
   template <bool Exact> TileType const& tileImpl(int i, int j, int k, int depth) const;
   /// Appends the live tiles of a depth range.
