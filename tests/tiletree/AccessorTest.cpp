@@ -16,6 +16,17 @@ using Support::Access;
 
 VLN_SHAPE_SUITE(Accessor);
 
+namespace {
+
+template <class T> struct OpenAccessor : Container<T>::ConstTileAccessor {
+  using Base = typename Container<T>::ConstTileAccessor;
+  explicit OpenAccessor(Base const& accessor)
+      : Base(accessor) {}
+  using Base::tiles;
+};
+
+} // namespace
+
 // boundary
 TYPED_TEST(Accessor, FreshOneOnAnEmptyContainerFindsTheInvalidTile) {
   using T = TypeParam;
@@ -303,4 +314,27 @@ TYPED_TEST(Accessor, AdditionDropsEachDerivedCache) {
   build();
   Access::tilesRemoved(tree, nullptr);
   expectDropped();
+}
+
+// requirement: the live tiles of a range of depths, appended
+TYPED_TEST(Accessor, ListsTheTilesOfADepthRange) {
+  using T = TypeParam;
+  Container<T> tree;
+  auto accessor = tree.tileAccessor();
+  accessor.addTile(0, 0, 0, 2);
+  accessor.addTile(0, 0, 0, 4);
+  TreeIndex const other = accessor.addTile(T::kMaxTileCoord, 0, 0, 4).treeIndex();
+  accessor.addTile(T::kMaxTileCoord, 0, 0, 6);
+  TreeIndex const far = accessor.addTile(T::kMinTileCoord, 0, 0, 4).treeIndex();
+  Access::killLeafTile(tree, far);
+  OpenAccessor<T> const open(std::as_const(tree).tileAccessor());
+  std::vector<TreeIndex> list{{9, 9}};
+  open.tiles(list, 3, 4);
+  EXPECT_EQ(list, (std::vector<TreeIndex>{{9, 9}, {0, 3}, {0, 4}, other}));
+  list.clear();
+  open.tiles(list, std::numeric_limits<int>::min(), std::numeric_limits<int>::max());
+  EXPECT_EQ(static_cast<std::int64_t>(list.size()), tree.tileCount(-1) - 1);
+  list.clear();
+  open.tiles(list, 4, 3);
+  EXPECT_TRUE(list.empty());
 }

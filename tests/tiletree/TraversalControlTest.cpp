@@ -171,6 +171,26 @@ TYPED_TEST(TraversalControl, VisitorCopiesAreMadeOncePerThreadAndFreedByTheOwner
   EXPECT_EQ(s_live, 0);
 }
 
+// requirement: all operations but the clone have defaults that do nothing, and keep every child
+TYPED_TEST(TraversalControl, VisitorsNeedNothingButTheirClone) {
+  using T = TypeParam;
+  struct Bare : Visitor<Container<T>> {
+    Bare* clone() const override { return new Bare; }
+  };
+  Container<T> tree = sample<T>();
+  for (int mode = 0; mode <= 9; ++mode) {
+    Bare visitor;
+    EXPECT_TRUE(visitor.isBeginTileOverridden());
+    EXPECT_TRUE(visitor.isEndTileOverridden());
+    EXPECT_NO_THROW(tree.traverse(visitor, static_cast<TraversalMode>(mode)));
+    EXPECT_NO_THROW(std::as_const(tree).reduce(visitor, static_cast<TraversalMode>(mode)));
+    auto& t = Access::editTile(tree, tree.cbeginRoots()->second);
+    EXPECT_TRUE(visitor.visitInteriorVoxel(t, int3{0, 0, 0}));
+    EXPECT_TRUE(visitor.visitInteriorVoxel(std::as_const(t), int3{0, 0, 0}));
+  }
+  EXPECT_TRUE(tree.checkBranchSizes(false));
+}
+
 // requirement: parallel modes end a cancelled job with the host's exception, serial ones run through
 TYPED_TEST(TraversalControl, CancelledJobEndsParallelModes) {
   using T = TypeParam;
