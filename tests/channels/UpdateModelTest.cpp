@@ -287,15 +287,15 @@ template <class C> void checkAllFlags(unsigned seeds, int steps) {
 }
 
 TEST(UpdateModel, RequirementPoints) {
-  checkAllFlags<ProbeChannel<PowerOfTwoTraits, float, 4, 0>>(6, 60);
-  checkAllFlags<ProbeChannel<OddTraits, float, 5, 0>>(3, 60);
+  checkAllFlags<ProbeChannel<PowerOfTwoTraits, float, 4, 0>>(4, 60);
+  checkAllFlags<ProbeChannel<OddTraits, float, 5, 0>>(2, 60);
 }
 TEST(UpdateModel, RequirementHalos) {
-  checkAllFlags<ProbeChannel<PowerOfTwoTraits, float, 4, 1>>(3, 50);
+  checkAllFlags<ProbeChannel<PowerOfTwoTraits, float, 4, 1>>(1, 50);
   checkAllFlags<ProbeChannel<OddTraits, float, 5, 2>>(1, 40);
 }
 TEST(UpdateModel, RequirementExtendedTiles) {
-  checkAllFlags<ProbeChannel<PowerOfTwoTraits, float, 5, 0>>(3, 50);
+  checkAllFlags<ProbeChannel<PowerOfTwoTraits, float, 5, 0>>(1, 50);
   checkAllFlags<ProbeChannel<OddTraits, float, 6, 0>>(1, 40);
 }
 /// Every enabled element type, with static and heap tiles.
