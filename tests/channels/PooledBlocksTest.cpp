@@ -47,6 +47,14 @@ TEST_F(PooledBlocks, RequirementHandedOverBlocksReturnWithTheStorage) {
   original.reset();
   EXPECT_EQ(ChannelMemoryPool::usedStoreSize(), before + 1);
   EXPECT_EQ(std::as_const(*copy).tileData(4, 3)[215], 4.0f);
+  // Tiles that move to new storage take their block along.
+  TilePermutation p(kChannelDepths);
+  p[3] = {4, 3, 2, 1, 0};
+  void const* const storage = copy->dataPtr();
+  copy->permute(&p);
+  EXPECT_NE(copy->dataPtr(), storage);
+  EXPECT_TRUE(copy->isStatic({0, 3}));
+  EXPECT_EQ(ChannelMemoryPool::usedStoreSize(), before + 1);
   copy.reset();
   EXPECT_EQ(ChannelMemoryPool::usedStoreSize(), before);
 }
