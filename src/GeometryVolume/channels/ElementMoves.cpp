@@ -115,8 +115,10 @@ void groupByDestination(std::vector<ElementToFrom> const& moves, std::vector<std
 
 void addSources(std::vector<ElementToFrom> const& moves, ElementRemovals& removals) {
   removals.resize(kChannelDepths);
-  for (ElementToFrom const& move : moves)
-    removals[static_cast<std::size_t>(move.fromDepth)].push_back({move.from, move.fromElement});
+  for (ElementToFrom const& move : moves) {
+    auto const depth = static_cast<std::size_t>(move.fromDepth);
+    if (depth < removals.size()) removals[depth].push_back({move.from, move.fromElement});
+  }
 }
 
 void finishRemovals(ElementRemovals& removals) {
@@ -124,6 +126,55 @@ void finishRemovals(ElementRemovals& removals) {
     sortRemovals(list);
     list.erase(std::unique(list.begin(), list.end()), list.end());
   }
+}
+
+ArrivalPlan planArrivals(std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals,
+                         std::size_t moveCount) {
+  ArrivalPlan plan;
+  plan.starts.reserve(tiles.size());
+  for (std::uint64_t tile : tiles) plan.starts.push_back(arrivals.find(tile)->second.first);
+  plan.end = moveCount;
+  return plan;
+}
+
+void ArrivalPlan::forEachRun(FunctionRef<void(std::size_t, std::uint64_t, std::uint64_t)> body) const {
+  if (starts.empty()) return;
+  ParallelOptions options;
+  options.grain = 1024;
+  parallelFor(
+      static_cast<std::int64_t>(starts.front()), static_cast<std::int64_t>(end),
+      [&](std::int64_t first, std::int64_t last) {
+        auto at = static_cast<std::uint64_t>(first);
+        auto run =
+            static_cast<std::size_t>(std::upper_bound(starts.begin(), starts.end(), at) - starts.begin() - 1);
+        for (; at < static_cast<std::uint64_t>(last); ++run) {
+          std::uint64_t const stop = std::min(starts[run] + count(run), static_cast<std::uint64_t>(last));
+          body(run, at, stop);
+          at = stop;
+        }
+      },
+      options);
+}
+
+void forEachTileRun(std::vector<ElementInTile> const& elements,
+                    FunctionRef<void(std::int64_t, std::int64_t)> body) {
+  auto const n = static_cast<std::int64_t>(elements.size());
+  auto const tile = [&](std::int64_t at) { return elements[static_cast<std::size_t>(at)].tile; };
+  ParallelOptions options;
+  options.grain = 512;
+  parallelFor(
+      0, n,
+      [&](std::int64_t begin, std::int64_t end) {
+        // Each tile belongs to the range in which its run begins.
+        while (begin > 0 && begin < n && tile(begin) == tile(begin - 1)) ++begin;
+        while (begin < end) {
+          std::int64_t stop = begin + 1;
+          while (stop < n && tile(stop) == tile(begin)) ++stop;
+          body(begin, stop);
+          begin = stop;
+        }
+      },
+      options);
 }
 
 } // namespace Internal
