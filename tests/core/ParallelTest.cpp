@@ -2,6 +2,7 @@
 #include "GeometryVolume/core/Parallel.h"
 #include "Ostil/Job.h"
 #include "Velorn/ExceptionMessage.h"
+#include "support/Threads.h"
 
 #include <gtest/gtest.h>
 

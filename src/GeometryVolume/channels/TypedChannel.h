@@ -49,6 +49,7 @@ public:
                       ArrivalMap const& arrivals) override;
   std::type_index elementType() const override { return typeid(T); }
   ChannelLayout layout() const override { return m_data->layout(); }
+  void fillTiles(int depth, std::vector<std::int64_t> const& tiles) override;
 
   // Settings
   T const& defaultValue() const { return m_data->defaultValue(); }

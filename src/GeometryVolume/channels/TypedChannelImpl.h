@@ -8,6 +8,7 @@
 #include "GeometryVolume/channels/TypedChannel.h"
 #include "GeometryVolume/core/Const.h"
 #include "GeometryVolume/core/LoggerHooks.h"
+#include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/core/Streaming.h"
 
 #include <iostream>
@@ -159,6 +160,23 @@ void TypedChannel<T>::setChannelData(unsigned int kind, Ostil::Any const& type,
     write([&](ChannelData<T>& d) { d.importFlat(*static_cast<Ostil::Array<T> const*>(data.get())); });
   if (kind == 3)
     write([&](ChannelData<T>& d) { d.importNested(*static_cast<NestedArrays<T> const*>(data.get())); });
+}
+
+template <class T> void TypedChannel<T>::fillTiles(int depth, std::vector<std::int64_t> const& tiles) {
+  if (tiles.empty() || depth < 0 || depth >= kChannelDepths) return;
+  cloneData();
+  auto& vectors = (*m_data->dataPtr())[static_cast<std::size_t>(depth)];
+  auto const count = static_cast<std::int64_t>(vectors.size());
+  parallelFor(0, static_cast<std::int64_t>(tiles.size()),
+              [&](std::int64_t begin, std::int64_t end) {
+                for (std::int64_t n = begin; n < end; ++n) {
+                  std::int64_t const tile = tiles[static_cast<std::size_t>(n)];
+                  if (tile < 0 || tile >= count) continue;
+                  auto& values = vectors[static_cast<std::size_t>(tile)];
+                  std::fill(values.begin(), values.end(), m_data->defaultValue());
+                }
+              },
+              {.grain = 64});
 }
 
 template <class T> void TypedChannel<T>::setDefaultValue(T const* value) {

@@ -115,6 +115,7 @@ template <class TraitsT> void Container<TraitsT>::resize(std::int64_t n, int dep
 
 template <class TraitsT>
 void Container<TraitsT>::reallocateTile(std::int64_t dst, std::int64_t src, int depth) {
+  m_data->detachTiles();
   auto& tiles = m_data->editTiles(depth);
   tiles[dst] = tiles[src];
 }

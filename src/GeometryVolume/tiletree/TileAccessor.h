@@ -29,7 +29,7 @@ public:
   /// @edges The invalid tile when there is none, and for points out of the domain. Depths deeper than the
   /// shape's last hold no tiles.
   /// @cost A hit on the cursor's tile costs one unsigned test an axis; other lookups begin at the deepest
-  /// known ancestor that holds the point, without walking up to it. ancestor.
+  /// known ancestor that holds the point, without walking up to it.
   TileType const& tile(int i, int j, int k, int depth, bool exact) const {
     TreeIndex const at = treeIndex(i, j, k, depth, exact);
     return at.depth >= 0 ? m_container->tile(at) : invalidTile();
@@ -114,8 +114,8 @@ protected:
   /// Follows child slots from a tile, keeps the path, and puts the cursor on the last tile.
   TreeIndex descend(TreeIndex at, int i, int j, int k, int depth) const;
 
-  /// Depth of a cursor without a tile: it equals no depth that can be asked for.
-  static constexpr std::int32_t kNoDepth = INT32_MIN;
+  /// Depth of a cursor without a tile. Asked for, it "hits" and gives the invalid index, which is the answer.
+  static constexpr std::int32_t kNoDepth = -1;
 
   ContainerT const* m_container = nullptr;
   mutable int3 m_corner{0, 0, 0};
