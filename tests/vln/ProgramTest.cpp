@@ -271,8 +271,10 @@ TEST_P(RealFile, IsReportedAndDrawn) {
   RunResult const run = vln({"info", path, "--json"});
   ASSERT_EQ(run.code, 0) << run.err;
   Json const j = Json::parse(run.out);
+  int drawn = 0;
   for (Json const& object : j["objects"])
     for (Json const& channel : object["channels"]) {
+      if (channel["active"] != 0 && ++drawn > 4) continue; // one file has two dozen
       std::string const name = channel["name"], picture = folder / "p.png";
       RunResult const slice =
           vln({"slice", path, "--channel", name, "--axis", "z", "--size", "200", "-o", picture});
