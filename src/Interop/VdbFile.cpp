@@ -7,6 +7,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <csignal>
 #include <cstring>
 #include <fstream>
 #include <new>
@@ -14,6 +15,7 @@
 
 #include <fcntl.h>
 #include <poll.h>
+#include <sys/prctl.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -137,6 +139,7 @@ void onNoMemory() {
                            int fd) {
   verdictEnd = fd, memoryVerdict = memoryReason(limits.memoryBytes);
   std::set_new_handler(onNoMemory);
+  prctl(PR_SET_PDEATHSIG, SIGKILL); // nobody waits for the verdict of an orphan
   // A sanitizer reserves address space by the terabyte; there the parent's watch over resident memory is the
   // only bound.
   if (start.space < (std::uint64_t(1) << 40))
