@@ -217,7 +217,11 @@ VdbReadLimits probe(std::string const& path, VdbReadLimits const& asked) {
   std::string const verdict = watchChild(ends[0], child, limits, start, reason);
   close(ends[0]);
   int status = 0;
-  while (waitpid(child, &status, 0) < 0 && errno == EINTR) {}
+  rusage usage = {};
+  while (wait4(child, &status, 0, &usage) < 0 && errno == EINTR) {}
+  // A child that was quicker than the watch; its greatest size is told in kB.
+  if (!reason && static_cast<std::uint64_t>(usage.ru_maxrss) * 1024 > start.resident + limits.memoryBytes)
+    reason = memoryReason(limits.memoryBytes);
 
   if (reason) throw FileError(path, *reason);
   if (WIFSIGNALED(status)) {
