@@ -243,7 +243,9 @@ void probeVdbFile(std::string const& path, VdbReadLimits const& limits) { probe(
 VdbFile readVdbFile(std::string const& path, VdbReadLimits const& asked) {
   VdbReadLimits const limits = probe(path, asked);
   try {
-    return readWhole(path);
+    VdbFile file = readWhole(path);
+    file.memoryBytes = limits.memoryBytes;
+    return file;
   } catch (...) { throw FileError(path, currentReason(limits.memoryBytes)); }
 }
 

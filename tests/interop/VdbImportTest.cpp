@@ -318,6 +318,11 @@ TEST(VdbImportTest, BoundsTheMemoryOfItsVolumes) {
   } catch (FileError const& error) {
     EXPECT_EQ(error.reason(), "its volumes need more than 10 MB of memory");
   }
+  // The bound of the reading is that of the volumes.
+  TempFolder folder;
+  openvdb::io::File(folder / "apart.vdb").write(file.grids);
+  EXPECT_EQ(importVdb(folder / "apart.vdb", {80000000, 0}).volumes.size(), 1u);
+  EXPECT_THROW(importVdb(folder / "apart.vdb", {25000000, 0}), FileError);
 }
 
 // requirement

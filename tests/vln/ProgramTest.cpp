@@ -206,8 +206,11 @@ TEST_F(ProgramTest, BadFilesEndInOneLine) {
   }
   std::string const large = m_folder / "large.vdb";
   ASSERT_EQ(vln({"make", "torus", large, "--voxels", "400000"}).code, 0);
-  expectFailure(vln({"info", large, "--max-memory", "1"}),
-                large + ": is damaged, or needs more than 1 MB of memory");
+  // Which bound is met first, that of the reading or that of the volumes, depends on the build.
+  RunResult const bounded = vln({"info", large, "--max-memory", "1"});
+  EXPECT_EQ(bounded.code, 1);
+  EXPECT_EQ(bounded.out, "");
+  EXPECT_NE(bounded.err.find("more than 1 MB of memory\n"), std::string::npos) << bounded.err;
   EXPECT_FALSE(std::filesystem::exists(picture));
 }
 
