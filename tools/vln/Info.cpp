@@ -1,9 +1,9 @@
+#include "Commands.h"
 #include "GeometryVolume/channels/Channel.h"
 #include "GeometryVolume/tiletree/Container.h"
 #include "Interop/FileError.h"
 #include "Interop/VdbImport.h"
-#include "vln/Commands.h"
-#include "vln/ProgressBar.h"
+#include "ProgressBar.h"
 
 #include <array>
 #include <cstdlib>

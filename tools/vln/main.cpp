@@ -1,12 +1,12 @@
 // vln: looks at volumes from the command line.
 //
 // Whatever goes wrong at the edges ends in one line on standard error and exit code 1.
+#include "Commands.h"
 #include "GeometryVolume/core/Version.h"
 #include "Interop/FileError.h"
 #include "Interop/OutputFile.h"
 #include "Interop/VdbFile.h"
 #include "Interop/VdbMake.h"
-#include "vln/Commands.h"
 
 #include <CLI/CLI.hpp>
 
