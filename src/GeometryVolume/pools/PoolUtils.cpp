@@ -1,5 +1,7 @@
 #include "GeometryVolume/pools/PoolUtils.h"
 
+#include "GeometryVolume/pools/PoolLogImpl.h"
+
 #include <algorithm>
 #include <charconv>
 #include <cstdlib>
@@ -88,12 +90,19 @@ void narrow(MemoryStats& stats, std::filesystem::path const& group) {
 } // namespace
 
 bool getMemoryStats(MemoryStats& out) {
+  bool const logging = loggingEnabled();
   try {
     MemoryStats stats = machineStats();
     if (auto const group = cgroupPath(); !group.empty()) narrow(stats, group);
     out = stats;
+    if (logging)
+      Internal::writeLine("PoolUtils: total physical memory = ", toMB(stats.totalPhysical),
+                          "MB, available physical memory = ", toMB(stats.availablePhysical), "MB");
     return true;
-  } catch (...) { return false; }
+  } catch (...) {
+    if (logging) Internal::writeLine("PoolUtils: unable to retrieve memory stats");
+    return false;
+  }
 }
 
 float toMB(std::uint64_t bytes) { return static_cast<float>(bytes) * 0.0009765625f * 0.0009765625f; }

@@ -23,8 +23,8 @@ VLN_API bool getMemoryStats(MemoryStats& out);
 /// @units 1 MB = 1,048,576 bytes.
 VLN_API float toMB(std::uint64_t bytes);
 
-/// Whether VELORN_ENABLE_VLN_POOL_UTILS_LOGGING held a number other than 0 at load. Nothing in this library
-/// reads it; the pools have log switches of their own.
+/// Whether VELORN_ENABLE_VLN_POOL_UTILS_LOGGING held a number other than 0 at load. Then each reading of the
+/// statistics writes one line to standard output.
 VLN_API bool loggingEnabled();
 
 /// Directory of the control group whose limit and usage narrow getMemoryStats(); empty for none. At load it
