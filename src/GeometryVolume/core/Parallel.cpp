@@ -4,8 +4,10 @@
 #include "Velorn/ExceptionMessage.h"
 
 #include <atomic>
+#include <optional>
 #include <stdexcept>
 #include <tbb/blocked_range.h>
+#include <tbb/global_control.h>
 #include <tbb/parallel_for.h>
 #include <tbb/parallel_sort.h>
 #include <tbb/partitioner.h>
@@ -108,6 +110,12 @@ void parallelSort(SortRecord* records, std::int64_t n) {
 }
 
 void withThreads(int threads, FunctionRef<void()> body) {
+  // More threads than the machine has are given too: the scheduler's own limit would leave them out.
+  using Control = tbb::global_control;
+  auto const wanted = static_cast<std::size_t>(std::max(threads, 1));
+  std::optional<Control> limit;
+  if (wanted > Control::active_value(Control::max_allowed_parallelism))
+    limit.emplace(Control::max_allowed_parallelism, wanted);
   tbb::task_arena arena(threads);
   arena.execute([&] { body(); });
 }

@@ -177,7 +177,8 @@ public:
   int tileSpaceMaxTileDistance() const;
 
   // Bulk change. Channels are not told: run the update protocol afterwards.
-  /// Makes this tree a superset of each source. Former roots hang below new tiles that hold them.
+  /// Makes this tree a superset of each source. Tiles between are made only where a former root comes to lie
+  /// below a new tile, or a root of a source below a coarser tile of this tree: roots never overlap.
   /// @param newTiles If given, the corner of every tile made is appended to the list of its depth.
   /// @param setBranchSizesAtEnd Else branch sizes are stale afterwards.
   /// @error std::runtime_error(VLN::exceptionMessage) when the host cancels the job; the depths finished so
@@ -230,7 +231,11 @@ protected:
   TreeIndex tileIndex(int i, int j, int k, int depth) const;
   TileType const& tile(int i, int j, int k, int depth) const;
   /// Follows child slots from a tile towards a point of the domain until `depth` or an empty slot.
-  TreeIndex descend(TreeIndex at, int i, int j, int k, int depth) const;
+  /// With `path`, the index of each tile below the first is kept under its depth.
+  TreeIndex descend(TreeIndex at, int i, int j, int k, int depth, std::int64_t* path = nullptr) const;
+  /// Where a search begins: the tile of the acceleration grid, or the root, that holds the point at or above
+  /// `depth`; invalid when there is none.
+  TreeIndex entry(int i, int j, int k, int depth) const;
 
   // Change. Tiles are named by index, since growth moves the records.
   TileType& editTile(TreeIndex const& at) { return m_data->editTiles(at.depth)[at.index]; }
@@ -276,7 +281,7 @@ private:
   /// Makes the tiles of distinct aligned corners that do not exist yet.
   void createTiles(std::vector<int3> const& corners, int depth, TileLists* newTiles);
   /// Hangs roots deeper than `depth` below roots of `depth` that hold them.
-  void adoptDeeperRoots(int depth, TileLists* newTiles);
+  void adoptDeeperRoots(int depth);
   /// Takes a tile or its branch out of the tree; returns how many tiles died.
   std::int64_t unlinkTile(TreeIndex const& at, bool withBranch, TileIndexLists& removed);
   void compact(TileIndexLists& lists, TileMoves& moves);

@@ -37,6 +37,13 @@ template <class TraitsT>
 std::vector<std::int64_t>
 Container<TraitsT>::findMissing(std::int64_t count, int depth,
                                 FunctionRef<int3 const*(std::int64_t)> cornerAt) const {
+  if (tileCount(depth) == 0) {
+    std::vector<std::int64_t> all;
+    for (std::int64_t n = 0; n < count; ++n) {
+      if (cornerAt(n)) all.push_back(n);
+    }
+    return all;
+  }
   std::vector<std::vector<std::int64_t>> parts(static_cast<std::size_t>(
       count >= Internal::kParallelTiles ? chunkCount(0, count, Internal::kRefineGrain) : 1));
   Internal::refinePass(count, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
@@ -44,8 +51,8 @@ Container<TraitsT>::findMissing(std::int64_t count, int depth,
     for (std::int64_t n = begin; n < end; ++n) {
       int3 const* corner = cornerAt(n);
       if (!corner) continue;
-      TileType const& found = accessor.tile(*corner, depth, false);
-      if (!found.valid() || found.depth() != depth) parts[static_cast<std::size_t>(chunk)].push_back(n);
+      if (accessor.treeIndex(corner->x, corner->y, corner->z, depth, false).depth != depth)
+        parts[static_cast<std::size_t>(chunk)].push_back(n);
     }
   });
   // Chunks are consecutive, so that the joined list is in the order of the serial pass.
@@ -58,9 +65,15 @@ template <class TraitsT>
 void Container<TraitsT>::createTiles(std::vector<int3> const& corners, int depth, TileLists* newTiles) {
   auto const count = static_cast<std::int64_t>(corners.size());
   if (count == 0) return;
+  Counts const before = m_data->m_tileCounts;
   std::int64_t const first = tileCount(depth);
   allocateTiles(depth, count);
-  std::vector<std::vector<std::int64_t>> newRoots(static_cast<std::size_t>(
+  // A tile without a parent is a root (no tile above it), or hangs below a coarser tile with tiles between.
+  struct Unlinked {
+    std::int64_t index;
+    TreeIndex above;
+  };
+  std::vector<std::vector<Unlinked>> parts(static_cast<std::size_t>(
       count >= Internal::kParallelTiles ? chunkCount(0, count, Internal::kRefineGrain) : 1));
   Internal::refinePass(count, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
     Container const& tree = *this;
@@ -69,29 +82,39 @@ void Container<TraitsT>::createTiles(std::vector<int3> const& corners, int depth
       int3 const& p = corners[static_cast<std::size_t>(n)];
       std::int64_t const index = first + n;
       std::int64_t parent = -1;
+      TreeIndex nearest;
       if (depth > 0) {
-        TileType const& above = accessor.tile(p, depth - 1, true);
-        if (above.valid()) {
+        TileType const& above = accessor.tile(p, depth - 1, false);
+        if (above.valid() && above.depth() == depth - 1) {
           // Each slot belongs to exactly one tile: no two workers write the same.
           parent = above.index();
           editTile(above.treeIndex()).childIndex(above.childIJK(p)) = index;
+        } else if (above.valid()) {
+          nearest = above.treeIndex();
         }
       }
       editTile({index, depth}).init(parent, p.x, p.y, p.z, depth, index);
-      if (parent < 0) newRoots[static_cast<std::size_t>(chunk)].push_back(index);
+      if (parent < 0) parts[static_cast<std::size_t>(chunk)].push_back({index, nearest});
     }
   });
   bool anyRoot = false;
-  for (auto const& part : newRoots) {
-    for (std::int64_t const index : part) addRoot(tile(index, depth)), anyRoot = true;
+  for (auto const& part : parts) {
+    for (Unlinked const& made : part) {
+      if (made.above.valid())
+        insertChild(made.above, {made.index, depth});
+      else
+        addRoot(tile(made.index, depth)), anyRoot = true;
+    }
   }
-  if (newTiles) {
-    for (int3 const& p : corners) (*newTiles)[static_cast<std::size_t>(depth)].append(p);
+  if (anyRoot) adoptDeeperRoots(depth);
+  // The asked tiles lie first among the new ones of their depth; tiles between were made at other depths.
+  for (int d = 0; newTiles && d <= kMaxDepth; ++d) {
+    for (std::int64_t n = before[static_cast<std::size_t>(d)]; n < tileCount(d); ++n)
+      (*newTiles)[static_cast<std::size_t>(d)].append(tile(n, d).tijk());
   }
-  if (anyRoot) adoptDeeperRoots(depth, newTiles);
 }
 
-template <class TraitsT> void Container<TraitsT>::adoptDeeperRoots(int depth, TileLists* newTiles) {
+template <class TraitsT> void Container<TraitsT>::adoptDeeperRoots(int depth) {
   bool deeper = false;
   for (int d = depth + 1; d <= kMaxDepth; ++d) deeper |= rootCount(d) > 0;
   if (!deeper) return;
@@ -103,14 +126,9 @@ template <class TraitsT> void Container<TraitsT>::adoptDeeperRoots(int depth, Ti
         {TraitsT::align(at.i, depth), TraitsT::align(at.j, depth), TraitsT::align(at.k, depth), depth});
     if (above != m_data->m_roots.end()) adoptions.emplace_back(above->second, index);
   }
-  Counts before = m_data->m_tileCounts;
   for (auto const& [parent, child] : adoptions) {
     removeRoot(tile(child));
     insertChild(parent, child);
-  }
-  for (int d = depth + 1; newTiles && d <= kMaxDepth; ++d) {
-    for (std::int64_t n = before[static_cast<std::size_t>(d)]; n < tileCount(d); ++n)
-      (*newTiles)[static_cast<std::size_t>(d)].append(tile(n, d).tijk());
   }
 }
 

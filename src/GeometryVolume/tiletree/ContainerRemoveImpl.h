@@ -134,13 +134,15 @@ template <class TraitsT> void Container<TraitsT>::compact(TileIndexLists& lists,
     auto& made = moves[static_cast<std::size_t>(d)];
     // Dead tiles at the very end go without a move, also those that an earlier removal left behind.
     std::int64_t last = tiles.size() - 1;
+    std::int64_t filled = -1; // the highest hole that has a tile coming, which is not there yet
     auto const dropDead = [&] {
-      while (last >= 0 && !tiles[last].valid()) --last;
+      while (last > filled && !tiles[last].valid()) --last;
     };
     dropDead();
     for (std::int64_t const hole : holes) {
       if (hole >= last) break;
       made.emplace_back(hole, last--);
+      filled = hole;
       dropDead();
     }
     std::vector<std::uint8_t> movedRoots(made.size());
@@ -186,6 +188,7 @@ template <class TraitsT> void Container<TraitsT>::permute(std::vector<std::int64
                     for (std::int64_t n = begin; n < end; ++n) {
                       TileType& t = tiles[n];
                       t.setIndex(n);
+                      if (!t.valid()) continue; // its links are old, and may lead nowhere
                       t.setParentIndex(d > 0 ? mapped(t.parentIndex(), d - 1) : t.parentIndex());
                       for (auto child = t.begin(); child != t.end(); ++child)
                         t.childIndex(*child) = mapped(t.childIndex(*child), d + 1);
