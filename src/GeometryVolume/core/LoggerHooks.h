@@ -13,6 +13,8 @@ class Base;
 struct LoggerHooks {
   void (*baseBuilt)(Base const*);
   void (*baseDestroyed)(Base const*);
+  void (*baseIncomplete)(Base const*);
+  void (*baseComplete)(Base const*);
   void (*pointerAllocated)(void const* block, Base const* owner);
   void (*pointerDeAllocated)(void const* block, Base const* owner);
   void (*pointerReAllocated)(void const* from, void const* to);
@@ -31,6 +33,31 @@ inline bool loggerDumpInProgress() {
   auto const* hooks = loggerHooks();
   return hooks && hooks->isDumpInProgress();
 }
+/// For classes whose memUse() follows pointers: between objectIncomplete() and objectComplete(), which may
+/// nest, a report that another thread writes does not ask the object for its size. A base class tells the
+/// first in its constructors; the class that completes it tells the second at the end of its constructors,
+/// and the first again at the beginning of its destructor.
+inline void objectIncomplete(Base const* base) {
+  if (auto const* hooks = loggerHooks()) hooks->baseIncomplete(base);
+}
+inline void objectComplete(Base const* base) {
+  if (auto const* hooks = loggerHooks()) hooks->baseComplete(base);
+}
+/// Both, around a change.
+class ObjectChange {
+public:
+  explicit ObjectChange(Base const* base)
+      : m_base(base) {
+    objectIncomplete(base);
+  }
+  ~ObjectChange() { objectComplete(m_base); }
+  ObjectChange(ObjectChange const&) = delete;
+  ObjectChange& operator=(ObjectChange const&) = delete;
+
+private:
+  Base const* m_base;
+};
+
 inline void pointerAllocated(void const* block, Base const* owner) {
   if (auto const* hooks = loggerHooks()) hooks->pointerAllocated(block, owner);
 }

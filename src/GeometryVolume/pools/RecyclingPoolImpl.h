@@ -102,8 +102,8 @@ protected:
 
   class CrossingLock;
 
-  /// The idle entry that serves a request of `n` best, null for none. Held by the caller it is no longer idle:
-  /// making room does not drop it.
+  /// The idle entry that serves a request of `n` best, null for none. Held by the caller it is no longer
+  /// idle: making room does not drop it.
   Entry bestFit(std::size_t store, std::uint64_t n, FunctionRef<void(Entry const&)> skipped) const;
   /// Moves the last entry of the store into the place of this one.
   void removeEntry(std::size_t store, Entry const& entry);
