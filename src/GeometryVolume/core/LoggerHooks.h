@@ -13,12 +13,13 @@ class Base;
 struct LoggerHooks {
   void (*baseBuilt)(Base const*);
   void (*baseDestroyed)(Base const*);
-  void (*baseIncomplete)(Base const*);
-  void (*baseComplete)(Base const*);
   void (*pointerAllocated)(void const* block, Base const* owner);
   void (*pointerDeAllocated)(void const* block, Base const* owner);
   void (*pointerReAllocated)(void const* from, void const* to);
   bool (*isDumpInProgress)();
+  /// May be null in a table of one's own.
+  void (*baseIncomplete)(Base const*) = nullptr;
+  void (*baseComplete)(Base const*) = nullptr;
 };
 
 namespace Internal {
@@ -38,10 +39,10 @@ inline bool loggerDumpInProgress() {
 /// first in its constructors; the class that completes it tells the second at the end of its constructors,
 /// and the first again at the beginning of its destructor.
 inline void objectIncomplete(Base const* base) {
-  if (auto const* hooks = loggerHooks()) hooks->baseIncomplete(base);
+  if (auto const* hooks = loggerHooks(); hooks && hooks->baseIncomplete) hooks->baseIncomplete(base);
 }
 inline void objectComplete(Base const* base) {
-  if (auto const* hooks = loggerHooks()) hooks->baseComplete(base);
+  if (auto const* hooks = loggerHooks(); hooks && hooks->baseComplete) hooks->baseComplete(base);
 }
 /// Both, around a change.
 class ObjectChange {

@@ -237,12 +237,12 @@ void hookPointerReAllocated(void const* from, void const* to) {
 
 constexpr LoggerHooks kHooks{&baseBuilt,
                              &baseDestroyed,
-                             &baseIncomplete,
-                             &baseComplete,
                              &hookPointerAllocated,
                              &hookPointerDeAllocated,
                              &hookPointerReAllocated,
-                             &BaseLogger::isDumpInProgress};
+                             &BaseLogger::isDumpInProgress,
+                             &baseIncomplete,
+                             &baseComplete};
 
 } // namespace
 
