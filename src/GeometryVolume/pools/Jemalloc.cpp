@@ -40,7 +40,7 @@ struct WorkerFlush {
 };
 
 /// How long the workers may leave the task lying.
-constexpr std::chrono::milliseconds kPatience(20);
+constexpr std::chrono::milliseconds kPatience(10);
 
 /// A cache can be flushed by its own thread only: spread one flush over each worker. Workers that all wait
 /// for a lock which the flushing thread holds never come for the task, so it does not wait for them for ever.
