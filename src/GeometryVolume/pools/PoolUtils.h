@@ -39,4 +39,14 @@ VLN_API Ostil::String cgroupPath();
 /// @threads Any thread; a call of getMemoryStats() that runs already keeps the old one.
 VLN_API void setCgroupPath(Ostil::String const& path);
 
+/// Narrows getMemoryStats() to what this process may have resident; 0, as at load, for no such limit. The
+/// pools then let go of idle memory before the process goes beyond it.
+/// @units Bytes.
+/// @threads Any thread.
+VLN_API void setProcessLimit(std::uint64_t bytes);
+VLN_API std::uint64_t processLimit();
+/// Memory of this process that is resident now; 0 when the system does not tell.
+/// @units Bytes.
+VLN_API std::uint64_t residentMemory();
+
 } // namespace VLN::TileTree3D::PoolUtils
