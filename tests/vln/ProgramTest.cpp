@@ -62,7 +62,7 @@ TEST_F(ProgramTest, TellsItsVersionAndItsUse) {
   EXPECT_EQ(std::count(version.out.begin(), version.out.end(), '\n'), 1);
   RunResult const help = vln({"--help"});
   EXPECT_EQ(help.code, 0);
-  for (char const* command : {"info", "slice", "make"}) {
+  for (char const* command : {"info", "slice", "make", "churn"}) {
     EXPECT_NE(help.out.find("\n  vln " + std::string(command) + " "), std::string::npos) << help.out;
     RunResult const one = vln({command, "--help"});
     EXPECT_EQ(one.code, 0);
