@@ -22,7 +22,7 @@ public:
     kType = 5
   };
 
-  Any() = default;
+  Any() noexcept {}
   template <class T>
   requires(!std::is_same_v<std::decay_t<T>, Any> && std::is_copy_constructible_v<std::decay_t<T>>)
       Any(T&& value) {
@@ -72,6 +72,9 @@ public:
     Argument a{nullptr, asked};
     return static_cast<T*>(m_manager(Request::kAddressIfType, this, &a));
   }
+  /// Address of the held value, whatever its type; null when empty.
+  void const* address() const { return const_cast<Any*>(this)->address(); }
+  void* address() { return m_manager ? m_manager(Request::kAddress, this, nullptr) : nullptr; }
 
 private:
   struct Argument {
@@ -88,7 +91,7 @@ private:
   static constexpr bool kInside = sizeof(V) <= sizeof(Storage) &&
                                   alignof(V) <= alignof(Storage) && std::is_nothrow_move_constructible_v<V>;
 
-  template <class V> V* address() {
+  template <class V> V* held() {
     if constexpr (kInside<V>)
       return std::launder(reinterpret_cast<V*>(m_storage.bytes));
     else
@@ -96,7 +99,7 @@ private:
   }
 
   template <class V> static void* manage(Request request, Any* self, Argument* a) {
-    V* value = self->address<V>();
+    V* value = self->held<V>();
     switch (request) {
     case Request::kDestroy:
       if constexpr (kInside<V>)

@@ -54,6 +54,8 @@ public:
   void clone(void const* held, void*& outObject, ControlBlock*& outBlock) const override {
     if constexpr (std::is_copy_constructible_v<T>) {
       auto* copy = new InplaceBlock(m_object);
+      // A class whose copies share parts with their source says here how a clone becomes independent.
+      if constexpr (requires(T & object) { object.separateClone(); }) copy->object()->separateClone();
       auto const offset = static_cast<char const*>(held) - reinterpret_cast<char const*>(&m_object);
       outObject = reinterpret_cast<char*>(copy->object()) + offset;
       outBlock = copy;
@@ -160,6 +162,14 @@ public:
     void* object = nullptr;
     shared.block()->clone(shared.get(), object, m_block);
     m_object = static_cast<T*>(object);
+  }
+  /// A handle on an object that `shared`'s other owners keep: the one exception to sole ownership, for makers that
+  /// have just stored what they made.
+  static MutablePtr shareWith(Ptr<T> shared) {
+    MutablePtr handle;
+    handle.m_object = shared.get(), handle.m_block = shared.block();
+    shared.forget();
+    return handle;
   }
   MutablePtr(MutablePtr&& other) noexcept
       : m_object(std::exchange(other.m_object, nullptr))

@@ -9,13 +9,21 @@ class Object::WriteAccess {
 public:
   explicit WriteAccess(Object& handle)
       : m_handle(handle)
-      , m_object(std::move(handle.m_object)) {}
+      , m_object(takeAlone(handle.m_object)) {}
   ~WriteAccess() { m_handle.m_object = std::move(m_object); }
   WriteAccess(WriteAccess const&) = delete;
   WriteAccess& operator=(WriteAccess const&) = delete;
   Velorn::Object* operator->() const { return m_object.get(); }
 
 private:
+  /// Leaves the handle whole when the clone throws.
+  static Ostil::MutablePtr<Velorn::Object> takeAlone(Ostil::Ptr<Velorn::Object>& shared) {
+    if (shared.unique()) return Ostil::MutablePtr<Velorn::Object>(std::move(shared));
+    Ostil::MutablePtr<Velorn::Object> own{Ostil::Ptr<Velorn::Object>(shared)};
+    shared.reset();
+    return own;
+  }
+
   Object& m_handle;
   Ostil::MutablePtr<Velorn::Object> m_object;
 };
@@ -67,7 +75,8 @@ void Object::removeComponent(Ostil::String const& name, Component*) {
 
 Ostil::Array<Ostil::String> Object::componentRange() const {
   Ostil::Array<Ostil::String> names;
-  for (auto const& key : *keys()) {
+  auto const all = keys(); // held: a range-for does not keep the pointer behind its range alive
+  for (auto const& key : *all) {
     if (component(key)) names.append(key);
   }
   return names;

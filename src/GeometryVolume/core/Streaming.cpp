@@ -20,7 +20,9 @@ long& indent(std::ostream& os) { return os.iword(slots().indent); }
 } // namespace
 
 Ostil::String pad(std::ostream& os) {
-  long const spaces = indent(os) * os.iword(slots().padWidth);
+  // Read one after the other: a look at a further slot may move the storage of all.
+  long const levels = indent(os);
+  long const spaces = levels * os.iword(slots().padWidth);
   return Ostil::String(static_cast<std::size_t>(std::max(0L, spaces)), ' ');
 }
 

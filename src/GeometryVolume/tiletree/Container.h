@@ -231,7 +231,11 @@ protected:
   TreeIndex tileIndex(int i, int j, int k, int depth) const;
   TileType const& tile(int i, int j, int k, int depth) const;
   /// Follows child slots from a tile towards a point of the domain until `depth` or an empty slot.
-  TreeIndex descend(TreeIndex at, int i, int j, int k, int depth) const;
+  /// With `path`, the index of each tile below the first is kept under its depth.
+  TreeIndex descend(TreeIndex at, int i, int j, int k, int depth, std::int64_t* path = nullptr) const;
+  /// Where a search begins: the tile of the acceleration grid, or the root, that holds the point at or above
+  /// `depth`; invalid when there is none.
+  TreeIndex entry(int i, int j, int k, int depth) const;
 
   // Change. Tiles are named by index, since growth moves the records.
   TileType& editTile(TreeIndex const& at) { return m_data->editTiles(at.depth)[at.index]; }

@@ -89,7 +89,7 @@ void ContainerData<TraitsT>::memUse(std::uint64_t& used, std::uint64_t& allocate
   allocated += m_threadLocalCounts.size() * kBookkeepingEntry;
 }
 
-#define VLN_INSTANTIATE(TraitsT) template struct ContainerData<TraitsT>;
+#define VLN_INSTANTIATE(TraitsT) template struct VLN_API ContainerData<TraitsT>;
 VLN_FOR_EACH_SHAPE(VLN_INSTANTIATE)
 
 } // namespace VLN::TileTree3D

@@ -22,7 +22,7 @@ template <class TraitsT> class Container;
 template <class TraitsT> struct TileHalo;
 struct CompressedTileHalo;
 
-template <class TraitsT> struct ContainerData {
+template <class TraitsT> struct VLN_API ContainerData {
   static constexpr int kMaxDepth = TraitsT::kMaxDepth;
   static constexpr int kDepths = TraitsT::kDepths;
 

@@ -37,6 +37,13 @@ template <class TraitsT>
 std::vector<std::int64_t>
 Container<TraitsT>::findMissing(std::int64_t count, int depth,
                                 FunctionRef<int3 const*(std::int64_t)> cornerAt) const {
+  if (tileCount(depth) == 0) {
+    std::vector<std::int64_t> all;
+    for (std::int64_t n = 0; n < count; ++n) {
+      if (cornerAt(n)) all.push_back(n);
+    }
+    return all;
+  }
   std::vector<std::vector<std::int64_t>> parts(static_cast<std::size_t>(
       count >= Internal::kParallelTiles ? chunkCount(0, count, Internal::kRefineGrain) : 1));
   Internal::refinePass(count, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
@@ -44,8 +51,8 @@ Container<TraitsT>::findMissing(std::int64_t count, int depth,
     for (std::int64_t n = begin; n < end; ++n) {
       int3 const* corner = cornerAt(n);
       if (!corner) continue;
-      TileType const& found = accessor.tile(*corner, depth, false);
-      if (!found.valid() || found.depth() != depth) parts[static_cast<std::size_t>(chunk)].push_back(n);
+      if (accessor.treeIndex(corner->x, corner->y, corner->z, depth, false).depth != depth)
+        parts[static_cast<std::size_t>(chunk)].push_back(n);
     }
   });
   // Chunks are consecutive, so that the joined list is in the order of the serial pass.

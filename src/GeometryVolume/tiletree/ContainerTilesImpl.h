@@ -29,7 +29,8 @@ auto Container<TraitsT>::tile(int i, int j, int k, int depth) const -> TileType 
 }
 
 template <class TraitsT>
-TreeIndex Container<TraitsT>::descend(TreeIndex at, int i, int j, int k, int depth) const {
+TreeIndex Container<TraitsT>::descend(TreeIndex at, int i, int j, int k, int depth,
+                                      std::int64_t* path) const {
   std::uint32_t const ui = TraitsT::offset(i), uj = TraitsT::offset(j), uk = TraitsT::offset(k);
   depth = std::min(depth, kMaxDepth);
   while (at.depth < depth) {
@@ -48,11 +49,17 @@ TreeIndex Container<TraitsT>::descend(TreeIndex at, int i, int j, int k, int dep
     std::int64_t const child = m_data->tiles(d)[at.index].childIndex(slot);
     if (child < 0) break;
     at = {child, c};
+    if (path) path[c] = child;
   }
   return at;
 }
 
 template <class TraitsT> TreeIndex Container<TraitsT>::tileIndex(int i, int j, int k, int depth) const {
+  TreeIndex const at = entry(i, j, k, depth);
+  return at.valid() ? descend(at, i, j, k, depth) : at;
+}
+
+template <class TraitsT> TreeIndex Container<TraitsT>::entry(int i, int j, int k, int depth) const {
   Data const& data = *m_data;
   if (depth < 0) return {};
   if (data.m_gridDepth >= 0 && depth >= data.m_gridDepth) {
@@ -72,7 +79,7 @@ template <class TraitsT> TreeIndex Container<TraitsT>::tileIndex(int i, int j, i
       std::int64_t const nx = data.m_gridSize[0], ny = data.m_gridSize[1];
       std::int64_t const at = (cell(k, o.z) * ny + cell(j, o.y)) * nx + cell(i, o.x);
       std::int64_t const index = data.m_gridTable[static_cast<std::size_t>(at)];
-      if (index >= 0) return descend({index, d}, i, j, k, depth);
+      if (index >= 0) return {index, d};
     }
   }
   if (!TraitsT::inDomain(i, j, k)) return {};
@@ -80,7 +87,7 @@ template <class TraitsT> TreeIndex Container<TraitsT>::tileIndex(int i, int j, i
     if (data.m_rootCounts[static_cast<std::size_t>(d)] == 0) continue;
     auto const found =
         data.m_roots.find({TraitsT::align(i, d), TraitsT::align(j, d), TraitsT::align(k, d), d});
-    if (found != data.m_roots.end()) return descend(found->second, i, j, k, depth);
+    if (found != data.m_roots.end()) return found->second;
   }
   return {};
 }
@@ -108,6 +115,7 @@ template <class TraitsT> void Container<TraitsT>::resize(std::int64_t n, int dep
 
 template <class TraitsT>
 void Container<TraitsT>::reallocateTile(std::int64_t dst, std::int64_t src, int depth) {
+  m_data->detachTiles();
   auto& tiles = m_data->editTiles(depth);
   tiles[dst] = tiles[src];
 }

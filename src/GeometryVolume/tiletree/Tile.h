@@ -245,11 +245,13 @@ public:
     int operator*() const { return m_slot; }
     TreeIndex treeIndex() const { return {m_table[m_slot], m_depth + 1}; }
     ChildIterator& operator++() {
+      if (!m_table) m_slot = kTileSize - 1; // a tile without a table has no occupied slot
       do ++m_slot;
       while (m_slot < kTileSize && m_table[m_slot] < 0);
       return *this;
     }
     ChildIterator& operator--() {
+      if (!m_table) m_slot = 0;
       do --m_slot;
       while (m_slot >= 0 && m_table[m_slot] < 0);
       return *this;

@@ -2,50 +2,85 @@
 
 #include "GeometryVolume/tiletree/NeighborSearch.h"
 
+#include <bit>
+
 namespace VLN::TileTree3D {
 
-template <class TraitsT>
-TreeIndex ConstTileAccessorOf<TraitsT>::findAncestor(int i, int j, int k, int depth) const {
-  auto const* table = m_container->neighborData();
-  TreeIndex at{m_index, m_depth};
-  while (at.depth >= 0) {
-    TileType const& t = m_container->tile(at);
-    auto const serves = [&](TreeIndex const& candidate) {
-      if (candidate.depth < 0 || candidate.depth > depth) return false;
-      TileType const& c = m_container->tile(candidate);
-      return c.valid() && c.contains(i, j, k);
-    };
-    if (serves(at)) return at;
-    if (table && t.valid()) {
-      int const w = t.tileVoxelWidth();
-      auto const side = [w](int c, int corner) {
-        return c < corner ? 0 : distance(c, corner) < std::uint32_t(w) ? 1 : 2;
-      };
-      auto const entry =
-          static_cast<std::size_t>(9 * side(i, t.ti()) + 3 * side(j, t.tj()) + side(k, t.tk()));
-      TreeIndex const next =
-          (*table)[static_cast<std::size_t>(at.depth)][static_cast<std::size_t>(at.index)][entry];
-      if (serves(next)) return next;
-    }
-    if (t.isRoot()) break;
-    at = t.parentTreeIndex();
-  }
-  return {};
+namespace {
+/// Bits of an offset in the power-of-two shape's domain.
+constexpr int kDomainBits = 30;
+static_assert(PowerOfTwoTraits::kDomainWidth == 1 << kDomainBits);
+} // namespace
+
+template <class TraitsT> auto ConstTileAccessorOf<TraitsT>::invalidTile() const -> TileType const& {
+  static TileType const none;
+  return m_container ? m_container->invalidTile() : none;
 }
 
 template <class TraitsT>
-template <bool Exact>
-auto ConstTileAccessorOf<TraitsT>::tileImpl(int i, int j, int k, int depth) const -> TileType const& {
-  if (!m_container) {
-    static TileType const none;
-    return none;
+TreeIndex ConstTileAccessorOf<TraitsT>::findNear(int i, int j, int k, int depth) const {
+  if (m_depth < 0) return {};
+  if (auto const* table = m_container->neighborData()) {
+    auto const w = static_cast<std::uint32_t>(TraitsT::width(m_depth));
+    auto const side = [w](int c, int corner) { return c < corner ? 0 : distance(c, corner) < w ? 1 : 2; };
+    auto const entry =
+        static_cast<std::size_t>(9 * side(i, m_corner.x) + 3 * side(j, m_corner.y) + side(k, m_corner.z));
+    TreeIndex const next =
+        (*table)[static_cast<std::size_t>(m_depth)][static_cast<std::size_t>(m_index)][entry];
+    if (next.depth >= 0 && next.depth <= depth && m_container->tile(next).contains(i, j, k)) {
+      moveTo(m_container->tile(next));
+      return next;
+    }
   }
-  if (depth < 0 || !TraitsT::inDomain(i, j, k)) return m_container->invalidTile();
-  TreeIndex at = findAncestor(i, j, k, depth);
-  at = at.valid() ? m_container->descend(at, i, j, k, depth) : m_container->tileIndex(i, j, k, depth);
-  if (!at.valid()) return m_container->invalidTile();
-  TileType const& found = moveTo(m_container->tile(at));
-  return Exact && at.depth != depth ? m_container->invalidTile() : found;
+  // The deepest depth at which the cursor's corner and the point lie in one tile.
+  int common = std::min(m_depth, depth);
+  if constexpr (TraitsT::kTW == 2) {
+    std::uint32_t const bits = (TraitsT::offset(i) ^ TraitsT::offset(m_corner.x)) |
+                               (TraitsT::offset(j) ^ TraitsT::offset(m_corner.y)) |
+                               (TraitsT::offset(k) ^ TraitsT::offset(m_corner.z));
+    common = std::min(common, kDomainBits - static_cast<int>(std::bit_width(bits)));
+  } else {
+    auto const shares = [&](int d) {
+      return TraitsT::quotient(TraitsT::offset(i), d) == TraitsT::quotient(TraitsT::offset(m_corner.x), d) &&
+             TraitsT::quotient(TraitsT::offset(j), d) == TraitsT::quotient(TraitsT::offset(m_corner.y), d) &&
+             TraitsT::quotient(TraitsT::offset(k), d) == TraitsT::quotient(TraitsT::offset(m_corner.z), d);
+    };
+    while (common > 0 && !shares(common)) --common;
+  }
+  if (common < m_pathTop) {
+    // Above the known path: the acceleration grid is the shorter way in; else complete the path upwards.
+    if (m_container->m_data->m_gridDepth >= 0 && depth >= m_container->m_data->m_gridDepth) return {};
+    while (m_pathTop > common) {
+      std::int64_t const parent =
+          m_container->tile(m_path[static_cast<std::size_t>(m_pathTop)], m_pathTop).parentIndex();
+      if (parent < 0) return {};
+      m_path[static_cast<std::size_t>(--m_pathTop)] = parent;
+    }
+  }
+  return {m_path[static_cast<std::size_t>(common)], common};
+}
+
+template <class TraitsT>
+TreeIndex ConstTileAccessorOf<TraitsT>::descend(TreeIndex at, int i, int j, int k, int depth) const {
+  if (at.depth < m_pathTop || m_depth < 0) m_pathTop = at.depth;
+  m_path[static_cast<std::size_t>(at.depth)] = at.index;
+  at = m_container->descend(at, i, j, k, depth, m_path.data());
+  m_depth = at.depth, m_index = at.index;
+  m_corner = {TraitsT::align(i, at.depth), TraitsT::align(j, at.depth), TraitsT::align(k, at.depth)};
+  return at;
+}
+
+template <class TraitsT>
+TreeIndex ConstTileAccessorOf<TraitsT>::find(int i, int j, int k, int depth, bool exact) const {
+  if (!m_container || depth < 0 || !TraitsT::inDomain(i, j, k)) return {};
+  TreeIndex at = findNear(i, j, k, std::min(depth, TraitsT::kMaxDepth));
+  if (!at.valid()) {
+    at = m_container->entry(i, j, k, depth);
+    if (!at.valid()) return {};
+    m_pathTop = at.depth;
+  }
+  at = descend(at, i, j, k, depth);
+  return exact && at.depth != depth ? TreeIndex{} : at;
 }
 
 template <class TraitsT>
@@ -94,15 +129,15 @@ auto TileAccessorOf<TraitsT>::addTile(int i, int j, int k, int depth) -> TileTyp
   ContainerT& tree = *m_mutableContainer;
   if (!TraitsT::isDepth(depth) || !TraitsT::inDomain(i, j, k)) return tree.invalidTile();
   if (depth == this->m_depth && this->holds(i, j, k)) return this->current();
-  TreeIndex at = this->findAncestor(i, j, k, depth);
+  TreeIndex at = this->findNear(i, j, k, depth);
   if (!at.valid()) return this->moveTo(tree.tile(tree.addTile(i, j, k, depth)));
-  at = tree.descend(at, i, j, k, depth);
+  at = this->descend(at, i, j, k, depth);
   if (at.depth != depth) {
     TreeIndex const made = tree.makeTile(i, j, k, depth);
     tree.insertChild(at, made);
-    at = made;
+    this->descend(at, i, j, k, depth);
   }
-  return this->moveTo(tree.tile(at));
+  return this->current();
 }
 
 template <class TraitsT>
@@ -172,11 +207,7 @@ void TileAccessorOf<TraitsT>::removeTiles(std::vector<std::int64_t> const& indic
 
 #define VLN_INSTANTIATE(TraitsT)                                                                             \
   template class VLN_API ConstTileAccessorOf<TraitsT>;                                                       \
-  template class VLN_API TileAccessorOf<TraitsT>;                                                            \
-  template VLN_API Tile<TraitsT, TraitsT::kTileSize> const& ConstTileAccessorOf<TraitsT>::tileImpl<true>(    \
-      int, int, int, int) const;                                                                             \
-  template VLN_API Tile<TraitsT, TraitsT::kTileSize> const& ConstTileAccessorOf<TraitsT>::tileImpl<false>(   \
-      int, int, int, int) const;
-VLN_FOR_EACH_SHAPE(VLN_INSTANTIATE)
+  template class VLN_API TileAccessorOf<TraitsT>;
+  VLN_FOR_EACH_SHAPE(VLN_INSTANTIATE)
 
 } // namespace VLN::TileTree3D

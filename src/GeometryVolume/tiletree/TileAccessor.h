@@ -16,7 +16,8 @@ public:
   using ContainerT = Container<TraitsT>;
   using TileType = typename ContainerT::TileType;
 
-  ConstTileAccessorOf() = default;
+  ConstTileAccessorOf()
+      : m_path{} {}
   ConstTileAccessorOf(ConstTileAccessorOf const&) = default;
   ConstTileAccessorOf& operator=(ConstTileAccessorOf const&) = default;
   virtual ~ConstTileAccessorOf() = default;
@@ -27,11 +28,11 @@ public:
   /// The tile at `depth` that holds the point; with `exact` false the deepest tile at or above `depth`.
   /// @edges The invalid tile when there is none, and for points out of the domain. Depths deeper than the
   /// shape's last hold no tiles.
-  /// @cost A hit on the cursor's tile costs one unsigned test an axis; other lookups walk up to a common
-  /// ancestor.
+  /// @cost A hit on the cursor's tile costs one unsigned test an axis; other lookups begin at the deepest
+  /// known ancestor that holds the point, without walking up to it.
   TileType const& tile(int i, int j, int k, int depth, bool exact) const {
-    if (depth >= 0 && depth == m_depth && holds(i, j, k)) return current();
-    return exact ? tileImpl<true>(i, j, k, depth) : tileImpl<false>(i, j, k, depth);
+    TreeIndex const at = treeIndex(i, j, k, depth, exact);
+    return at.depth >= 0 ? m_container->tile(at) : invalidTile();
   }
   TileType const& tile(int3 const& p, int depth, bool exact) const {
     return tile(p.x, p.y, p.z, depth, exact);
@@ -40,8 +41,10 @@ public:
     return tile(at.i, at.j, at.k, at.depth, exact);
   }
   /// Index of the tile that tile() finds; invalid when there is none.
+  /// @cost As tile(), without touching the tile's record.
   TreeIndex treeIndex(int i, int j, int k, int depth, bool exact) const {
-    return tile(i, j, k, depth, exact).treeIndex();
+    if (depth == m_depth && holds(i, j, k)) return {m_index, m_depth};
+    return find(i, j, k, depth, exact);
   }
 
   // Access by index; the cursor stays
@@ -51,7 +54,7 @@ public:
 
   /// The tile found last; the invalid tile of a fresh accessor.
   TileType const& current() const {
-    return m_depth >= 0 ? m_container->tile(m_index, m_depth) : m_container->invalidTile();
+    return m_depth >= 0 ? m_container->tile(m_index, m_depth) : invalidTile();
   }
 
   // Neighbours
@@ -85,8 +88,8 @@ protected:
   explicit ConstTileAccessorOf(ContainerT const& container)
       : m_container(&container) {}
 
-  /// The search behind a miss of the cursor.
-  template <bool Exact> TileType const& tileImpl(int i, int j, int k, int depth) const;
+  /// The search behind a miss of the cursor; moves the cursor to the deepest tile that it reaches.
+  TreeIndex find(int i, int j, int k, int depth, bool exact) const;
   /// Appends the live tiles of a depth range.
   void tiles(std::vector<TreeIndex>& list, int minDepth, int maxDepth) const;
 
@@ -97,19 +100,30 @@ protected:
   static std::uint32_t distance(int c, int corner) {
     return static_cast<std::uint32_t>(c) - static_cast<std::uint32_t>(corner);
   }
+  TileType const& invalidTile() const;
+  /// Puts the cursor on a tile whose ancestors are not known.
   TileType const& moveTo(TileType const& t) const {
-    m_corner = t.tijk(), m_depth = t.depth(), m_index = t.index();
+    m_corner = t.tijk(), m_depth = m_pathTop = t.depth(), m_index = t.index();
+    if (m_depth >= 0) m_path[static_cast<std::size_t>(m_depth)] = m_index;
     return t;
   }
-  void resetCursor() const { m_corner = {0, 0, 0}, m_depth = -1, m_index = -1; }
-  /// The start of the walk: from the cursor to a tile at or above `depth` that holds the point; invalid when
-  /// the walk leaves the tree.
-  TreeIndex findAncestor(int i, int j, int k, int depth) const;
+  void resetCursor() const { m_corner = {0, 0, 0}, m_depth = m_pathTop = kNoDepth, m_index = -1; }
+  /// A tile at or above `depth` that holds the point, from the cursor's neighbours or its path; invalid when
+  /// the way leads over the tree's entry. What the path keeps is then still right for the tile returned.
+  TreeIndex findNear(int i, int j, int k, int depth) const;
+  /// Follows child slots from a tile, keeps the path, and puts the cursor on the last tile.
+  TreeIndex descend(TreeIndex at, int i, int j, int k, int depth) const;
+
+  /// Depth of a cursor without a tile. Asked for, it "hits" and gives the invalid index, which is the answer.
+  static constexpr std::int32_t kNoDepth = -1;
 
   ContainerT const* m_container = nullptr;
   mutable int3 m_corner{0, 0, 0};
-  mutable std::int32_t m_depth = -1; // none; negative depths never match
+  mutable std::int32_t m_depth = kNoDepth;
   mutable std::int64_t m_index = -1;
+  /// Indices of the cursor's tile and its ancestors, known from depth m_pathTop on.
+  mutable std::int32_t m_pathTop = kNoDepth;
+  mutable std::array<std::int64_t, static_cast<std::size_t>(TraitsT::kDepths)> m_path;
 };
 
 /// Adds tiles as well.

@@ -1,0 +1,113 @@
+// Channel<Traits, T, E, H>: one named field over a tile tree, a tile of elements for each tile of the tree.
+//
+//   Traits         (E,H)                     kExtended
+//   <2,4,0,1>      (4,0) (4,1) (4,2)         0
+//                  (5,0)                     1: one more sample on the far side of each axis
+//   <5,5,0,1>      (5,0) (5,1) (5,2)         0
+//                  (6,0)                     1
+//
+// Each combination exists for the 18 element types. Channels with E of the tree's tile data width and no halo
+// follow the counts of the component they are updated from, and so may hold points; the others have kSize
+// elements in every tile.
+#pragma once
+
+#include "GeometryVolume/channels/TileData.h"
+#include "GeometryVolume/channels/TypedChannel.h"
+#include "GeometryVolume/tiletree/Tile.h"
+
+#include <utility>
+
+namespace VLN::TileTree3D {
+
+template <class TraitsT, class T, int E, int H> class VLN_API Channel : public TypedChannel<T> {
+  using Base = TypedChannel<T>;
+
+public:
+  using Traits = TraitsT;
+  using value_type = T;
+  using ConstTile = ConstTileData<T, E, H>;
+  using WritableTile = TileData<T, E, H>;
+  using TileDataElementAccessor = TileTree3D::TileDataElementAccessor;
+
+  static constexpr int kExtended = E - TraitsT::kTileDataWidth;
+  static constexpr int kHalo = H;
+  static constexpr int kSize = ConstTile::kSize;
+  static constexpr ChannelLayout kLayout{E, H, kExtended, TraitsT::kTileDataWidth, kSize, TraitsT::kMaxDepth};
+  static_assert((kExtended == 0 && H >= 0 && H <= 2) || (kExtended == 1 && H == 0), "no such channel");
+
+  /// What channels that were assigned to each other share.
+  class Data : public ChannelData<T> {
+  public:
+    Data()
+        : ChannelData<T>(kLayout) {}
+    Data(T const* defaultValue, DataElementInitializerType initializer, bool useStaticAllocation,
+         bool callElementConstructor, int minDepth, int depth)
+        : ChannelData<T>(kLayout, defaultValue, initializer, useStaticAllocation, callElementConstructor,
+                         minDepth, depth) {}
+    Data(Data const&) = default;
+
+    WritableTile tileData(TreeIndex const& tile) { return WritableTile(&this->vector(tile)); }
+    ConstTile tileData(TreeIndex const& tile) const { return ConstTile(&this->vector(tile)); }
+    WritableTile tileData(std::int64_t flat) { return tileData(this->indexToTreeIndex(flat)); }
+    ConstTile tileData(std::int64_t flat) const { return tileData(this->indexToTreeIndex(flat)); }
+  };
+
+  /// A channel without tiles. An empty name becomes Const::TileTreeChannelName, a null default value zero.
+  /// With static allocation, the tiles of one update lie in one block.
+  Channel(Ostil::String const& name, T const* defaultValue, DataElementInitializerType initializer,
+          bool useStaticAllocation, bool callElementConstructor, int minDepth, int depth);
+  Channel(Channel const& other);
+  Channel& operator=(Channel const& other);
+  ~Channel() override;
+
+  /// A deep copy, as a new channel.
+  void copyTo(Ostil::Ptr<VLN::Component>& target) const override;
+
+  // Elements, unchecked. The forms that may write need a channel that shares nothing.
+  T& operator[](ElementTreeIndex const& e) { return element(this->tileVector(e), e.element); }
+  T const& operator[](ElementTreeIndex const& e) const { return element(this->tileVector(e), e.element); }
+  T& operator[](VoxelTreeIndex const& v) { return element(this->tileVector(v), ConstTile::index(v.ijk)); }
+  T const& operator[](VoxelTreeIndex const& v) const {
+    return element(this->tileVector(v), ConstTile::index(v.ijk));
+  }
+  /// By flat tile index * kSize + position: for channels that hold kSize elements in every tile.
+  T& operator[](std::int64_t flat) {
+    return element(this->tileVector(this->indexToTreeIndex(flat / kSize)), static_cast<int>(flat % kSize));
+  }
+  T const& operator[](std::int64_t flat) const {
+    return element(this->tileVector(this->indexToTreeIndex(flat / kSize)), static_cast<int>(flat % kSize));
+  }
+  template <int N> T& operator()(Tile<TraitsT, N> const& tile, int3 const& ijk) {
+    return element(this->tileVector(tile.treeIndex()), ConstTile::index(ijk));
+  }
+  template <int N> T const& operator()(Tile<TraitsT, N> const& tile, int3 const& ijk) const {
+    return element(this->tileVector(tile.treeIndex()), ConstTile::index(ijk));
+  }
+
+  // Tiles, as views
+  WritableTile tileData(TreeIndex const& tile) { return WritableTile(&this->tileVector(tile)); }
+  ConstTile tileData(TreeIndex const& tile) const { return ConstTile(&this->tileVector(tile)); }
+  WritableTile tileData(std::int64_t flat) { return tileData(this->indexToTreeIndex(flat)); }
+  ConstTile tileData(std::int64_t flat) const { return tileData(this->indexToTreeIndex(flat)); }
+  WritableTile tileData(std::int64_t index, int depth) { return tileData(TreeIndex{index, depth}); }
+  ConstTile tileData(std::int64_t index, int depth) const { return tileData(TreeIndex{index, depth}); }
+
+protected:
+  Ostil::Ptr<Data> getData() const { return Ostil::staticCast<Data>(this->m_data); }
+
+private:
+  template <class Vector> static auto& element(Vector& v, int at) { return v[static_cast<std::size_t>(at)]; }
+};
+
+} // namespace VLN::TileTree3D
+
+/// Expands X(traits, type, E, H) for the eight channel classes of an element type.
+#define VLN_FOR_EACH_CHANNEL_OF(type, X)                                                                     \
+  X(::VLN::TileTree3D::PowerOfTwoTraits, type, 4, 0)                                                         \
+  X(::VLN::TileTree3D::PowerOfTwoTraits, type, 4, 1)                                                         \
+  X(::VLN::TileTree3D::PowerOfTwoTraits, type, 4, 2)                                                         \
+  X(::VLN::TileTree3D::PowerOfTwoTraits, type, 5, 0)                                                         \
+  X(::VLN::TileTree3D::OddTraits, type, 5, 0)                                                                \
+  X(::VLN::TileTree3D::OddTraits, type, 5, 1)                                                                \
+  X(::VLN::TileTree3D::OddTraits, type, 5, 2)                                                                \
+  X(::VLN::TileTree3D::OddTraits, type, 6, 0)

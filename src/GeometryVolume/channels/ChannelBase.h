@@ -1,0 +1,57 @@
+// ChannelBase: a channel without its element type, as objects and the update protocol handle it.
+#pragma once
+
+#include "GeometryVolume/channels/ChannelTypes.h"
+#include "Ostil/Any.h"
+#include "Ostil/Ptr.h"
+
+#include <typeindex>
+
+namespace VLN::TileTree3D {
+
+/// The order of the virtual operations is fixed; new ones go behind updateElements().
+class VLN_API ChannelBase : public Component {
+public:
+  using Component::Component;
+  ChannelBase() = default;
+  ChannelBase(ChannelBase const&) = default;
+  ChannelBase& operator=(ChannelBase const&) = default;
+  ~ChannelBase() override;
+
+  void memUse(std::uint64_t& used, std::uint64_t& allocated, bool notShared) const override;
+
+  /// Shallowest depth with storage.
+  virtual int minDepth() const = 0;
+  /// Deepest depth with storage.
+  virtual int depth() const = 0;
+  /// Moves the shallow end of the range: depths that leave it are dropped, new ones are filled from `source`.
+  virtual void setMinDepth(int minDepth, Component const& source) = 0;
+  /// Moves the deep end of the range.
+  virtual void setDepth(int depth, Component const& source) = 0;
+  /// Whether `type` holds the identity of the element type, a std::type_index, or a value of it.
+  virtual bool hasElementType(Ostil::Any const& type) const = 0;
+  /// All elements as plain arrays: kind 0 is one flat Array<T>, kind 3 an array of 29 depths of tiles.
+  /// @shape Kind 0: depth by depth, tile by tile, each tile whole with its halo. Kind 3: see NestedArrays.
+  /// @error A new empty Array<T> of this channel's type for another type or kind.
+  virtual Ostil::Ptr<void> channelData(unsigned int kind, Ostil::Any const& type) = 0;
+  /// The way back. Sizes must match those of the tiles; otherwise nothing happens.
+  virtual void setChannelData(unsigned int kind, Ostil::Any const& type, Ostil::Ptr<void> const& data) = 0;
+
+  // The update protocol: the container has changed, then its topologies were updated, now the channels
+  // follow.
+  virtual void updateTilesAdded(Component const& tree) = 0;
+  virtual void updateTilesRemoved(TileRemovalList const& removed, Component const& tree) = 0;
+  virtual void updateTilesPermuted(TilePermutation const& newToOld) = 0;
+  virtual void updateElements(ElementMoves const& moves, ElementOrder const& order,
+                              DestinationTiles const& tiles, ArrivalMap const& arrivals) = 0;
+
+  /// Identity of the element type.
+  virtual std::type_index elementType() const = 0;
+  virtual ChannelLayout layout() const = 0;
+  /// Sets every element of the listed tiles of one depth to the default value. Tiles that the channel lacks are
+  /// skipped.
+  /// @cost Parallel over the tiles.
+  virtual void fillTiles(int depth, std::vector<std::int64_t> const& tiles) = 0;
+};
+
+} // namespace VLN::TileTree3D

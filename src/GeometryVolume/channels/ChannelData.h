@@ -1,0 +1,197 @@
+// ChannelData<T>: storage of a channel, shared by the handles that were assigned to each other.
+//
+//   Channel ──Ptr──> ChannelData ──Ptr──> TileStorage ── depth 0: [tile][tile]...
+//   Channel ──Ptr──────^   |                             ...
+//                          └─ blocks behind static tiles depth 28: [tile]...
+//
+// A copied ChannelData shares the TileStorage of its source until one of the two is written. Blocks follow
+// the storage that lives in them: whoever leaves a storage that others still hold leaves its blocks there.
+#pragma once
+
+#include "GeometryVolume/channels/ChannelPlan.h"
+#include "GeometryVolume/channels/ChannelTypes.h"
+#include "GeometryVolume/core/Export.h"
+#include "GeometryVolume/core/FunctionRef.h"
+#include "GeometryVolume/pools/TileDataAllocator.h"
+#include "Ostil/Array.h"
+#include "Ostil/Ptr.h"
+
+#include <algorithm>
+#include <array>
+#include <cstdint>
+#include <vector>
+
+namespace VLN::TileTree3D {
+
+/// Element vectors by depth and tile. Both tree shapes have 29 depths here.
+template <class T> using TileArrays = std::array<std::vector<TileVector<T>>, kChannelDepths>;
+
+template <class T> class TileStorage : public TileArrays<T> {
+public:
+  TileStorage() = default;
+  TileStorage(TileStorage const&) = delete;
+  TileStorage& operator=(TileStorage const&) = delete;
+  ~TileStorage() { Internal::freeBlocks(m_blocks); }
+
+  /// Keeps blocks that static tiles of this storage lie in, for a holder that leaves.
+  void adopt(std::vector<void*>& blocks) { Internal::handOverBlocks(m_blocks, blocks); }
+  /// Takes over the blocks of a storage whose tiles move here.
+  void adoptAll(TileStorage& from) { adopt(from.m_blocks); }
+
+private:
+  std::vector<void*> m_blocks;
+};
+
+/// Nested export: by depth, by tile, the tile's elements. Depths outside the channel's range are null.
+template <class T> using NestedArrays = Ostil::Array<Ostil::Ptr<Ostil::Array<Ostil::Ptr<Ostil::Array<T>>>>>;
+
+/// @threads As a channel: concurrent readers, or one writer.
+template <class T> class VLN_API ChannelData {
+public:
+  using Vector = TileVector<T>;
+
+  /// Without storage.
+  explicit ChannelData(ChannelLayout const& layout);
+  /// With storage for no tiles. A null default value stands for zero.
+  ChannelData(ChannelLayout const& layout, T const* defaultValue, DataElementInitializerType initializer,
+              bool useStaticAllocation, bool callElementConstructor, int minDepth, int depth);
+  /// Shares the storage in constant time. Blocks stay with the source, and the flags take their defaults.
+  ChannelData(ChannelData const& b);
+  ChannelData& operator=(ChannelData const&) = delete;
+  ~ChannelData();
+
+  // Settings
+  ChannelLayout const& layout() const { return m_layout; }
+  T const& defaultValue() const { return m_defaultValue; }
+  void setDefaultValue(T const* value) { m_defaultValue = value ? *value : T{}; }
+  DataElementInitializerType initializer() const { return m_initializer; }
+  void setInitializer(DataElementInitializerType v) { m_initializer = v; }
+  bool useStaticAllocation() const { return m_useStaticAllocation; }
+  bool callElementConstructor() const { return m_callElementConstructor; }
+  /// Whether element construction has ever been off.
+  bool rawCopy() const { return m_rawCopy; }
+  void setCallElementConstructor(bool b) {
+    m_callElementConstructor = b;
+    if (!b) m_rawCopy = true;
+  }
+  bool allocateEmptyTileData() const { return m_allocateEmptyTileData; }
+  void setAllocateEmptyTileData(bool b) { m_allocateEmptyTileData = b; }
+  int minDepth() const { return m_minDepth; }
+  int depth() const { return m_depth; }
+  void setMinDepth(int d) { m_minDepth = d; }
+  void setDepth(int d) { m_depth = d; }
+
+  // Counts
+  std::int64_t tileCount(int depth) const;
+  std::int64_t elementCount(int depth) const;
+  int elementCount(TreeIndex const& tile) const { return static_cast<int>(vector(tile).size()); }
+  std::int64_t treeIndexToIndex(TreeIndex const& tile) const {
+    std::int64_t flat = tile.index;
+    for (int d = 0; d < tile.depth; ++d) flat += m_tileCounts[static_cast<std::size_t>(d)];
+    return flat;
+  }
+  TreeIndex indexToTreeIndex(std::int64_t flat) const {
+    int d = 0;
+    for (; d < kChannelDepths - 1 && flat >= m_tileCounts[static_cast<std::size_t>(d)]; ++d)
+      flat -= m_tileCounts[static_cast<std::size_t>(d)];
+    return {flat, d};
+  }
+
+  // Access
+  TileArrays<T>* dataPtr() const { return m_data.get(); }
+  Ostil::Ptr<TileStorage<T>> const& storage() const { return m_data; }
+  Vector& vector(TreeIndex const& tile) const {
+    return (*m_data)[static_cast<std::size_t>(tile.depth)][static_cast<std::size_t>(tile.index)];
+  }
+  bool storageIsShared() const { return m_data && !m_data.unique(); }
+
+  // Copying
+  /// Makes this the only holder of its storage.
+  void cloneData();
+  /// Takes over range, counts and tiles of `source`, in storage of its own.
+  void deepCopy(ChannelData const& source);
+  /// Brings all capacities down to the sizes.
+  void compactStorage();
+
+  // Blocks
+  std::vector<void*> const& allocations() const { return m_allocations; }
+  void freeAndClearAllocations() { Internal::freeBlocks(m_allocations); }
+
+  // Updates; each separates the storage first when it changes anything.
+  /// Grows and shrinks every depth of the range to the tile counts of `source`.
+  /// @return false when a static block could not be allocated; nothing has changed then.
+  bool resizeTiles(Internal::TileCounts const& source);
+  /// Applies a compaction of tiles. Sources that lie at or beyond `kept(depth)` are about to be dropped.
+  void moveTiles(TileRemovalList const& removed, FunctionRef<std::int64_t(int depth)> kept);
+  /// Puts the tiles in a new order, in new storage.
+  /// @return false when there was nothing to do or no memory for a static block.
+  bool permuteTiles(TilePermutation const& newToOld);
+  void removeDepths(int first, int last);
+  bool resizeDepth(int depth, std::int64_t tileCount, int elementCount);
+  /// Grows tiles that hold fewer elements than `source` says.
+  void growElements(Internal::TileCounts const& source);
+  /// Grows the destination tiles of one depth by what arrives there.
+  void allocateElements(std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals,
+                        std::size_t moveCount, int depth);
+  /// Writes the arrivals of one depth behind the elements that its tiles had.
+  /// @pre allocateElements() was called for the depth.
+  void copyElements(std::vector<ElementToFrom> const& moves, std::vector<std::uint64_t> const& order,
+                    std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals, int depth);
+  /// Removes elements, filling the holes from each tile's tail.
+  /// @pre Sorted by tile and element.
+  void removeElements(std::vector<ElementInTile> const& elements, int depth);
+
+  // Plain arrays
+  Ostil::Ptr<Ostil::Array<T>> exportFlat() const;
+  Ostil::Ptr<NestedArrays<T>> exportNested() const;
+  void importFlat(Ostil::Array<T> const& values);
+  void importNested(NestedArrays<T> const& values);
+
+  void memUse(std::uint64_t& used, std::uint64_t& allocated) const;
+
+private:
+  using Spans = Internal::TileSpans;
+  using Counts = Internal::DepthCounts;
+  /// Gives the values for a tile of new storage.
+  using TileValues = FunctionRef<T const*(int depth, std::int64_t tile)>;
+
+  int firstDepth() const { return std::max(0, m_minDepth); }
+  int lastDepth() const { return std::min(kChannelDepths - 1, m_depth); }
+  std::int64_t& count(int d) { return m_tileCounts[static_cast<std::size_t>(d)]; }
+  std::int64_t count(int d) const { return m_tileCounts[static_cast<std::size_t>(d)]; }
+  std::vector<Vector>& depthTiles(int d) const { return (*m_data)[static_cast<std::size_t>(d)]; }
+  std::int64_t slotElements(std::size_t size) const;
+  std::size_t tileBytes() const { return static_cast<std::size_t>(m_layout.size) * sizeof(T); }
+  void sumCounts();
+  Spans allTiles() const;
+
+  /// A vector of `n` unwritten elements, in `slot` when that is not null.
+  Vector unwrittenTile(std::int64_t n, T* slot) const;
+  /// A new tile as the flags ask for.
+  Vector newTile(std::int64_t n, T* slot) const;
+  /// Leaves the storage, and its blocks to whoever still holds it; then holds `fresh` and `block`.
+  void replaceStorage(Ostil::Ptr<TileStorage<T>> fresh, void* block);
+  /// New storage with the tiles of `source`, their values taken from `values`. Leaves out [skipFirst,
+  /// skipLast].
+  void rebuild(TileArrays<T> const& source, Counts const& counts, TileValues values, int skipFirst,
+               int skipLast);
+  void separateWithout(int skipFirst, int skipLast);
+  void importValues(TileValues values);
+  std::vector<std::vector<std::int64_t>> tileOffsets() const;
+
+  T m_defaultValue{};
+  DataElementInitializerType m_initializer = kInitializeDefaultValue;
+  Ostil::Ptr<TileStorage<T>> m_data;
+  std::vector<void*> m_allocations;
+  bool m_useStaticAllocation = false;
+  bool m_callElementConstructor = true;
+  bool m_rawCopy = false;
+  bool m_allocateEmptyTileData = false;
+  std::int32_t m_minDepth = 0;
+  std::int32_t m_depth = kChannelDepths - 1;
+  Counts m_tileCounts{};
+  std::int64_t m_tileCountTotal = 0;
+  ChannelLayout m_layout;
+};
+
+} // namespace VLN::TileTree3D

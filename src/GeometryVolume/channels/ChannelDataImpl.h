@@ -1,0 +1,219 @@
+// Definitions of ChannelData: storage, copying, accounting. Only the generated sources include this.
+#pragma once
+
+#include "GeometryVolume/channels/ChannelData.h"
+#include "GeometryVolume/core/Parallel.h"
+
+#include <algorithm>
+#include <cstring>
+#include <iostream>
+#include <iterator>
+#include <utility>
+
+namespace VLN::TileTree3D {
+
+template <class T>
+ChannelData<T>::ChannelData(ChannelLayout const& layout)
+    : m_layout(layout) {}
+
+template <class T>
+ChannelData<T>::ChannelData(ChannelLayout const& layout, T const* defaultValue,
+                            DataElementInitializerType initializer, bool useStaticAllocation,
+                            bool callElementConstructor, int minDepth, int depth)
+    : m_defaultValue(defaultValue ? *defaultValue : T{})
+    , m_initializer(initializer)
+    , m_data(Ostil::makePtr<TileStorage<T>>())
+    , m_useStaticAllocation(useStaticAllocation)
+    , m_callElementConstructor(callElementConstructor)
+    , m_rawCopy(!callElementConstructor)
+    , m_minDepth(minDepth)
+    , m_depth(depth)
+    , m_layout(layout) {}
+
+template <class T>
+ChannelData<T>::ChannelData(ChannelData const& b)
+    : m_defaultValue(b.m_defaultValue)
+    , m_initializer(b.m_initializer)
+    , m_data(b.m_data)
+    , m_minDepth(b.m_minDepth)
+    , m_depth(b.m_depth)
+    , m_tileCounts(b.m_tileCounts)
+    , m_tileCountTotal(b.m_tileCountTotal)
+    , m_layout(b.m_layout) {}
+
+template <class T> ChannelData<T>::~ChannelData() { replaceStorage(nullptr, nullptr); }
+
+template <class T> std::int64_t ChannelData<T>::tileCount(int depth) const {
+  if (depth == -1) return m_tileCountTotal;
+  return depth >= 0 && depth < kChannelDepths ? count(depth) : 0;
+}
+
+template <class T> std::int64_t ChannelData<T>::elementCount(int depth) const {
+  if (!m_data || depth < -1 || depth >= kChannelDepths) return 0;
+  int const first = std::max(depth, 0), last = depth == -1 ? kChannelDepths - 1 : depth;
+  std::int64_t sum = 0;
+  for (int d = first; d <= last; ++d) {
+    auto const& tiles = depthTiles(d);
+    sum += parallelReduce(
+        0, static_cast<std::int64_t>(tiles.size()), 16384, std::int64_t(0),
+        [&](std::int64_t begin, std::int64_t end) {
+          std::int64_t part = 0;
+          for (auto i = begin; i < end; ++i) part += static_cast<std::int64_t>(tiles[std::size_t(i)].size());
+          return part;
+        },
+        [](std::int64_t a, std::int64_t b) { return a + b; });
+  }
+  return sum;
+}
+
+template <class T> void ChannelData<T>::sumCounts() {
+  m_tileCountTotal = 0;
+  for (int d = firstDepth(); d <= lastDepth(); ++d) m_tileCountTotal += count(d);
+}
+
+template <class T> Internal::TileSpans ChannelData<T>::allTiles() const {
+  Spans spans;
+  for (int d = firstDepth(); d <= lastDepth(); ++d) spans.add(d, 0, count(d));
+  return spans;
+}
+
+template <class T> std::int64_t ChannelData<T>::slotElements(std::size_t size) const {
+  return Internal::tileSlotStride(std::max<std::int64_t>(m_layout.size, static_cast<std::int64_t>(size)),
+                                  sizeof(T));
+}
+
+template <class T> TileVector<T> ChannelData<T>::unwrittenTile(std::int64_t n, T* slot) const {
+  using Allocator = TileDataAllocator<T>;
+  Vector raw(static_cast<std::size_t>(n), slot ? Allocator(slot, n, false) : Allocator(false));
+  // Only static tiles keep the flag: a tile that grows must carry its elements along.
+  Allocator const kept = raw.get_allocator().withConstruct(slot ? m_callElementConstructor : true);
+  return Vector(std::move(raw), kept);
+}
+
+template <class T> TileVector<T> ChannelData<T>::newTile(std::int64_t n, T* slot) const {
+  Vector tile = unwrittenTile(n, slot);
+  if (m_callElementConstructor) std::fill(tile.begin(), tile.end(), m_defaultValue);
+  return tile;
+}
+
+template <class T> void ChannelData<T>::replaceStorage(Ostil::Ptr<TileStorage<T>> fresh, void* block) {
+  if (storageIsShared())
+    m_data->adopt(m_allocations);
+  else
+    freeAndClearAllocations();
+  m_data = std::move(fresh);
+  if (block) m_allocations.push_back(block);
+}
+
+template <class T>
+void ChannelData<T>::rebuild(TileArrays<T> const& source, Counts const& counts, TileValues values,
+                             int skipFirst, int skipLast) {
+  auto const skipped = [&](int d) { return d >= skipFirst && d <= skipLast; };
+  // Slots of a static block, one after the other; the offset of each tile in elements.
+  std::vector<std::vector<std::int64_t>> offsets(kChannelDepths);
+  std::int64_t total = 0;
+  if (m_useStaticAllocation) {
+    for (int d = firstDepth(); d <= lastDepth(); ++d) {
+      if (skipped(d)) continue;
+      auto& list = offsets[static_cast<std::size_t>(d)];
+      for (Vector const& tile : source[static_cast<std::size_t>(d)]) {
+        list.push_back(total);
+        if (!tile.empty()) total += slotElements(tile.size());
+      }
+    }
+  }
+  void* const block = total > 0 ? Internal::allocateBlock(total, sizeof(T)) : nullptr;
+  auto fresh = Ostil::makePtr<TileStorage<T>>();
+  m_tileCounts.fill(0);
+  if (block || total == 0) {
+    Spans spans;
+    for (int d = firstDepth(); d <= lastDepth(); ++d) {
+      if (skipped(d)) continue;
+      count(d) = counts[static_cast<std::size_t>(d)];
+      spans.add(d, 0, count(d));
+    }
+    Internal::forEachDepth(firstDepth(), lastDepth(), [&](int d) {
+      (*fresh)[static_cast<std::size_t>(d)].resize(static_cast<std::size_t>(count(d)));
+    });
+    spans.forEach(Internal::tileGrain(tileBytes()), [&](int d, std::int64_t begin, std::int64_t end) {
+      auto const depth = static_cast<std::size_t>(d);
+      for (auto i = static_cast<std::size_t>(begin); i < static_cast<std::size_t>(end); ++i) {
+        std::size_t const n = source[depth][i].size();
+        if (n == 0) continue;
+        T* const slot = block ? static_cast<T*>(block) + offsets[depth][i] : nullptr;
+        Vector tile = unwrittenTile(static_cast<std::int64_t>(n), slot);
+        std::memcpy(static_cast<void*>(tile.data()), values(d, static_cast<std::int64_t>(i)), n * sizeof(T));
+        (*fresh)[depth][i].swap(tile);
+      }
+    });
+  }
+  sumCounts();
+  replaceStorage(std::move(fresh), block);
+}
+
+template <class T> void ChannelData<T>::separateWithout(int skipFirst, int skipLast) {
+  if (!storageIsShared()) return;
+  auto const old = m_data;
+  auto const counts = m_tileCounts;
+  auto const values = [&](int d, std::int64_t i) -> T const* {
+    return (*old)[static_cast<std::size_t>(d)][static_cast<std::size_t>(i)].data();
+  };
+  rebuild(*old, counts, values, skipFirst, skipLast);
+}
+
+template <class T> void ChannelData<T>::cloneData() { separateWithout(0, -1); }
+
+template <class T> void ChannelData<T>::deepCopy(ChannelData const& source) {
+  m_minDepth = source.m_minDepth;
+  m_depth = source.m_depth;
+  auto const old = source.m_data;
+  if (!old) return replaceStorage(nullptr, nullptr);
+  auto const values = [&](int d, std::int64_t i) -> T const* {
+    return (*old)[static_cast<std::size_t>(d)][static_cast<std::size_t>(i)].data();
+  };
+  rebuild(*old, Counts(source.m_tileCounts), values, 0, -1);
+}
+
+template <class T> void ChannelData<T>::compactStorage() {
+  if (!m_data) return;
+  cloneData();
+  Internal::forEachDepth(0, lastDepth(), [&](int d) {
+    auto& tiles = depthTiles(d);
+    parallelFor(0, static_cast<std::int64_t>(tiles.size()), [&](std::int64_t begin, std::int64_t end) {
+      for (auto i = begin; i < end; ++i) {
+        Vector& tile = tiles[static_cast<std::size_t>(i)];
+        // A static tile's room belongs to its block and cannot be given back alone.
+        if (tile.capacity() == tile.size() || tile.get_allocator().isStatic()) continue;
+        Vector exact = unwrittenTile(static_cast<std::int64_t>(tile.size()), nullptr);
+        std::copy(tile.begin(), tile.end(), exact.begin());
+        tile.swap(exact);
+      }
+    });
+    if (tiles.capacity() == tiles.size()) return;
+    std::vector<Vector> exact;
+    exact.reserve(tiles.size());
+    std::move(tiles.begin(), tiles.end(), std::back_inserter(exact));
+    tiles.swap(exact);
+  });
+}
+
+template <class T> void ChannelData<T>::memUse(std::uint64_t& used, std::uint64_t& allocated) const {
+  used = allocated = sizeof(ChannelData);
+  bool const blocks = !m_allocations.empty();
+  if (m_data) {
+    if (m_data.useCount() != 1)
+      std::cerr << "Channel::Data.memUse(): Warning: 'm_data' not unique (use count = " << m_data.useCount()
+                << ")\n";
+    for (auto const& tiles : *m_data) {
+      used += sizeof(tiles);
+      allocated += sizeof(tiles);
+      for (Vector const& tile : tiles) {
+        used += tile.size() * sizeof(T);
+        allocated += tile.capacity() * sizeof(T);
+      }
+    }
+  }
+  if (blocks) std::cerr << "Channel::Data.memUse(): Warning: not counting size of 'allocations'\n";
+}
+
+} // namespace VLN::TileTree3D

@@ -1,0 +1,81 @@
+// Bookkeeping of channel updates that no element type takes part in.
+#pragma once
+
+#include "GeometryVolume/core/Export.h"
+#include "GeometryVolume/core/FunctionRef.h"
+#include "GeometryVolume/tiletree/Traits.h"
+#include "GeometryVolume/tiletree/TreeComponent.h"
+
+#include <array>
+#include <cstddef>
+#include <cstdint>
+#include <vector>
+
+namespace VLN::TileTree3D::Internal {
+
+using DepthCounts = std::array<std::int64_t, kChannelDepths>;
+
+/// Elements from one tile's slot to the next in a static block: `elements` padded to whole cache lines. Slots
+/// start on a cache line when the element size divides 64; other slots are only spaced apart.
+VLN_API std::int64_t tileSlotStride(std::int64_t elements, std::size_t elementSize);
+
+/// A 64-byte aligned block from the pool while that is enabled, else from the allocator.
+/// @error Null when there is no memory.
+VLN_API void* allocateBlock(std::int64_t elements, std::size_t elementSize);
+/// Frees the blocks and empties the list.
+VLN_API void freeBlocks(std::vector<void*>& blocks);
+/// Appends `from` to `into` and empties it.
+/// @threads Several threads may hand blocks to one list.
+VLN_API void handOverBlocks(std::vector<void*>& into, std::vector<void*>& from);
+
+/// Source of the counts that a channel is brought into step with.
+class TileCounts {
+public:
+  virtual std::int64_t tileCount(int depth) const = 0;
+  virtual std::int64_t elementCount(TreeIndex const& tile) const = 0;
+
+protected:
+  ~TileCounts() = default;
+};
+
+class ComponentCounts final : public TileCounts {
+public:
+  explicit ComponentCounts(Component const& component)
+      : m_component(component) {}
+  std::int64_t tileCount(int depth) const override { return m_component.tileCount(depth); }
+  std::int64_t elementCount(TreeIndex const& tile) const override { return m_component.elementCount(tile); }
+
+private:
+  Component const& m_component;
+};
+
+/// A run of tiles at each depth, counted through from depth 0 so that one flat loop covers them all.
+class VLN_API TileSpans {
+public:
+  TileSpans() { m_ends.fill(0); }
+  /// Adds the tiles [begin, end) of a depth.
+  /// @pre Depths are added rising, each at most once.
+  void add(int depth, std::int64_t begin, std::int64_t end);
+  std::int64_t total() const { return m_ends.back(); }
+
+  /// Calls `body(depth, begin, end)` in parallel for pieces that cover all runs.
+  void forEach(std::int64_t grain, FunctionRef<void(int, std::int64_t, std::int64_t)> body) const;
+
+private:
+  DepthCounts m_begins{};
+  /// Running totals of tiles through each depth.
+  DepthCounts m_ends;
+};
+
+/// Tiles of `bytes` each that are worth a task of their own.
+inline std::int64_t tileGrain(std::size_t bytes) {
+  return bytes >= 32768 ? 1 : static_cast<std::int64_t>(32768 / (bytes + 64)) + 1;
+}
+
+/// Runs `body(depth)` for each depth of [first, last] in parallel.
+VLN_API void forEachDepth(int first, int last, FunctionRef<void(int)> body);
+
+/// Whether the list names no index twice and only indices below `count`.
+VLN_API bool isInjective(std::vector<std::int64_t> const& list, std::int64_t count);
+
+} // namespace VLN::TileTree3D::Internal

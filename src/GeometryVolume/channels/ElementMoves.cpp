@@ -1,0 +1,130 @@
+#include "GeometryVolume/channels/ElementMoves.h"
+
+#include "GeometryVolume/core/Parallel.h"
+#include "GeometryVolume/tiletree/Traits.h"
+
+#include <algorithm>
+#include <numeric>
+#include <tuple>
+
+namespace VLN::TileTree3D {
+
+namespace {
+
+bool bySource(ElementToFrom const& a, ElementToFrom const& b) {
+  // The destination last, so that the result does not depend on how the list was sorted.
+  return std::tie(a.fromDepth, a.from, a.fromElement, a.to) <
+         std::tie(b.fromDepth, b.from, b.fromElement, b.to);
+}
+
+void fillWithPositions(std::vector<std::uint64_t>& order, std::size_t n) {
+  order.resize(n);
+  ParallelOptions options;
+  options.grain = 16384;
+  parallelFor(
+      0, static_cast<std::int64_t>(n),
+      [&](std::int64_t begin, std::int64_t end) {
+        std::iota(order.begin() + begin, order.begin() + end, static_cast<std::uint64_t>(begin));
+      },
+      options);
+}
+
+template <class Record, class Less> void sortRecords(std::vector<Record>& records, Less const& less) {
+  if (records.size() < Internal::kParallelSortFrom) {
+    std::sort(records.begin(), records.end(), less);
+    return;
+  }
+  // Recorded tile by tile, lists often arrive sorted.
+  if (std::is_sorted(records.begin(), records.end(), less)) return;
+  std::vector<std::uint64_t> order;
+  fillWithPositions(order, records.size());
+  parallelSortPositions(order.data(), static_cast<std::int64_t>(order.size()),
+                        [&](std::uint64_t a, std::uint64_t b) { return less(records[a], records[b]); });
+  std::vector<Record> sorted(records.size());
+  ParallelOptions options;
+  options.grain = 4096;
+  parallelFor(
+      0, static_cast<std::int64_t>(order.size()),
+      [&](std::int64_t begin, std::int64_t end) {
+        for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n)
+          sorted[n] = records[order[n]];
+      },
+      options);
+  records.swap(sorted);
+}
+
+} // namespace
+
+TilePermutation invertPermutation(TilePermutation const& permutation) {
+  TilePermutation inverse(permutation.size());
+  for (std::size_t d = 0; d < permutation.size(); ++d) {
+    auto const& list = permutation[d];
+    inverse[d].assign(list.size(), -1);
+    for (std::size_t i = 0; i < list.size(); ++i)
+      inverse[d][static_cast<std::size_t>(list[i])] = static_cast<std::int64_t>(i);
+  }
+  return inverse;
+}
+
+namespace Internal {
+
+void sortMoves(std::vector<ElementToFrom>& moves) { sortRecords(moves, bySource); }
+
+void sortRemovals(std::vector<ElementInTile>& elements) {
+  sortRecords(elements, [](ElementInTile const& a, ElementInTile const& b) { return a < b; });
+}
+
+void groupByDestination(std::vector<ElementToFrom> const& moves, std::vector<std::uint64_t>& order,
+                        std::vector<std::uint64_t>& tiles, TileArrivals& arrivals,
+                        FunctionRef<int(std::int64_t)> elementCount) {
+  auto const n = static_cast<std::int64_t>(moves.size());
+  fillWithPositions(order, moves.size());
+  auto const byDestination = [&](std::uint64_t a, std::uint64_t b) {
+    return moves[a].to != moves[b].to ? moves[a].to < moves[b].to : a < b;
+  };
+  if (moves.size() < kParallelSortFrom)
+    std::sort(order.begin(), order.end(), byDestination);
+  else
+    parallelSortPositions(order.data(), n, byDestination);
+
+  struct Run {
+    std::int64_t tile;
+    std::uint64_t start;
+    int firstFree;
+  };
+  constexpr std::int64_t kGrain = 4096;
+  std::vector<std::vector<Run>> parts(static_cast<std::size_t>(chunkCount(0, n, kGrain)));
+  auto const destination = [&](std::int64_t at) { return moves[order[static_cast<std::size_t>(at)]].to; };
+  parallelChunks(0, n, kGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+    auto& runs = parts[static_cast<std::size_t>(chunk)];
+    for (auto at = begin; at < end; ++at) {
+      std::int64_t const to = destination(at);
+      if (to < 0 || (at > 0 && destination(at - 1) == to)) continue;
+      runs.push_back({to, static_cast<std::uint64_t>(at), elementCount(to)});
+    }
+  });
+  tiles.clear();
+  arrivals.clear();
+  for (auto const& runs : parts)
+    for (Run const& run : runs) {
+      auto const tile = static_cast<std::uint64_t>(run.tile);
+      arrivals.emplace_hint(arrivals.end(), tile, std::pair(run.start, run.firstFree));
+      tiles.push_back(tile);
+    }
+}
+
+void addSources(std::vector<ElementToFrom> const& moves, ElementRemovals& removals) {
+  removals.resize(kChannelDepths);
+  for (ElementToFrom const& move : moves)
+    removals[static_cast<std::size_t>(move.fromDepth)].push_back({move.from, move.fromElement});
+}
+
+void finishRemovals(ElementRemovals& removals) {
+  for (auto& list : removals) {
+    sortRemovals(list);
+    list.erase(std::unique(list.begin(), list.end()), list.end());
+  }
+}
+
+} // namespace Internal
+} // namespace VLN::TileTree3D

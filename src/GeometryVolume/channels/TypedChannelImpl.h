@@ -1,0 +1,396 @@
+// Definitions of TypedChannel. Only the generated sources include this.
+#pragma once
+
+#include "GeometryVolume/channels/ChannelDataImpl.h"
+#include "GeometryVolume/channels/ChannelExportImpl.h"
+#include "GeometryVolume/channels/ChannelUpdateImpl.h"
+#include "GeometryVolume/channels/ElementMovesImpl.h"
+#include "GeometryVolume/channels/TypedChannel.h"
+#include "GeometryVolume/core/Const.h"
+#include "GeometryVolume/core/LoggerHooks.h"
+#include "GeometryVolume/core/Parallel.h"
+#include "GeometryVolume/core/Streaming.h"
+
+#include <iostream>
+#include <limits>
+#include <utility>
+
+namespace VLN::TileTree3D {
+
+template <class T>
+TypedChannel<T>::TypedChannel(Ostil::String const& name, Ostil::Ptr<ChannelData<T>> data)
+    : ChannelBase(name)
+    , m_data(std::move(data)) {
+  replaceEmptyName();
+  pointerAllocated(dataPtr(), this);
+}
+
+template <class T>
+TypedChannel<T>::TypedChannel(TypedChannel const& other)
+    : ChannelBase(other)
+    , m_data(other.m_data) {
+  pointerAllocated(dataPtr(), this);
+  replaceEmptyName();
+  write([](ChannelData<T>&) {});
+}
+
+template <class T> TypedChannel<T>& TypedChannel<T>::operator=(TypedChannel const& other) {
+  if (this == &other) return *this;
+  ChannelBase::operator=(other);
+  pointerDeAllocated(dataPtr(), this);
+  m_data = other.m_data;
+  pointerAllocated(dataPtr(), this);
+  return *this;
+}
+
+template <class T> TypedChannel<T>::~TypedChannel() { pointerDeAllocated(dataPtr(), this); }
+
+template <class T> void TypedChannel<T>::replaceEmptyName() {
+  if (name().empty()) setName(Const::TileTreeChannelName);
+}
+
+template <class T> void TypedChannel<T>::write(FunctionRef<void(ChannelData<T>&)> change) {
+  void const* const before = dataPtr();
+  if (m_data && !m_data.unique()) m_data = Ostil::MutablePtr<ChannelData<T>>(std::move(m_data));
+  change(*m_data);
+  void const* const after = dataPtr();
+  if (after == before) return;
+  pointerDeAllocated(before, this);
+  pointerAllocated(after, this);
+}
+
+template <class T> Ostil::Ptr<TileStorage<T>> const& TypedChannel<T>::cloneData() {
+  write([](ChannelData<T>& data) { data.cloneData(); });
+  return m_data->storage();
+}
+
+template <class T> void TypedChannel<T>::deepCopyTo(TypedChannel& copy) const {
+  if (loggingEnabled())
+    std::cout << "ERROR: Copying " << name() << " from ptr " << static_cast<void const*>(this) << " to ptr "
+              << static_cast<void const*>(&copy) << '\n';
+  copy.write([&](ChannelData<T>& data) { data.deepCopy(*m_data); });
+}
+
+template <class T> void TypedChannel<T>::dump(std::ostream& os) const {
+  ChannelBase::dump(os);
+  auto const pad = Streaming::pad(os);
+  auto const line = [&](char const* what, auto const& countOf) {
+    os << pad << what << " {" << kChannelDepths - 1 << "} =";
+    for (int d = 0; d < kChannelDepths; ++d) os << (d == 0 ? "" : ", ") << countOf(d);
+    os << '\n';
+  };
+  line("tileCount", [&](int d) { return tileCount(d); });
+  line("elementCount", [&](int d) { return elementCount(d); });
+}
+
+template <class T>
+void TypedChannel<T>::memUse(std::uint64_t& used, std::uint64_t& allocated, bool notShared) const {
+  ChannelBase::memUse(used, allocated, notShared);
+  used += sizeof(m_data);
+  allocated += sizeof(m_data);
+  if (!m_data) return;
+  std::uint64_t dataUsed = 0, dataAllocated = 0;
+  m_data->memUse(dataUsed, dataAllocated);
+  std::int64_t const sharers = m_data.useCount();
+  auto const divisor = static_cast<std::uint64_t>(notShared ? 1 : std::max<std::int64_t>(1, sharers));
+  used += dataUsed / divisor;
+  allocated += dataAllocated / divisor;
+  if (loggerDumpInProgress() && sharers > 1) {
+    std::cout << " Data shared by " << sharers
+              << " channels, raw data ptr = " << static_cast<void const*>(dataPtr()) << '\n'
+              << " Total shared data = " << static_cast<float>(static_cast<double>(dataUsed) / 1e6)
+              << "MB (total shared data allocated = "
+              << static_cast<float>(static_cast<double>(dataAllocated) / 1e6) << "MB)";
+  }
+}
+
+template <class T> std::uint64_t TypedChannel<T>::size() const {
+  return static_cast<std::uint64_t>(elementCount(-1));
+}
+template <class T> std::int64_t TypedChannel<T>::elementCount(int depth) const {
+  return m_data->elementCount(depth);
+}
+template <class T> int TypedChannel<T>::elementCount(TreeIndex const& tile) const {
+  return m_data->elementCount(tile);
+}
+template <class T> std::int64_t TypedChannel<T>::tileCount(int depth) const {
+  return m_data->tileCount(depth);
+}
+template <class T> int TypedChannel<T>::minDepth() const { return m_data->minDepth(); }
+template <class T> int TypedChannel<T>::depth() const { return m_data->depth(); }
+
+template <class T> void TypedChannel<T>::setMinDepth(int minDepth, Component const& source) {
+  int const old = this->minDepth();
+  if (minDepth == old) return;
+  write([&](ChannelData<T>& data) { data.setMinDepth(minDepth); });
+  if (old <= minDepth)
+    remove(old, minDepth - 1);
+  else
+    this->update(source);
+}
+
+template <class T> void TypedChannel<T>::setDepth(int depth, Component const& source) {
+  int const old = this->depth();
+  if (depth == old) return;
+  write([&](ChannelData<T>& data) { data.setDepth(depth); });
+  if (old >= depth)
+    remove(depth + 1, old);
+  else
+    this->update(source);
+}
+
+template <class T> bool TypedChannel<T>::hasElementType(Ostil::Any const& type) const {
+  auto const* identity = type.get<std::type_index>();
+  return identity ? *identity == typeid(T) : type.type() == typeid(T);
+}
+
+template <class T> Ostil::Ptr<void> TypedChannel<T>::channelData(unsigned int kind, Ostil::Any const& type) {
+  if (hasElementType(type)) {
+    if (kind == 0) return m_data->exportFlat();
+    if (kind == 3) return m_data->exportNested();
+  }
+  return Ostil::makePtr<Ostil::Array<T>>();
+}
+
+template <class T>
+void TypedChannel<T>::setChannelData(unsigned int kind, Ostil::Any const& type,
+                                     Ostil::Ptr<void> const& data) {
+  if (!hasElementType(type) || !data) return;
+  if (kind == 0)
+    write([&](ChannelData<T>& d) { d.importFlat(*static_cast<Ostil::Array<T> const*>(data.get())); });
+  if (kind == 3)
+    write([&](ChannelData<T>& d) { d.importNested(*static_cast<NestedArrays<T> const*>(data.get())); });
+}
+
+template <class T> void TypedChannel<T>::fillTiles(int depth, std::vector<std::int64_t> const& tiles) {
+  if (tiles.empty() || depth < 0 || depth >= kChannelDepths) return;
+  cloneData();
+  auto& vectors = (*m_data->dataPtr())[static_cast<std::size_t>(depth)];
+  auto const count = static_cast<std::int64_t>(vectors.size());
+  parallelFor(0, static_cast<std::int64_t>(tiles.size()),
+              [&](std::int64_t begin, std::int64_t end) {
+                for (std::int64_t n = begin; n < end; ++n) {
+                  std::int64_t const tile = tiles[static_cast<std::size_t>(n)];
+                  if (tile < 0 || tile >= count) continue;
+                  auto& values = vectors[static_cast<std::size_t>(tile)];
+                  std::fill(values.begin(), values.end(), m_data->defaultValue());
+                }
+              },
+              {.grain = 64});
+}
+
+template <class T> void TypedChannel<T>::setDefaultValue(T const* value) {
+  write([&](ChannelData<T>& data) { data.setDefaultValue(value); });
+}
+template <class T>
+DataElementInitializerType TypedChannel<T>::setDataElementInitializerType(DataElementInitializerType v) {
+  auto const old = dataElementInitializerType();
+  write([&](ChannelData<T>& data) { data.setInitializer(v); });
+  return old;
+}
+template <class T> void TypedChannel<T>::setCallElementConstructor(bool b) {
+  write([&](ChannelData<T>& data) { data.setCallElementConstructor(b); });
+}
+template <class T> void TypedChannel<T>::enableAllocateEmptyTileData() {
+  write([](ChannelData<T>& data) { data.setAllocateEmptyTileData(true); });
+}
+template <class T> void TypedChannel<T>::disableAllocateEmptyTileData() {
+  write([](ChannelData<T>& data) { data.setAllocateEmptyTileData(false); });
+}
+
+template <class T> void TypedChannel<T>::compactStorage() {
+  if (dataPtr()) write([](ChannelData<T>& data) { data.compactStorage(); });
+}
+
+// The update protocol
+
+template <class T> void TypedChannel<T>::update(VLN::Component const& source) {
+  if (auto const* tree = dynamic_cast<Component const*>(&source)) updateTileResizeNoDispatch(*tree);
+}
+template <class T> void TypedChannel<T>::updateTilesAdded(Component const& tree) {
+  updateTileResizeNoDispatch(tree);
+}
+template <class T> void TypedChannel<T>::updateTileResizeNoDispatch(Component const& tree) {
+  Internal::ComponentCounts const counts(tree);
+  write([&](ChannelData<T>& data) { data.resizeTiles(counts); });
+}
+
+template <class T>
+void TypedChannel<T>::updateTilesRemoved(TileRemovalList const& removed, Component const& tree) {
+  write([&](ChannelData<T>& data) { data.moveTiles(removed, [&](int d) { return tree.tileCount(d); }); });
+  updateTileResizeNoDispatch(tree);
+}
+template <class T> void TypedChannel<T>::updateTilesNoDispatch(TileRemovalList const* removed) {
+  // Nothing is known about which tiles go: all keep their elements.
+  write([&](ChannelData<T>& data) {
+    data.moveTiles(*removed, [](int) { return std::numeric_limits<std::int64_t>::max(); });
+  });
+}
+
+template <class T> void TypedChannel<T>::updateTilesPermuted(TilePermutation const& newToOld) {
+  updateTilePermuteNoDispatch(&newToOld);
+}
+template <class T> bool TypedChannel<T>::permute(TilePermutation const* newToOld) {
+  updateTilePermuteNoDispatch(newToOld);
+  return true;
+}
+template <class T> void TypedChannel<T>::updateTilePermuteNoDispatch(TilePermutation const* newToOld) {
+  void const* const before = dataPtr();
+  if (m_data && !m_data.unique()) m_data = Ostil::MutablePtr<ChannelData<T>>(std::move(m_data));
+  m_data->permuteTiles(*newToOld);
+  if (dataPtr() != before) pointerReAllocated(before, dataPtr());
+}
+
+template <class T> void TypedChannel<T>::updateElementResizeNoDispatch(Component const& source) {
+  Internal::ComponentCounts const counts(source);
+  write([&](ChannelData<T>& data) { data.growElements(counts); });
+}
+
+template <class T> void TypedChannel<T>::remove(int firstDepth, int lastDepth) {
+  write([&](ChannelData<T>& data) { data.removeDepths(firstDepth, lastDepth); });
+}
+template <class T> bool TypedChannel<T>::removeAll() {
+  if (!dataPtr()) return false;
+  remove(0, depth());
+  return true;
+}
+
+template <class T> bool TypedChannel<T>::resize(int depth, std::int64_t tileCount, int elementCount) {
+  bool resized = false;
+  write([&](ChannelData<T>& data) { resized = data.resizeDepth(depth, tileCount, elementCount); });
+  return resized;
+}
+
+template <class T> bool TypedChannel<T>::resize(std::int64_t const* tileCounts, int elementCount) {
+  class Wanted final : public Internal::TileCounts {
+  public:
+    Wanted(std::int64_t const* counts, int elements)
+        : m_counts(counts)
+        , m_elements(elements) {}
+    std::int64_t tileCount(int d) const override { return m_counts[d]; }
+    std::int64_t elementCount(TreeIndex const&) const override { return m_elements; }
+
+  private:
+    std::int64_t const* m_counts;
+    int m_elements;
+  };
+  Wanted const wanted(tileCounts, elementCount);
+  write([&](ChannelData<T>& data) { data.resizeTiles(wanted); });
+  return true;
+}
+
+// Element moves
+
+template <class T>
+void TypedChannel<T>::computePermutation(std::vector<ElementToFrom>& moves, std::vector<std::uint64_t>& order,
+                                         std::vector<std::uint64_t>& tiles, TileArrivals& arrivals, int depth,
+                                         bool sorted) const {
+  if (!sorted) Internal::sortMoves(moves);
+  Internal::groupByDestination(moves, order, tiles, arrivals, [&](std::int64_t tile) {
+    return elementCount(TreeIndex{tile, depth});
+  });
+}
+
+template <class T>
+void TypedChannel<T>::computePermutation(ElementMoves& moves, ElementOrder& order, DestinationTiles& tiles,
+                                         ArrivalMap& arrivals, bool sorted) const {
+  moves.resize(kChannelDepths);
+  order.resize(kChannelDepths);
+  tiles.resize(kChannelDepths);
+  arrivals.resize(kChannelDepths);
+  for (std::size_t d = 0; d < kChannelDepths; ++d)
+    computePermutation(moves[d], order[d], tiles[d], arrivals[d], static_cast<int>(d), sorted);
+}
+
+template <class T>
+void TypedChannel<T>::allocateElementStorage(std::vector<std::uint64_t> const& tiles,
+                                             TileArrivals const& arrivals, std::size_t moveCount, int depth) {
+  write([&](ChannelData<T>& data) { data.allocateElements(tiles, arrivals, moveCount, depth); });
+}
+
+template <class T>
+void TypedChannel<T>::updateElementsNoDispatch(std::vector<ElementToFrom> const& moves,
+                                               std::vector<std::uint64_t> const& order,
+                                               std::vector<std::uint64_t> const& tiles,
+                                               TileArrivals const& arrivals, int depth) {
+  updateElementsNoDispatch(ElementPermutation{ElementPermutation::kOneDepth, &moves, &order, &tiles,
+                                              &arrivals, depth, depth, nullptr, nullptr, nullptr, nullptr,
+                                              nullptr});
+}
+
+template <class T> void TypedChannel<T>::updateElementsNoDispatch(ElementPermutation const& p) {
+  write([&](ChannelData<T>& data) {
+    auto const forEachList = [&](auto const& body) {
+      if (p.kind == ElementPermutation::kOneDepth) {
+        body(*p.moves, *p.order, *p.tiles, *p.arrivals, p.firstDepth);
+        return;
+      }
+      std::size_t const n = std::min({p.allMoves->size(), p.allOrders->size(), p.allTiles->size(),
+                                      p.allArrivals->size(), std::size_t(kChannelDepths)});
+      for (std::size_t d = 0; d < n; ++d)
+        body((*p.allMoves)[d], (*p.allOrders)[d], (*p.allTiles)[d], (*p.allArrivals)[d], static_cast<int>(d));
+    };
+    // Sources are read by position, so nothing is removed before everything is copied.
+    forEachList([&](auto const& moves, auto const&, auto const& tiles, auto const& arrivals, int d) {
+      data.allocateElements(tiles, arrivals, moves.size(), d);
+    });
+    forEachList([&](auto const& moves, auto const& order, auto const& tiles, auto const& arrivals, int d) {
+      data.copyElements(moves, order, tiles, arrivals, d);
+    });
+    ElementRemovals collected;
+    ElementRemovals const* removals = p.removals;
+    if (p.kind != ElementPermutation::kRecorded) {
+      forEachList([&](auto const& moves, auto const&, auto const&, auto const&, int) {
+        Internal::addSources(moves, collected);
+      });
+      Internal::finishRemovals(collected);
+      removals = &collected;
+    }
+    for (std::size_t d = 0; d < removals->size(); ++d)
+      data.removeElements((*removals)[d], static_cast<int>(d));
+  });
+}
+
+template <class T>
+void TypedChannel<T>::updateElements(ElementMoves const& moves, ElementOrder const& order,
+                                     DestinationTiles const& tiles, ArrivalMap const& arrivals) {
+  ElementPermutation p{ElementPermutation::kAllDepths};
+  p.allMoves = &moves, p.allOrders = &order, p.allTiles = &tiles, p.allArrivals = &arrivals;
+  updateElementsNoDispatch(p);
+}
+
+template <class T>
+void TypedChannel<T>::update(std::vector<ElementToFrom>& moves, int first, int last, bool sorted) {
+  std::vector<std::uint64_t> order, tiles;
+  TileArrivals arrivals;
+  computePermutation(moves, order, tiles, arrivals, first, sorted);
+  ElementPermutation p{ElementPermutation::kOneDepth, &moves, &order, &tiles, &arrivals, first, last};
+  updateElementsNoDispatch(p);
+}
+template <class T> void TypedChannel<T>::update(std::vector<ElementToFrom>& moves, int depth, bool sorted) {
+  update(moves, depth, depth, sorted);
+}
+
+template <class T> void TypedChannel<T>::update(ElementMoves& moves, bool sorted) {
+  ElementOrder order;
+  DestinationTiles tiles;
+  ArrivalMap arrivals;
+  computePermutation(moves, order, tiles, arrivals, sorted);
+  TypedChannel::updateElements(moves, order, tiles, arrivals);
+}
+
+template <class T> void TypedChannel<T>::update(TileDataElementAccessor& recorded) {
+  Internal::finishRemovals(recorded.elementsFrom());
+  ElementMoves& moves = recorded.elementsTo();
+  for (auto& list : moves) Internal::sortMoves(list);
+  ElementOrder order;
+  DestinationTiles tiles;
+  ArrivalMap arrivals;
+  computePermutation(moves, order, tiles, arrivals, true);
+  ElementPermutation p{ElementPermutation::kRecorded};
+  p.allMoves = &moves, p.allOrders = &order, p.allTiles = &tiles, p.allArrivals = &arrivals;
+  p.removals = &recorded.elementsFrom();
+  updateElementsNoDispatch(p);
+}
+
+} // namespace VLN::TileTree3D

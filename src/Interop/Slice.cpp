@@ -1,0 +1,147 @@
+#include "Interop/Slice.h"
+
+#include "GeometryVolume/channels/Channel.h"
+#include "GeometryVolume/core/Numeric.h"
+#include "GeometryVolume/core/Parallel.h"
+#include "GeometryVolume/tiletree/Container.h"
+#include "Interop/ColorMap.h"
+
+#include <algorithm>
+#include <cmath>
+#include <cstdio>
+#include <stdexcept>
+#include <vector>
+
+namespace VLN::Interop {
+
+namespace {
+
+using VdbTraits = TileTree3D::Traits<2, 4, 0, 1>;
+using Container = TileTree3D::Container<VdbTraits>;
+using FloatChannel = TileTree3D::Channel<VdbTraits, float, 4, 0>;
+using Velorn::Math::int3;
+
+constexpr Rgb kNoTile{222, 222, 222};
+constexpr Rgb kPaper{255, 255, 255};
+
+struct Sample {
+  float value = 0;
+  bool found = false;
+};
+
+std::string number(double value) {
+  char text[32];
+  std::snprintf(text, sizeof text, "%.6g", value);
+  return text;
+}
+
+// The plane in samples and in pixels.
+struct Plane {
+  int axis, across, up; // axes of tile space
+  int at;               // index along `axis`
+  IndexBox box;
+  int width, height;
+
+  int extent(int a) const { return box.max[a] - box.min[a]; }
+  int3 indexOf(int x, int y) const {
+    int3 p{};
+    p[axis] = at;
+    p[across] = box.min[across] + static_cast<int>((x + 0.5) * extent(across) / width);
+    p[up] = box.max[up] - 1 - static_cast<int>((y + 0.5) * extent(up) / height);
+    return p;
+  }
+};
+
+Plane planeFor(VdbVolume const& volume, VdbChannel const& channel, SliceOptions const& options) {
+  Plane plane{};
+  plane.axis = options.axis;
+  plane.across = options.axis == 0 ? 1 : 0;
+  plane.up = options.axis == 2 ? 1 : 2;
+  plane.box = channel.activeBox;
+  int const low = plane.box.min[plane.axis], high = plane.box.max[plane.axis] - 1;
+  double const at = options.at ? *options.at / volume.voxelSize : 0.5 * (double(low) + high);
+  plane.at = toIntFloor(at + 0.5);
+  if (plane.at < low || plane.at > high)
+    throw std::invalid_argument("position " + number(options.at.value_or(0)) + " on axis " +
+                                std::string(1, "xyz"[plane.axis]) +
+                                " misses the active voxels, which lie in " + number(low * volume.voxelSize) +
+                                ".." + number(high * volume.voxelSize));
+  double const across = plane.extent(plane.across), up = plane.extent(plane.up);
+  double const scale = options.size / std::max(across, up);
+  plane.width = std::max(1, static_cast<int>(std::lround(across * scale)));
+  plane.height = std::max(1, static_cast<int>(std::lround(up * scale)));
+  return plane;
+}
+
+} // namespace
+
+Slice drawSlice(VdbVolume const& volume, std::string const& name, SliceOptions const& options) {
+  VdbChannel const* info = volume.channel(name);
+  auto const channel = volume.object->component<FloatChannel>(name);
+  auto const container = volume.object->component<Container>(kVdbContainerName);
+  if (!info || !channel || !container) throw std::invalid_argument("there is no channel '" + name + "'");
+  if (info->activeBox.empty()) throw std::invalid_argument("channel '" + name + "' has no active voxel");
+  if (options.axis < 0 || options.axis > 2) throw std::invalid_argument("the axis must be x, y or z");
+  if (options.size < kSmallestSlice || options.size > kLargestSlice)
+    throw std::invalid_argument("the size must lie in " + std::to_string(kSmallestSlice) + ".." +
+                                std::to_string(kLargestSlice));
+
+  Plane const plane = planeFor(volume, *info, options);
+  FloatChannel const& samplesOf = *channel;
+  Container const& tree = *container;
+  std::vector<Sample> samples(static_cast<std::size_t>(plane.width) * static_cast<std::size_t>(plane.height));
+  parallelFor(0, plane.height,
+              [&](std::int64_t begin, std::int64_t end) {
+                auto accessor = tree.tileAccessor();
+                for (std::int64_t y = begin; y < end; ++y)
+                  for (int x = 0; x < plane.width; ++x) {
+                    int3 const p = plane.indexOf(x, static_cast<int>(y));
+                    auto const& tile = accessor.tile(p, Container::kMaxDepth, false);
+                    if (!tile.valid()) continue;
+                    samples[static_cast<std::size_t>(y * plane.width + x)] = {
+                        samplesOf.tileData(tile.treeIndex())(tile.childDataIJK(p)), true};
+                  }
+              },
+              {.grain = 8});
+
+  Slice slice{Image(1, 1), plane.at * volume.voxelSize, 0, 0, 0, 0};
+  std::vector<float> numbers;
+  for (Sample const& s : samples) {
+    slice.drawn += s.found;
+    if (s.found && std::isfinite(s.value)) numbers.push_back(s.value);
+  }
+  if (!numbers.empty()) {
+    auto const [low, high] = std::minmax_element(numbers.begin(), numbers.end());
+    slice.low = *low, slice.high = slice.top = *high;
+    if (slice.low >= 0 || slice.high <= 0) {
+      auto const nth = numbers.begin() + static_cast<std::ptrdiff_t>(0.995 * double(numbers.size() - 1));
+      std::nth_element(numbers.begin(), nth, numbers.end());
+      if (*nth > slice.low) slice.top = *nth;
+    }
+  }
+  ColorMap const map = ColorMap::forRange(slice.low, slice.top);
+  Image picture(plane.width, plane.height, kNoTile);
+  parallelFor(0, plane.height,
+              [&](std::int64_t begin, std::int64_t end) {
+                for (int y = static_cast<int>(begin); y < end; ++y)
+                  for (int x = 0; x < plane.width; ++x) {
+                    Sample const& s =
+                        samples[static_cast<std::size_t>(y) * static_cast<std::size_t>(plane.width) +
+                                static_cast<std::size_t>(x)];
+                    if (s.found) picture(x, y) = map.color(s.value);
+                  }
+              },
+              {.grain = 64});
+
+  int const textScale = options.size >= 700 ? 2 : 1;
+  int const margin = 8 * textScale;
+  Image const scale =
+      map.scale(std::clamp(plane.height, 60 * textScale, 400 * textScale), textScale, slice.top < slice.high);
+  slice.image = Image(plane.width + scale.width() + 3 * margin,
+                      std::max(plane.height, scale.height()) + 2 * margin, kPaper);
+  slice.image.paste(picture, margin, (slice.image.height() - plane.height) / 2);
+  slice.image.paste(scale, plane.width + 2 * margin, (slice.image.height() - scale.height()) / 2);
+  return slice;
+}
+
+} // namespace VLN::Interop

@@ -1,0 +1,245 @@
+#include "Interop/VdbFile.h"
+
+#include "Interop/FileError.h"
+#include "Interop/VdbFileImpl.h"
+
+#include <openvdb/io/Stream.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+#include <fstream>
+#include <new>
+#include <optional>
+
+#include <fcntl.h>
+#include <poll.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+namespace VLN::Interop {
+
+namespace {
+
+constexpr std::uint64_t kMB = 1000000;
+
+// Regular file that starts as a .vdb file does. Returns its size.
+std::uint64_t checkHeader(std::string const& path) {
+  struct stat info;
+  if (stat(path.c_str(), &info) != 0) throw FileError(path, std::strerror(errno));
+  if (S_ISDIR(info.st_mode)) throw FileError(path, "is a directory");
+  // A pipe or a device might never end, and cannot be read twice.
+  if (!S_ISREG(info.st_mode)) throw FileError(path, "is not a regular file");
+  std::ifstream in(path, std::ios::binary);
+  if (!in) throw FileError(path, std::string("cannot be opened: ") + std::strerror(errno));
+  if (info.st_size == 0) throw FileError(path, "is empty");
+  unsigned char head[8] = {};
+  in.read(reinterpret_cast<char*>(head), sizeof head);
+  static constexpr unsigned char kMagic[8] = {0x20, 0x42, 0x44, 0x56, 0, 0, 0, 0};
+  auto const got = static_cast<std::size_t>(in.gcount());
+  if (std::memcmp(head, kMagic, std::min(got, sizeof head)) != 0)
+    throw FileError(path, "is not an OpenVDB file");
+  if (got < sizeof head) throw FileError(path, "is truncated");
+  return static_cast<std::uint64_t>(info.st_size);
+}
+
+// Reads from a stream that throws at the first byte that is missing: OpenVDB itself does not ask whether its
+// reads succeed, and would go on with whatever its buffers hold.
+VdbFile readWhole(std::string const& path) {
+  openvdb::initialize();
+  VdbFile file;
+  file.path = path;
+  std::ifstream in(path, std::ios::binary);
+  if (!in) throw FileError(path, std::string("cannot be opened: ") + std::strerror(errno));
+  in.exceptions(std::ios::failbit | std::ios::badbit | std::ios::eofbit);
+  openvdb::io::Stream stream(in, /*delayLoad=*/false);
+  file.metadata = stream.getMetadata();
+  file.grids = *stream.getGrids();
+  for (auto const& grid : file.grids)
+    if (!grid) throw std::runtime_error("a grid is missing");
+  return file;
+}
+
+std::string memoryReason(std::uint64_t bytes) {
+  return "is damaged, or needs more than " + std::to_string(bytes / kMB) + " MB of memory";
+}
+
+// The reason why readWhole() failed, from inside a catch block.
+std::string currentReason(std::uint64_t memoryBytes) {
+  try {
+    throw;
+  } catch (FileError const& error) { return error.reason(); } catch (std::bad_alloc const&) {
+    return memoryReason(memoryBytes);
+  } catch (std::length_error const&) {
+    return "is damaged: it claims a size that cannot be";
+  } catch (std::ios::failure const&) {
+    return "is truncated or damaged: data that it announces is missing";
+  } catch (std::exception const& error) { return "cannot be read: " + oneLine(error.what()); } catch (...) {
+    return "cannot be read";
+  }
+}
+
+std::uint64_t availableMemory() {
+  std::ifstream in("/proc/meminfo");
+  std::string name, unit;
+  std::uint64_t kB = 0;
+  while (in >> name >> kB) {
+    if (name == "MemAvailable:") return kB * 1024;
+    std::getline(in, unit);
+  }
+  return static_cast<std::uint64_t>(sysconf(_SC_PHYS_PAGES)) *
+         static_cast<std::uint64_t>(sysconf(_SC_PAGESIZE));
+}
+
+// First and second figure of /proc/<process>/statm: address space and resident memory, in bytes.
+struct Memory {
+  std::uint64_t space = 0, resident = 0;
+};
+Memory memoryOf(char const* process) {
+  Memory memory;
+  std::ifstream in(std::string("/proc/") + process + "/statm");
+  in >> memory.space >> memory.resident;
+  auto const page = static_cast<std::uint64_t>(sysconf(_SC_PAGESIZE));
+  return {memory.space * page, memory.resident * page};
+}
+
+void setLimit(decltype(RLIMIT_AS) resource, std::uint64_t soft, std::uint64_t hard) {
+  rlimit limit;
+  if (getrlimit(resource, &limit) != 0) return;
+  limit.rlim_cur = std::min<rlim_t>(soft, limit.rlim_max);
+  limit.rlim_max = std::min<rlim_t>(hard, limit.rlim_max);
+  setrlimit(resource, &limit);
+}
+
+void writeAll(int fd, std::string const& text) {
+  char const* next = text.data();
+  std::size_t left = text.size();
+  while (left > 0) {
+    ssize_t const n = ::write(fd, next, left);
+    if (n < 0 && errno == EINTR) continue;
+    if (n <= 0) return;
+    next += n, left -= static_cast<std::size_t>(n);
+  }
+}
+
+// Out of memory in the child: an exception would need memory on its way, so the verdict is given at once.
+int verdictEnd = -1;
+std::string memoryVerdict;
+void onNoMemory() {
+  writeAll(verdictEnd, memoryVerdict);
+  _exit(0);
+}
+
+// The child's whole life. It writes "ok", or the reason why not, and never returns.
+[[noreturn]] void runChild(std::string const& path, VdbReadLimits const& limits, Memory const& start,
+                           int fd) {
+  verdictEnd = fd, memoryVerdict = memoryReason(limits.memoryBytes);
+  std::set_new_handler(onNoMemory);
+  // A sanitizer reserves address space by the terabyte; there the parent's watch over resident memory is the
+  // only bound.
+  if (start.space < (std::uint64_t(1) << 40))
+    setLimit(RLIMIT_AS, start.space + limits.memoryBytes, start.space + limits.memoryBytes);
+  setLimit(RLIMIT_CPU, limits.seconds, limits.seconds + 1);
+  setLimit(RLIMIT_CORE, 0, 0);
+  for (int n : {SIGSEGV, SIGBUS, SIGFPE, SIGILL, SIGABRT, SIGXCPU, SIGTERM, SIGINT}) signal(n, SIG_DFL);
+  // What OpenVDB has to say about the file is the business of the real reading.
+  int const null = open("/dev/null", O_RDWR);
+  if (null >= 0)
+    for (int n = 0; n < 3; ++n) dup2(null, n);
+  try {
+    VdbFile file = readWhole(path);
+    writeAll(fd, "ok");
+  } catch (...) { writeAll(fd, currentReason(limits.memoryBytes)); }
+  _exit(0);
+}
+
+// Collects what the child writes until it ends. Sets `reason` and stops the child when it takes too much.
+std::string watchChild(int fd, pid_t child, VdbReadLimits const& limits, Memory const& start,
+                       std::optional<std::string>& reason) {
+  std::string const process = std::to_string(child);
+  // The processor time is bounded by the system; this is for a child that waits for ever.
+  double const patience = 60 + 10.0 * limits.seconds;
+  timespec begin, now;
+  clock_gettime(CLOCK_MONOTONIC, &begin);
+  std::string text;
+  for (;;) {
+    pollfd wait{fd, POLLIN, 0};
+    int const ready = poll(&wait, 1, 20);
+    if (ready < 0 && errno != EINTR) return text;
+    if (ready > 0) {
+      char buffer[1024];
+      ssize_t const n = read(fd, buffer, sizeof buffer);
+      if (n < 0 && errno == EINTR) continue;
+      if (n <= 0) return text;
+      if (text.size() < 4096) text.append(buffer, static_cast<std::size_t>(n));
+      continue;
+    }
+    clock_gettime(CLOCK_MONOTONIC, &now);
+    if (memoryOf(process.c_str()).resident > start.resident + limits.memoryBytes)
+      reason = memoryReason(limits.memoryBytes);
+    else if (double(now.tv_sec - begin.tv_sec) > patience)
+      reason = "cannot be read in " + std::to_string(static_cast<long>(patience)) + " s";
+    if (reason) {
+      kill(child, SIGKILL);
+      return text;
+    }
+  }
+}
+
+VdbReadLimits effective(VdbReadLimits limits, std::uint64_t fileSize) {
+  if (limits.memoryBytes == 0) limits.memoryBytes = availableMemory() / 4 * 3;
+  if (limits.seconds == 0)
+    limits.seconds = static_cast<unsigned>(10 + std::min<std::uint64_t>(fileSize / kMB, 100000));
+  return limits;
+}
+
+// Probes and returns the limits in force.
+VdbReadLimits probe(std::string const& path, VdbReadLimits const& asked) {
+  VdbReadLimits const limits = effective(asked, checkHeader(path));
+  openvdb::initialize();
+  int ends[2];
+  if (pipe2(ends, O_CLOEXEC) != 0) throw FileError(path, std::string("no pipe: ") + std::strerror(errno));
+  Memory const start = memoryOf("self");
+  pid_t const child = fork();
+  if (child < 0) {
+    int const error = errno;
+    close(ends[0]), close(ends[1]);
+    throw FileError(path, std::string("no process to read it in: ") + std::strerror(error));
+  }
+  if (child == 0) runChild(path, limits, start, ends[1]);
+  close(ends[1]);
+  std::optional<std::string> reason;
+  std::string const verdict = watchChild(ends[0], child, limits, start, reason);
+  close(ends[0]);
+  int status = 0;
+  while (waitpid(child, &status, 0) < 0 && errno == EINTR) {}
+
+  if (reason) throw FileError(path, *reason);
+  if (WIFSIGNALED(status)) {
+    int const number = WTERMSIG(status);
+    if (number == SIGXCPU || number == SIGKILL)
+      throw FileError(path, "is damaged, or takes more than " + std::to_string(limits.seconds) +
+                                " s of processor time");
+    throw FileError(path, std::string("is damaged: reading it ends in \"") + strsignal(number) + "\"");
+  }
+  if (verdict.empty()) throw FileError(path, "is damaged: reading it ends without a word");
+  if (verdict != "ok") throw FileError(path, verdict);
+  return limits;
+}
+
+} // namespace
+
+void probeVdbFile(std::string const& path, VdbReadLimits const& limits) { probe(path, limits); }
+
+VdbFile readVdbFile(std::string const& path, VdbReadLimits const& asked) {
+  VdbReadLimits const limits = probe(path, asked);
+  try {
+    return readWhole(path);
+  } catch (...) { throw FileError(path, currentReason(limits.memoryBytes)); }
+}
+
+char const* openvdbVersion() { return openvdb::getLibraryVersionString(); }
+
+} // namespace VLN::Interop

@@ -1,0 +1,33 @@
+// Safe reading of .vdb files. No type of OpenVDB shows here.
+//
+//   file --> header looked at --> read whole in a child process --> read for real
+//                                 (memory and time bounded)
+//
+// OpenVDB trusts its input: a damaged file can make it ask for any amount of memory, loop, or crash. The
+// child process meets all of that first, and only its verdict comes back.
+#pragma once
+
+#include "GeometryVolume/core/Export.h"
+
+#include <cstdint>
+#include <string>
+
+namespace VLN::Interop {
+
+struct VdbReadLimits {
+  /// Most memory that reading the file may take. 0: three quarters of what the machine has available.
+  std::uint64_t memoryBytes = 0;
+  /// Most processor time that reading the file may take. 0: ten seconds, and one more for each MB.
+  unsigned seconds = 0;
+};
+
+/// Reads a whole file in a child process and drops what was read.
+/// @error FileError that names the file and what is wrong with it: missing, not a regular file, of another
+/// kind, truncated, damaged, or over a limit.
+/// @threads No other thread may be calling OpenVDB meanwhile: its locks would stay taken in the child.
+VLN_API void probeVdbFile(std::string const& path, VdbReadLimits const& limits = {});
+
+/// Version of the OpenVDB library in use, such as "10.0.1".
+VLN_API char const* openvdbVersion();
+
+} // namespace VLN::Interop

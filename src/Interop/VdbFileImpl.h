@@ -1,0 +1,20 @@
+// What Interop's own sources, and tests that speak OpenVDB themselves, share.
+#pragma once
+
+#include "Interop/VdbFile.h"
+
+#include <openvdb/openvdb.h>
+
+namespace VLN::Interop {
+
+struct VdbFile {
+  std::string path;
+  openvdb::GridPtrVec grids; ///< in the order of the file
+  openvdb::MetaMap::Ptr metadata;
+};
+
+/// Probes a file as probeVdbFile() does, then reads all of it, nothing delayed.
+/// @error FileError.
+VLN_API VdbFile readVdbFile(std::string const& path, VdbReadLimits const& limits = {});
+
+} // namespace VLN::Interop

@@ -1,0 +1,83 @@
+// From a .vdb file to volumes: one object for each transform, one channel for each grid.
+//
+//   object { "voxel_component" : VoxelTopology, "voxel_tile_tree" : Container, "<grid>" : Channel, ... }
+//
+// One VDB voxel is one sample at the deepest depth, and lies at its integer index, the sample's low corner.
+//
+//   in the file                      in the tree
+//   leaf, 8 voxels wide              tiles of 4 samples at depth 28, below one of 2-wide samples at depth 27
+//   active tile,   8 wide            a sample of a tile at depth 25
+//   active tile,  128 wide           a sample of a tile at depth 21
+//   active tile, 4096 wide           a sample of a tile at depth 16
+//
+// Above them stands the chain of ancestors up to one depth of roots, the deepest at which the whole box is at
+// most 64 tiles wide on each axis and no active tile lies higher. Grids of one object share the union of
+// their trees. Every sample of every tile holds the grid's value at the sample's corner.
+//
+// A quarter block of a leaf (4 voxels wide) is left out where that loses nothing: all its voxels are inactive
+// and equal to what a reader finds there without it. So reading the deepest tile at a voxel, or the channel's
+// default value where there is no tile, gives exactly the grid's value for all voxels of leaves and active
+// tiles.
+#pragma once
+
+#include "GeometryVolume/core/Object.h"
+#include "Interop/Progress.h"
+#include "Interop/VdbFile.h"
+#include "Velorn/Math.h"
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+namespace VLN::Interop {
+
+inline constexpr char const* kVdbContainerName = "voxel_tile_tree";
+inline constexpr char const* kVdbTopologyName = "voxel_component";
+
+/// @space Tile space; half open.
+using IndexBox = Velorn::Math::bbox<Velorn::Math::int3, int>;
+
+struct VdbChannel {
+  std::string name;     ///< of the channel in its object; unlike the grid's only where that is taken
+  std::string gridName; ///< as in the file
+  std::string type;     ///< "float"
+  int core = 0;
+  int halo = 0;
+  std::int64_t activeVoxels = 0; ///< of the grid, those of active tiles included
+  double minimum = 0;            ///< of the active values that are numbers
+  double maximum = 0;
+  bool hasRange = false; ///< whether there are such values
+  IndexBox activeBox;    ///< empty() without an active voxel
+};
+
+struct VdbVolume {
+  Ostil::Ptr<Object> object;
+  double voxelSize = 1; ///< as in the file; the container holds it as a float
+  /// Empty when the transform is one uniform scale. Otherwise what it is; world positions leave out all of it
+  /// but the voxel size along x.
+  std::string transform;
+  IndexBox activeBox;
+  std::vector<VdbChannel> channels;
+
+  VdbChannel const* channel(std::string const& name) const;
+};
+
+struct SkippedGrid {
+  std::string grid;
+  std::string reason;
+};
+
+struct VdbImport {
+  std::string file;
+  std::vector<VdbVolume> volumes; ///< in the order in which their first grids come
+  std::vector<SkippedGrid> skipped;
+};
+
+/// Reads a file and builds its volumes: each float grid becomes a Channel<Traits<2,4,0,1>, float, 4, 0> whose
+/// default value is the grid's background.
+/// @numeric The same trees and values for any number of threads.
+/// @error FileError; see probeVdbFile().
+VLN_API VdbImport importVdb(std::string const& path, VdbReadLimits const& limits = {},
+                            Progress const& progress = {});
+
+} // namespace VLN::Interop

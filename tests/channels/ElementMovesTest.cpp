@@ -1,0 +1,207 @@
+// Elements that move between tiles.
+#include "FakeTree.h"
+#include "GeometryVolume/core/Parallel.h"
+#include "ProbeChannel.h"
+
+#include <gtest/gtest.h>
+#include <random>
+#include <sstream>
+#include <utility>
+
+namespace {
+
+using namespace VLN;
+using namespace VLN::TileTree3D;
+using namespace VLN::Test;
+
+using Points = ProbeChannel<PowerOfTwoTraits, int, 4, 0>;
+
+/// Tiles {0,1,2,..}, {100,101,..}, ... at one depth.
+Points points(std::vector<int> const& sizes, int depth = 3, bool useStatic = false) {
+  Points channel(Flags{useStatic});
+  FakeTree tree;
+  tree.elements[std::size_t(depth)] = sizes;
+  channel.update(tree);
+  for (std::int64_t i = 0; i < channel.tileCount(depth); ++i)
+    for (int n = 0; n < channel.elementCount(TreeIndex{i, depth}); ++n)
+      channel[ElementTreeIndex(i, depth, n)] = int(100 * i) + n;
+  return channel;
+}
+std::vector<int> tile(Points const& channel, std::int64_t i, int depth = 3) {
+  auto const data = channel.tileData(i, depth);
+  return {data.begin(), data.end()};
+}
+using Values = std::vector<int>;
+
+class ElementMoves : public ::testing::TestWithParam<bool> {};
+INSTANTIATE_TEST_SUITE_P(HeapAndStatic, ElementMoves, ::testing::Bool());
+
+TEST_P(ElementMoves, RequirementArrivalsFollowAndHolesAreFilledFromTheTail) {
+  Points channel = points({5, 2, 3}, 3, GetParam());
+  std::vector<ElementToFrom> moves = {{1, 0, 1, 3}, {2, 0, 0, 3}, {1, 2, 2, 3}};
+  channel.update(moves, 3, false);
+  EXPECT_EQ(tile(channel, 0), (Values{4, 3, 2}));
+  EXPECT_EQ(tile(channel, 1), (Values{100, 101, 1, 202}));
+  EXPECT_EQ(tile(channel, 2), (Values{200, 201, 0}));
+}
+
+TEST_P(ElementMoves, RequirementDestinationMinusOneRemovesTheElement) {
+  Points channel = points({4, 2}, 3, GetParam());
+  std::vector<ElementToFrom> moves = {{-1, 0, 1, 3}, {-2, 1, 0, 3}};
+  channel.update(moves, 3, 3, false);
+  EXPECT_EQ(tile(channel, 0), (Values{0, 3, 2}));
+  EXPECT_EQ(tile(channel, 1), (Values{101}));
+}
+
+TEST_P(ElementMoves, RequirementMovedTailElementsArePoppedFirst) {
+  Points channel = points({6, 0}, 3, GetParam());
+  std::vector<ElementToFrom> moves = {{1, 0, 0, 3}, {1, 0, 4, 3}, {1, 0, 5, 3}};
+  channel.update(moves, 3, false);
+  EXPECT_EQ(tile(channel, 0), (Values{3, 1, 2}));
+  EXPECT_EQ(tile(channel, 1), (Values{0, 4, 5}));
+}
+
+TEST_P(ElementMoves, BoundaryAllElementsLeaveAndATileWithoutElementsReceives) {
+  Points channel = points({3, 0}, 3, GetParam());
+  std::vector<ElementToFrom> moves = {{1, 0, 2, 3}, {1, 0, 1, 3}, {1, 0, 0, 3}};
+  channel.update(moves, 3, false);
+  EXPECT_TRUE(tile(channel, 0).empty());
+  EXPECT_EQ(tile(channel, 1), (Values{0, 1, 2}));
+  EXPECT_EQ(channel.tileData(0, 3).data()->capacity(), 0u);
+}
+
+TEST_P(ElementMoves, RequirementElementsMoveBetweenDepths) {
+  Points channel(Flags{GetParam()});
+  FakeTree tree;
+  tree.elements[2] = {3};
+  tree.elements[5] = {3, 2};
+  channel.update(tree);
+  for (int n = 0; n < 3; ++n) channel[ElementTreeIndex(0, 2, n)] = 20 + n;
+  for (int n = 0; n < 3; ++n) channel[ElementTreeIndex(0, 5, n)] = 50 + n;
+  for (int n = 0; n < 2; ++n) channel[ElementTreeIndex(1, 5, n)] = 60 + n;
+  TileTree3D::ElementMoves moves(kChannelDepths);
+  // Two lists take from the same source tile: positions must be read before anything is removed.
+  moves[2] = {{0, 0, 0, 5}, {0, 1, 1, 5}};
+  moves[5] = {{1, 0, 2, 5}, {0, 0, 1, 2}};
+  channel.update(moves, false);
+  EXPECT_EQ(tile(channel, 0, 2), (Values{20, 22, 50, 61}));
+  EXPECT_EQ(tile(channel, 0, 5), (Values{51, 21}));
+  EXPECT_EQ(tile(channel, 1, 5), (Values{60, 52}));
+}
+
+TEST(ElementMovesPreparation, RequirementOrderTilesAndArrivals) {
+  Points const channel = points({5, 2, 3});
+  std::vector<ElementToFrom> moves = {{2, 1, 0, 3}, {0, 2, 1, 3}, {-1, 0, 2, 3}, {2, 0, 1, 3}};
+  std::vector<std::uint64_t> order, tiles;
+  TileArrivals arrivals;
+  channel.computePermutation(moves, order, tiles, arrivals, 3, false);
+  EXPECT_EQ(moves, (std::vector<ElementToFrom>{{2, 0, 1, 3}, {-1, 0, 2, 3}, {2, 1, 0, 3}, {0, 2, 1, 3}}));
+  EXPECT_EQ(order, (std::vector<std::uint64_t>{1, 3, 0, 2}));
+  EXPECT_EQ(tiles, (std::vector<std::uint64_t>{0, 2}));
+  EXPECT_EQ(arrivals, (TileArrivals{{0, {1, 5}}, {2, {2, 3}}}));
+}
+
+TEST(ElementMovesPreparation, BoundaryNoMoves) {
+  Points channel = points({5, 2});
+  std::vector<ElementToFrom> moves;
+  channel.update(moves, 3, false);
+  EXPECT_EQ(tile(channel, 0).size(), 5u);
+  TileTree3D::ElementMoves lists;
+  channel.update(lists, false);
+  EXPECT_EQ(tile(channel, 0).size(), 5u);
+}
+
+TEST(ElementMovesPreparation, RequirementAllocateElementStorageGrowsByTheRuns) {
+  Points channel = points({5, 2, 3});
+  channel.allocateElementStorage({0, 2}, {{0, {1, 5}}, {2, {2, 3}}}, 4, 3);
+  EXPECT_EQ(channel.elementCount(TreeIndex{0, 3}), 6);
+  EXPECT_EQ(channel.elementCount(TreeIndex{1, 3}), 2);
+  EXPECT_EQ(channel.elementCount(TreeIndex{2, 3}), 5);
+}
+
+TEST(ElementMovesPreparation, RequirementPermutationKindsReadTheSame) {
+  std::vector<ElementToFrom> const list = {{1, 0, 1, 3}, {2, 0, 0, 3}, {-1, 2, 2, 3}};
+  auto const prepared = [&](auto const& apply) {
+    Points channel = points({5, 2, 3});
+    std::vector<ElementToFrom> moves = list;
+    std::vector<std::uint64_t> order, tiles;
+    TileArrivals arrivals;
+    channel.computePermutation(moves, order, tiles, arrivals, 3, false);
+    TileTree3D::ElementMoves allMoves(4);
+    ElementOrder allOrders(4);
+    DestinationTiles allTiles(4);
+    ArrivalMap allArrivals(4);
+    allMoves[3] = moves, allOrders[3] = order, allTiles[3] = tiles, allArrivals[3] = arrivals;
+    ElementRemovals removals(4);
+    removals[3] = {{0, 0}, {0, 1}, {2, 2}};
+    apply(channel, Permutation<PowerOfTwoTraits>(moves, order, tiles, arrivals, 3, 3),
+          Permutation<PowerOfTwoTraits>(allMoves, allOrders, allTiles, allArrivals),
+          Permutation<PowerOfTwoTraits>(allMoves, allOrders, allTiles, allArrivals, removals));
+    std::vector<Values> result;
+    for (std::int64_t i = 0; i < 3; ++i) result.push_back(tile(channel, i));
+    return result;
+  };
+  auto const one =
+      prepared([](Points& c, auto const& p, auto const&, auto const&) { c.updateElementsNoDispatch(p); });
+  auto const all =
+      prepared([](Points& c, auto const&, auto const& p, auto const&) { c.updateElementsNoDispatch(p); });
+  auto const recorded =
+      prepared([](Points& c, auto const&, auto const&, auto const& p) { c.updateElementsNoDispatch(p); });
+  EXPECT_EQ(one, (std::vector<Values>{{4, 3, 2}, {100, 101, 1}, {200, 201, 0}}));
+  EXPECT_EQ(all, one);
+  EXPECT_EQ(recorded, one);
+}
+
+TEST(TileDataElementAccessor, RequirementRecordsAndApplies) {
+  Points channel = points({4, 1});
+  TileDataElementAccessor a, b;
+  a.move(ElementTreeIndex(0, 3, 2), TreeIndex{1, 3});
+  b.remove(ElementTreeIndex(0, 3, 0));
+  EXPECT_TRUE(b.elementsTo()[3].empty());
+  b.move(ElementTreeIndex(0, 3, 1), TreeIndex{1, 3});
+  a.join(b);
+  EXPECT_EQ(a.elementsTo()[3], (std::vector<ElementToFrom>{{1, 0, 2, 3}, {1, 0, 1, 3}}));
+  EXPECT_EQ(a.elementsFrom()[3], (std::vector<ElementInTile>{{0, 2}, {0, 0}, {0, 1}}));
+  std::ostringstream os;
+  a.dump(os);
+  EXPECT_NE(os.str().find("m_elementsTo[3].size() = 2\n"), std::string::npos);
+  EXPECT_NE(os.str().find("m_elementsFrom[3].size() = 3\n"), std::string::npos);
+  EXPECT_LT(os.str().find("m_elementsTo[28]"), os.str().find("m_elementsFrom[0]"));
+  channel.update(a);
+  EXPECT_EQ(tile(channel, 0), (Values{3}));
+  EXPECT_EQ(tile(channel, 1), (Values{100, 1, 2}));
+}
+
+TEST(TileDataElementAccessor, BoundaryRemovalAloneShrinksTheTileByOne) {
+  Points channel = points({4});
+  TileDataElementAccessor a;
+  a.remove(ElementTreeIndex(0, 3, 3));
+  channel.update(a);
+  EXPECT_EQ(tile(channel, 0), (Values{0, 1, 2}));
+}
+
+/// Many random moves at 1, 2 and 8 threads: the same bytes.
+TEST(ElementMovesThreads, RequirementResultDoesNotDependOnTheNumberOfThreads) {
+  auto const run = [](int threads) {
+    std::mt19937 random(77);
+    std::vector<int> sizes(300);
+    for (int& n : sizes) n = int(random() % 60);
+    Points channel = points(sizes);
+    std::vector<ElementToFrom> moves;
+    for (std::size_t i = 0; i < sizes.size(); ++i)
+      for (int n = 0; n < sizes[i]; ++n)
+        if (random() % 3 == 0) moves.push_back({int(random() % 310) - 10, std::int64_t(i), n, 3});
+    for (auto& move : moves)
+      if (move.to < 0) move.to = -1;
+    std::shuffle(moves.begin(), moves.end(), random);
+    withThreads(threads, [&] { channel.update(moves, 3, false); });
+    std::vector<Values> result;
+    for (std::int64_t i = 0; i < channel.tileCount(3); ++i) result.push_back(tile(channel, i));
+    return result;
+  };
+  auto const one = run(1);
+  EXPECT_EQ(run(2), one);
+  EXPECT_EQ(run(8), one);
+}
+
+} // namespace

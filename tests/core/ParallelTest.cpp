@@ -1,0 +1,150 @@
+// Parallel loops: coverage, order of joins, cancellation, exceptions.
+#include "GeometryVolume/core/Parallel.h"
+#include "Ostil/Job.h"
+#include "Velorn/ExceptionMessage.h"
+#include "support/Threads.h"
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <atomic>
+#include <cmath>
+#include <cstring>
+#include <numeric>
+#include <random>
+#include <stdexcept>
+#include <string>
+#include <vector>
+
+using namespace VLN;
+
+namespace {
+
+/// Cancels the job while it lives.
+struct Cancelled {
+  Cancelled() { Ostil::setJobCancelled(true); }
+  ~Cancelled() { Ostil::setJobCancelled(false); }
+};
+
+} // namespace
+
+// requirement
+TEST(Parallel, EachItemIsHandledOnce) {
+  for (int threads : {1, 2, 8}) {
+    for (std::int64_t n : {0, 1, 2, 63, 1000}) {
+      for (std::int64_t grain : {0, 1, 7, 5000}) {
+        std::vector<std::atomic<int>> hits(static_cast<std::size_t>(n));
+        AffinityPartitioner affinity;
+        withThreads(threads, [&] {
+          ParallelOptions options;
+          options.grain = grain;
+          options.affinity = grain == 7 ? &affinity : nullptr;
+          parallelFor(
+              10, 10 + n,
+              [&](std::int64_t b, std::int64_t e) {
+                EXPECT_LT(b, e);
+                for (std::int64_t i = b; i < e; ++i) ++hits[static_cast<std::size_t>(i - 10)];
+              },
+              options);
+        });
+        for (auto const& hit : hits) ASSERT_EQ(hit, 1) << threads << ' ' << n << ' ' << grain;
+      }
+    }
+  }
+  int calls = 0;
+  parallelFor(5, 5, [&](std::int64_t, std::int64_t) { ++calls; });
+  parallelFor(5, 4, [&](std::int64_t, std::int64_t) { ++calls; });
+  EXPECT_EQ(calls, 0);
+}
+
+// requirement
+TEST(Parallel, ChunksAreConsecutive) {
+  std::vector<std::pair<std::int64_t, std::int64_t>> chunks(4);
+  parallelChunks(3, 13, 3, [&](std::int64_t c, std::int64_t b, std::int64_t e) {
+    chunks[static_cast<std::size_t>(c)] = {b, e};
+  });
+  using Chunks = decltype(chunks);
+  EXPECT_EQ(chunks, (Chunks{{3, 6}, {6, 9}, {9, 12}, {12, 13}}));
+  EXPECT_EQ(chunkCount(3, 13, 3), 4);
+  EXPECT_EQ(chunkCount(3, 3, 3), 0);
+}
+
+// requirement: floating-point sums come out the same bytes with any number of threads
+TEST(Parallel, ReductionDoesNotDependOnThreads) {
+  std::vector<double> values(20000);
+  std::mt19937 random(5);
+  for (auto& v : values) v = std::ldexp(static_cast<double>(random()), static_cast<int>(random() % 60) - 30);
+  auto const sum = [&](int threads) {
+    double result = 0;
+    withThreads(threads, [&] {
+      result = parallelReduce(
+          0, static_cast<std::int64_t>(values.size()), 64, 0.0,
+          [&](std::int64_t b, std::int64_t e) {
+            return std::accumulate(&values[b], &values[e - 1] + 1, 0.0);
+          },
+          [](double a, double b) { return a + b; });
+    });
+    return result;
+  };
+  double const one = sum(1);
+  for (int threads : {2, 8}) {
+    double const many = sum(threads);
+    EXPECT_EQ(std::memcmp(&one, &many, sizeof one), 0) << threads;
+  }
+}
+
+// requirement: equal keys keep their order
+TEST(Parallel, SortOfPositionsIsStable) {
+  std::vector<int> keys(5000);
+  std::mt19937 random(7);
+  for (int& key : keys) key = static_cast<int>(random() % 10);
+  std::vector<std::uint64_t> order(keys.size());
+  std::iota(order.begin(), order.end(), 0u);
+  auto expected = order;
+  std::stable_sort(expected.begin(), expected.end(), [&](auto a, auto b) { return keys[a] < keys[b]; });
+  parallelSortPositions(order.data(), static_cast<std::int64_t>(order.size()),
+                        [&](std::uint64_t a, std::uint64_t b) { return keys[a] < keys[b]; });
+  EXPECT_EQ(order, expected);
+}
+
+// requirement
+TEST(Parallel, CancelledJobThrowsWhenPolledOnly) {
+  Cancelled const cancelled;
+  int calls = 0;
+  auto const body = [&](std::int64_t, std::int64_t) { ++calls; };
+  EXPECT_NO_THROW(parallelFor(0, 1, body));
+  EXPECT_EQ(calls, 1);
+  for (std::int64_t n : {1, 1000}) {
+    try {
+      parallelFor(0, n, body, {.cancellation = Cancellation::kPoll});
+      ADD_FAILURE() << "a cancelled job went through";
+    } catch (std::runtime_error const& e) { EXPECT_STREQ(e.what(), exceptionMessage); }
+  }
+  EXPECT_EQ(calls, 1);
+  EXPECT_NO_THROW(parallelFor(0, 0, body, {.cancellation = Cancellation::kPoll}));
+}
+
+// requirement
+TEST(Parallel, ExceptionsOfTheBodyPass) {
+  for (int threads : {1, 2}) {
+    withThreads(threads, [] {
+      EXPECT_THROW(parallelFor(0, 1000,
+                               [](std::int64_t b, std::int64_t) {
+                                 if (b >= 500) throw std::out_of_range("body");
+                               }),
+                   std::out_of_range);
+    });
+  }
+}
+
+// requirement
+TEST(Parallel, ThreadIndicesStayBelowTheNumberOfThreads) {
+  withThreads(2, [] {
+    EXPECT_EQ(parallelThreads(), 2);
+    parallelFor(0, 1000, [](std::int64_t, std::int64_t) {
+      EXPECT_GE(parallelThreadIndex(), 0);
+      EXPECT_LT(parallelThreadIndex(), 2);
+    });
+  });
+  EXPECT_GE(parallelThreads(), 1);
+}

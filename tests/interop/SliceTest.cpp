@@ -1,0 +1,150 @@
+#include "Interop/Slice.h"
+#include "ImportCheck.h"
+#include "Interop/ColorMap.h"
+
+#include <openvdb/tools/LevelSetSphere.h>
+
+#include <array>
+#include <cmath>
+#include <limits>
+#include <set>
+
+namespace {
+
+using namespace VLN::Interop;
+using namespace VLN::Test;
+using openvdb::Coord;
+
+VdbVolume volumeOf(openvdb::FloatGrid::Ptr grid) {
+  VdbFile file;
+  file.path = "in memory";
+  file.grids = {grid};
+  return importGrids(file).volumes.at(0);
+}
+
+// A ramp of a different slope on each axis, so that every voxel has its own value.
+openvdb::FloatGrid::Ptr ramp(Coord const& low, Coord const& high, double voxelSize) {
+  openvdb::initialize();
+  auto grid = openvdb::FloatGrid::create(0.0f);
+  grid->setName("ramp");
+  grid->setTransform(openvdb::math::Transform::createLinearTransform(voxelSize));
+  for (int i = low.x(); i <= high.x(); ++i)
+    for (int j = low.y(); j <= high.y(); ++j)
+      for (int k = low.z(); k <= high.z(); ++k)
+        grid->tree().setValueOn(Coord(i, j, k),
+                                float(1 + (i - low.x()) + 100 * (j - low.y()) + 10000 * (k - low.z())));
+  return grid;
+}
+
+// requirement: each pixel shows the voxel below it, the second axis upwards
+TEST(SliceTest, ShowsTheNearestSample) {
+  Coord const low(-5, 3, 10), high(10, 10, 13); // 16 x 8 x 4 voxels
+  VdbVolume const volume = volumeOf(ramp(low, high, 0.5));
+  struct Case {
+    int axis, across, up;
+  };
+  for (Case const c : {Case{0, 1, 2}, Case{1, 0, 2}, Case{2, 0, 1}}) {
+    int const at = low[c.axis] + 1;
+    int const wide = high[c.across] - low[c.across] + 1, tall = high[c.up] - low[c.up] + 1;
+    int const zoom = 8;
+    // Anywhere within half a voxel the same samples are the nearest.
+    for (double off : {-0.49, 0.0, 0.49}) {
+      Slice const slice = drawSlice(volume, "ramp", {c.axis, (at + off) * 0.5, zoom * std::max(wide, tall)});
+      EXPECT_EQ(slice.at, at * 0.5);
+      EXPECT_EQ(slice.drawn, std::int64_t(zoom) * wide * zoom * tall);
+      ColorMap const map = ColorMap::forRange(slice.low, slice.top);
+      int const left = 8, top = (slice.image.height() - zoom * tall) / 2;
+      for (int v = 0; v < tall; ++v)
+        for (int u = 0; u < wide; ++u) {
+          Coord p;
+          p[c.axis] = 1, p[c.across] = u, p[c.up] = v;
+          double const value = 1 + p.x() + 100 * p.y() + 10000 * p.z();
+          int const x = left + zoom * u + zoom / 2, y = top + zoom * (tall - 1 - v) + zoom / 2;
+          ASSERT_EQ(slice.image(x, y), map.color(value)) << "axis " << c.axis << " at " << p;
+        }
+    }
+  }
+}
+
+// requirement
+TEST(SliceTest, DefaultsToTheMiddleAndKeepsTheAspect) {
+  VdbVolume const volume = volumeOf(ramp(Coord(0), Coord(40, 20, 6), 2.0));
+  Slice const slice = drawSlice(volume, "ramp", {2, {}, 164});
+  EXPECT_EQ(slice.at, 6);
+  EXPECT_EQ(slice.drawn, 164 * 84);
+}
+
+// requirement: coarse tiles are shown, and what has no tile is grey
+TEST(SliceTest, ShowsCoarseTilesAndGaps) {
+  openvdb::initialize();
+  auto grid = openvdb::FloatGrid::create(0.0f);
+  grid->setName("fog");
+  grid->fill(openvdb::CoordBBox(Coord(0), Coord(127)), 0.5f);
+  grid->tree().setValueOn(Coord(3000, 64, 64), 2.0f);
+  Slice const slice = drawSlice(volumeOf(grid), "fog", {2, 64.0, 3001});
+  EXPECT_EQ(slice.low, 0);
+  EXPECT_EQ(slice.high, 2);
+  std::set<std::array<int, 3>> colors;
+  for (int y = 0; y < slice.image.height(); ++y)
+    for (int x = 0; x < slice.image.width(); ++x) {
+      Rgb const c = slice.image(x, y);
+      colors.insert({c.r, c.g, c.b});
+    }
+  EXPECT_TRUE(colors.count({222, 222, 222}));
+  Rgb const half = ColorMap::forRange(slice.low, slice.top).color(0.5);
+  EXPECT_TRUE(colors.count({half.r, half.g, half.b}));
+}
+
+// requirement: a level set is white at its surface, blue inside, red outside
+TEST(SliceTest, ALevelSetShowsItsZero) {
+  openvdb::initialize();
+  auto grid = openvdb::tools::createLevelSetSphere<openvdb::FloatGrid>(20, openvdb::Vec3f(0), 1.0f, 3.0f);
+  grid->setName("sphere");
+  Slice const slice = drawSlice(volumeOf(grid), "sphere", {1, 0.0, 460});
+  EXPECT_LT(slice.low, 0);
+  EXPECT_GT(slice.high, 0);
+  EXPECT_EQ(slice.top, slice.high);
+  // 45 voxels across on 460 pixels: along the middle row the surface lies at 20 voxels from the centre.
+  int const row = slice.image.height() / 2;
+  auto const pixel = [&](double voxels) {
+    return slice.image(8 + int((voxels + 22.5 + 0.5) * 460 / 46), row);
+  };
+  EXPECT_GT(pixel(20).r, 220);
+  EXPECT_GT(pixel(20).b, 220);
+  EXPECT_GT(pixel(17.6).b, pixel(17.6).r + 80);
+  EXPECT_GT(pixel(22).r, pixel(22).b + 80);
+}
+
+// boundary: what is no number has a colour of its own and no part in the range
+TEST(SliceTest, NotANumber) {
+  auto grid = ramp(Coord(0), Coord(7), 1);
+  grid->tree().setValueOn(Coord(3, 3, 3), std::nanf(""));
+  grid->tree().setValueOn(Coord(4, 3, 3), std::numeric_limits<float>::infinity());
+  Slice const slice = drawSlice(volumeOf(grid), "ramp", {2, 3.0, 80});
+  EXPECT_TRUE(std::isfinite(slice.high));
+  EXPECT_EQ(slice.image(8 + 35, (slice.image.height() - 80) / 2 + 45), ColorMap::notANumber());
+}
+
+// negative
+TEST(SliceTest, NamesWhatCannotBeDrawn) {
+  VdbVolume const volume = volumeOf(ramp(Coord(0), Coord(7), 0.5));
+  auto message = [&](std::string const& channel, SliceOptions const& options) {
+    try {
+      drawSlice(volume, channel, options);
+      return std::string();
+    } catch (std::invalid_argument const& error) { return std::string(error.what()); }
+  };
+  EXPECT_EQ(message("none", {}), "there is no channel 'none'");
+  EXPECT_EQ(message("ramp", {2, 9.0, 100}),
+            "position 9 on axis z misses the active voxels, which lie in 0..3.5");
+  EXPECT_NE(message("ramp", {2, std::nan(""), 100}), "");
+  EXPECT_NE(message("ramp", {2, 1e300, 100}), "");
+  EXPECT_NE(message("ramp", {3, {}, 100}), "");
+  EXPECT_NE(message("ramp", {2, {}, 1}), "");
+  EXPECT_EQ(message("ramp", {2, 3.5, 100}), "");
+  auto empty = openvdb::FloatGrid::create(1.0f);
+  empty->setName("empty");
+  EXPECT_THROW(drawSlice(volumeOf(empty), "empty", {}), std::invalid_argument);
+}
+
+} // namespace

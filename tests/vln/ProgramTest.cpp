@@ -1,0 +1,299 @@
+// The program as its users meet it: run as a process, judged by what it says, writes and returns.
+#include "support/PngReader.h"
+#include "support/RunProgram.h"
+
+#include <gtest/gtest.h>
+#include <nlohmann/json.hpp>
+#include <openvdb/openvdb.h>
+
+#include <algorithm>
+#include <array>
+#include <set>
+
+namespace {
+
+using namespace VLN::Test;
+using Json = nlohmann::ordered_json;
+
+RunResult vln(std::vector<std::string> arguments) {
+  arguments.insert(arguments.begin(), VLN_PROGRAM);
+  return runProgram(arguments);
+}
+
+// Every failure: exit code 1, nothing on standard output, one line on standard error.
+void expectFailure(RunResult const& run, std::string const& line) {
+  EXPECT_EQ(run.code, 1);
+  EXPECT_EQ(run.out, "");
+  EXPECT_EQ(std::count(run.err.begin(), run.err.end(), '\n'), 1) << run.err;
+  EXPECT_EQ(run.err, "vln: " + line + "\n");
+}
+
+std::vector<std::string> keysOf(Json const& object) {
+  std::vector<std::string> keys;
+  for (auto const& item : object.items()) keys.push_back(item.key());
+  return keys;
+}
+
+int distinctColors(VLN::Interop::Image const& image) {
+  std::set<std::array<int, 3>> colors;
+  for (int y = 0; y < image.height(); ++y)
+    for (int x = 0; x < image.width(); ++x) colors.insert({image(x, y).r, image(x, y).g, image(x, y).b});
+  return int(colors.size());
+}
+
+class ProgramTest : public testing::Test {
+protected:
+  // A small torus, made by the program.
+  std::string torus(std::string const& name = "torus.vdb") {
+    std::string const path = m_folder / name;
+    RunResult const run = vln({"make", "torus", path, "--voxels", "20000"});
+    EXPECT_EQ(run.code, 0) << run.err;
+    return path;
+  }
+
+  TempFolder m_folder;
+};
+
+// requirement
+TEST_F(ProgramTest, TellsItsVersionAndItsUse) {
+  RunResult const version = vln({"--version"});
+  EXPECT_EQ(version.code, 0);
+  EXPECT_EQ(version.out.rfind("vln ", 0), 0u) << version.out;
+  EXPECT_EQ(std::count(version.out.begin(), version.out.end(), '\n'), 1);
+  RunResult const help = vln({"--help"});
+  EXPECT_EQ(help.code, 0);
+  for (char const* command : {"info", "slice", "make"}) {
+    EXPECT_NE(help.out.find("\n  vln " + std::string(command) + " "), std::string::npos) << help.out;
+    RunResult const one = vln({command, "--help"});
+    EXPECT_EQ(one.code, 0);
+    EXPECT_NE(one.out.find("Example:\n  vln " + std::string(command) + " "), std::string::npos) << one.out;
+  }
+}
+
+// requirement: the keys of the report are fixed
+TEST_F(ProgramTest, InfoAsJsonHasStableKeys) {
+  std::string const path = torus();
+  RunResult const run = vln({"info", path, "--json"});
+  ASSERT_EQ(run.code, 0) << run.err;
+  EXPECT_EQ(run.err, "");
+  Json const j = Json::parse(run.out);
+  EXPECT_EQ(keysOf(j), (std::vector<std::string>{"file", "objects", "skipped"}));
+  EXPECT_EQ(j["file"], path);
+  EXPECT_EQ(j["skipped"], Json::array());
+  ASSERT_EQ(j["objects"].size(), 1u);
+  Json const& object = j["objects"][0];
+  EXPECT_EQ(keysOf(object),
+            (std::vector<std::string>{"voxel_size", "tiles", "channels", "memory", "world_bounds"}));
+  ASSERT_FALSE(object["tiles"].empty());
+  std::int64_t tiles = 0;
+  for (Json const& depth : object["tiles"]) {
+    EXPECT_EQ(keysOf(depth), (std::vector<std::string>{"depth", "count"}));
+    EXPECT_GT(depth["count"], 0);
+    tiles += depth["count"].get<std::int64_t>();
+  }
+  ASSERT_EQ(object["channels"].size(), 1u);
+  Json const& channel = object["channels"][0];
+  EXPECT_EQ(keysOf(channel),
+            (std::vector<std::string>{"name", "type", "core", "halo", "elements", "active", "min", "max"}));
+  EXPECT_EQ(channel["name"], "surface");
+  EXPECT_EQ(channel["type"], "float");
+  EXPECT_EQ(channel["core"], 4);
+  EXPECT_EQ(channel["halo"], 0);
+  EXPECT_EQ(channel["elements"], 64 * tiles);
+  EXPECT_NEAR(channel["active"].get<double>(), 20000, 200);
+  EXPECT_LT(channel["min"], 0);
+  EXPECT_GT(channel["max"], 0);
+  EXPECT_EQ(keysOf(object["memory"]), (std::vector<std::string>{"used", "allocated"}));
+  EXPECT_GT(object["memory"]["used"], 4 * 64 * tiles);
+  EXPECT_GE(object["memory"]["allocated"], object["memory"]["used"]);
+  double const size = object["voxel_size"];
+  ASSERT_EQ(object["world_bounds"].size(), 2u);
+  for (std::size_t a = 0; a < 3; ++a) {
+    // The torus is 1.4 wide from its middle, 0.4 along z; its band adds 3 voxels and the tiles at most 4.
+    double const far = (a == 2 ? 0.4 : 1.4) + 3 * size;
+    EXPECT_NEAR(object["world_bounds"][0][a], -far, 4.01 * size);
+    EXPECT_NEAR(object["world_bounds"][1][a], far, 4.01 * size);
+  }
+}
+
+// requirement
+TEST_F(ProgramTest, InfoPrintsTables) {
+  std::string const path = torus();
+  RunResult const run = vln({"info", path});
+  ASSERT_EQ(run.code, 0) << run.err;
+  EXPECT_EQ(run.err, "");
+  EXPECT_EQ(run.out.rfind(path + "\n", 0), 0u);
+  for (char const* part : {"voxel size", "world box", "depth", "surface", "float", "active voxels", "MB used",
+                           "MB allocated", "bytes for each active voxel"})
+    EXPECT_NE(run.out.find(part), std::string::npos) << part << " in\n" << run.out;
+  EXPECT_EQ(run.out.find('\r'), std::string::npos);
+}
+
+// boundary: grids that do not come in, an empty one, and a transform that is more than a scale
+TEST_F(ProgramTest, InfoNamesWhatIsLeftOut) {
+  openvdb::initialize();
+  auto vectors = openvdb::Vec3SGrid::create();
+  vectors->setName("velocity");
+  auto empty = openvdb::FloatGrid::create(2.0f);
+  empty->setName("empty");
+  empty->transform().postTranslate(openvdb::Vec3d(1, 2, 3));
+  std::string const path = m_folder / "odd.vdb";
+  openvdb::io::File(path).write(openvdb::GridPtrVec{vectors, empty});
+
+  RunResult const text = vln({"info", path});
+  EXPECT_EQ(text.code, 0);
+  EXPECT_NE(text.out.find("velocity: grids of type vec3s are not read yet"), std::string::npos) << text.out;
+  EXPECT_NE(text.out.find("note: the transform is a uniform scale with a translation"), std::string::npos);
+  EXPECT_NE(text.out.find("no voxel is active"), std::string::npos);
+
+  RunResult const json = vln({"info", path, "--json"});
+  Json const j = Json::parse(json.out);
+  ASSERT_EQ(j["skipped"].size(), 1u);
+  EXPECT_EQ(keysOf(j["skipped"][0]), (std::vector<std::string>{"grid", "reason"}));
+  EXPECT_EQ(j["skipped"][0]["grid"], "velocity");
+  EXPECT_EQ(j["objects"][0]["world_bounds"], nullptr);
+  EXPECT_EQ(j["objects"][0]["channels"][0]["active"], 0);
+  EXPECT_EQ(j["objects"][0]["channels"][0]["min"], nullptr);
+  EXPECT_NE(json.err.find("note: the transform"), std::string::npos);
+}
+
+// requirement: a picture that shows something
+TEST_F(ProgramTest, SliceWritesAPicture) {
+  std::string const path = torus(), picture = m_folder / "slice.png";
+  for (char const* axis : {"x", "y", "z"}) {
+    RunResult const run =
+        vln({"slice", path, "--channel", "surface", "--axis", axis, "--size", "200", "-o", picture});
+    ASSERT_EQ(run.code, 0) << run.err;
+    EXPECT_EQ(run.err, "");
+    VLN::Interop::Image const image = readPng(picture);
+    EXPECT_GE(std::max(image.width(), image.height()), 200);
+    EXPECT_GT(distinctColors(image), 60) << axis;
+  }
+  RunResult const run =
+      vln({"slice", path, "--channel", "surface", "--axis", "z", "--at", "0.2", "-o", picture});
+  EXPECT_EQ(run.code, 0) << run.err;
+  EXPECT_NE(run.out.find("surface at z = 0.2"), std::string::npos) << run.out;
+}
+
+// requirement
+TEST_F(ProgramTest, MakeIsRepeatable) {
+  std::string const a = m_folder / "a.vdb", b = m_folder / "b.vdb";
+  for (char const* shape : {"cloud", "torus"}) {
+    ASSERT_EQ(vln({"make", shape, a, "--voxels", "5000"}).code, 0);
+    ASSERT_EQ(vln({"make", shape, b, "--voxels", "5000"}).code, 0);
+    EXPECT_TRUE(readAll(a) == readAll(b)) << shape;
+  }
+  EXPECT_EQ(m_folder.names().size(), 2u);
+}
+
+// negative
+TEST_F(ProgramTest, BadFilesEndInOneLine) {
+  std::string const missing = m_folder / "missing.vdb", foreign = m_folder / "foreign.vdb",
+                    picture = m_folder / "p.png";
+  writeAll(foreign, "certainly no volume");
+  std::string const whole = torus(), cut = m_folder / "cut.vdb";
+  writeAll(cut, readAll(whole).substr(0, 10000));
+  struct Case {
+    std::string file, reason;
+  };
+  for (Case const& c : {Case{missing, "No such file or directory"}, Case{foreign, "is not an OpenVDB file"},
+                        Case{m_folder.path(), "is a directory"},
+                        Case{cut, "is truncated or damaged: data that it announces is missing"}}) {
+    expectFailure(vln({"info", c.file}), c.file + ": " + c.reason);
+    expectFailure(vln({"info", c.file, "--json"}), c.file + ": " + c.reason);
+    expectFailure(vln({"slice", c.file, "--channel", "surface", "--axis", "x", "-o", picture}),
+                  c.file + ": " + c.reason);
+  }
+  expectFailure(vln({"info", whole, "--max-memory", "1"}),
+                whole + ": is damaged, or needs more than 1 MB of memory");
+  EXPECT_FALSE(std::filesystem::exists(picture));
+}
+
+// negative
+TEST_F(ProgramTest, WhatCannotBeDrawnEndsInOneLine) {
+  std::string const path = torus(), picture = m_folder / "p.png";
+  expectFailure(vln({"slice", path, "--channel", "density", "--axis", "x", "-o", picture}),
+                path + ": has no channel 'density'; it has surface");
+  RunResult const off =
+      vln({"slice", path, "--channel", "surface", "--axis", "x", "--at", "77", "-o", picture});
+  EXPECT_EQ(off.code, 1);
+  EXPECT_NE(off.err.find("position 77 on axis x misses the active voxels"), std::string::npos) << off.err;
+  expectFailure(vln({"slice", path, "--channel", "surface", "--axis", "x", "-o", m_folder / "no/p.png"}),
+                (m_folder / "no/p.png") + ": cannot be written: No such file or directory");
+  expectFailure(vln({"make", "cloud", m_folder.path()}), m_folder.path() + ": is a directory");
+  EXPECT_EQ(m_folder.names(), std::vector<std::string>{"torus.vdb"});
+}
+
+// negative
+TEST_F(ProgramTest, BadOptionsEndInOneLine) {
+  std::vector<std::vector<std::string>> const cases = {
+      {},
+      {"frobnicate"},
+      {"info"},
+      {"info", "a.vdb", "--frob"},
+      {"info", "a.vdb", "b.vdb"},
+      {"slice", "a.vdb"},
+      {"slice", "a.vdb", "--channel", "d", "--axis", "w", "-o", "p.png"},
+      {"slice", "a.vdb", "--channel", "d", "--axis", "x", "--size", "9", "-o", "p.png"},
+      {"slice", "a.vdb", "--channel", "d", "--axis", "x", "--at", "here", "-o", "p.png"},
+      {"make", "cube", "a.vdb"},
+      {"make", "cloud", "a.vdb", "--voxels", "-5"},
+      {"make", "cloud", "a.vdb", "--voxels", "many"},
+      {"info", "a.vdb", "--max-memory", "0"},
+  };
+  for (auto const& arguments : cases) {
+    RunResult const run = vln(arguments);
+    std::string const line = arguments.empty() ? "" : arguments.back();
+    EXPECT_EQ(run.code, 1) << line;
+    EXPECT_EQ(run.out, "") << line;
+    EXPECT_EQ(std::count(run.err.begin(), run.err.end(), '\n'), 1) << line << "\n" << run.err;
+    EXPECT_EQ(run.err.rfind("vln: ", 0), 0u) << run.err;
+  }
+}
+
+// boundary: a full disk is an error, not a silence
+TEST_F(ProgramTest, TellsThatItsOutputIsLost) {
+  if (!std::filesystem::exists("/dev/full")) GTEST_SKIP() << "no /dev/full";
+  std::string const path = torus();
+  RunResult const run =
+      runProgram({"/bin/sh", "-c", std::string("'") + VLN_PROGRAM + "' info '" + path + "' > /dev/full"});
+  EXPECT_EQ(run.code, 1);
+  EXPECT_EQ(run.err, "vln: standard output cannot be written\n");
+}
+
+class RealFile : public testing::TestWithParam<char const*> {};
+
+// requirement: info and slice on every file of the shared data
+TEST_P(RealFile, IsReportedAndDrawn) {
+  std::string const path = dataFile(std::string("vdb/") + GetParam());
+  if (path.empty()) GTEST_SKIP() << "no shared test data";
+  TempFolder folder;
+  RunResult const run = vln({"info", path, "--json"});
+  ASSERT_EQ(run.code, 0) << run.err;
+  Json const j = Json::parse(run.out);
+  for (Json const& object : j["objects"])
+    for (Json const& channel : object["channels"]) {
+      std::string const name = channel["name"], picture = folder / "p.png";
+      RunResult const slice =
+          vln({"slice", path, "--channel", name, "--axis", "z", "--size", "200", "-o", picture});
+      if (channel["active"] == 0) {
+        expectFailure(slice, path + ": channel '" + name + "' has no active voxel");
+        continue;
+      }
+      ASSERT_EQ(slice.code, 0) << slice.err;
+      EXPECT_GT(distinctColors(readPng(picture)), 20) << name;
+    }
+  for (Json const& skipped : j["skipped"])
+    EXPECT_NE(skipped["reason"].get<std::string>().find("are not read yet"), std::string::npos);
+}
+
+INSTANTIATE_TEST_SUITE_P(Shared, RealFile,
+                         testing::Values("bunny_ls_128.vdb", "bunny_ls_512_half.vdb",
+                                         "mantaflow_smoke_0010.vdb", "smoke.vdb", "sphere.vdb",
+                                         "sphereCd.vdb", "sphere_points.vdb", "spot_ls_128.vdb"),
+                         [](auto const& param) {
+                           std::string name = param.param;
+                           return name.substr(0, name.find('.'));
+                         });
+
+} // namespace

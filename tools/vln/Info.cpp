@@ -1,0 +1,200 @@
+#include "GeometryVolume/channels/Channel.h"
+#include "GeometryVolume/tiletree/Container.h"
+#include "Interop/FileError.h"
+#include "Interop/VdbImport.h"
+#include "vln/Commands.h"
+#include "vln/ProgressBar.h"
+
+#include <array>
+#include <cstdlib>
+#include <iostream>
+
+#include <fmt/format.h>
+#include <nlohmann/json.hpp>
+
+namespace Vln {
+
+namespace {
+
+using namespace VLN::Interop;
+using VdbTraits = VLN::TileTree3D::Traits<2, 4, 0, 1>;
+using Container = VLN::TileTree3D::Container<VdbTraits>;
+using Json = nlohmann::ordered_json;
+
+struct Memory {
+  std::uint64_t used = 0, allocated = 0;
+};
+
+Memory memoryOf(VLN::Object const& object) {
+  Memory memory;
+  for (auto const& name : object.componentRange()) {
+    Memory one;
+    object.component(name)->memUse(one.used, one.allocated, true);
+    memory.used += one.used, memory.allocated += one.allocated;
+  }
+  return memory;
+}
+
+std::int64_t elementsOf(VdbVolume const& volume, std::string const& channel) {
+  return static_cast<std::int64_t>(volume.object->component(channel)->size());
+}
+
+std::int64_t activeVoxels(VdbVolume const& volume) {
+  std::int64_t count = 0;
+  for (auto const& channel : volume.channels) count += channel.activeVoxels;
+  return count;
+}
+
+using Bounds = std::array<std::array<double, 3>, 2>;
+
+// World box of the finest tiles that hold active voxels; their corners are multiples of the tile's width.
+Bounds worldBounds(VdbVolume const& volume) {
+  Bounds bounds{};
+  constexpr int kWidth = VdbTraits::width(VdbTraits::kMaxDepth);
+  for (int a = 0; a < 3; ++a) {
+    auto const axis = static_cast<std::size_t>(a);
+    auto const tiles = [&](int c) { return std::int64_t(VdbTraits::align(c, VdbTraits::kMaxDepth)); };
+    bounds[0][axis] = double(tiles(volume.activeBox.min[a])) * volume.voxelSize;
+    bounds[1][axis] = double(tiles(volume.activeBox.max[a] - 1) + kWidth) * volume.voxelSize;
+  }
+  return bounds;
+}
+
+// A float's value in the fewest digits that name it.
+double shortest(double value) {
+  auto const f = static_cast<float>(value);
+  return double(f) == value ? std::strtod(fmt::format("{}", f).c_str(), nullptr) : value;
+}
+
+Json channelJson(VdbVolume const& volume, VdbChannel const& channel) {
+  Json j = {{"name", channel.name},
+            {"type", channel.type},
+            {"core", channel.core},
+            {"halo", channel.halo},
+            {"elements", elementsOf(volume, channel.name)},
+            {"active", channel.activeVoxels},
+            {"min", nullptr},
+            {"max", nullptr}};
+  if (channel.hasRange) j["min"] = shortest(channel.minimum), j["max"] = shortest(channel.maximum);
+  return j;
+}
+
+Json volumeJson(VdbVolume const& volume) {
+  auto const container = volume.object->component<Container>(kVdbContainerName);
+  Json tiles = Json::array(), channels = Json::array();
+  for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth)
+    if (auto const count = container->tileCount(depth); count > 0)
+      tiles.push_back({{"depth", depth}, {"count", count}});
+  for (auto const& channel : volume.channels) channels.push_back(channelJson(volume, channel));
+  Memory const memory = memoryOf(*volume.object);
+  Json j = {{"voxel_size", shortest(volume.voxelSize)},
+            {"tiles", tiles},
+            {"channels", channels},
+            {"memory", {{"used", memory.used}, {"allocated", memory.allocated}}},
+            {"world_bounds", nullptr}};
+  if (!volume.activeBox.empty()) j["world_bounds"] = worldBounds(volume);
+  return j;
+}
+
+void printJson(VdbImport const& content) {
+  Json j = {{"file", content.file}, {"objects", Json::array()}, {"skipped", Json::array()}};
+  for (auto const& volume : content.volumes) j["objects"].push_back(volumeJson(volume));
+  for (auto const& s : content.skipped) j["skipped"].push_back({{"grid", s.grid}, {"reason", s.reason}});
+  // Names in a file may be of any bytes.
+  std::cout << j.dump(2, ' ', false, Json::error_handler_t::replace) << "\n";
+}
+
+// 1234567 as "1,234,567".
+std::string grouped(std::int64_t n) {
+  std::string const digits = std::to_string(n);
+  std::string text;
+  for (std::size_t at = 0; at < digits.size(); ++at) {
+    if (at > 0 && digits[at - 1] != '-' && (digits.size() - at) % 3 == 0) text += ',';
+    text += digits[at];
+  }
+  return text;
+}
+
+std::string number(double value) { return fmt::format("{:.6g}", value); }
+
+void printVolume(VdbVolume const& volume, std::size_t n) {
+  auto const container = volume.object->component<Container>(kVdbContainerName);
+  auto& out = std::cout;
+  out << fmt::format("\nobject {}: voxel size {} world units\n", n, number(volume.voxelSize));
+  if (!volume.transform.empty())
+    out << fmt::format(
+        "  note: the transform is {};\n        world positions leave out all but the voxel size\n",
+        volume.transform);
+  if (volume.activeBox.empty()) {
+    out << "  world box: none, no voxel is active\n";
+  } else {
+    auto const& a = volume.activeBox;
+    Bounds const b = worldBounds(volume);
+    out << fmt::format("  world box: ({}, {}, {}) .. ({}, {}, {})\n", number(b[0][0]), number(b[0][1]),
+                       number(b[0][2]), number(b[1][0]), number(b[1][1]), number(b[1][2]));
+    out << fmt::format("  active voxels: {} x {} x {}, from index ({}, {}, {})\n",
+                       grouped(std::int64_t(a.max.x) - a.min.x), grouped(std::int64_t(a.max.y) - a.min.y),
+                       grouped(std::int64_t(a.max.z) - a.min.z), a.min.x, a.min.y, a.min.z);
+  }
+
+  out << fmt::format("\n  {:>5}  {:>12}  {:>12}  {:>14}\n", "depth", "tile width", "sample width", "tiles");
+  for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth)
+    if (auto const count = container->tileCount(depth); count > 0)
+      out << fmt::format("  {:>5}  {:>12}  {:>12}  {:>14}\n", depth, grouped(VdbTraits::width(depth)),
+                         grouped(VdbTraits::width(depth) / VdbTraits::kTDW), grouped(count));
+  out << fmt::format("  {:>5}  {:>12}  {:>12}  {:>14}\n", "all", "", "", grouped(container->tileCount(-1)));
+
+  std::size_t width = 7;
+  for (auto const& channel : volume.channels) width = std::max(width, oneLine(channel.name, 60).size());
+  out << fmt::format("\n  {:<{}}  {:<6} {:>4} {:>4}  {:>14}  {:>14}  {:>12}  {:>12}\n", "channel", width,
+                     "type", "core", "halo", "elements", "active voxels", "min", "max");
+  for (auto const& channel : volume.channels)
+    out << fmt::format("  {:<{}}  {:<6} {:>4} {:>4}  {:>14}  {:>14}  {:>12}  {:>12}\n",
+                       oneLine(channel.name, 60), width, channel.type, channel.core, channel.halo,
+                       grouped(elementsOf(volume, channel.name)), grouped(channel.activeVoxels),
+                       channel.hasRange ? number(channel.minimum) : "-",
+                       channel.hasRange ? number(channel.maximum) : "-");
+
+  Memory const memory = memoryOf(*volume.object);
+  auto const active = activeVoxels(volume);
+  out << fmt::format("\n  memory: {:.2f} MB used, {:.2f} MB allocated", double(memory.used) / 1e6,
+                     double(memory.allocated) / 1e6);
+  if (active > 0)
+    out << fmt::format("; {:.1f} bytes for each active voxel of a channel",
+                       double(memory.used) / double(active));
+  out << "\n";
+}
+
+void printTables(VdbImport const& content) {
+  std::cout << content.file << "\n";
+  std::size_t n = 0;
+  for (auto const& volume : content.volumes) printVolume(volume, ++n);
+  if (content.volumes.empty()) std::cout << "\nno float grid\n";
+  if (content.skipped.empty()) return;
+  std::cout << "\nskipped\n";
+  for (auto const& s : content.skipped)
+    std::cout << fmt::format("  {}: {}\n", oneLine(s.grid, 60), oneLine(s.reason));
+}
+
+} // namespace
+
+void info(InfoOptions const& options) {
+  VdbImport content;
+  {
+    ProgressBar bar;
+    content = importVdb(options.file, options.limits, bar.progress());
+  }
+  if (options.json) {
+    printJson(content);
+    // The report has no place for it.
+    for (auto const& volume : content.volumes)
+      if (!volume.transform.empty())
+        std::cerr << fmt::format("vln: {}: note: the transform is {}; world positions leave out all but the "
+                                 "voxel size\n",
+                                 content.file, volume.transform);
+  } else {
+    printTables(content);
+  }
+}
+
+} // namespace Vln

@@ -1,0 +1,15 @@
+#include "Interop/VdbMake.h"
+#include "vln/Commands.h"
+#include "vln/ProgressBar.h"
+
+namespace Vln {
+
+void make(MakeOptions const& options) {
+  ProgressBar bar;
+  if (options.shape == "cloud")
+    VLN::Interop::makeCloud(options.output, options.voxels, bar.progress());
+  else
+    VLN::Interop::makeTorus(options.output, options.voxels, bar.progress());
+}
+
+} // namespace Vln

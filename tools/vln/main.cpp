@@ -1,0 +1,140 @@
+// vln: looks at volumes from the command line.
+//
+// Whatever goes wrong at the edges ends in one line on standard error and exit code 1.
+#include "GeometryVolume/core/Version.h"
+#include "Interop/FileError.h"
+#include "Interop/OutputFile.h"
+#include "Interop/VdbFile.h"
+#include "Interop/VdbMake.h"
+#include "vln/Commands.h"
+
+#include <CLI/CLI.hpp>
+
+#include <csignal>
+#include <cstdio>
+#include <exception>
+#include <iostream>
+#include <new>
+
+#include <unistd.h>
+
+namespace {
+
+std::string versionText() {
+  auto const& v = VLN::versionInfo();
+  return "vln " + std::to_string(v.majorNumber) + "." + std::to_string(v.minorNumber) + "." +
+         std::to_string(v.patchNumber) + " (commit " + v.commit + ", " + v.buildDate + ", OpenVDB " +
+         VLN::Interop::openvdbVersion() + ")";
+}
+
+int fail(std::string const& message) {
+  std::cerr << "vln: " << VLN::Interop::oneLine(message, 1000) << std::endl;
+  return 1;
+}
+
+// An interrupted run leaves nothing half-written behind.
+extern "C" void onInterrupt(int number) {
+  VLN::Interop::removeUnfinishedOutput();
+  signal(number, SIG_DFL);
+  raise(number);
+}
+
+void addMemoryLimit(CLI::App& command, VLN::Interop::VdbReadLimits& limits) {
+  command
+      .add_option_function<std::uint64_t>(
+          "--max-memory", [&limits](std::uint64_t const& mb) { limits.memoryBytes = mb * 1000000; },
+          "Most memory in MB that reading the file may take (default: three quarters of what is available)")
+      ->check(CLI::Range(std::uint64_t(1), std::uint64_t(1) << 40))
+      ->type_name("MB");
+}
+
+struct Options {
+  Vln::InfoOptions info;
+  Vln::SliceOptions slice;
+  Vln::MakeOptions make;
+};
+
+void addInfo(CLI::App& app, Vln::InfoOptions& o) {
+  auto* command = app.add_subcommand("info", "Report what a volume file holds");
+  command->add_option("FILE", o.file, "A .vdb file")->required();
+  command->add_flag("--json", o.json, "One JSON object instead of tables");
+  addMemoryLimit(*command, o.limits);
+  command->footer("Example:\n  vln info smoke.vdb");
+  command->callback([&o] { Vln::info(o); });
+}
+
+void addSlice(CLI::App& app, Vln::SliceOptions& o) {
+  auto* command = app.add_subcommand("slice", "Draw a channel on a plane as a PNG picture");
+  command->add_option("FILE", o.file, "A .vdb file")->required();
+  command->add_option("--channel", o.channel, "Name of the channel, as info tells it")
+      ->required()
+      ->type_name("NAME");
+  command
+      ->add_option_function<std::string>(
+          "--axis", [&o](std::string const& axis) { o.plane.axis = axis[0] - 'x'; },
+          "Axis that the plane stands across: x, y or z")
+      ->required()
+      ->check(CLI::IsMember({"x", "y", "z"}))
+      ->type_name("AXIS");
+  command->add_option("--at", o.plane.at, "World position on the axis (default: middle of the active voxels)")
+      ->type_name("W");
+  command->add_option("--size", o.plane.size, "Pixels along the longer side")
+      ->check(CLI::Range(VLN::Interop::kSmallestSlice, VLN::Interop::kLargestSlice))
+      ->capture_default_str()
+      ->type_name("N");
+  command->add_option("-o,--output", o.output, "The PNG file to write")->required()->type_name("OUT.png");
+  addMemoryLimit(*command, o.limits);
+  command->footer("Example:\n  vln slice smoke.vdb --channel density --axis z -o slice.png");
+  command->callback([&o] { Vln::slice(o); });
+}
+
+void addMake(CLI::App& app, Vln::MakeOptions& o) {
+  auto* command = app.add_subcommand("make", "Write a generated volume");
+  command->add_option("SHAPE", o.shape, "cloud (fog volume \"density\") or torus (level set \"surface\")")
+      ->required()
+      ->check(CLI::IsMember({"cloud", "torus"}))
+      ->type_name("cloud|torus");
+  command->add_option("OUT", o.output, "The .vdb file to write")->required()->type_name("OUT.vdb");
+  command->add_option("--voxels", o.voxels, "About how many active voxels")
+      ->check(CLI::Range(VLN::Interop::kFewestMadeVoxels, VLN::Interop::kMostMadeVoxels))
+      ->capture_default_str()
+      ->type_name("N");
+  command->footer("Example:\n  vln make cloud cloud.vdb --voxels 1000000");
+  command->callback([&o] { Vln::make(o); });
+}
+
+} // namespace
+
+int main(int argc, char** argv) {
+  for (int number : {SIGINT, SIGTERM, SIGHUP}) signal(number, onInterrupt);
+  // A reader that goes away (vln info FILE | head) is an error to be told, not a death.
+  signal(SIGPIPE, SIG_IGN);
+
+  CLI::App app("Looks at sparse volumes: what a file holds, and what it looks like.", "vln");
+  app.set_version_flag("--version", versionText());
+  app.set_help_flag("-h,--help", "Show this help");
+  app.set_help_all_flag("--help-all", "Show the help of all commands");
+  app.require_subcommand(1);
+  app.footer("Examples:\n"
+             "  vln info smoke.vdb\n"
+             "  vln slice smoke.vdb --channel density --axis z -o slice.png\n"
+             "  vln make cloud cloud.vdb --voxels 1000000\n"
+             "\n'vln COMMAND --help' tells the options of a command.");
+  Options options;
+  addInfo(app, options.info);
+  addSlice(app, options.slice);
+  addMake(app, options.make);
+
+  try {
+    app.parse(argc, argv);
+    std::cout.flush();
+    if (!std::cout) return fail("standard output cannot be written");
+    return 0;
+  } catch (CLI::Success const& done) { // --help and --version
+    return app.exit(done);
+  } catch (CLI::ParseError const& error) {
+    return fail(std::string(error.what()) + " (vln --help tells more)");
+  } catch (std::bad_alloc const&) { return fail("out of memory"); } catch (std::exception const& error) {
+    return fail(error.what());
+  }
+}
