@@ -11,6 +11,7 @@
 // elements in every tile.
 #pragma once
 
+#include "GeometryVolume/channels/ElementIterator.h"
 #include "GeometryVolume/channels/TileData.h"
 #include "GeometryVolume/channels/TypedChannel.h"
 #include "GeometryVolume/tiletree/Tile.h"
@@ -28,6 +29,12 @@ public:
   using ConstTile = ConstTileData<T, E, H>;
   using WritableTile = TileData<T, E, H>;
   using TileDataElementAccessor = TileTree3D::TileDataElementAccessor;
+  /// All elements, depth by depth and tile by tile; empty tiles and depths are not seen.
+  template <class TD, class VecIterator, class Reference, class Pointer, class ChannelPointer>
+  using IteratorBase = ElementIteratorBase<TD, VecIterator, Reference, Pointer, ChannelPointer>;
+  using Iterator = IteratorBase<WritableTile, typename TileVector<T>::iterator, T&, T*, Channel*>;
+  using ConstIterator =
+      IteratorBase<ConstTile, typename TileVector<T>::const_iterator, T const&, T const*, Channel const*>;
 
   static constexpr int kExtended = E - TraitsT::kTileDataWidth;
   static constexpr int kHalo = H;
@@ -92,10 +99,43 @@ public:
   WritableTile tileData(std::int64_t index, int depth) { return tileData(TreeIndex{index, depth}); }
   ConstTile tileData(std::int64_t index, int depth) const { return tileData(TreeIndex{index, depth}); }
 
+  /// Grows and shrinks single tiles. Owns nothing.
+  /// @pre As for the views that may write.
+  class TileDataAccessor {
+  public:
+    TileDataAccessor(TileDataAccessor&&) = default;
+    TileDataAccessor& operator=(TileDataAccessor&&) = default;
+    DynamicTileData<WritableTile> tileData(TreeIndex const& tile) const {
+      return DynamicTileData<WritableTile>(&m_channel->tileVector(tile));
+    }
+    DynamicTileData<WritableTile> tileData(std::int64_t flat) const {
+      return tileData(m_channel->indexToTreeIndex(flat));
+    }
+
+  protected:
+    friend class Channel;
+    explicit TileDataAccessor(Channel& channel)
+        : m_channel(&channel) {}
+
+  private:
+    Channel* m_channel;
+  };
+  TileDataAccessor tileDataAccessor() { return TileDataAccessor(*this); }
+
+  // Elements in order
+  Iterator begin() { return Iterator(this, true); }
+  Iterator end() { return Iterator(this, false); }
+  ConstIterator begin() const { return cbegin(); }
+  ConstIterator end() const { return cend(); }
+  ConstIterator cbegin() const { return ConstIterator(this, true); }
+  ConstIterator cend() const { return ConstIterator(this, false); }
+
 protected:
   Ostil::Ptr<Data> getData() const { return Ostil::staticCast<Data>(this->m_data); }
 
 private:
+  template <class, class, class, class, class> friend class ElementIteratorBase;
+
   template <class Vector> static auto& element(Vector& v, int at) { return v[static_cast<std::size_t>(at)]; }
 };
 
