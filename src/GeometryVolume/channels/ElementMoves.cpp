@@ -74,9 +74,39 @@ void sortRemovals(std::vector<ElementInTile>& elements) {
   sortRecords(elements, [](ElementInTile const& a, ElementInTile const& b) { return a < b; });
 }
 
-void groupByDestination(std::vector<ElementToFrom> const& moves, std::vector<std::uint64_t>& order,
-                        std::vector<std::uint64_t>& tiles, TileArrivals& arrivals,
-                        FunctionRef<int(std::int64_t)> elementCount) {
+namespace {
+
+struct Run {
+  std::int64_t tile;
+  std::uint64_t start;
+};
+
+/// Sorts by counting: linear, where the destinations are few. @return false when they are not.
+bool countByDestination(std::vector<ElementToFrom> const& moves, std::vector<std::uint64_t>& order,
+                        std::vector<Run>& runs) {
+  std::int64_t lowest = 0, highest = 0;
+  for (ElementToFrom const& move : moves) {
+    lowest = std::min(lowest, move.to);
+    highest = std::max(highest, move.to);
+  }
+  constexpr std::int64_t kLowest = -2; // dropped, or without a tile
+  if (lowest < kLowest || highest - kLowest >= static_cast<std::int64_t>(4 * moves.size())) return false;
+  std::vector<std::uint64_t> next(static_cast<std::size_t>(highest - kLowest + 2));
+  for (ElementToFrom const& move : moves) ++next[static_cast<std::size_t>(move.to - kLowest + 1)];
+  for (std::size_t bucket = 1; bucket < next.size(); ++bucket) {
+    bool const holdsAny = next[bucket] > 0;
+    auto const tile = static_cast<std::int64_t>(bucket) - 1 + kLowest;
+    if (holdsAny && tile >= 0) runs.push_back({tile, next[bucket - 1]});
+    next[bucket] += next[bucket - 1];
+  }
+  order.resize(moves.size());
+  for (std::uint64_t at = 0; at < moves.size(); ++at)
+    order[next[static_cast<std::size_t>(moves[at].to - kLowest)]++] = at;
+  return true;
+}
+
+void sortByDestination(std::vector<ElementToFrom> const& moves, std::vector<std::uint64_t>& order,
+                       std::vector<Run>& runs) {
   auto const n = static_cast<std::int64_t>(moves.size());
   fillWithPositions(order, moves.size());
   auto const byDestination = [&](std::uint64_t a, std::uint64_t b) {
@@ -86,31 +116,33 @@ void groupByDestination(std::vector<ElementToFrom> const& moves, std::vector<std
     std::sort(order.begin(), order.end(), byDestination);
   else
     parallelSortPositions(order.data(), n, byDestination);
-
-  struct Run {
-    std::int64_t tile;
-    std::uint64_t start;
-    int firstFree;
-  };
-  constexpr std::int64_t kGrain = 4096;
-  std::vector<std::vector<Run>> parts(static_cast<std::size_t>(chunkCount(0, n, kGrain)));
   auto const destination = [&](std::int64_t at) { return moves[order[static_cast<std::size_t>(at)]].to; };
-  parallelChunks(0, n, kGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-    auto& runs = parts[static_cast<std::size_t>(chunk)];
-    for (auto at = begin; at < end; ++at) {
-      std::int64_t const to = destination(at);
-      if (to < 0 || (at > 0 && destination(at - 1) == to)) continue;
-      runs.push_back({to, static_cast<std::uint64_t>(at), elementCount(to)});
-    }
-  });
+  for (std::int64_t at = 0; at < n; ++at) {
+    std::int64_t const to = destination(at);
+    if (to >= 0 && (at == 0 || destination(at - 1) != to))
+      runs.push_back({to, static_cast<std::uint64_t>(at)});
+  }
+}
+
+} // namespace
+
+void groupByDestination(std::vector<ElementToFrom> const& moves, std::vector<std::uint64_t>& order,
+                        std::vector<std::uint64_t>& tiles, TileArrivals& arrivals,
+                        FunctionRef<int(std::int64_t)> elementCount) {
+  // Both ways give the same order: by destination, then by position.
+  std::vector<Run> runs;
+  if (moves.size() < kParallelSortFrom || !countByDestination(moves, order, runs)) {
+    runs.clear();
+    sortByDestination(moves, order, runs);
+  }
   tiles.clear();
   arrivals.clear();
-  for (auto const& runs : parts)
-    for (Run const& run : runs) {
-      auto const tile = static_cast<std::uint64_t>(run.tile);
-      arrivals.emplace_hint(arrivals.end(), tile, std::pair(run.start, run.firstFree));
-      tiles.push_back(tile);
-    }
+  tiles.reserve(runs.size());
+  for (Run const& run : runs) {
+    auto const tile = static_cast<std::uint64_t>(run.tile);
+    arrivals.emplace_hint(arrivals.end(), tile, std::pair(run.start, elementCount(run.tile)));
+    tiles.push_back(tile);
+  }
 }
 
 void addSources(std::vector<ElementToFrom> const& moves, ElementRemovals& removals) {

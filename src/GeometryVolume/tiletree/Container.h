@@ -195,6 +195,12 @@ public:
   void computeMortonPermutations(std::vector<std::vector<std::int64_t>>& perms) const;
   void sortIntoMortonOrder(std::vector<std::vector<std::int64_t>>* permutations = nullptr);
 
+  /// Writes the tiles of a depth as boxes of a Wavefront OBJ file, in three colours that tell neighbours
+  /// apart, and the materials as "tile_tree.mtl" in the current directory.
+  /// @space World space.
+  /// @error None: a file that cannot be written is left out silently.
+  void dumpObj(Ostil::String const& filename, int depth) const;
+
   // Scratch containers for parallel builders
   /// Hands out a private container; it begins with one tile at depth 0 unless `keepEmpty` is not 0.
   Container* threadLocalContainer(int keepEmpty);
