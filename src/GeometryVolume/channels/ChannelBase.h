@@ -48,8 +48,8 @@ public:
   /// Identity of the element type.
   virtual std::type_index elementType() const = 0;
   virtual ChannelLayout layout() const = 0;
-  /// Sets every element of the listed tiles of one depth to the default value. Tiles that the channel lacks are
-  /// skipped.
+  /// Sets every element of the listed tiles of one depth to the default value. Tiles that the channel lacks
+  /// are skipped.
   /// @cost Parallel over the tiles.
   virtual void fillTiles(int depth, std::vector<std::int64_t> const& tiles) = 0;
 };

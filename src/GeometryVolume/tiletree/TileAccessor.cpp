@@ -208,6 +208,6 @@ void TileAccessorOf<TraitsT>::removeTiles(std::vector<std::int64_t> const& indic
 #define VLN_INSTANTIATE(TraitsT)                                                                             \
   template class VLN_API ConstTileAccessorOf<TraitsT>;                                                       \
   template class VLN_API TileAccessorOf<TraitsT>;
-  VLN_FOR_EACH_SHAPE(VLN_INSTANTIATE)
+VLN_FOR_EACH_SHAPE(VLN_INSTANTIATE)
 
 } // namespace VLN::TileTree3D
