@@ -34,7 +34,9 @@ struct ElementOps {
   /// Elements of a tile; null for one that the arrays lack, or that holds fewer than `count`.
   void const* (*elements)(void const* tileArrays, TreeIndex const& at, int count);
   void (*blendParent)(ParentBlend const&);
-  void (*blendCorners)(CornerBlend const&, float scale, void* out);
+  void (*blendCorners)(CornerBlend const&, void* out);
+  /// Every component of an element times a factor, in place.
+  void (*scale)(void* element, float factor);
   /// The constant in every component.
   void (*broadcast)(float constant, void* out);
   double (*distance)(void const* a, void const* b);

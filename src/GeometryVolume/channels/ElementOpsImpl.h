@@ -63,11 +63,15 @@ template <class T> struct TypedElementOps {
         }
   }
 
-  static void blendCorners(CornerBlend const& b, float scale, void* out) {
-    T value = blendEight<T>([&](int n) -> T const& { return *static_cast<T const*>(b.corners[n]); },
-                            Blend(b.fraction[0]), Blend(b.fraction[1]), Blend(b.fraction[2]));
-    if (scale != 1.0f) value = Traits::scaled(value, Blend(scale));
-    *static_cast<T*>(out) = value;
+  static void blendCorners(CornerBlend const& b, void* out) {
+    *static_cast<T*>(out) =
+        blendEight<T>([&](int n) -> T const& { return *static_cast<T const*>(b.corners[n]); },
+                      Blend(b.fraction[0]), Blend(b.fraction[1]), Blend(b.fraction[2]));
+  }
+
+  static void scale(void* element, float factor) {
+    auto& value = *static_cast<T*>(element);
+    value = Traits::scaled(value, Blend(factor));
   }
 
   static void broadcast(float constant, void* out) {
@@ -82,7 +86,7 @@ template <class T> struct TypedElementOps {
 
   static ElementOps const& get() {
     static ElementOps const ops{
-        sizeof(T), &haloKernels(sizeof(T)), elements, blendParent, blendCorners, broadcast, distance};
+        sizeof(T), &haloKernels(sizeof(T)), elements, blendParent, blendCorners, scale, broadcast, distance};
     return ops;
   }
 };

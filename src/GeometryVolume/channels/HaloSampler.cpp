@@ -7,6 +7,11 @@
 namespace VLN::TileTree3D::Internal {
 
 template <class TraitsT> void HaloSampler<TraitsT>::sample(int3 const& p, float scale, void* out) {
+  read(p, out);
+  if (scale != 1.0f) m_source.ops->scale(out, scale);
+}
+
+template <class TraitsT> void HaloSampler<TraitsT>::read(int3 const& p, void* out) {
   // A tile at the deepest depth that is asked for is the deepest one everywhere inside it.
   int const depth = std::min(m_source.maxDepth, TraitsT::kMaxDepth);
   if (!m_tile || m_tile->depth() != depth || !m_tile->contains(p)) {
@@ -29,7 +34,7 @@ template <class TraitsT> void HaloSampler<TraitsT>::sample(int3 const& p, float 
   }
   for (int n = 0; n < 8; ++n)
     blend.corners[n] = corner({low[0] + (n & 1), low[1] + (n >> 1 & 1), low[2] + (n >> 2)});
-  m_source.ops->blendCorners(blend, scale, out);
+  m_source.ops->blendCorners(blend, out);
 }
 
 template <class TraitsT> void const* HaloSampler<TraitsT>::corner(int3 const& at) const {

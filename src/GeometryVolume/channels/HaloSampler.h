@@ -23,7 +23,7 @@ public:
       , m_offset(voxelOffset(offsetType))
       , m_accessor(accessor) {}
 
-  /// Writes the value at `p`, read from the deepest tile there that the channel covers.
+  /// Writes the value at `p` times the scale, read from the deepest tile there that the channel covers.
   ///
   /// @formula l = (p - corner) / sample width - offset; the eight samples at floor(l) and one further. Those
   /// outside the tile's core come from the tile at their place: at the same depth its sample, coarser the
@@ -32,6 +32,7 @@ public:
   void sample(int3 const& p, float scale, void* out);
 
 private:
+  void read(int3 const& p, void* out);
   void const* corner(int3 const& at) const;
   void const* flat(void const* tile, int3 const& at) const {
     auto const index = m_origin + at.x + (at.y + at.z * m_width) * m_width;
