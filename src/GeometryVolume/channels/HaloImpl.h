@@ -1,23 +1,11 @@
 // Definitions of the halo functions. Only the generated sources include this.
 #pragma once
 
-#include "GeometryVolume/channels/ElementOpsImpl.h"
+#include "GeometryVolume/channels/EraseTilesImpl.h"
 #include "GeometryVolume/channels/Halo.h"
 #include "GeometryVolume/channels/HaloDriver.h"
 
 namespace VLN::TileTree3D {
-
-namespace Internal {
-template <class T> ErasedTiles eraseTiles(TypedChannel<T> const& channel) {
-  return {&TypedElementOps<T>::get(), channel.tileArrays(), &channel.defaultValue(),
-          channel.minDepth(),         channel.depth(),      channel.layout().size};
-}
-/// The target of a pass, which is written and so shares nothing from here on.
-template <class T> ErasedTiles eraseTarget(TypedChannel<T>& channel) {
-  channel.cloneData();
-  return eraseTiles(channel);
-}
-} // namespace Internal
 
 template <class TraitsT, class T, int SourceExtended, int SourceHalo, int TargetExtended, int TargetHalo>
 requires(Internal::isPlainHalo(SourceExtended, SourceHalo, TargetExtended, TargetHalo)) void computeHalo(
