@@ -71,6 +71,8 @@ public:
   /// Makes this channel the only holder of its Data and of its storage, and returns the storage.
   /// @cost A deep copy when the storage is shared, else nothing.
   Ostil::Ptr<TileStorage<T>> const& cloneData();
+  /// The tiles by depth, for passes that read many.
+  TileArrays<T> const* tileArrays() const { return dataPtr(); }
   /// Called on the copy that stands in for a channel which others still hold.
   void separateClone() { cloneData(); }
   /// Always 0; memUse() reports.
