@@ -82,18 +82,25 @@ std::size_t countOf(TileCorners const& corners) {
   return count;
 }
 
-// Adds the tiles that inactive tiles of the files need. A new tile makes finer what stands above its
-// neighbours, so that these are looked at again.
-void addUnreadTiles(Container& container, Group const& group, int rootDepth) {
+// Adds the corners of the tiles that inactive tiles of the file need. Roots stay at one depth, if need be a
+// shallower one. A new tile makes finer what stands above its neighbours, so that these are looked at again.
+void addUnreadTiles(TileCorners& corners, Group const& group, int rootDepth) {
   for (bool added = true; added;) {
     added = false;
+    Container tree("unread", 1.0f);
+    addTiles(tree, corners);
     for (auto const& grid : group.grids) {
-      TileCorners missing = grid->unreadTiles(container);
-      if (countOf(missing) == 0) continue;
-      completeCorners(missing, rootDepth);
-      addTiles(container, missing);
-      added = true;
+      TileCorners const missing = grid->unreadTiles(tree);
+      for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth) {
+        auto const& list = missing[static_cast<std::size_t>(depth)];
+        auto& all = corners[static_cast<std::size_t>(depth)];
+        all.insert(all.end(), list.begin(), list.end());
+        if (list.empty()) continue;
+        added = true;
+        rootDepth = std::min(rootDepth, depth);
+      }
     }
+    if (added) completeCorners(corners, rootDepth);
   }
 }
 
@@ -127,6 +134,10 @@ VdbVolume buildVolume(VdbFile const& file, Group const& group, std::uint64_t& me
   for (auto const& grid : group.grids) grid->collectTiles(root < VdbTraits::kMaxDepth, corners);
   completeCorners(corners, root);
   checkMemory(file, bytesFor(countOf(corners), group), memoryLeft);
+  addUnreadTiles(corners, group, root);
+  std::uint64_t const bytes = bytesFor(countOf(corners), group);
+  checkMemory(file, bytes, memoryLeft);
+  memoryLeft -= bytes;
   VdbVolume volume;
   volume.indexToWorld = IndexToWorld(transformBytes(*group.transform));
   volume.transform = volume.indexToWorld.besidesScale();
@@ -139,10 +150,6 @@ VdbVolume buildVolume(VdbFile const& file, Group const& group, std::uint64_t& me
                                                                TileTree3D::kVoxelOffsetCorner);
   auto container = object->extractComponent<Container>(kVdbContainerName);
   addTiles(*container, corners);
-  addUnreadTiles(*container, group, root);
-  std::uint64_t const bytes = bytesFor(static_cast<std::size_t>(container->tileCount(-1)), group);
-  checkMemory(file, bytes, memoryLeft);
-  memoryLeft -= bytes;
   auto topology = object->extractComponent<Topology>(kVdbTopologyName);
   topology->update(*container);
 

@@ -11,8 +11,8 @@
 //   active tile, 4096 wide           a sample of a tile at depth 16
 //
 // Above them stands the chain of ancestors up to one depth of roots, the deepest at which the whole box is at
-// most 64 tiles wide on each axis and no active tile lies higher. Grids of one object share the union of
-// their trees. Every sample of every tile holds the grid's value at the sample's corner.
+// most 64 tiles wide on each axis and no tile that the file needs lies higher. Grids of one object share the
+// union of their trees. Every sample of every tile holds the grid's value at the sample's corner.
 //
 // An inactive tile of the file gets a coarse tile like an active one where a reader of the tree would not
 // find its value without.

@@ -43,7 +43,10 @@ void expectSame(openvdb::GridPtrVec const& grids, openvdb::MetaMap::Ptr const& m
   exportVdb(import.volumes, out.path.string());
   openvdb::MetaMap::Ptr metadataBack;
   auto back = readBack(out.path, metadataBack);
-  if (metadata) EXPECT_EQ(VdbCompare::metadataDifference(*metadata, *metadataBack), "") << what;
+  // Metadata of a file lives on its volumes.
+  if (metadata && !import.volumes.empty()) {
+    EXPECT_EQ(VdbCompare::metadataDifference(*metadata, *metadataBack), "") << what;
+  }
   std::size_t expected = grids.size() - import.skipped.size();
   ASSERT_EQ(back.size(), expected) << what;
   auto const byName = [](auto const& a, auto const& b) { return a->getName() < b->getName(); };

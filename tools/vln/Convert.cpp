@@ -12,6 +12,16 @@ namespace Vln {
 
 using namespace VLN::Interop;
 
+namespace {
+
+std::string whyNot(VdbImport const& content) {
+  std::string reasons;
+  for (auto const& s : content.skipped) reasons += "; '" + oneLine(s.grid, 60) + "': " + oneLine(s.reason);
+  return reasons;
+}
+
+} // namespace
+
 void convert(ConvertOptions const& options) {
   checkOutput(options.output);
   VdbImport content;
@@ -20,6 +30,7 @@ void convert(ConvertOptions const& options) {
     ProgressBar bar;
     content = importVdb(options.file, options.limits, bar.progress());
     for (auto const& volume : content.volumes) written += volume.channels.size();
+    if (written == 0) throw FileError(options.file, "has no grid that could be written" + whyNot(content));
     exportVdb(content.volumes, options.output, bar.progress());
   }
   std::cout << fmt::format("{}: {} {} written\n", options.output, written, written == 1 ? "grid" : "grids");
