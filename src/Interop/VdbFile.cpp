@@ -4,6 +4,7 @@
 #include "Interop/VdbFileImpl.h"
 
 #include <openvdb/io/Stream.h>
+#include <tbb/global_control.h>
 
 #include <algorithm>
 #include <cerrno>
@@ -151,9 +152,13 @@ void onNoMemory() {
   int const null = open("/dev/null", O_RDWR);
   if (null >= 0)
     for (int n = 0; n < 3; ++n) dup2(null, n);
+  // The parent's worker threads do not exist here: loops that OpenVDB runs while it reads or gives up must
+  // not wait for them.
+  tbb::global_control const alone(tbb::global_control::max_allowed_parallelism, 1);
   try {
     VdbFile file = readWhole(path);
     writeAll(fd, "ok");
+    _exit(0);
   } catch (...) { writeAll(fd, currentReason(limits.memoryBytes)); }
   _exit(0);
 }

@@ -27,6 +27,13 @@ struct SliceOptions {
 };
 void slice(SliceOptions const& options);
 
+struct ConvertOptions {
+  std::string file;
+  std::string output;
+  VLN::Interop::VdbReadLimits limits;
+};
+void convert(ConvertOptions const& options);
+
 struct MakeOptions {
   std::string shape;
   std::string output;

@@ -12,6 +12,7 @@
 #include <array>
 #include <cstdlib>
 #include <iostream>
+#include <limits>
 
 #include <fmt/format.h>
 #include <nlohmann/json.hpp>
@@ -54,15 +55,23 @@ std::int64_t activeVoxels(VdbVolume const& volume) {
 
 using Bounds = std::array<std::array<double, 3>, 2>;
 
-// World box of the finest tiles that hold active voxels; their corners are multiples of the tile's width.
+// World box of the finest tiles that hold active voxels: of their eight corners, through the whole transform.
+// Corners of tiles are multiples of their width.
 Bounds worldBounds(VdbVolume const& volume) {
-  Bounds bounds{};
-  constexpr int kWidth = VdbTraits::width(VdbTraits::kMaxDepth);
-  for (int a = 0; a < 3; ++a) {
-    auto const axis = static_cast<std::size_t>(a);
-    auto const tiles = [&](int c) { return std::int64_t(VdbTraits::align(c, VdbTraits::kMaxDepth)); };
-    bounds[0][axis] = double(tiles(volume.activeBox.min[a])) * volume.voxelSize;
-    bounds[1][axis] = double(tiles(volume.activeBox.max[a] - 1) + kWidth) * volume.voxelSize;
+  constexpr double kFar = std::numeric_limits<double>::infinity();
+  Bounds bounds{{{kFar, kFar, kFar}, {-kFar, -kFar, -kFar}}};
+  constexpr int kDepth = VdbTraits::kMaxDepth, kWidth = VdbTraits::width(kDepth);
+  for (int corner = 0; corner < 8; ++corner) {
+    double index[3];
+    for (int a = 0; a < 3; ++a)
+      index[a] = corner >> a & 1 ? double(VdbTraits::align(volume.activeBox.max[a] - 1, kDepth)) + kWidth
+                                 : double(VdbTraits::align(volume.activeBox.min[a], kDepth));
+    auto const world = volume.indexToWorld.toWorld({index[0], index[1], index[2]});
+    for (int a = 0; a < 3; ++a) {
+      auto const axis = static_cast<std::size_t>(a);
+      bounds[0][axis] = std::min(bounds[0][axis], world[a]);
+      bounds[1][axis] = std::max(bounds[1][axis], world[a]);
+    }
   }
   return bounds;
 }
@@ -128,10 +137,7 @@ void printVolume(VdbVolume const& volume, std::size_t n) {
   auto const container = volume.object->component<Container>(kVdbContainerName);
   auto& out = std::cout;
   out << fmt::format("\nobject {}: voxel size {} world units\n", n, number(volume.voxelSize));
-  if (!volume.transform.empty())
-    out << fmt::format(
-        "  note: the transform is {};\n        world positions leave out all but the voxel size\n",
-        volume.transform);
+  if (!volume.transform.empty()) out << fmt::format("  transform: {}\n", volume.transform);
   if (volume.activeBox.empty()) {
     out << "  world box: none, no voxel is active\n";
   } else {
@@ -176,7 +182,7 @@ void printTables(VdbImport const& content) {
   std::cout << content.file << "\n";
   std::size_t n = 0;
   for (auto const& volume : content.volumes) printVolume(volume, ++n);
-  if (content.volumes.empty()) std::cout << "\nno float grid\n";
+  if (content.volumes.empty()) std::cout << "\nno grid came in\n";
   if (content.skipped.empty()) return;
   std::cout << "\nskipped\n";
   for (auto const& s : content.skipped)
@@ -209,12 +215,6 @@ void info(InfoOptions const& options) {
   }
   if (options.json) {
     printJson(content);
-    // The report has no place for it.
-    for (auto const& volume : content.volumes)
-      if (!volume.transform.empty())
-        std::cerr << fmt::format("vln: {}: note: the transform is {}; world positions leave out all but the "
-                                 "voxel size\n",
-                                 content.file, volume.transform);
   } else {
     printTables(content);
   }

@@ -35,7 +35,7 @@ VdbVolume const& volumeWith(VdbImport const& content, std::string const& channel
 
 void slice(SliceOptions const& options) {
   checkOutput(options.output);
-  std::string summary, note;
+  std::string summary;
   {
     ProgressBar bar;
     auto const content = importVdb(options.file, options.limits, bar.progress());
@@ -47,12 +47,8 @@ void slice(SliceOptions const& options) {
                             "xyz"[options.plane.axis], result.at, result.low, result.high,
                             result.image.width(), result.image.height());
     } catch (std::invalid_argument const& error) { throw FileError(options.file, error.what()); }
-    if (!volume.transform.empty())
-      note = fmt::format("vln: {}: note: its transform is {}; positions are voxel size times index only\n",
-                         options.file, volume.transform);
   }
   std::cout << summary;
-  std::cerr << note;
 }
 
 } // namespace Vln

@@ -51,6 +51,7 @@ void addMemoryLimit(CLI::App& command, VLN::Interop::VdbReadLimits& limits) {
 struct Options {
   Vln::InfoOptions info;
   Vln::SliceOptions slice;
+  Vln::ConvertOptions convert;
   Vln::MakeOptions make;
   Vln::ChurnOptions churn;
   Vln::PointsOptions points;
@@ -92,6 +93,15 @@ void addSlice(CLI::App& app, Vln::SliceOptions& o) {
   addMemoryLimit(*command, o.limits);
   command->footer("Example:\n  vln slice smoke.vdb --channel density --axis z -o slice.png");
   command->callback([&o] { Vln::slice(o); });
+}
+
+void addConvert(CLI::App& app, Vln::ConvertOptions& o) {
+  auto* command = app.add_subcommand("convert", "Write a volume file again, through the tree and back");
+  command->add_option("IN", o.file, "A .vdb file")->required()->type_name("IN.vdb");
+  command->add_option("OUT", o.output, "The .vdb file to write")->required()->type_name("OUT.vdb");
+  addMemoryLimit(*command, o.limits);
+  command->footer("Example:\n  vln convert smoke.vdb copy.vdb");
+  command->callback([&o] { Vln::convert(o); });
 }
 
 void addMake(CLI::App& app, Vln::MakeOptions& o) {
@@ -203,12 +213,14 @@ int main(int argc, char** argv) {
   app.footer("Examples:\n"
              "  vln info smoke.vdb\n"
              "  vln slice smoke.vdb --channel density --axis z -o slice.png\n"
+             "  vln convert smoke.vdb copy.vdb\n"
              "  vln make cloud cloud.vdb --voxels 1000000\n"
              "  vln churn smoke.vdb --limit 512MB --rounds 30\n"
              "\n'vln COMMAND --help' tells the options of a command.");
   Options options;
   addInfo(app, options.info);
   addSlice(app, options.slice);
+  addConvert(app, options.convert);
   addMake(app, options.make);
   addChurn(app, options.churn);
   addPoints(app, options.points);
