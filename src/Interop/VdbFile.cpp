@@ -138,6 +138,9 @@ void onNoMemory() {
 // The child's whole life. It writes "ok", or the reason why not, and never returns.
 [[noreturn]] void runChild(std::string const& path, VdbReadLimits const& limits, Memory const& start,
                            int fd) {
+  // The parent's worker threads do not exist here: loops that OpenVDB runs while it reads or gives up must
+  // not wait for them.
+  tbb::global_control const alone(tbb::global_control::max_allowed_parallelism, 1);
   verdictEnd = fd, memoryVerdict = memoryReason(limits.memoryBytes);
   std::set_new_handler(onNoMemory);
   prctl(PR_SET_PDEATHSIG, SIGKILL); // nobody waits for the verdict of an orphan
@@ -152,9 +155,6 @@ void onNoMemory() {
   int const null = open("/dev/null", O_RDWR);
   if (null >= 0)
     for (int n = 0; n < 3; ++n) dup2(null, n);
-  // The parent's worker threads do not exist here: loops that OpenVDB runs while it reads or gives up must
-  // not wait for them.
-  tbb::global_control const alone(tbb::global_control::max_allowed_parallelism, 1);
   try {
     VdbFile file = readWhole(path);
     writeAll(fd, "ok");

@@ -121,8 +121,10 @@ TEST(VdbImportTest, ReadsALevelSet) {
   grid->setName("sphere");
   VdbImport const result = checkedImport(grid);
   TreeReader const reader(result.volumes[0], "sphere");
-  // 400 voxels across: roots at depth 27, so a leaf's spare blocks still read as inside.
-  EXPECT_GT(reader.tree().rootCount(27), 0);
+  // 400 voxels across: roots at depth 27 would do, but the deep inside needs the samples of depth 25, 8
+  // voxels wide.
+  EXPECT_GT(reader.tree().rootCount(25), 0);
+  EXPECT_EQ(reader.tree().rootCount(27), 0);
   EXPECT_LT(reader.tree().tileCount(28), 8 * reader.tree().tileCount(27));
   EXPECT_LT(result.volumes[0].channels[0].minimum, -2.9);
 }
@@ -239,16 +241,17 @@ TEST(VdbImportTest, TellsTransformsThatAreMoreThanAScale) {
 
 // requirement
 TEST(VdbImportTest, NamesSkippedGrids) {
+  auto mask = openvdb::MaskGrid::create();
+  mask->setName("mask");
   auto vectors = openvdb::Vec3SGrid::create();
   vectors->setName("velocity");
-  auto flags = openvdb::Int32Grid::create();
-  flags->setName("flags");
-  VdbImport const result = importGrids(inMemory({vectors, flags}));
-  EXPECT_TRUE(result.volumes.empty());
-  ASSERT_EQ(result.skipped.size(), 2u);
-  EXPECT_EQ(result.skipped[0].grid, "velocity");
-  EXPECT_EQ(result.skipped[0].reason, "grids of type vec3s are not read yet");
-  EXPECT_EQ(result.skipped[1].reason, "grids of type int32 are not read yet");
+  VdbImport const result = importGrids(inMemory({mask, vectors}));
+  ASSERT_EQ(result.volumes.size(), 1u);
+  ASSERT_EQ(result.volumes[0].channels.size(), 1u);
+  EXPECT_EQ(result.volumes[0].channels[0].type, "vec3s");
+  ASSERT_EQ(result.skipped.size(), 1u);
+  EXPECT_EQ(result.skipped[0].grid, "mask");
+  EXPECT_EQ(result.skipped[0].reason, "grids of type mask are not read");
 }
 
 // boundary
@@ -359,7 +362,7 @@ TEST_P(RealFile, EqualsWhatOpenVdbReads) {
         if (channel.gridName != base->getName()) continue;
         found = true, ++read;
         SCOPED_TRACE(channel.name);
-        ASSERT_TRUE(grid);
+        if (!grid) continue; // other types are compared on their way back
         TreeReader const reader(volume, channel.name);
         Comparison const c = compareAll(*grid, reader);
         EXPECT_EQ(c.wrong, 0) << c.first;
@@ -368,7 +371,8 @@ TEST_P(RealFile, EqualsWhatOpenVdbReads) {
         EXPECT_EQ(wrongSamples(*grid, reader), 0);
         expectSoundTree(reader.tree());
       }
-    EXPECT_EQ(found, bool(grid)) << base->getName();
+    bool const isPoints = base->type() == "Tree_ptdataidx32_5_4_3";
+    EXPECT_EQ(found, !isPoints) << base->getName();
   }
   EXPECT_EQ(read + result.skipped.size(), grids->size());
 }
