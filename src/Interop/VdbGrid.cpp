@@ -44,7 +44,7 @@ GridSummary joinSummaries(GridSummary a, GridSummary const& b) {
 }
 
 std::unique_ptr<GridSource> makeGridSource(openvdb::GridBase::ConstPtr const& grid, std::string& type) {
-  type = grid->type() == "Tree_ptdataidx32_5_4_3" ? "points" : grid->valueType();
+  type = grid->type() == "Tree_ptdataidx32_5_4_3" ? "points" : grid->type();
   // A grid of another node configuration has the value type, but none of the nodes.
   auto source = makeScalarSource(grid);
   return source ? std::move(source) : makeVectorSource(grid);

@@ -251,7 +251,7 @@ TEST(VdbImportTest, NamesSkippedGrids) {
   EXPECT_EQ(result.volumes[0].channels[0].type, "vec3s");
   ASSERT_EQ(result.skipped.size(), 1u);
   EXPECT_EQ(result.skipped[0].grid, "mask");
-  EXPECT_EQ(result.skipped[0].reason, "grids of type mask are not read");
+  EXPECT_EQ(result.skipped[0].reason, "grids of type Tree_mask_5_4_3 are not read");
 }
 
 // boundary

@@ -156,7 +156,7 @@ TEST_F(ProgramTest, InfoNamesWhatIsLeftOut) {
 
   RunResult const text = vln({"info", path});
   EXPECT_EQ(text.code, 0);
-  EXPECT_NE(text.out.find("mask: grids of type mask are not read"), std::string::npos) << text.out;
+  EXPECT_NE(text.out.find("mask: grids of type Tree_mask_5_4_3 are not read"), std::string::npos) << text.out;
   EXPECT_NE(text.out.find("transform: a uniform scale with a translation"), std::string::npos);
   EXPECT_NE(text.out.find("no voxel is active"), std::string::npos);
 
@@ -168,7 +168,6 @@ TEST_F(ProgramTest, InfoNamesWhatIsLeftOut) {
   EXPECT_EQ(j["objects"][0]["world_bounds"], nullptr);
   EXPECT_EQ(j["objects"][0]["channels"][0]["active"], 0);
   EXPECT_EQ(j["objects"][0]["channels"][0]["min"], nullptr);
-  EXPECT_NE(json.err.find("note: the transform"), std::string::npos);
 }
 
 // requirement: a picture that shows something
