@@ -37,17 +37,13 @@ void tell(Progress const& progress, char const* stage, double done) {
   if (progress) progress(stage, done);
 }
 
-std::string typeOf(openvdb::GridBase const& grid) {
-  if (grid.type() == "Tree_ptdataidx32_5_4_3") return "points";
-  return grid.valueType();
-}
-
 std::vector<Group> groupByTransform(VdbFile const& file, std::vector<SkippedGrid>& skipped) {
   std::vector<Group> groups;
   for (auto const& base : file.grids) {
     auto const grid = openvdb::gridConstPtrCast<FloatGrid>(base);
     if (!grid) {
-      skipped.push_back({base->getName(), "grids of type " + typeOf(*base) + " are not read yet"});
+      if (isPointGrid(*base)) continue;
+      skipped.push_back({base->getName(), "grids of type " + base->valueType() + " are not read yet"});
       continue;
     }
     if (auto const reason = whyNotPlaced(*grid)) {
@@ -205,6 +201,7 @@ VdbImport importGrids(VdbFile const& file, Progress const& progress) {
     result.volumes.push_back(
         buildVolume(groups[n], progress, kTreeDone + share * double(n), kTreeDone + share * double(n + 1)));
   }
+  result.points = importPointGrids(file, result.skipped);
   tell(progress, "done", 1);
   return result;
 }

@@ -10,6 +10,10 @@ namespace VLN::Interop {
 /// Builds the volumes of a file that is in memory. Grids that cannot come in are named as skipped.
 VLN_API VdbImport importGrids(VdbFile const& file, Progress const& progress = {});
 
+/// A volume for each points grid of the file. Those that cannot come in are named as skipped.
+std::vector<PointVolume> importPointGrids(VdbFile const& file, std::vector<SkippedGrid>& skipped);
+bool isPointGrid(openvdb::GridBase const& grid);
+
 /// Values of a tile's samples, i fastest: the grid's value at the corner of each.
 void fillTile(openvdb::FloatGrid::ConstAccessor& grid, Velorn::Math::int3 const& corner, int depth,
               float* samples);

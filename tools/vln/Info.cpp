@@ -3,6 +3,8 @@
 #include "Interop/FileError.h"
 #include "Interop/VdbImport.h"
 #include "vln/Commands.h"
+#include "vln/InfoPoints.h"
+#include "vln/PointsFile.h"
 #include "vln/ProgressBar.h"
 
 #include <array>
@@ -99,6 +101,7 @@ Json volumeJson(VdbVolume const& volume) {
 void printJson(VdbImport const& content) {
   Json j = {{"file", content.file}, {"objects", Json::array()}, {"skipped", Json::array()}};
   for (auto const& volume : content.volumes) j["objects"].push_back(volumeJson(volume));
+  for (auto const& volume : content.points) j["objects"].push_back(pointsJson(volume));
   for (auto const& s : content.skipped) j["skipped"].push_back({{"grid", s.grid}, {"reason", s.reason}});
   // Names in a file may be of any bytes.
   std::cout << j.dump(2, ' ', false, Json::error_handler_t::replace) << "\n";
@@ -169,7 +172,8 @@ void printTables(VdbImport const& content) {
   std::cout << content.file << "\n";
   std::size_t n = 0;
   for (auto const& volume : content.volumes) printVolume(volume, ++n);
-  if (content.volumes.empty()) std::cout << "\nno float grid\n";
+  for (auto const& volume : content.points) printPoints(volume, ++n);
+  if (n == 0) std::cout << "\nno float grid and no points\n";
   if (content.skipped.empty()) return;
   std::cout << "\nskipped\n";
   for (auto const& s : content.skipped)
@@ -182,8 +186,15 @@ void info(InfoOptions const& options) {
   VdbImport content;
   {
     ProgressBar bar;
-    content = importVdb(options.file, options.limits, bar.progress());
+    if (isPointsFile(options.file)) {
+      PointsInput input;
+      input.file = content.file = options.file;
+      content.points = readPointVolumes(input, bar.progress());
+    } else {
+      content = importVdb(options.file, options.limits, bar.progress());
+    }
   }
+  for (auto const& volume : content.points) noteLosses(content.file, volume);
   if (options.json) {
     printJson(content);
     // The report has no place for it.
