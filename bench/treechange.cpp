@@ -48,8 +48,7 @@ void addLeaves(Container<Shape>& tree, openvdb::MaskGrid const& shell) {
   for (auto leaf = shell.tree().cbeginLeaf(); leaf; ++leaf) {
     auto const& o = leaf->origin();
     for (int d = 20; d <= 27; ++d) lists[static_cast<std::size_t>(d)].append({o.x(), o.y(), o.z()});
-    for (int n = 0; n < 8; ++n)
-      lists[28].append({o.x() + 4 * (n & 1), o.y() + 2 * (n & 2), o.z() + (n & 4)});
+    for (int n = 0; n < 8; ++n) lists[28].append({o.x() + 4 * (n & 1), o.y() + 2 * (n & 2), o.z() + (n & 4)});
   }
   tree.tileAccessor().addTiles(lists);
 }
@@ -166,7 +165,8 @@ std::vector<float3> const& ball(int perVoxel) {
   auto& points = balls[perVoxel];
   if (!points.empty()) return points;
   constexpr std::size_t kPoints = 1000000;
-  float const radius = std::cbrt(static_cast<float>(kPoints) / static_cast<float>(perVoxel) * 0.75f / 3.14159265f);
+  float const radius =
+      std::cbrt(static_cast<float>(kPoints) / static_cast<float>(perVoxel) * 0.75f / 3.14159265f);
   std::mt19937 random(3);
   std::uniform_real_distribution<float> along(-radius, radius);
   while (points.size() < kPoints) {
@@ -200,8 +200,9 @@ void BM_MovePointsVdb(benchmark::State& state) {
   std::vector<openvdb::Vec3f> list;
   for (float3 const& p : points) list.emplace_back(p.x, p.y, p.z);
   auto const transform = openvdb::math::Transform::createLinearTransform(1.0);
-  auto grid = openvdb::points::createPointDataGrid<openvdb::points::NullCodec, openvdb::points::PointDataGrid>(
-      list, *transform);
+  auto grid =
+      openvdb::points::createPointDataGrid<openvdb::points::NullCodec, openvdb::points::PointDataGrid>(
+          list, *transform);
   std::int64_t n = 0;
   for (auto _ : state) {
     Along along{stepOf(state, n++)};

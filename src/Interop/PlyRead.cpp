@@ -29,8 +29,8 @@ constexpr std::array<std::size_t, 8> kSizes{1, 1, 2, 2, 4, 4, 4, 8};
 std::size_t sizeOf(Scalar s) { return kSizes[static_cast<std::size_t>(s)]; }
 
 bool scalarNamed(std::string const& name, Scalar& out) {
-  static constexpr char const* kNames[8][2] = {{"char", "int8"},    {"uchar", "uint8"}, {"short", "int16"},
-                                               {"ushort", "uint16"}, {"int", "int32"},   {"uint", "uint32"},
+  static constexpr char const* kNames[8][2] = {{"char", "int8"},     {"uchar", "uint8"},   {"short", "int16"},
+                                               {"ushort", "uint16"}, {"int", "int32"},     {"uint", "uint32"},
                                                {"float", "float32"}, {"double", "float64"}};
   for (std::size_t n = 0; n < 8; ++n) {
     if (name == kNames[n][0] || name == kNames[n][1]) {
@@ -87,7 +87,8 @@ private:
   std::string headerLine() {
     char const* const limit = m_next + std::min<std::uint64_t>(left(), kLongestHeader - m_headerBytes);
     char const* const end = std::find(m_next, limit, '\n');
-    if (end == limit) fail(limit == m_end ? "is truncated: its header does not end" : "has too long a header");
+    if (end == limit)
+      fail(limit == m_end ? "is truncated: its header does not end" : "has too long a header");
     std::string line(m_next, end);
     m_headerBytes += static_cast<std::size_t>(end + 1 - m_next);
     m_next = end + 1;
@@ -132,7 +133,8 @@ private:
   void readElement(std::istringstream& line, std::string const& text) {
     Element element;
     std::string count, more;
-    if (!(line >> element.name >> count) || line >> more) fail("has a bad element: '" + oneLine(text, 60) + "'");
+    if (!(line >> element.name >> count) || line >> more)
+      fail("has a bad element: '" + oneLine(text, 60) + "'");
     auto const parsed = std::from_chars(count.data(), count.data() + count.size(), element.count);
     if (parsed.ec != std::errc() || parsed.ptr != count.data() + count.size())
       fail("has an element with a bad count: '" + oneLine(text, 60) + "'");
@@ -179,14 +181,22 @@ private:
     }
     double number() const {
       switch (type) {
-      case Scalar::kInt8: return as<std::int8_t>();
-      case Scalar::kUint8: return as<std::uint8_t>();
-      case Scalar::kInt16: return as<std::int16_t>();
-      case Scalar::kUint16: return as<std::uint16_t>();
-      case Scalar::kInt32: return as<std::int32_t>();
-      case Scalar::kUint32: return as<std::uint32_t>();
-      case Scalar::kFloat: return double(as<float>());
-      case Scalar::kDouble: return as<double>();
+      case Scalar::kInt8:
+        return as<std::int8_t>();
+      case Scalar::kUint8:
+        return as<std::uint8_t>();
+      case Scalar::kInt16:
+        return as<std::int16_t>();
+      case Scalar::kUint16:
+        return as<std::uint16_t>();
+      case Scalar::kInt32:
+        return as<std::int32_t>();
+      case Scalar::kUint32:
+        return as<std::uint32_t>();
+      case Scalar::kFloat:
+        return double(as<float>());
+      case Scalar::kDouble:
+        return as<double>();
       }
       return 0;
     }
@@ -218,29 +228,45 @@ private:
     auto const store = [&](auto v) { std::memcpy(value.bytes, &v, sizeof v); };
     auto const storeWhole = [&](auto v) {
       using T = decltype(v);
-      if (!(number >= double(std::numeric_limits<T>::min()) && number <= double(std::numeric_limits<T>::max())) ||
+      if (!(number >= double(std::numeric_limits<T>::min()) &&
+            number <= double(std::numeric_limits<T>::max())) ||
           number != std::floor(number))
         fail("has a value that its type does not hold: '" + oneLine(std::string(begin, end), 40) + "'");
       store(static_cast<T>(number));
     };
     switch (type) {
-    case Scalar::kInt8: storeWhole(std::int8_t()); break;
-    case Scalar::kUint8: storeWhole(std::uint8_t()); break;
-    case Scalar::kInt16: storeWhole(std::int16_t()); break;
-    case Scalar::kUint16: storeWhole(std::uint16_t()); break;
-    case Scalar::kInt32: storeWhole(std::int32_t()); break;
-    case Scalar::kUint32: storeWhole(std::uint32_t()); break;
+    case Scalar::kInt8:
+      storeWhole(std::int8_t());
+      break;
+    case Scalar::kUint8:
+      storeWhole(std::uint8_t());
+      break;
+    case Scalar::kInt16:
+      storeWhole(std::int16_t());
+      break;
+    case Scalar::kUint16:
+      storeWhole(std::uint16_t());
+      break;
+    case Scalar::kInt32:
+      storeWhole(std::int32_t());
+      break;
+    case Scalar::kUint32:
+      storeWhole(std::uint32_t());
+      break;
     case Scalar::kFloat: {
       // Parsed as a float: rounding twice would not always give the nearest one.
       float v = 0;
       auto const f = std::from_chars(begin, end, v);
       if (f.ec == std::errc::result_out_of_range)
-        v = std::abs(number) < 1 ? 0.0f
-                                 : std::copysign(std::numeric_limits<float>::infinity(), static_cast<float>(number));
+        v = std::abs(number) < 1
+                ? 0.0f
+                : std::copysign(std::numeric_limits<float>::infinity(), static_cast<float>(number));
       store(v);
       break;
     }
-    case Scalar::kDouble: store(number); break;
+    case Scalar::kDouble:
+      store(number);
+      break;
     }
     return value;
   }
@@ -328,7 +354,8 @@ private:
 
   /// From world to tile space. Float positions keep the origin, so that a power of two scales them exactly.
   PointSet place(PlyOptions const& options) {
-    m_points.voxelSize = options.voxelSize > 0 ? options.voxelSize : chooseVoxelSize(m_world, options.pointsPerTile);
+    m_points.voxelSize =
+        options.voxelSize > 0 ? options.voxelSize : chooseVoxelSize(m_world, options.pointsPerTile);
     double const s = 1 / m_points.voxelSize;
     if (m_points.doublePositions) {
       for (int a = 0; a < 3; ++a) {
@@ -345,7 +372,8 @@ private:
     m_points.positions.reserve(m_world.size());
     for (double3 const& p : m_world) {
       double3 const q = (p - m_points.origin) * s;
-      m_points.positions.push_back({static_cast<float>(q.x), static_cast<float>(q.y), static_cast<float>(q.z)});
+      m_points.positions.push_back(
+          {static_cast<float>(q.x), static_cast<float>(q.y), static_cast<float>(q.z)});
     }
     return std::move(m_points);
   }
@@ -380,12 +408,13 @@ double chooseVoxelSize(std::vector<double3> const& world, double pointsPerTile) 
     largest = std::max({largest, std::abs(low[a]), std::abs(high[a])});
   }
   if (!(extent > 0)) return 1;
-  if (!std::isfinite(extent)) extent = largest;
+  extent = std::min(extent, 0x1p1000); // finite, also as a power of two
   auto const occupied = [&](double voxelSize) {
     double const s = 0.25 / voxelSize;
     std::vector<std::array<double, 3>> tiles;
     tiles.reserve(finite.size());
-    for (double3 const& p : finite) tiles.push_back({std::floor(p.x * s), std::floor(p.y * s), std::floor(p.z * s)});
+    for (double3 const& p : finite)
+      tiles.push_back({std::floor(p.x * s), std::floor(p.y * s), std::floor(p.z * s)});
     std::sort(tiles.begin(), tiles.end());
     return double(std::unique(tiles.begin(), tiles.end()) - tiles.begin());
   };

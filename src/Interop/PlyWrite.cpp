@@ -31,10 +31,38 @@ template <class T> char const* plyType() {
 template <class T> struct ScalarOf { using type = T; };
 template <class T>
 requires requires { typename T::Scalar; }
-struct ScalarOf<T> { using type = typename T::Scalar; };
+struct ScalarOf<T> {
+  using type = typename T::Scalar;
+};
+
+/// Every element type, whether this build has channels of it or not.
+template <class Body> void withAnyElementType(std::string const& name, Body&& body) {
+  using namespace Velorn::Math;
+  auto const attempt = [&]<class T>(char const* typeName) {
+    if (name == typeName) body.template operator()<T>();
+  };
+  attempt.template operator()<signed char>("int8");
+  attempt.template operator()<unsigned char>("uint8");
+  attempt.template operator()<short>("int16");
+  attempt.template operator()<unsigned short>("uint16");
+  attempt.template operator()<int>("int32");
+  attempt.template operator()<unsigned int>("uint32");
+  attempt.template operator()<std::int64_t>("int64");
+  attempt.template operator()<std::uint64_t>("uint64");
+  attempt.template operator()<float>("float");
+  attempt.template operator()<double>("double");
+  attempt.template operator()<float2>("float2");
+  attempt.template operator()<float3>("float3");
+  attempt.template operator()<float4>("float4");
+  attempt.template operator()<double3>("double3");
+  attempt.template operator()<int3>("int3");
+  attempt.template operator()<float3x3>("float3x3");
+  attempt.template operator()<float4x2>("float4x2");
+  attempt.template operator()<float4x4>("float4x4");
+}
 
 void addColumns(PointAttribute const& attribute, std::string& header, std::vector<Column>& columns) {
-  withElementType(attribute.type, [&]<class T>() {
+  withAnyElementType(attribute.type, [&]<class T>() {
     using S = typename ScalarOf<T>::type;
     constexpr std::size_t kParts = sizeof(T) / sizeof(S);
     for (std::size_t n = 0; n < kParts; ++n) {
@@ -47,14 +75,17 @@ void addColumns(PointAttribute const& attribute, std::string& header, std::vecto
   });
 }
 
-template <class T> void put(std::string& out, T v) { out.append(reinterpret_cast<char const*>(&v), sizeof v); }
+template <class T> void put(std::string& out, T v) {
+  out.append(reinterpret_cast<char const*>(&v), sizeof v);
+}
 
 } // namespace
 
 void writePly(std::string const& path, PointSet const& points) {
   OutputFile file(path);
   char const* const real = points.doublePositions ? "double" : "float";
-  std::string text = "ply\nformat binary_little_endian 1.0\nelement vertex " + std::to_string(points.size()) + "\n";
+  std::string text =
+      "ply\nformat binary_little_endian 1.0\nelement vertex " + std::to_string(points.size()) + "\n";
   for (char const axis : {'x', 'y', 'z'}) text += std::string("property ") + real + " " + axis + "\n";
   std::vector<Column> columns;
   for (PointAttribute const& attribute : points.attributes) addColumns(attribute, text, columns);
@@ -68,7 +99,8 @@ void writePly(std::string const& path, PointSet const& points) {
         put(text, static_cast<float>(p[a]));
     }
     for (Column const& c : columns) {
-      auto const* at = reinterpret_cast<char const*>(c.attribute->bytes.data()) + n * c.attribute->valueSize + c.offset;
+      auto const* at =
+          reinterpret_cast<char const*>(c.attribute->bytes.data()) + n * c.attribute->valueSize + c.offset;
       if (!c.narrow) {
         text.append(at, c.size);
         continue;

@@ -1,8 +1,8 @@
 // PointSet: points with their attributes as plain arrays, between a file and a volume.
 #pragma once
 
-#include "GeometryVolume/core/Export.h"
 #include "GeometryVolume/core/ElementTypes.h"
+#include "GeometryVolume/core/Export.h"
 #include "Velorn/Math.h"
 
 #include <cstddef>

@@ -25,7 +25,9 @@ int rootDepthOf(Velorn::Math::bbox<int3, int> const& box) {
   for (int d = kDeepest; d > 0; --d) {
     bool fits = true;
     for (int a = 0; a < 3; ++a) {
-      auto const tiles = [&](int c) { return std::int64_t(PointTraits::align(c, d)) / PointTraits::width(d); };
+      auto const tiles = [&](int c) {
+        return std::int64_t(PointTraits::align(c, d)) / PointTraits::width(d);
+      };
       fits &= tiles(box.max[a]) - tiles(box.min[a]) < 64;
     }
     if (fits) return d;
@@ -75,7 +77,8 @@ Placement placePoints(std::vector<float3> const& positions) {
   for (int d = kDeepest, top = rootDepthOf(box); d > top; --d) {
     auto& above = result.corners[static_cast<std::size_t>(d - 1)];
     for (int3 const& p : result.corners[static_cast<std::size_t>(d)]) {
-      int3 const corner{PointTraits::align(p.x, d - 1), PointTraits::align(p.y, d - 1), PointTraits::align(p.z, d - 1)};
+      int3 const corner{PointTraits::align(p.x, d - 1), PointTraits::align(p.y, d - 1),
+                        PointTraits::align(p.z, d - 1)};
       if (above.empty() || above.back() != corner) above.append(corner);
     }
   }
@@ -136,8 +139,8 @@ PointVolume buildPointVolume(PointSet const& points) {
   for (PointAttribute const& attribute : points.attributes) {
     bool const known = withElementType(attribute.type, [&]<class T>() {
       std::string const name = freeName(attribute.name, taken);
-      auto channel = Command::createChannel<T, 2, 4, 4, 0, 0>(name, *topology, *object, T{},
-                                                              TileTree3D::kInitializeDefaultValue, 0, kDeepest);
+      auto channel = Command::createChannel<T, 2, 4, 4, 0, 0>(
+          name, *topology, *object, T{}, TileTree3D::kInitializeDefaultValue, 0, kDeepest);
       fillTiles(*channel, tiles, placement, [&](std::size_t n) { return attribute.value<T>(n); });
       volume.attributes.emplace_back(attribute.name, name);
     });

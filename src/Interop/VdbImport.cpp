@@ -43,6 +43,7 @@ std::vector<Group> groupByTransform(VdbFile const& file, std::vector<SkippedGrid
     std::string type;
     auto source = makeGridSource(base, type);
     if (!source) {
+      if (isPointGrid(*base)) continue;
       skipped.push_back({base->getName(), "grids of type " + oneLine(type) + " are not read"});
       continue;
     }
@@ -234,6 +235,7 @@ VdbImport importGrids(VdbFile const& file, Progress const& progress) {
     result.volumes.push_back(buildVolume(file, groups[n], memoryLeft, progress, kTreeDone + share * double(n),
                                          kTreeDone + share * double(n + 1)));
   }
+  result.points = importPointGrids(file, result.skipped);
   tell(progress, "done", 1);
   return result;
 }

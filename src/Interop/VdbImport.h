@@ -27,6 +27,7 @@
 
 #include "GeometryVolume/core/Object.h"
 #include "Interop/IndexToWorld.h"
+#include "Interop/PointVolume.h"
 #include "Interop/Progress.h"
 #include "Interop/VdbFile.h"
 #include "Velorn/Math.h"
@@ -78,7 +79,8 @@ struct SkippedGrid {
 
 struct VdbImport {
   std::string file;
-  std::vector<VdbVolume> volumes; ///< in the order in which their first grids come
+  std::vector<VdbVolume> volumes;  ///< in the order in which their first grids come
+  std::vector<PointVolume> points; ///< one for each points grid
   std::vector<SkippedGrid> skipped;
 };
 

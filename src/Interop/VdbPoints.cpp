@@ -35,30 +35,35 @@ PointAttribute readAttribute(PointDataGrid const& grid, std::string const& name,
   return result;
 }
 
-bool appendAttribute(PointDataGrid const& grid, std::string const& name, std::size_t index, std::string const& type,
-                     PointSet& points) {
+bool appendAttribute(PointDataGrid const& grid, std::string const& name, std::size_t index,
+                     std::string const& type, PointSet& points) {
   auto const add = [&]<class T, class V>(auto const& convert) {
     if (makeAttribute<T>("").type.empty()) return false; // not in this build
     points.attributes.push_back(readAttribute<T, V>(grid, name, index, convert));
     return true;
   };
-  auto const same = [&]<class T>() {
-    return add.template operator()<T, T>([](T v) { return v; });
-  };
+  auto const same = [&]<class T>() { return add.template operator()<T, T>([](T v) { return v; }); };
   if (type == "float") return same.template operator()<float>();
   if (type == "double") return same.template operator()<double>();
-  if (type == "int8") return add.template operator()<signed char, std::int8_t>([](std::int8_t v) { return v; });
+  if (type == "int8")
+    return add.template operator()<signed char, std::int8_t>([](std::int8_t v) { return v; });
   if (type == "int16") return same.template operator()<short>();
   if (type == "int32") return same.template operator()<int>();
   if (type == "int64") return same.template operator()<std::int64_t>();
   if (type == "bool")
     return add.template operator()<unsigned char, bool>([](bool v) { return static_cast<unsigned char>(v); });
   if (type == "vec3s")
-    return add.template operator()<float3, openvdb::Vec3f>([](auto const& v) { return float3{v.x(), v.y(), v.z()}; });
+    return add.template operator()<float3, openvdb::Vec3f>([](auto const& v) {
+      return float3{v.x(), v.y(), v.z()};
+    });
   if (type == "vec3d")
-    return add.template operator()<double3, openvdb::Vec3d>([](auto const& v) { return double3{v.x(), v.y(), v.z()}; });
+    return add.template operator()<double3, openvdb::Vec3d>([](auto const& v) {
+      return double3{v.x(), v.y(), v.z()};
+    });
   if (type == "vec3i")
-    return add.template operator()<int3, openvdb::Vec3i>([](auto const& v) { return int3{v.x(), v.y(), v.z()}; });
+    return add.template operator()<int3, openvdb::Vec3i>([](auto const& v) {
+      return int3{v.x(), v.y(), v.z()};
+    });
   return false;
 }
 
@@ -74,7 +79,8 @@ PointVolume readGrid(PointDataGrid const& grid) {
   if (auto const first = grid.tree().cbeginLeaf()) {
     auto const& descriptor = first->attributeSet().descriptor();
     std::size_t const position = descriptor.find("P");
-    if (position == openvdb::points::AttributeSet::INVALID_POS) throw std::runtime_error("its points have no positions");
+    if (position == openvdb::points::AttributeSet::INVALID_POS)
+      throw std::runtime_error("its points have no positions");
     for (auto leaf = first; leaf; ++leaf) {
       // Leaves are read by the first one's attributes.
       if (!(leaf->attributeSet().descriptor() == descriptor))
@@ -132,15 +138,24 @@ std::vector<PointVolume> importVdbPoints(std::string const& path, VdbReadLimits 
                                          Progress const& progress) {
   if (progress) progress("reading", 0);
   VdbFile const file = readVdbFile(path, limits);
+  if (progress) progress("building the tree", 0.5);
+  std::vector<SkippedGrid> skipped;
+  auto volumes = importPointGrids(file, skipped);
+  if (!skipped.empty()) throw FileError(path, "'" + oneLine(skipped[0].grid, 60) + "': " + skipped[0].reason);
+  return volumes;
+}
+
+bool isPointGrid(openvdb::GridBase const& grid) { return grid.isType<PointDataGrid>(); }
+
+std::vector<PointVolume> importPointGrids(VdbFile const& file, std::vector<SkippedGrid>& skipped) {
   std::vector<PointVolume> volumes;
   for (auto const& base : file.grids) {
     auto const grid = openvdb::gridConstPtrCast<PointDataGrid>(base);
     if (!grid) continue;
-    if (progress) progress("building the tree", 0.5);
     try {
       volumes.push_back(readGrid(*grid));
-    } catch (std::runtime_error const& error) {
-      throw FileError(path, "'" + oneLine(grid->getName(), 60) + "': " + oneLine(error.what()));
+    } catch (std::bad_alloc const&) { throw; } catch (std::exception const& error) {
+      skipped.push_back({grid->getName(), oneLine(error.what())});
     }
   }
   return volumes;
@@ -158,9 +173,10 @@ void writeVdbPoints(std::string const& path, PointSet const& points, std::string
     world.emplace_back(p.x, p.y, p.z);
   }
   openvdb::points::PointAttributeVector<openvdb::Vec3d> const positions(world);
-  auto const index = openvdb::tools::createPointIndexGrid<openvdb::tools::PointIndexGrid>(positions, *transform);
-  auto grid = openvdb::points::createPointDataGrid<openvdb::points::NullCodec, PointDataGrid>(*index, positions,
-                                                                                             *transform);
+  auto const index =
+      openvdb::tools::createPointIndexGrid<openvdb::tools::PointIndexGrid>(positions, *transform);
+  auto grid = openvdb::points::createPointDataGrid<openvdb::points::NullCodec, PointDataGrid>(
+      *index, positions, *transform);
   grid->setName(name);
   for (PointAttribute const& attribute : points.attributes) {
     withElementType(attribute.type, [&]<class T>() {
@@ -168,7 +184,8 @@ void writeVdbPoints(std::string const& path, PointSet const& points, std::string
       if constexpr (!std::is_void_v<V>) {
         std::vector<V> values;
         values.reserve(points.size());
-        for (std::size_t n = 0; n < points.size(); ++n) values.push_back(toStored<T, V>(attribute.value<T>(n)));
+        for (std::size_t n = 0; n < points.size(); ++n)
+          values.push_back(toStored<T, V>(attribute.value<T>(n)));
         using Array = openvdb::points::TypedAttributeArray<V>;
         openvdb::points::appendAttribute(grid->tree(), attribute.name, Array::attributeType());
         openvdb::points::PointAttributeVector<V> const wrapper(values);

@@ -16,6 +16,7 @@ VLN_API std::vector<PointVolume> importVdbPoints(std::string const& path, VdbRea
 /// Writes a points grid with a uniform scale and the origin as its transform. Unsigned and 8-bit attributes
 /// become the next wider signed type that the format knows.
 /// @error FileError; no file is left half-written.
-VLN_API void writeVdbPoints(std::string const& path, PointSet const& points, std::string const& name = "points");
+VLN_API void writeVdbPoints(std::string const& path, PointSet const& points,
+                            std::string const& name = "points");
 
 } // namespace VLN::Interop

@@ -7,7 +7,10 @@
 #include "GeometryVolume/tiletree/Container.h"
 #include "Interop/FileError.h"
 #include "Interop/VdbImport.h"
-#include "ProgressBar.h"
+#include "vln/Commands.h"
+#include "vln/InfoPoints.h"
+#include "vln/PointsFile.h"
+#include "vln/ProgressBar.h"
 
 #include <array>
 #include <cstdlib>
@@ -115,6 +118,7 @@ Json volumeJson(VdbVolume const& volume) {
 void printJson(VdbImport const& content) {
   Json j = {{"file", content.file}, {"objects", Json::array()}, {"skipped", Json::array()}};
   for (auto const& volume : content.volumes) j["objects"].push_back(volumeJson(volume));
+  for (auto const& volume : content.points) j["objects"].push_back(pointsJson(volume));
   for (auto const& s : content.skipped) j["skipped"].push_back({{"grid", s.grid}, {"reason", s.reason}});
   // Names in a file may be of any bytes.
   std::cout << j.dump(2, ' ', false, Json::error_handler_t::replace) << "\n";
@@ -182,7 +186,8 @@ void printTables(VdbImport const& content) {
   std::cout << content.file << "\n";
   std::size_t n = 0;
   for (auto const& volume : content.volumes) printVolume(volume, ++n);
-  if (content.volumes.empty()) std::cout << "\nno grid came in\n";
+  for (auto const& volume : content.points) printPoints(volume, ++n);
+  if (n == 0) std::cout << "\nno grid came in\n";
   if (content.skipped.empty()) return;
   std::cout << "\nskipped\n";
   for (auto const& s : content.skipped)
@@ -211,8 +216,15 @@ void info(InfoOptions const& options) {
   VdbImport content;
   {
     ProgressBar bar;
-    content = importVdb(options.file, options.limits, bar.progress());
+    if (isPointsFile(options.file)) {
+      PointsInput input;
+      input.file = content.file = options.file;
+      content.points = readPointVolumes(input, bar.progress());
+    } else {
+      content = importVdb(options.file, options.limits, bar.progress());
+    }
   }
+  for (auto const& volume : content.points) noteLosses(content.file, volume);
   if (options.json) {
     printJson(content);
   } else {

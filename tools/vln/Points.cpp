@@ -39,8 +39,8 @@ void points(PointsOptions const& options) {
     writePoints(options.output, volume, options.size);
   }
   noteLosses(options.input.file, volume);
-  std::cout << fmt::format("{} points in {} tiles, voxel size {:.6g}\n", pointCount(volume), tileCount(volume),
-                           volume.voxelSize);
+  std::cout << fmt::format("{} points in {} tiles, voxel size {:.6g}\n", pointCount(volume),
+                           tileCount(volume), volume.voxelSize);
 }
 
 void tiles(TilesOptions const& options) {
@@ -114,8 +114,8 @@ void advect(AdvectOptions const& options) {
   std::cout << fmt::format("{} points, {} steps in {:.3f} s: {:.1f} million points a second\n"
                            "{} points after, {} dropped\n"
                            "{} tiles before, {} gained, {} lost, {} after\n",
-                           before, options.steps, seconds, rate / 1e6, after, before - after, tilesBefore, gained, lost,
-                           tileCount(volume));
+                           before, options.steps, seconds, rate / 1e6, after, before - after, tilesBefore,
+                           gained, lost, tileCount(volume));
 }
 
 } // namespace Vln

@@ -50,12 +50,14 @@ PointVolume readPointVolume(PointsInput const& input, Progress const& progress) 
 
 void noteLosses(std::string const& file, PointVolume const& volume) {
   if (volume.dropped > 0)
-    std::cerr << fmt::format("vln: {}: note: {} points lie out of reach and are left out\n", file, volume.dropped);
+    std::cerr << fmt::format("vln: {}: note: {} points lie out of reach and are left out\n", file,
+                             volume.dropped);
   for (auto const& name : volume.skippedAttributes)
     std::cerr << fmt::format("vln: {}: note: the attribute {} is left out\n", file, oneLine(name, 60));
   if (!volume.transform.empty())
-    std::cerr << fmt::format("vln: {}: note: the transform is {}; positions leave out all but the voxel size\n", file,
-                             volume.transform);
+    std::cerr << fmt::format(
+        "vln: {}: note: the transform is {}; positions leave out all but the voxel size\n", file,
+        volume.transform);
 }
 
 void checkPointsOutput(std::string const& path) {

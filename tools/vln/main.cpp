@@ -61,7 +61,7 @@ struct Options {
 
 void addInfo(CLI::App& app, Vln::InfoOptions& o) {
   auto* command = app.add_subcommand("info", "Report what a volume file holds");
-  command->add_option("FILE", o.file, "A .vdb file")->required();
+  command->add_option("FILE", o.file, "A .vdb or .ply file")->required();
   auto* json = command->add_flag("--json", o.json, "One JSON object instead of tables");
   command->add_flag("--memory", o.memory, "Also what accounts for memory: objects, their data, and the pools")
       ->excludes(json);
@@ -145,14 +145,15 @@ void addChurn(CLI::App& app, Vln::ChurnOptions& o) {
 
 void addPointsInput(CLI::App& command, Vln::PointsInput& o) {
   command.add_option("FILE", o.file, "A .ply file, or a .vdb file with points")->required();
-  command.add_option("--grid", o.grid, "Points grid of a .vdb file that has more than one")->type_name("NAME");
+  command.add_option("--grid", o.grid, "Points grid of a .vdb file that has more than one")
+      ->type_name("NAME");
   auto* size = command.add_option("--voxel-size", o.voxelSize, "World length of a voxel, for .ply files")
                    ->check(CLI::PositiveNumber)
                    ->type_name("W");
   command
       .add_option("--points-per-tile", o.pointsPerTile,
                   "Choose the voxel size of a .ply file so that a tile holds about so many points")
-      ->check(CLI::Range(1.0, 1e9))
+      ->check(CLI::Range(2.0, 1e9))
       ->capture_default_str()
       ->excludes(size)
       ->type_name("N");
@@ -162,8 +163,12 @@ void addPointsInput(CLI::App& command, Vln::PointsInput& o) {
 void addPoints(CLI::App& app, Vln::PointsOptions& o) {
   auto* command = app.add_subcommand("points", "Write points as boxes, or into another format");
   addPointsInput(*command, o.input);
-  command->add_option("-o,--output", o.output, "The file to write: .obj, .ply or .vdb")->required()->type_name("OUT");
-  command->add_option("--size", o.size, "Half-width of the cubes of an .obj file (default: a quarter of a voxel)")
+  command->add_option("-o,--output", o.output, "The file to write: .obj, .ply or .vdb")
+      ->required()
+      ->type_name("OUT");
+  command
+      ->add_option("--size", o.size,
+                   "Half-width of the cubes of an .obj file (default: a quarter of a voxel)")
       ->check(CLI::PositiveNumber)
       ->type_name("W");
   command->footer("Example:\n  vln points scan.ply -o scan.vdb");
@@ -185,14 +190,19 @@ void addTiles(CLI::App& app, Vln::TilesOptions& o) {
 }
 
 void addAdvect(CLI::App& app, Vln::AdvectOptions& o) {
-  auto* command = app.add_subcommand("advect", "Move points, each step into the tiles where they then belong");
+  auto* command =
+      app.add_subcommand("advect", "Move points, each step into the tiles where they then belong");
   addPointsInput(*command, o.input);
-  command->add_option("--velocity", o.velocity, "World vector of a step")->required()->expected(3)->type_name("X Y Z");
+  command->add_option("--velocity", o.velocity, "World vector of a step")
+      ->required()
+      ->expected(3)
+      ->type_name("X Y Z");
   command->add_option("--steps", o.steps, "Number of steps")
       ->check(CLI::Range(0, 1000000))
       ->capture_default_str()
       ->type_name("N");
-  command->add_option("-o,--output", o.output, "Write the moved points: .obj, .ply or .vdb")->type_name("OUT");
+  command->add_option("-o,--output", o.output, "Write the moved points: .obj, .ply or .vdb")
+      ->type_name("OUT");
   command->add_flag("--json", o.json, "One JSON object instead of text");
   command->footer("Example:\n  vln advect scan.ply --velocity 0.1 0 0 --steps 100");
   command->callback([&o] { Vln::advect(o); });

@@ -285,7 +285,9 @@ private:
   std::vector<std::int64_t> findMissing(std::int64_t count, int depth,
                                         FunctionRef<int3 const*(std::int64_t)> cornerAt) const;
   /// Makes the tiles of distinct aligned corners that do not exist yet.
-  void createTiles(std::vector<int3> const& corners, int depth, TileLists* newTiles);
+  /// @param parents If given, the parent of each where it is known; -1 where it has to be searched.
+  void createTiles(std::vector<int3> const& corners, int depth, TileLists* newTiles,
+                   std::vector<std::int64_t> const* parents = nullptr);
   /// Hangs roots deeper than `depth` below roots of `depth` that hold them.
   void adoptDeeperRoots(int depth);
   /// Takes a tile or its branch out of the tree; returns how many tiles died.
