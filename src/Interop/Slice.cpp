@@ -3,12 +3,14 @@
 #include "GeometryVolume/channels/Channel.h"
 #include "GeometryVolume/core/Numeric.h"
 #include "GeometryVolume/core/Parallel.h"
+#include "GeometryVolume/sampling/VoxelSamplerLinear.h"
 #include "GeometryVolume/tiletree/Container.h"
 #include "Interop/ColorMap.h"
 
 #include <algorithm>
 #include <cmath>
 #include <cstdio>
+#include <memory>
 #include <stdexcept>
 #include <vector>
 
@@ -19,6 +21,9 @@ namespace {
 using VdbTraits = TileTree3D::Traits<2, 4, 0, 1>;
 using Container = TileTree3D::Container<VdbTraits>;
 using FloatChannel = TileTree3D::Channel<VdbTraits, float, 4, 0>;
+using Topology = TileTree3D::VoxelTopology<VdbTraits>;
+using Sampler = TileTree3D::FloatVoxelSamplerLinear<VdbTraits>;
+using Velorn::Math::float3;
 using Velorn::Math::int3;
 
 constexpr Rgb kNoTile{222, 222, 222};
@@ -39,10 +44,21 @@ std::string number(double value) {
 struct Plane {
   int axis, across, up; // axes of tile space
   int at;               // index along `axis`
+  double where;         // the same, between indices
   IndexBox box;
   int width, height;
 
   int extent(int a) const { return box.max[a] - box.min[a]; }
+  double acrossAt(int x) const { return box.min[across] + (x + 0.5) * extent(across) / width; }
+  double upAt(int y) const { return box.max[up] - (y + 0.5) * extent(up) / height; }
+  // A pixel in the middle of a sample's square lies on the sample.
+  float3 placeOf(int x, int y) const {
+    float3 p{};
+    p[axis] = static_cast<float>(where);
+    p[across] = static_cast<float>(acrossAt(x) - 0.5);
+    p[up] = static_cast<float>(upAt(y) - 0.5);
+    return p;
+  }
   int3 indexOf(int x, int y) const {
     int3 p{};
     p[axis] = at;
@@ -61,6 +77,7 @@ Plane planeFor(VdbVolume const& volume, VdbChannel const& channel, SliceOptions 
   int const low = plane.box.min[plane.axis], high = plane.box.max[plane.axis] - 1;
   double const at = options.at ? *options.at / volume.voxelSize : 0.5 * (double(low) + high);
   plane.at = toIntFloor(at + 0.5);
+  plane.where = at;
   if (plane.at < low || plane.at > high)
     throw std::invalid_argument("position " + number(options.at.value_or(0)) + " on axis " +
                                 std::string(1, "xyz"[plane.axis]) +
@@ -73,23 +90,12 @@ Plane planeFor(VdbVolume const& volume, VdbChannel const& channel, SliceOptions 
   return plane;
 }
 
-} // namespace
+std::size_t pixelCount(Plane const& plane) {
+  return static_cast<std::size_t>(plane.width) * static_cast<std::size_t>(plane.height);
+}
 
-Slice drawSlice(VdbVolume const& volume, std::string const& name, SliceOptions const& options) {
-  VdbChannel const* info = volume.channel(name);
-  auto const channel = volume.object->component<FloatChannel>(name);
-  auto const container = volume.object->component<Container>(kVdbContainerName);
-  if (!info || !channel || !container) throw std::invalid_argument("there is no channel '" + name + "'");
-  if (info->activeBox.empty()) throw std::invalid_argument("channel '" + name + "' has no active voxel");
-  if (options.axis < 0 || options.axis > 2) throw std::invalid_argument("the axis must be x, y or z");
-  if (options.size < kSmallestSlice || options.size > kLargestSlice)
-    throw std::invalid_argument("the size must lie in " + std::to_string(kSmallestSlice) + ".." +
-                                std::to_string(kLargestSlice));
-
-  Plane const plane = planeFor(volume, *info, options);
-  FloatChannel const& samplesOf = *channel;
-  Container const& tree = *container;
-  std::vector<Sample> samples(static_cast<std::size_t>(plane.width) * static_cast<std::size_t>(plane.height));
+std::vector<Sample> nearestSamples(Plane const& plane, Container const& tree, FloatChannel const& channel) {
+  std::vector<Sample> samples(pixelCount(plane));
   parallelFor(0, plane.height,
               [&](std::int64_t begin, std::int64_t end) {
                 auto accessor = tree.tileAccessor();
@@ -99,12 +105,67 @@ Slice drawSlice(VdbVolume const& volume, std::string const& name, SliceOptions c
                     auto const& tile = accessor.tile(p, Container::kMaxDepth, false);
                     if (!tile.valid()) continue;
                     samples[static_cast<std::size_t>(y * plane.width + x)] = {
-                        samplesOf.tileData(tile.treeIndex())(tile.childDataIJK(p)), true};
+                        channel.tileData(tile.treeIndex())(tile.childDataIJK(p)), true};
                   }
               },
               {.grain = 8});
+  return samples;
+}
 
-  Slice slice{Image(1, 1), plane.at * volume.voxelSize, 0, 0, 0, 0};
+std::vector<Sample> linearSamples(Plane const& plane, Sampler const& cold, bool gradient) {
+  std::vector<Sample> samples(pixelCount(plane));
+  // Samplers keep tiles that they have widened: one for each thread, for all of its rows.
+  std::vector<std::unique_ptr<Sampler>> samplers(static_cast<std::size_t>(parallelThreads()));
+  parallelFor(0, plane.height,
+              [&](std::int64_t begin, std::int64_t end) {
+                auto& sampler = samplers[static_cast<std::size_t>(parallelThreadIndex())];
+                if (!sampler) sampler = std::make_unique<Sampler>(cold);
+                for (std::int64_t y = begin; y < end; ++y)
+                  for (int x = 0; x < plane.width; ++x) {
+                    float3 const p = plane.placeOf(x, static_cast<int>(y));
+                    TileTree3D::TreeIndex tile;
+                    int3 ijk;
+                    float3 weights;
+                    if (!sampler->prepareToSample(p, TileTree3D::kSamplerTileSpace, tile, ijk, weights,
+                                                  Container::kMaxDepth, nullptr))
+                      continue;
+                    Sample& s = samples[static_cast<std::size_t>(y * plane.width + x)];
+                    s.found = true;
+                    if (gradient) {
+                      float3 g;
+                      sampler->sampleGradient(p, TileTree3D::kSamplerTileSpace, &g);
+                      s.value = std::hypot(g.x, g.y, g.z);
+                    } else {
+                      s.value = sampler->sample(tile, ijk, weights);
+                    }
+                  }
+              },
+              {.grain = 8});
+  return samples;
+}
+
+} // namespace
+
+Slice drawSlice(VdbVolume const& volume, std::string const& name, SliceOptions const& options) {
+  VdbChannel const* info = volume.channel(name);
+  auto const channel = volume.object->component<FloatChannel>(name);
+  auto const container = volume.object->component<Container>(kVdbContainerName);
+  auto const topology = volume.object->component<Topology>(kVdbTopologyName);
+  if (!info || !channel || !container || !topology)
+    throw std::invalid_argument("there is no channel '" + name + "'");
+  if (info->activeBox.empty()) throw std::invalid_argument("channel '" + name + "' has no active voxel");
+  if (options.axis < 0 || options.axis > 2) throw std::invalid_argument("the axis must be x, y or z");
+  if (options.size < kSmallestSlice || options.size > kLargestSlice)
+    throw std::invalid_argument("the size must lie in " + std::to_string(kSmallestSlice) + ".." +
+                                std::to_string(kLargestSlice));
+
+  Plane const plane = planeFor(volume, *info, options);
+  auto const samples = options.nearest && !options.gradient
+                           ? nearestSamples(plane, *container, *channel)
+                           : linearSamples(plane, {*container, *topology, *channel}, options.gradient);
+
+  double const at = options.nearest && !options.gradient ? plane.at : plane.where;
+  Slice slice{Image(1, 1), at * volume.voxelSize, 0, 0, 0, 0};
   std::vector<float> numbers;
   for (Sample const& s : samples) {
     slice.drawn += s.found;

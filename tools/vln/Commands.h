@@ -6,6 +6,7 @@
 
 #include <cstdint>
 #include <string>
+#include <vector>
 
 namespace Vln {
 
@@ -24,6 +25,15 @@ struct SliceOptions {
   VLN::Interop::VdbReadLimits limits;
 };
 void slice(SliceOptions const& options);
+
+struct ProbeOptions {
+  std::string file;
+  std::string channel;
+  std::vector<float> positions; ///< x, y, z, x, y, z, ...
+  std::string points;           ///< a CSV file; empty for none
+  VLN::Interop::VdbReadLimits limits;
+};
+void probe(ProbeOptions const& options);
 
 struct MakeOptions {
   std::string shape;
