@@ -4,6 +4,7 @@
 #include "GeometryVolume/core/ElementTypes.h"
 #include "GeometryVolume/core/Numeric.h"
 #include "GeometryVolume/core/Parallel.h"
+#include "GeometryVolume/sampling/VoxelSamplerLinear.h"
 #include "GeometryVolume/tiletree/Container.h"
 #include "Interop/ColorMap.h"
 
@@ -11,6 +12,7 @@
 #include <cmath>
 #include <cstdio>
 #include <functional>
+#include <memory>
 #include <stdexcept>
 #include <vector>
 
@@ -22,6 +24,10 @@ using VdbTraits = TileTree3D::Traits<2, 4, 0, 1>;
 using Container = TileTree3D::Container<VdbTraits>;
 using TileTree3D::ChannelBase;
 using TileTree3D::TreeIndex;
+using Topology = TileTree3D::VoxelTopology<VdbTraits>;
+using FloatChannel = TileTree3D::Channel<VdbTraits, float, 4, 0>;
+using Sampler = TileTree3D::FloatVoxelSamplerLinear<VdbTraits>;
+using Velorn::Math::float3;
 using Velorn::Math::int3;
 
 constexpr Rgb kNoTile{222, 222, 222};
@@ -79,10 +85,21 @@ Reader readerOf(ChannelBase const& channel) {
 struct Plane {
   int axis, across, up; // axes of tile space
   int at;               // index along `axis`
+  double where;         // the same, between indices
   IndexBox box;
   int width, height;
 
   int extent(int a) const { return box.max[a] - box.min[a]; }
+  double acrossAt(int x) const { return box.min[across] + (x + 0.5) * extent(across) / width; }
+  double upAt(int y) const { return box.max[up] - (y + 0.5) * extent(up) / height; }
+  // A pixel in the middle of a sample's square lies on the sample.
+  float3 placeOf(int x, int y) const {
+    float3 p{};
+    p[axis] = static_cast<float>(where);
+    p[across] = static_cast<float>(acrossAt(x) - 0.5);
+    p[up] = static_cast<float>(upAt(y) - 0.5);
+    return p;
+  }
   int3 indexOf(int x, int y) const {
     int3 p{};
     p[axis] = at;
@@ -119,6 +136,7 @@ Plane planeFor(VdbVolume const& volume, VdbChannel const& channel, SliceOptions 
   int const low = plane.box.min[plane.axis], high = plane.box.max[plane.axis] - 1;
   double const at = options.at ? indexAt(volume, plane, *options.at) : 0.5 * (double(low) + high);
   plane.at = toIntFloor(at + 0.5);
+  plane.where = at;
   if (plane.at < low || plane.at > high)
     throw std::invalid_argument(
         "position " + number(options.at.value_or(0)) + " on axis " + std::string(1, "xyz"[plane.axis]) +
@@ -131,23 +149,13 @@ Plane planeFor(VdbVolume const& volume, VdbChannel const& channel, SliceOptions 
   return plane;
 }
 
-} // namespace
+std::size_t pixelCount(Plane const& plane) {
+  return static_cast<std::size_t>(plane.width) * static_cast<std::size_t>(plane.height);
+}
 
-Slice drawSlice(VdbVolume const& volume, std::string const& name, SliceOptions const& options) {
-  VdbChannel const* info = volume.channel(name);
-  auto const channel = volume.object->component<ChannelBase>(name);
-  auto const container = volume.object->component<Container>(kVdbContainerName);
-  if (!info || !channel || !container) throw std::invalid_argument("there is no channel '" + name + "'");
-  if (info->activeBox.empty()) throw std::invalid_argument("channel '" + name + "' has no active voxel");
-  if (options.axis < 0 || options.axis > 2) throw std::invalid_argument("the axis must be x, y or z");
-  if (options.size < kSmallestSlice || options.size > kLargestSlice)
-    throw std::invalid_argument("the size must lie in " + std::to_string(kSmallestSlice) + ".." +
-                                std::to_string(kLargestSlice));
-
-  Plane const plane = planeFor(volume, *info, options);
-  Reader const read = readerOf(*channel);
-  Container const& tree = *container;
-  std::vector<Sample> samples(static_cast<std::size_t>(plane.width) * static_cast<std::size_t>(plane.height));
+std::vector<Sample> nearestSamples(Plane const& plane, Container const& tree, ChannelBase const& channel) {
+  std::vector<Sample> samples(pixelCount(plane));
+  Reader const read = readerOf(channel);
   parallelFor(0, plane.height,
               [&](std::int64_t begin, std::int64_t end) {
                 auto accessor = tree.tileAccessor();
@@ -161,8 +169,67 @@ Slice drawSlice(VdbVolume const& volume, std::string const& name, SliceOptions c
                   }
               },
               {.grain = 8});
+  return samples;
+}
 
-  Slice slice{Image(1, 1), worldOn(volume, plane, plane.at), 0, 0, 0, 0};
+std::vector<Sample> linearSamples(Plane const& plane, Sampler const& cold, bool gradient) {
+  std::vector<Sample> samples(pixelCount(plane));
+  // Samplers keep tiles that they have widened: one for each thread, for all of its rows.
+  std::vector<std::unique_ptr<Sampler>> samplers(static_cast<std::size_t>(parallelThreads()));
+  parallelFor(0, plane.height,
+              [&](std::int64_t begin, std::int64_t end) {
+                auto& sampler = samplers[static_cast<std::size_t>(parallelThreadIndex())];
+                if (!sampler) sampler = std::make_unique<Sampler>(cold);
+                for (std::int64_t y = begin; y < end; ++y)
+                  for (int x = 0; x < plane.width; ++x) {
+                    float3 const p = plane.placeOf(x, static_cast<int>(y));
+                    TileTree3D::TreeIndex tile;
+                    int3 ijk;
+                    float3 weights;
+                    if (!sampler->prepareToSample(p, TileTree3D::kSamplerTileSpace, tile, ijk, weights,
+                                                  Container::kMaxDepth, nullptr))
+                      continue;
+                    Sample& s = samples[static_cast<std::size_t>(y * plane.width + x)];
+                    s.found = true;
+                    if (gradient) {
+                      float3 g;
+                      sampler->sampleGradient(p, TileTree3D::kSamplerTileSpace, &g);
+                      s.value = std::hypot(g.x, g.y, g.z);
+                    } else {
+                      s.value = sampler->sample(tile, ijk, weights);
+                    }
+                  }
+              },
+              {.grain = 8});
+  return samples;
+}
+
+} // namespace
+
+Slice drawSlice(VdbVolume const& volume, std::string const& name, SliceOptions const& options) {
+  VdbChannel const* info = volume.channel(name);
+  auto const channel = volume.object->component<ChannelBase>(name);
+  auto const container = volume.object->component<Container>(kVdbContainerName);
+  auto const topology = volume.object->component<Topology>(kVdbTopologyName);
+  if (!info || !channel || !container || !topology)
+    throw std::invalid_argument("there is no channel '" + name + "'");
+  if (info->activeBox.empty()) throw std::invalid_argument("channel '" + name + "' has no active voxel");
+  if (options.axis < 0 || options.axis > 2) throw std::invalid_argument("the axis must be x, y or z");
+  if (options.size < kSmallestSlice || options.size > kLargestSlice)
+    throw std::invalid_argument("the size must lie in " + std::to_string(kSmallestSlice) + ".." +
+                                std::to_string(kLargestSlice));
+
+  Plane const plane = planeFor(volume, *info, options);
+  auto const* floats = dynamic_cast<FloatChannel const*>(channel.get());
+  if (options.gradient && !floats)
+    throw std::invalid_argument("channel '" + name +
+                                "' is no float channel, so that it has no gradient here");
+  // Channels of other types than float are drawn by their nearest samples.
+  bool const nearest = !floats || (options.nearest && !options.gradient);
+  auto const samples = nearest ? nearestSamples(plane, *container, *channel)
+                               : linearSamples(plane, {*container, *topology, *floats}, options.gradient);
+
+  Slice slice{Image(1, 1), worldOn(volume, plane, nearest ? plane.at : plane.where), 0, 0, 0, 0};
   std::vector<float> numbers;
   for (Sample const& s : samples) {
     slice.drawn += s.found;

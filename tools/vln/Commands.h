@@ -34,6 +34,15 @@ struct ConvertOptions {
 };
 void convert(ConvertOptions const& options);
 
+struct ProbeOptions {
+  std::string file;
+  std::string channel;
+  std::vector<float> positions; ///< x, y, z, x, y, z, ...
+  std::string points;           ///< a CSV file; empty for none
+  VLN::Interop::VdbReadLimits limits;
+};
+void probe(ProbeOptions const& options);
+
 struct MakeOptions {
   std::string shape;
   std::string output;

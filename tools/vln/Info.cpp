@@ -1,10 +1,12 @@
 #include "Commands.h"
 #include "GeometryVolume/channels/Channel.h"
+#include "GeometryVolume/channels/NonLeafValues.h"
 #include "GeometryVolume/pools/ArrayPool.h"
 #include "GeometryVolume/pools/BaseLogger.h"
 #include "GeometryVolume/pools/ChannelMemoryPool.h"
 #include "GeometryVolume/pools/ChannelPool.h"
 #include "GeometryVolume/tiletree/Container.h"
+#include "GeometryVolume/topology/VoxelTopology.h"
 #include "Interop/FileError.h"
 #include "Interop/VdbImport.h"
 #include "vln/Commands.h"
@@ -50,6 +52,15 @@ std::int64_t elementsOf(VdbVolume const& volume, std::string const& channel) {
   return static_cast<std::int64_t>(volume.object->component(channel)->size());
 }
 
+// Whether each refined sample holds the value of the child sample at its place.
+bool coarseEqualsChildren(VdbVolume const& volume, std::string const& channel) {
+  auto const tree = volume.object->component<Container>(kVdbContainerName);
+  auto const topology = volume.object->component<VLN::TileTree3D::VoxelTopology<VdbTraits>>(kVdbTopologyName);
+  auto const values = volume.object->component<VLN::TileTree3D::Channel<VdbTraits, float, 4, 0>>(channel);
+  return !VLN::TileTree3D::checkIfNonLeafValueIsSetToChildValue(*values, *tree, topology->offsetType(), 0.0f,
+                                                                0, Container::kMaxDepth);
+}
+
 std::int64_t activeVoxels(VdbVolume const& volume) {
   std::int64_t count = 0;
   for (auto const& channel : volume.channels) count += channel.activeVoxels;
@@ -93,7 +104,8 @@ Json channelJson(VdbVolume const& volume, VdbChannel const& channel) {
             {"elements", elementsOf(volume, channel.name)},
             {"active", channel.activeVoxels},
             {"min", nullptr},
-            {"max", nullptr}};
+            {"max", nullptr},
+            {"coarse_equals_children", coarseEqualsChildren(volume, channel.name)}};
   if (channel.hasRange) j["min"] = shortest(channel.minimum), j["max"] = shortest(channel.maximum);
   return j;
 }
@@ -171,6 +183,10 @@ void printVolume(VdbVolume const& volume, std::size_t n) {
                        grouped(elementsOf(volume, channel.name)), grouped(channel.activeVoxels),
                        channel.hasRange ? number(channel.minimum) : "-",
                        channel.hasRange ? number(channel.maximum) : "-");
+
+  for (auto const& channel : volume.channels)
+    out << fmt::format("  {}: coarse values {} those of their children\n", oneLine(channel.name, 60),
+                       coarseEqualsChildren(volume, channel.name) ? "equal" : "differ from");
 
   Memory const memory = memoryOf(*volume.object);
   auto const active = activeVoxels(volume);

@@ -52,6 +52,7 @@ struct Options {
   Vln::InfoOptions info;
   Vln::SliceOptions slice;
   Vln::ConvertOptions convert;
+  Vln::ProbeOptions probe;
   Vln::MakeOptions make;
   Vln::ChurnOptions churn;
   Vln::PointsOptions points;
@@ -89,6 +90,8 @@ void addSlice(CLI::App& app, Vln::SliceOptions& o) {
       ->check(CLI::Range(VLN::Interop::kSmallestSlice, VLN::Interop::kLargestSlice))
       ->capture_default_str()
       ->type_name("N");
+  command->add_flag("--nearest", o.plane.nearest, "Draw the nearest sample instead of blending linearly");
+  command->add_flag("--gradient", o.plane.gradient, "Draw the length of the gradient")->excludes("--nearest");
   command->add_option("-o,--output", o.output, "The PNG file to write")->required()->type_name("OUT.png");
   addMemoryLimit(*command, o.limits);
   command->footer("Example:\n  vln slice smoke.vdb --channel density --axis z -o slice.png");
@@ -102,6 +105,21 @@ void addConvert(CLI::App& app, Vln::ConvertOptions& o) {
   addMemoryLimit(*command, o.limits);
   command->footer("Example:\n  vln convert smoke.vdb copy.vdb");
   command->callback([&o] { Vln::convert(o); });
+}
+
+void addProbe(CLI::App& app, Vln::ProbeOptions& o) {
+  auto* command =
+      app.add_subcommand("probe", "Print value and gradient of a channel at world positions as CSV");
+  command->add_option("FILE", o.file, "A .vdb file")->required();
+  command->add_option("X Y Z", o.positions, "World positions, three numbers each")->type_name("...");
+  command->add_option("--channel", o.channel, "Name of the channel, as info tells it")
+      ->required()
+      ->type_name("NAME");
+  command->add_option("--points", o.points, "A file with a line x,y,z for each position, without header")
+      ->type_name("FILE.csv");
+  addMemoryLimit(*command, o.limits);
+  command->footer("Example:\n  vln probe smoke.vdb --channel density 0.5 1.25 -3");
+  command->callback([&o] { Vln::probe(o); });
 }
 
 void addMake(CLI::App& app, Vln::MakeOptions& o) {
@@ -224,6 +242,7 @@ int main(int argc, char** argv) {
              "  vln info smoke.vdb\n"
              "  vln slice smoke.vdb --channel density --axis z -o slice.png\n"
              "  vln convert smoke.vdb copy.vdb\n"
+             "  vln probe smoke.vdb --channel density 0.5 1.25 -3\n"
              "  vln make cloud cloud.vdb --voxels 1000000\n"
              "  vln churn smoke.vdb --limit 512MB --rounds 30\n"
              "\n'vln COMMAND --help' tells the options of a command.");
@@ -231,6 +250,7 @@ int main(int argc, char** argv) {
   addInfo(app, options.info);
   addSlice(app, options.slice);
   addConvert(app, options.convert);
+  addProbe(app, options.probe);
   addMake(app, options.make);
   addChurn(app, options.churn);
   addPoints(app, options.points);
