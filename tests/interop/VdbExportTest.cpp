@@ -47,10 +47,13 @@ void expectSame(openvdb::GridPtrVec const& grids, openvdb::MetaMap::Ptr const& m
   if (metadata && !import.volumes.empty()) {
     EXPECT_EQ(VdbCompare::metadataDifference(*metadata, *metadataBack), "") << what;
   }
-  std::size_t expected = grids.size() - import.skipped.size();
+  auto const isPoints = [](auto const& grid) { return grid->type() == "Tree_ptdataidx32_5_4_3"; };
+  auto const points = static_cast<std::size_t>(std::count_if(grids.begin(), grids.end(), isPoints));
+  std::size_t const expected = grids.size() - points - import.skipped.size();
   ASSERT_EQ(back.size(), expected) << what;
   auto const byName = [](auto const& a, auto const& b) { return a->getName() < b->getName(); };
   auto sorted = grids;
+  std::erase_if(sorted, isPoints);
   std::erase_if(sorted, [&](auto const& grid) {
     return std::any_of(import.skipped.begin(), import.skipped.end(),
                        [&](auto const& s) { return s.grid == grid->getName(); });

@@ -1,4 +1,4 @@
-#include "vln/Content.h"
+#include "Content.h"
 
 #include "Interop/FileError.h"
 

@@ -1,18 +1,18 @@
 #include "Commands.h"
 #include "GeometryVolume/channels/Channel.h"
 #include "GeometryVolume/channels/NonLeafValues.h"
+#include "GeometryVolume/core/ElementTypes.h"
 #include "GeometryVolume/pools/ArrayPool.h"
 #include "GeometryVolume/pools/BaseLogger.h"
 #include "GeometryVolume/pools/ChannelMemoryPool.h"
 #include "GeometryVolume/pools/ChannelPool.h"
 #include "GeometryVolume/tiletree/Container.h"
 #include "GeometryVolume/topology/VoxelTopology.h"
+#include "InfoPoints.h"
 #include "Interop/FileError.h"
 #include "Interop/VdbImport.h"
-#include "vln/Commands.h"
-#include "vln/InfoPoints.h"
-#include "vln/PointsFile.h"
-#include "vln/ProgressBar.h"
+#include "PointsFile.h"
+#include "ProgressBar.h"
 
 #include <array>
 #include <cstdlib>
@@ -52,13 +52,24 @@ std::int64_t elementsOf(VdbVolume const& volume, std::string const& channel) {
   return static_cast<std::int64_t>(volume.object->component(channel)->size());
 }
 
-// Whether each refined sample holds the value of the child sample at its place.
-bool coarseEqualsChildren(VdbVolume const& volume, std::string const& channel) {
+template <class T>
+bool coarseEqualsChildrenAs(VdbVolume const& volume, std::string const& channel, bool& equal) {
+  auto const values = volume.object->component<VLN::TileTree3D::Channel<VdbTraits, T, 4, 0>>(channel);
+  if (!values) return false;
   auto const tree = volume.object->component<Container>(kVdbContainerName);
   auto const topology = volume.object->component<VLN::TileTree3D::VoxelTopology<VdbTraits>>(kVdbTopologyName);
-  auto const values = volume.object->component<VLN::TileTree3D::Channel<VdbTraits, float, 4, 0>>(channel);
-  return !VLN::TileTree3D::checkIfNonLeafValueIsSetToChildValue(*values, *tree, topology->offsetType(), 0.0f,
-                                                                0, Container::kMaxDepth);
+  equal = !VLN::TileTree3D::checkIfNonLeafValueIsSetToChildValue(*values, *tree, topology->offsetType(), 0.0f,
+                                                                 0, Container::kMaxDepth);
+  return true;
+}
+
+// Whether each refined sample holds the value of the child sample at its place.
+bool coarseEqualsChildren(VdbVolume const& volume, std::string const& channel) {
+  bool equal = false, known = false;
+#define VLN_TRY(T, NAME) known = known || coarseEqualsChildrenAs<T>(volume, channel, equal);
+  VLN_FOR_EACH_ELEMENT_TYPE(VLN_TRY)
+#undef VLN_TRY
+  return equal;
 }
 
 std::int64_t activeVoxels(VdbVolume const& volume) {
@@ -104,8 +115,7 @@ Json channelJson(VdbVolume const& volume, VdbChannel const& channel) {
             {"elements", elementsOf(volume, channel.name)},
             {"active", channel.activeVoxels},
             {"min", nullptr},
-            {"max", nullptr},
-            {"coarse_equals_children", coarseEqualsChildren(volume, channel.name)}};
+            {"max", nullptr}};
   if (channel.hasRange) j["min"] = shortest(channel.minimum), j["max"] = shortest(channel.maximum);
   return j;
 }

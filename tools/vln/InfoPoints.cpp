@@ -1,4 +1,4 @@
-#include "vln/InfoPoints.h"
+#include "InfoPoints.h"
 
 #include "Interop/FileError.h"
 

@@ -1,10 +1,10 @@
+#include "Commands.h"
 #include "GeometryVolume/tiletree/Container.h"
 #include "Interop/FileError.h"
 #include "Interop/OutputFile.h"
 #include "Interop/VdbImport.h"
-#include "vln/Commands.h"
-#include "vln/PointsFile.h"
-#include "vln/ProgressBar.h"
+#include "PointsFile.h"
+#include "ProgressBar.h"
 
 #include <chrono>
 #include <filesystem>

@@ -1,4 +1,4 @@
-#include "vln/PointsFile.h"
+#include "PointsFile.h"
 
 #include "GeometryVolume/debug/DumpObj.h"
 #include "Interop/FileError.h"

@@ -1,7 +1,7 @@
 #pragma once
 
+#include "Commands.h"
 #include "Interop/PointVolume.h"
-#include "vln/Commands.h"
 
 #include <string>
 #include <vector>

@@ -1,11 +1,11 @@
+#include "Commands.h"
+#include "Content.h"
 #include "GeometryVolume/channels/Channel.h"
 #include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/sampling/VoxelSamplerLinear.h"
 #include "Interop/FileError.h"
 #include "Interop/VdbImport.h"
-#include "vln/Commands.h"
-#include "vln/Content.h"
-#include "vln/ProgressBar.h"
+#include "ProgressBar.h"
 
 #include <charconv>
 #include <cstring>

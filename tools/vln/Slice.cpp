@@ -1,10 +1,9 @@
 #include "Commands.h"
+#include "Content.h"
 #include "Interop/FileError.h"
 #include "Interop/OutputFile.h"
 #include "Interop/VdbImport.h"
-#include "vln/Commands.h"
-#include "vln/Content.h"
-#include "vln/ProgressBar.h"
+#include "ProgressBar.h"
 
 #include <iostream>
 #include <stdexcept>

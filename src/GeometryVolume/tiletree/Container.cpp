@@ -211,9 +211,8 @@ void Container<TraitsT>::reduce(VisitorType& visitor, TraversalMode mode, Traver
   TraversalEngine<false, TraitsT>::run(*this, visitor, mode, range, VisitorResults::kJoin);
 }
 template <class TraitsT> void Container<TraitsT>::setBranchSizes() {
-  // Tiles of the deepest depth have no children and keep the size that they were made with.
   BranchSizeVisitor<TraitsT> visitor(*m_data);
-  traverse(visitor, kParallelBottomUp, {.maxDepth = kMaxDepth - 1});
+  traverse(visitor, kParallelBottomUp);
 }
 template <class TraitsT> bool Container<TraitsT>::checkBranchSizes(bool verbose) const {
   return TileTree3D::checkBranchSizes(*this, verbose);
