@@ -242,6 +242,5 @@ TYPED_TEST(TileDataOf, RequirementSettersStayInsideTheTile) {
   VLN_INSTANTIATE_DYNAMIC(type, 5, 0)                                                                        \
   VLN_INSTANTIATE_DYNAMIC(type, 5, 1)                                                                        \
   VLN_INSTANTIATE_DYNAMIC(type, 5, 2)                                                                        \
-  VLN_INSTANTIATE_DYNAMIC(type, 6, 0) VLN_INSTANTIATE_DYNAMIC(type, 8, 0)                                    \
-      VLN_INSTANTIATE_DYNAMIC(type, 8, 1)
+  VLN_INSTANTIATE_DYNAMIC(type, 6, 0) VLN_INSTANTIATE_DYNAMIC(type, 8, 0) VLN_INSTANTIATE_DYNAMIC(type, 8, 1)
 VLN_FOR_EACH_ELEMENT_TYPE(VLN_INSTANTIATE)
