@@ -100,7 +100,24 @@ void fillChannel(FloatChannel& channel, Container const& container, FloatGrid co
     }
 }
 
-VdbVolume buildVolume(Group const& group, Progress const& progress, double from, double to) {
+// About what a volume takes: records of tiles and of their vectors, child tables and samples. Many grids that
+// lie apart share one large tree, so a small file can ask for much.
+std::uint64_t bytesFor(TileCorners const& corners, std::size_t channels) {
+  std::uint64_t tiles = 0;
+  for (auto const& list : corners) tiles += list.size();
+  return tiles * (160 + channels * (VdbTraits::kTileDataSize * sizeof(float) + 64));
+}
+
+// `memoryLeft` falls by what the volume takes.
+VdbVolume buildVolume(VdbFile const& file, Group const& group, std::uint64_t& memoryLeft,
+                      Progress const& progress, double from, double to) {
+  tell(progress, "building the tree", from);
+  TileCorners const corners = tileCorners(group.grids, rootDepth(group.summaries));
+  if (std::uint64_t const bytes = bytesFor(corners, group.grids.size()); bytes <= memoryLeft)
+    memoryLeft -= bytes;
+  else
+    throw FileError(file.path, "its volumes need more than " + std::to_string(file.memoryBytes / 1000000) +
+                                   " MB of memory");
   VdbVolume volume;
   volume.transform = transformBesidesScale(*group.transform);
   double const size = group.transform->voxelSize().x();
@@ -111,8 +128,7 @@ VdbVolume buildVolume(Group const& group, Progress const& progress, double from,
                                                                static_cast<float>(volume.voxelSize),
                                                                TileTree3D::kVoxelOffsetCorner);
   auto container = object->extractComponent<Container>(kVdbContainerName);
-  tell(progress, "building the tree", from);
-  addTiles(*container, tileCorners(group.grids, rootDepth(group.summaries)));
+  addTiles(*container, corners);
   auto topology = object->extractComponent<Topology>(kVdbTopologyName);
   topology->update(*container);
 
@@ -200,10 +216,11 @@ VdbImport importGrids(VdbFile const& file, Progress const& progress) {
       tell(progress, "looking through the grids", kReadDone);
       group.summaries.push_back(summarize(*grid));
     }
+  std::uint64_t memoryLeft = file.memoryBytes > 0 ? file.memoryBytes : ~std::uint64_t(0);
   for (std::size_t n = 0; n < groups.size(); ++n) {
     double const share = (1 - kTreeDone) / double(groups.size());
-    result.volumes.push_back(
-        buildVolume(groups[n], progress, kTreeDone + share * double(n), kTreeDone + share * double(n + 1)));
+    result.volumes.push_back(buildVolume(file, groups[n], memoryLeft, progress, kTreeDone + share * double(n),
+                                         kTreeDone + share * double(n + 1)));
   }
   tell(progress, "done", 1);
   return result;

@@ -2,7 +2,7 @@
 
 #include "GeometryVolume/core/Parallel.h"
 #include "Interop/FileError.h"
-#include "Interop/Noise.h"
+#include "Interop/NoiseImpl.h"
 #include "Interop/OutputFile.h"
 
 #include <openvdb/io/File.h>

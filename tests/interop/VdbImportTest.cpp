@@ -301,6 +301,30 @@ TEST(VdbImportTest, ThreadsDoNotMatter) {
   EXPECT_EQ(all[0], all[2]);
 }
 
+// negative: grids that lie apart share one tree, which can be far larger than the file
+TEST(VdbImportTest, BoundsTheMemoryOfItsVolumes) {
+  VdbFile file = inMemory({});
+  for (int n = 0; n < 40; ++n) {
+    auto grid = makeGrid("grid" + std::to_string(n));
+    for (int k = 0; k < 40; ++k) grid->tree().setValueOn(Coord(8 * n, 0, 8 * k), 1.0f);
+    file.grids.push_back(grid);
+  }
+  file.memoryBytes = 60000000;
+  EXPECT_EQ(importGrids(file).volumes.size(), 1u);
+  file.memoryBytes = 10000000;
+  try {
+    importGrids(file);
+    ADD_FAILURE() << "imported";
+  } catch (FileError const& error) {
+    EXPECT_EQ(error.reason(), "its volumes need more than 10 MB of memory");
+  }
+  // The bound of the reading is that of the volumes.
+  TempFolder folder;
+  openvdb::io::File(folder / "apart.vdb").write(file.grids);
+  EXPECT_EQ(importVdb(folder / "apart.vdb", {80000000, 0}).volumes.size(), 1u);
+  EXPECT_THROW(importVdb(folder / "apart.vdb", {25000000, 0}), FileError);
+}
+
 // requirement
 TEST(VdbImportTest, TellsItsProgress) {
   auto grid = makeGrid("density");

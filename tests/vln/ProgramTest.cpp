@@ -62,7 +62,7 @@ TEST_F(ProgramTest, TellsItsVersionAndItsUse) {
   EXPECT_EQ(std::count(version.out.begin(), version.out.end(), '\n'), 1);
   RunResult const help = vln({"--help"});
   EXPECT_EQ(help.code, 0);
-  for (char const* command : {"info", "slice", "make"}) {
+  for (char const* command : {"info", "slice", "make", "churn"}) {
     EXPECT_NE(help.out.find("\n  vln " + std::string(command) + " "), std::string::npos) << help.out;
     RunResult const one = vln({command, "--help"});
     EXPECT_EQ(one.code, 0);
@@ -204,8 +204,13 @@ TEST_F(ProgramTest, BadFilesEndInOneLine) {
     expectFailure(vln({"slice", c.file, "--channel", "surface", "--axis", "x", "-o", picture}),
                   c.file + ": " + c.reason);
   }
-  expectFailure(vln({"info", whole, "--max-memory", "1"}),
-                whole + ": is damaged, or needs more than 1 MB of memory");
+  std::string const large = m_folder / "large.vdb";
+  ASSERT_EQ(vln({"make", "torus", large, "--voxels", "400000"}).code, 0);
+  // Which bound is met first, that of the reading or that of the volumes, depends on the build.
+  RunResult const bounded = vln({"info", large, "--max-memory", "1"});
+  EXPECT_EQ(bounded.code, 1);
+  EXPECT_EQ(bounded.out, "");
+  EXPECT_NE(bounded.err.find("more than 1 MB of memory\n"), std::string::npos) << bounded.err;
   EXPECT_FALSE(std::filesystem::exists(picture));
 }
 
@@ -271,8 +276,10 @@ TEST_P(RealFile, IsReportedAndDrawn) {
   RunResult const run = vln({"info", path, "--json"});
   ASSERT_EQ(run.code, 0) << run.err;
   Json const j = Json::parse(run.out);
+  int drawn = 0;
   for (Json const& object : j["objects"])
     for (Json const& channel : object["channels"]) {
+      if (channel["active"] != 0 && ++drawn > 4) continue; // one file has two dozen
       std::string const name = channel["name"], picture = folder / "p.png";
       RunResult const slice =
           vln({"slice", path, "--channel", name, "--axis", "z", "--size", "200", "-o", picture});

@@ -12,6 +12,7 @@ namespace Vln {
 struct InfoOptions {
   std::string file;
   bool json = false;
+  bool memory = false;
   VLN::Interop::VdbReadLimits limits;
 };
 void info(InfoOptions const& options);
@@ -31,5 +32,18 @@ struct MakeOptions {
   std::int64_t voxels = 1000000;
 };
 void make(MakeOptions const& options);
+
+struct ChurnOptions {
+  std::string file;
+  std::uint64_t limitBytes = 0;
+  int rounds = 20;
+  bool json = false;
+  std::string only; ///< "with" or "without": one of the two runs, for the program itself
+  VLN::Interop::VdbReadLimits limits;
+};
+void churn(ChurnOptions const& options);
+
+/// Why the program fails has been said already.
+struct AlreadyTold {};
 
 } // namespace Vln

@@ -1,9 +1,13 @@
+#include "Commands.h"
 #include "GeometryVolume/channels/Channel.h"
+#include "GeometryVolume/pools/ArrayPool.h"
+#include "GeometryVolume/pools/BaseLogger.h"
+#include "GeometryVolume/pools/ChannelMemoryPool.h"
+#include "GeometryVolume/pools/ChannelPool.h"
 #include "GeometryVolume/tiletree/Container.h"
 #include "Interop/FileError.h"
 #include "Interop/VdbImport.h"
-#include "vln/Commands.h"
-#include "vln/ProgressBar.h"
+#include "ProgressBar.h"
 
 #include <array>
 #include <cstdlib>
@@ -17,6 +21,9 @@ namespace Vln {
 namespace {
 
 using namespace VLN::Interop;
+namespace ArrayPool = VLN::TileTree3D::ArrayPool;
+namespace ChannelPool = VLN::TileTree3D::ChannelPool;
+namespace ChannelMemoryPool = VLN::TileTree3D::ChannelMemoryPool;
 using VdbTraits = VLN::TileTree3D::Traits<2, 4, 0, 1>;
 using Container = VLN::TileTree3D::Container<VdbTraits>;
 using Json = nlohmann::ordered_json;
@@ -176,9 +183,25 @@ void printTables(VdbImport const& content) {
     std::cout << fmt::format("  {}: {}\n", oneLine(s.grid, 60), oneLine(s.reason));
 }
 
+void printMemory() {
+  std::cout << "\nmemory\n\n";
+  VLN::BaseLogger::dump();
+  ArrayPool::dump();
+  ChannelPool::dump();
+  std::cout << fmt::format("blocks: {} in use, {} free with {:.2f} MB\n", ChannelMemoryPool::usedStoreSize(),
+                           ChannelMemoryPool::freeStoreSize(),
+                           double(ChannelMemoryPool::freeStoreAvailableMemory()) / 1e6);
+}
+
 } // namespace
 
 void info(InfoOptions const& options) {
+  if (options.memory) {
+    VLN::BaseLogger::enable();
+    ArrayPool::enable();
+    ChannelPool::enable();
+    ChannelMemoryPool::enable();
+  }
   VdbImport content;
   {
     ProgressBar bar;
@@ -195,6 +218,7 @@ void info(InfoOptions const& options) {
   } else {
     printTables(content);
   }
+  if (options.memory) printMemory();
 }
 
 } // namespace Vln

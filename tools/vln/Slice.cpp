@@ -1,8 +1,8 @@
+#include "Commands.h"
 #include "Interop/FileError.h"
 #include "Interop/OutputFile.h"
 #include "Interop/VdbImport.h"
-#include "vln/Commands.h"
-#include "vln/ProgressBar.h"
+#include "ProgressBar.h"
 
 #include <iostream>
 #include <stdexcept>

@@ -1,12 +1,12 @@
 // vln: looks at volumes from the command line.
 //
 // Whatever goes wrong at the edges ends in one line on standard error and exit code 1.
+#include "Commands.h"
 #include "GeometryVolume/core/Version.h"
 #include "Interop/FileError.h"
 #include "Interop/OutputFile.h"
 #include "Interop/VdbFile.h"
 #include "Interop/VdbMake.h"
-#include "vln/Commands.h"
 
 #include <CLI/CLI.hpp>
 
@@ -52,12 +52,15 @@ struct Options {
   Vln::InfoOptions info;
   Vln::SliceOptions slice;
   Vln::MakeOptions make;
+  Vln::ChurnOptions churn;
 };
 
 void addInfo(CLI::App& app, Vln::InfoOptions& o) {
   auto* command = app.add_subcommand("info", "Report what a volume file holds");
   command->add_option("FILE", o.file, "A .vdb file")->required();
-  command->add_flag("--json", o.json, "One JSON object instead of tables");
+  auto* json = command->add_flag("--json", o.json, "One JSON object instead of tables");
+  command->add_flag("--memory", o.memory, "Also what accounts for memory: objects, their data, and the pools")
+      ->excludes(json);
   addMemoryLimit(*command, o.limits);
   command->footer("Example:\n  vln info smoke.vdb");
   command->callback([&o] { Vln::info(o); });
@@ -103,6 +106,30 @@ void addMake(CLI::App& app, Vln::MakeOptions& o) {
   command->callback([&o] { Vln::make(o); });
 }
 
+void addChurn(CLI::App& app, Vln::ChurnOptions& o) {
+  auto* command =
+      app.add_subcommand("churn", "Measure repeated work on a volume with memory pools and without");
+  command->add_option("FILE", o.file, "A .vdb file")->required();
+  command
+      ->add_option("--limit", o.limitBytes,
+                   "Resident memory that the pools hold the process to, such as 512MB (1 KB is 1024 bytes)")
+      ->required()
+      ->transform(CLI::AsSizeValue(false))
+      ->check(CLI::Range(std::uint64_t(1) << 20, std::uint64_t(1) << 50))
+      ->type_name("SIZE");
+  command->add_option("--rounds", o.rounds, "How often the volume is loaded, copied, edited and dropped")
+      ->check(CLI::Range(1, 1000000))
+      ->capture_default_str()
+      ->type_name("N");
+  command->add_flag("--json", o.json, "One JSON object instead of a table");
+  command->add_option("--only", o.only)->check(CLI::IsMember({"with", "without"}))->group("");
+  addMemoryLimit(*command, o.limits);
+  command->footer(
+      "The file is read once in each run; each round builds its channels anew from what was read.\n\n"
+      "Example:\n  vln churn smoke.vdb --limit 512MB --rounds 30");
+  command->callback([&o] { Vln::churn(o); });
+}
+
 } // namespace
 
 int main(int argc, char** argv) {
@@ -119,11 +146,13 @@ int main(int argc, char** argv) {
              "  vln info smoke.vdb\n"
              "  vln slice smoke.vdb --channel density --axis z -o slice.png\n"
              "  vln make cloud cloud.vdb --voxels 1000000\n"
+             "  vln churn smoke.vdb --limit 512MB --rounds 30\n"
              "\n'vln COMMAND --help' tells the options of a command.");
   Options options;
   addInfo(app, options.info);
   addSlice(app, options.slice);
   addMake(app, options.make);
+  addChurn(app, options.churn);
 
   try {
     app.parse(argc, argv);
@@ -134,7 +163,7 @@ int main(int argc, char** argv) {
     return app.exit(done);
   } catch (CLI::ParseError const& error) {
     return fail(std::string(error.what()) + " (vln --help tells more)");
-  } catch (std::bad_alloc const&) { return fail("out of memory"); } catch (std::exception const& error) {
-    return fail(error.what());
-  }
+  } catch (Vln::AlreadyTold const&) { return 1; } catch (std::bad_alloc const&) {
+    return fail("out of memory");
+  } catch (std::exception const& error) { return fail(error.what()); }
 }

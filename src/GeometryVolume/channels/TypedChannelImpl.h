@@ -17,23 +17,26 @@ namespace VLN::TileTree3D {
 
 template <class T>
 TypedChannel<T>::TypedChannel(Ostil::String const& name, Ostil::Ptr<ChannelData<T>> data)
-    : ChannelBase(name)
+    : ChannelBase(name, Incomplete())
     , m_data(std::move(data)) {
   replaceEmptyName();
   pointerAllocated(dataPtr(), this);
+  objectComplete(this);
 }
 
 template <class T>
 TypedChannel<T>::TypedChannel(TypedChannel const& other)
-    : ChannelBase(other)
+    : ChannelBase(other, Incomplete())
     , m_data(other.m_data) {
   pointerAllocated(dataPtr(), this);
   replaceEmptyName();
   write([](ChannelData<T>&) {});
+  objectComplete(this);
 }
 
 template <class T> TypedChannel<T>& TypedChannel<T>::operator=(TypedChannel const& other) {
   if (this == &other) return *this;
+  ObjectChange const change(this);
   ChannelBase::operator=(other);
   pointerDeAllocated(dataPtr(), this);
   m_data = other.m_data;
@@ -41,13 +44,17 @@ template <class T> TypedChannel<T>& TypedChannel<T>::operator=(TypedChannel cons
   return *this;
 }
 
-template <class T> TypedChannel<T>::~TypedChannel() { pointerDeAllocated(dataPtr(), this); }
+template <class T> TypedChannel<T>::~TypedChannel() {
+  objectIncomplete(this);
+  pointerDeAllocated(dataPtr(), this);
+}
 
 template <class T> void TypedChannel<T>::replaceEmptyName() {
   if (name().empty()) setName(Const::TileTreeChannelName);
 }
 
 template <class T> void TypedChannel<T>::write(FunctionRef<void(ChannelData<T>&)> change) {
+  ObjectChange const accounted(this);
   void const* const before = dataPtr();
   if (m_data && !m_data.unique()) m_data = Ostil::MutablePtr<ChannelData<T>>(std::move(m_data));
   change(*m_data);
@@ -214,6 +221,7 @@ template <class T> bool TypedChannel<T>::permute(TilePermutation const* newToOld
   return true;
 }
 template <class T> void TypedChannel<T>::updateTilePermuteNoDispatch(TilePermutation const* newToOld) {
+  ObjectChange const accounted(this);
   void const* const before = dataPtr();
   if (m_data && !m_data.unique()) m_data = Ostil::MutablePtr<ChannelData<T>>(std::move(m_data));
   m_data->permuteTiles(*newToOld);
