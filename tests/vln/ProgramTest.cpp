@@ -294,6 +294,7 @@ TEST_P(RealFile, IsReportedAndDrawn) {
     for (Json const& channel : object["channels"]) {
       if (channel["active"] != 0 && ++drawn > 4) continue; // one file has two dozen
       std::string const name = channel["name"], picture = folder / "p.png";
+      if (name == "positions") continue; // points have no plane to draw
       RunResult const slice =
           vln({"slice", path, "--channel", name, "--axis", "z", "--size", "200", "-o", picture});
       if (channel["active"] == 0) {
