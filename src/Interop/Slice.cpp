@@ -1,14 +1,18 @@
 #include "Interop/Slice.h"
 
 #include "GeometryVolume/channels/Channel.h"
+#include "GeometryVolume/core/ElementTypes.h"
 #include "GeometryVolume/core/Numeric.h"
 #include "GeometryVolume/core/Parallel.h"
+#include "GeometryVolume/sampling/VoxelSamplerLinear.h"
 #include "GeometryVolume/tiletree/Container.h"
 #include "Interop/ColorMap.h"
 
 #include <algorithm>
 #include <cmath>
 #include <cstdio>
+#include <functional>
+#include <memory>
 #include <stdexcept>
 #include <vector>
 
@@ -18,7 +22,12 @@ namespace {
 
 using VdbTraits = TileTree3D::Traits<2, 4, 0, 1>;
 using Container = TileTree3D::Container<VdbTraits>;
+using TileTree3D::ChannelBase;
+using TileTree3D::TreeIndex;
+using Topology = TileTree3D::VoxelTopology<VdbTraits>;
 using FloatChannel = TileTree3D::Channel<VdbTraits, float, 4, 0>;
+using Sampler = TileTree3D::FloatVoxelSamplerLinear<VdbTraits>;
+using Velorn::Math::float3;
 using Velorn::Math::int3;
 
 constexpr Rgb kNoTile{222, 222, 222};
@@ -35,14 +44,62 @@ std::string number(double value) {
   return text;
 }
 
+// Gives a sample as a number: a vector by its length.
+using Reader = std::function<float(TreeIndex const&, int3 const&)>;
+
+float asNumber(auto const& value) {
+  using T = std::remove_cvref_t<decltype(value)>;
+  if constexpr (std::is_arithmetic_v<T>)
+    return static_cast<float>(value);
+  else
+    return static_cast<float>(std::hypot(double(value.x), double(value.y), double(value.z)));
+}
+
+template <class T> bool readerIfOf(ChannelBase const& channel, Reader& reader) {
+  auto const* typed = dynamic_cast<TileTree3D::Channel<VdbTraits, T, 4, 0> const*>(&channel);
+  if (!typed) return false;
+  reader = [typed](TreeIndex const& tile, int3 const& sample) {
+    return asNumber(typed->tileData(tile)(sample));
+  };
+  return true;
+}
+
+Reader readerOf(ChannelBase const& channel) {
+  Reader reader;
+  bool const known = readerIfOf<float>(channel, reader) ||
+                     readerIfOf<Velorn::Math::float3>(channel, reader) || readerIfOf<int>(channel, reader) ||
+                     readerIfOf<std::int64_t>(channel, reader) ||
+                     readerIfOf<unsigned char>(channel, reader) ||
+#if VLN_HAS_ELEMENT_INT3
+                     readerIfOf<int3>(channel, reader) ||
+#endif
+#if VLN_HAS_ELEMENT_DOUBLE
+                     readerIfOf<double>(channel, reader) ||
+#endif
+                     readerIfOf<Velorn::Math::double3>(channel, reader);
+  if (!known) throw std::invalid_argument("channel '" + channel.name() + "' has a type that cannot be drawn");
+  return reader;
+}
+
 // The plane in samples and in pixels.
 struct Plane {
   int axis, across, up; // axes of tile space
   int at;               // index along `axis`
+  double where;         // the same, between indices
   IndexBox box;
   int width, height;
 
   int extent(int a) const { return box.max[a] - box.min[a]; }
+  double acrossAt(int x) const { return box.min[across] + (x + 0.5) * extent(across) / width; }
+  double upAt(int y) const { return box.max[up] - (y + 0.5) * extent(up) / height; }
+  // A pixel in the middle of a sample's square lies on the sample.
+  float3 placeOf(int x, int y) const {
+    float3 p{};
+    p[axis] = static_cast<float>(where);
+    p[across] = static_cast<float>(acrossAt(x) - 0.5);
+    p[up] = static_cast<float>(upAt(y) - 0.5);
+    return p;
+  }
   int3 indexOf(int x, int y) const {
     int3 p{};
     p[axis] = at;
@@ -52,6 +109,24 @@ struct Plane {
   }
 };
 
+// World position, on the plane's axis, of the point of index `at` on the line through the middle of the box.
+double worldOn(VdbVolume const& volume, Plane const& plane, double at) {
+  Velorn::Math::double3 index{};
+  for (int a = 0; a < 3; ++a) index[a] = 0.5 * (double(plane.box.min[a]) + plane.box.max[a] - 1);
+  index[plane.axis] = at;
+  return volume.indexToWorld.toWorld(index)[plane.axis];
+}
+
+// Index of the point of that line which lies at a world position.
+double indexAt(VdbVolume const& volume, Plane const& plane, double world) {
+  int const low = plane.box.min[plane.axis], high = plane.box.max[plane.axis];
+  double const first = worldOn(volume, plane, low), last = worldOn(volume, plane, high);
+  if (first == last)
+    throw std::invalid_argument(std::string("its transform turns axis ") + "xyz"[plane.axis] +
+                                " away, so that a position on it names no plane; leave --at out");
+  return low + (world - first) / (last - first) * (double(high) - low);
+}
+
 Plane planeFor(VdbVolume const& volume, VdbChannel const& channel, SliceOptions const& options) {
   Plane plane{};
   plane.axis = options.axis;
@@ -59,13 +134,14 @@ Plane planeFor(VdbVolume const& volume, VdbChannel const& channel, SliceOptions 
   plane.up = options.axis == 2 ? 1 : 2;
   plane.box = channel.activeBox;
   int const low = plane.box.min[plane.axis], high = plane.box.max[plane.axis] - 1;
-  double const at = options.at ? *options.at / volume.voxelSize : 0.5 * (double(low) + high);
+  double const at = options.at ? indexAt(volume, plane, *options.at) : 0.5 * (double(low) + high);
   plane.at = toIntFloor(at + 0.5);
+  plane.where = at;
   if (plane.at < low || plane.at > high)
-    throw std::invalid_argument("position " + number(options.at.value_or(0)) + " on axis " +
-                                std::string(1, "xyz"[plane.axis]) +
-                                " misses the active voxels, which lie in " + number(low * volume.voxelSize) +
-                                ".." + number(high * volume.voxelSize));
+    throw std::invalid_argument(
+        "position " + number(options.at.value_or(0)) + " on axis " + std::string(1, "xyz"[plane.axis]) +
+        " misses the active voxels, which lie in " + number(worldOn(volume, plane, low)) + ".." +
+        number(worldOn(volume, plane, high)));
   double const across = plane.extent(plane.across), up = plane.extent(plane.up);
   double const scale = options.size / std::max(across, up);
   plane.width = std::max(1, static_cast<int>(std::lround(across * scale)));
@@ -73,23 +149,13 @@ Plane planeFor(VdbVolume const& volume, VdbChannel const& channel, SliceOptions 
   return plane;
 }
 
-} // namespace
+std::size_t pixelCount(Plane const& plane) {
+  return static_cast<std::size_t>(plane.width) * static_cast<std::size_t>(plane.height);
+}
 
-Slice drawSlice(VdbVolume const& volume, std::string const& name, SliceOptions const& options) {
-  VdbChannel const* info = volume.channel(name);
-  auto const channel = volume.object->component<FloatChannel>(name);
-  auto const container = volume.object->component<Container>(kVdbContainerName);
-  if (!info || !channel || !container) throw std::invalid_argument("there is no channel '" + name + "'");
-  if (info->activeBox.empty()) throw std::invalid_argument("channel '" + name + "' has no active voxel");
-  if (options.axis < 0 || options.axis > 2) throw std::invalid_argument("the axis must be x, y or z");
-  if (options.size < kSmallestSlice || options.size > kLargestSlice)
-    throw std::invalid_argument("the size must lie in " + std::to_string(kSmallestSlice) + ".." +
-                                std::to_string(kLargestSlice));
-
-  Plane const plane = planeFor(volume, *info, options);
-  FloatChannel const& samplesOf = *channel;
-  Container const& tree = *container;
-  std::vector<Sample> samples(static_cast<std::size_t>(plane.width) * static_cast<std::size_t>(plane.height));
+std::vector<Sample> nearestSamples(Plane const& plane, Container const& tree, ChannelBase const& channel) {
+  std::vector<Sample> samples(pixelCount(plane));
+  Reader const read = readerOf(channel);
   parallelFor(0, plane.height,
               [&](std::int64_t begin, std::int64_t end) {
                 auto accessor = tree.tileAccessor();
@@ -99,12 +165,71 @@ Slice drawSlice(VdbVolume const& volume, std::string const& name, SliceOptions c
                     auto const& tile = accessor.tile(p, Container::kMaxDepth, false);
                     if (!tile.valid()) continue;
                     samples[static_cast<std::size_t>(y * plane.width + x)] = {
-                        samplesOf.tileData(tile.treeIndex())(tile.childDataIJK(p)), true};
+                        read(tile.treeIndex(), tile.childDataIJK(p)), true};
                   }
               },
               {.grain = 8});
+  return samples;
+}
 
-  Slice slice{Image(1, 1), plane.at * volume.voxelSize, 0, 0, 0, 0};
+std::vector<Sample> linearSamples(Plane const& plane, Sampler const& cold, bool gradient) {
+  std::vector<Sample> samples(pixelCount(plane));
+  // Samplers keep tiles that they have widened: one for each thread, for all of its rows.
+  std::vector<std::unique_ptr<Sampler>> samplers(static_cast<std::size_t>(parallelThreads()));
+  parallelFor(0, plane.height,
+              [&](std::int64_t begin, std::int64_t end) {
+                auto& sampler = samplers[static_cast<std::size_t>(parallelThreadIndex())];
+                if (!sampler) sampler = std::make_unique<Sampler>(cold);
+                for (std::int64_t y = begin; y < end; ++y)
+                  for (int x = 0; x < plane.width; ++x) {
+                    float3 const p = plane.placeOf(x, static_cast<int>(y));
+                    TileTree3D::TreeIndex tile;
+                    int3 ijk;
+                    float3 weights;
+                    if (!sampler->prepareToSample(p, TileTree3D::kSamplerTileSpace, tile, ijk, weights,
+                                                  Container::kMaxDepth, nullptr))
+                      continue;
+                    Sample& s = samples[static_cast<std::size_t>(y * plane.width + x)];
+                    s.found = true;
+                    if (gradient) {
+                      float3 g;
+                      sampler->sampleGradient(p, TileTree3D::kSamplerTileSpace, &g);
+                      s.value = std::hypot(g.x, g.y, g.z);
+                    } else {
+                      s.value = sampler->sample(tile, ijk, weights);
+                    }
+                  }
+              },
+              {.grain = 8});
+  return samples;
+}
+
+} // namespace
+
+Slice drawSlice(VdbVolume const& volume, std::string const& name, SliceOptions const& options) {
+  VdbChannel const* info = volume.channel(name);
+  auto const channel = volume.object->component<ChannelBase>(name);
+  auto const container = volume.object->component<Container>(kVdbContainerName);
+  auto const topology = volume.object->component<Topology>(kVdbTopologyName);
+  if (!info || !channel || !container || !topology)
+    throw std::invalid_argument("there is no channel '" + name + "'");
+  if (info->activeBox.empty()) throw std::invalid_argument("channel '" + name + "' has no active voxel");
+  if (options.axis < 0 || options.axis > 2) throw std::invalid_argument("the axis must be x, y or z");
+  if (options.size < kSmallestSlice || options.size > kLargestSlice)
+    throw std::invalid_argument("the size must lie in " + std::to_string(kSmallestSlice) + ".." +
+                                std::to_string(kLargestSlice));
+
+  Plane const plane = planeFor(volume, *info, options);
+  auto const* floats = dynamic_cast<FloatChannel const*>(channel.get());
+  if (options.gradient && !floats)
+    throw std::invalid_argument("channel '" + name +
+                                "' is no float channel, so that it has no gradient here");
+  // Channels of other types than float are drawn by their nearest samples.
+  bool const nearest = !floats || (options.nearest && !options.gradient);
+  auto const samples = nearest ? nearestSamples(plane, *container, *channel)
+                               : linearSamples(plane, {*container, *topology, *floats}, options.gradient);
+
+  Slice slice{Image(1, 1), worldOn(volume, plane, nearest ? plane.at : plane.where), 0, 0, 0, 0};
   std::vector<float> numbers;
   for (Sample const& s : samples) {
     slice.drawn += s.found;

@@ -163,8 +163,8 @@ public:
     shared.block()->clone(shared.get(), object, m_block);
     m_object = static_cast<T*>(object);
   }
-  /// A handle on an object that `shared`'s other owners keep: the one exception to sole ownership, for makers that
-  /// have just stored what they made.
+  /// A handle on an object that `shared`'s other owners keep: the one exception to sole ownership, for makers
+  /// that have just stored what they made.
   static MutablePtr shareWith(Ptr<T> shared) {
     MutablePtr handle;
     handle.m_object = shared.get(), handle.m_block = shared.block();

@@ -49,7 +49,9 @@ TEST(SliceTest, ShowsTheNearestSample) {
     int const zoom = 8;
     // Anywhere within half a voxel the same samples are the nearest.
     for (double off : {-0.49, 0.0, 0.49}) {
-      Slice const slice = drawSlice(volume, "ramp", {c.axis, (at + off) * 0.5, zoom * std::max(wide, tall)});
+      Slice const slice = drawSlice(
+          volume, "ramp",
+          {.axis = c.axis, .at = (at + off) * 0.5, .size = zoom * std::max(wide, tall), .nearest = true});
       EXPECT_EQ(slice.at, at * 0.5);
       EXPECT_EQ(slice.drawn, std::int64_t(zoom) * wide * zoom * tall);
       ColorMap const map = ColorMap::forRange(slice.low, slice.top);
@@ -69,7 +71,7 @@ TEST(SliceTest, ShowsTheNearestSample) {
 // requirement
 TEST(SliceTest, DefaultsToTheMiddleAndKeepsTheAspect) {
   VdbVolume const volume = volumeOf(ramp(Coord(0), Coord(40, 20, 6), 2.0));
-  Slice const slice = drawSlice(volume, "ramp", {2, {}, 164});
+  Slice const slice = drawSlice(volume, "ramp", {.axis = 2, .at = {}, .size = 164, .nearest = true});
   EXPECT_EQ(slice.at, 6);
   EXPECT_EQ(slice.drawn, 164 * 84);
 }
@@ -100,7 +102,8 @@ TEST(SliceTest, ALevelSetShowsItsZero) {
   openvdb::initialize();
   auto grid = openvdb::tools::createLevelSetSphere<openvdb::FloatGrid>(20, openvdb::Vec3f(0), 1.0f, 3.0f);
   grid->setName("sphere");
-  Slice const slice = drawSlice(volumeOf(grid), "sphere", {1, 0.0, 460});
+  Slice const slice =
+      drawSlice(volumeOf(grid), "sphere", {.axis = 1, .at = 0.0, .size = 460, .nearest = true});
   EXPECT_LT(slice.low, 0);
   EXPECT_GT(slice.high, 0);
   EXPECT_EQ(slice.top, slice.high);

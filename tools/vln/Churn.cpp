@@ -3,11 +3,11 @@
 //
 //   vln churn FILE ── vln churn FILE --only with ──────> one line of figures
 //                  └─ vln churn FILE --only without ───> one line of figures
+#include "ChurnRounds.h"
+#include "Commands.h"
 #include "GeometryVolume/pools/PoolUtils.h"
 #include "Interop/FileError.h"
-#include "vln/ChurnRounds.h"
-#include "vln/Commands.h"
-#include "vln/ProgressBar.h"
+#include "ProgressBar.h"
 
 #include <array>
 #include <cstdio>

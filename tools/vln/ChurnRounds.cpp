@@ -1,4 +1,4 @@
-#include "vln/ChurnRounds.h"
+#include "ChurnRounds.h"
 
 #include "GeometryVolume/channels/Channel.h"
 #include "GeometryVolume/core/Parallel.h"
@@ -9,7 +9,7 @@
 #include "GeometryVolume/tiletree/Container.h"
 #include "GeometryVolume/topology/VoxelTopology.h"
 #include "Interop/VdbImport.h"
-#include "vln/ProgressBar.h"
+#include "ProgressBar.h"
 
 #include <algorithm>
 #include <chrono>

@@ -1,7 +1,7 @@
 // The rounds of vln churn.
 #pragma once
 
-#include "vln/Commands.h"
+#include "Commands.h"
 
 #include <cstdint>
 

@@ -6,6 +6,7 @@
 
 #include <cstdint>
 #include <string>
+#include <vector>
 
 namespace Vln {
 
@@ -26,6 +27,22 @@ struct SliceOptions {
 };
 void slice(SliceOptions const& options);
 
+struct ConvertOptions {
+  std::string file;
+  std::string output;
+  VLN::Interop::VdbReadLimits limits;
+};
+void convert(ConvertOptions const& options);
+
+struct ProbeOptions {
+  std::string file;
+  std::string channel;
+  std::vector<float> positions; ///< x, y, z, x, y, z, ...
+  std::string points;           ///< a CSV file; empty for none
+  VLN::Interop::VdbReadLimits limits;
+};
+void probe(ProbeOptions const& options);
+
 struct MakeOptions {
   std::string shape;
   std::string output;
@@ -45,5 +62,39 @@ void churn(ChurnOptions const& options);
 
 /// Why the program fails has been said already.
 struct AlreadyTold {};
+
+/// How the points of a file become a volume.
+struct PointsInput {
+  std::string file; ///< .ply, or .vdb with a points grid
+  std::string grid; ///< of a .vdb file; empty: its only points grid
+  double voxelSize = 0;
+  double pointsPerTile = 64;
+  VLN::Interop::VdbReadLimits limits;
+};
+struct PointsOptions {
+  PointsInput input;
+  std::string output; ///< .obj, .ply or .vdb
+  double size = 0;    ///< half-width of a cube in an .obj file; 0: a quarter of a voxel
+};
+void points(PointsOptions const& options);
+
+struct TilesOptions {
+  PointsInput input;
+  int depth = 28;
+  std::string output;
+};
+void tiles(TilesOptions const& options);
+
+struct AdvectOptions {
+  PointsInput input;
+  std::vector<double> velocity;
+  int steps = 1;
+  bool json = false;
+  std::string output;
+};
+void advect(AdvectOptions const& options);
+
+/// Whether `info` has points to tell of: a .ply file.
+bool isPointsFile(std::string const& path);
 
 } // namespace Vln

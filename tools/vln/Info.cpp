@@ -1,17 +1,23 @@
+#include "Commands.h"
 #include "GeometryVolume/channels/Channel.h"
+#include "GeometryVolume/channels/NonLeafValues.h"
+#include "GeometryVolume/core/ElementTypes.h"
 #include "GeometryVolume/pools/ArrayPool.h"
 #include "GeometryVolume/pools/BaseLogger.h"
 #include "GeometryVolume/pools/ChannelMemoryPool.h"
 #include "GeometryVolume/pools/ChannelPool.h"
 #include "GeometryVolume/tiletree/Container.h"
+#include "GeometryVolume/topology/VoxelTopology.h"
+#include "InfoPoints.h"
 #include "Interop/FileError.h"
 #include "Interop/VdbImport.h"
-#include "vln/Commands.h"
-#include "vln/ProgressBar.h"
+#include "PointsFile.h"
+#include "ProgressBar.h"
 
 #include <array>
 #include <cstdlib>
 #include <iostream>
+#include <limits>
 
 #include <fmt/format.h>
 #include <nlohmann/json.hpp>
@@ -46,6 +52,26 @@ std::int64_t elementsOf(VdbVolume const& volume, std::string const& channel) {
   return static_cast<std::int64_t>(volume.object->component(channel)->size());
 }
 
+template <class T>
+bool coarseEqualsChildrenAs(VdbVolume const& volume, std::string const& channel, bool& equal) {
+  auto const values = volume.object->component<VLN::TileTree3D::Channel<VdbTraits, T, 4, 0>>(channel);
+  if (!values) return false;
+  auto const tree = volume.object->component<Container>(kVdbContainerName);
+  auto const topology = volume.object->component<VLN::TileTree3D::VoxelTopology<VdbTraits>>(kVdbTopologyName);
+  equal = !VLN::TileTree3D::checkIfNonLeafValueIsSetToChildValue(*values, *tree, topology->offsetType(), 0.0f,
+                                                                 0, Container::kMaxDepth);
+  return true;
+}
+
+// Whether each refined sample holds the value of the child sample at its place.
+bool coarseEqualsChildren(VdbVolume const& volume, std::string const& channel) {
+  bool equal = false, known = false;
+#define VLN_TRY(T, NAME) known = known || coarseEqualsChildrenAs<T>(volume, channel, equal);
+  VLN_FOR_EACH_ELEMENT_TYPE(VLN_TRY)
+#undef VLN_TRY
+  return equal;
+}
+
 std::int64_t activeVoxels(VdbVolume const& volume) {
   std::int64_t count = 0;
   for (auto const& channel : volume.channels) count += channel.activeVoxels;
@@ -54,15 +80,23 @@ std::int64_t activeVoxels(VdbVolume const& volume) {
 
 using Bounds = std::array<std::array<double, 3>, 2>;
 
-// World box of the finest tiles that hold active voxels; their corners are multiples of the tile's width.
+// World box of the finest tiles that hold active voxels: of their eight corners, through the whole transform.
+// Corners of tiles are multiples of their width.
 Bounds worldBounds(VdbVolume const& volume) {
-  Bounds bounds{};
-  constexpr int kWidth = VdbTraits::width(VdbTraits::kMaxDepth);
-  for (int a = 0; a < 3; ++a) {
-    auto const axis = static_cast<std::size_t>(a);
-    auto const tiles = [&](int c) { return std::int64_t(VdbTraits::align(c, VdbTraits::kMaxDepth)); };
-    bounds[0][axis] = double(tiles(volume.activeBox.min[a])) * volume.voxelSize;
-    bounds[1][axis] = double(tiles(volume.activeBox.max[a] - 1) + kWidth) * volume.voxelSize;
+  constexpr double kFar = std::numeric_limits<double>::infinity();
+  Bounds bounds{{{kFar, kFar, kFar}, {-kFar, -kFar, -kFar}}};
+  constexpr int kDepth = VdbTraits::kMaxDepth, kWidth = VdbTraits::width(kDepth);
+  for (int corner = 0; corner < 8; ++corner) {
+    double index[3];
+    for (int a = 0; a < 3; ++a)
+      index[a] = corner >> a & 1 ? double(VdbTraits::align(volume.activeBox.max[a] - 1, kDepth)) + kWidth
+                                 : double(VdbTraits::align(volume.activeBox.min[a], kDepth));
+    auto const world = volume.indexToWorld.toWorld({index[0], index[1], index[2]});
+    for (int a = 0; a < 3; ++a) {
+      auto const axis = static_cast<std::size_t>(a);
+      bounds[0][axis] = std::min(bounds[0][axis], world[a]);
+      bounds[1][axis] = std::max(bounds[1][axis], world[a]);
+    }
   }
   return bounds;
 }
@@ -106,6 +140,7 @@ Json volumeJson(VdbVolume const& volume) {
 void printJson(VdbImport const& content) {
   Json j = {{"file", content.file}, {"objects", Json::array()}, {"skipped", Json::array()}};
   for (auto const& volume : content.volumes) j["objects"].push_back(volumeJson(volume));
+  for (auto const& volume : content.points) j["objects"].push_back(pointsJson(volume));
   for (auto const& s : content.skipped) j["skipped"].push_back({{"grid", s.grid}, {"reason", s.reason}});
   // Names in a file may be of any bytes.
   std::cout << j.dump(2, ' ', false, Json::error_handler_t::replace) << "\n";
@@ -128,10 +163,7 @@ void printVolume(VdbVolume const& volume, std::size_t n) {
   auto const container = volume.object->component<Container>(kVdbContainerName);
   auto& out = std::cout;
   out << fmt::format("\nobject {}: voxel size {} world units\n", n, number(volume.voxelSize));
-  if (!volume.transform.empty())
-    out << fmt::format(
-        "  note: the transform is {};\n        world positions leave out all but the voxel size\n",
-        volume.transform);
+  if (!volume.transform.empty()) out << fmt::format("  transform: {}\n", volume.transform);
   if (volume.activeBox.empty()) {
     out << "  world box: none, no voxel is active\n";
   } else {
@@ -162,6 +194,10 @@ void printVolume(VdbVolume const& volume, std::size_t n) {
                        channel.hasRange ? number(channel.minimum) : "-",
                        channel.hasRange ? number(channel.maximum) : "-");
 
+  for (auto const& channel : volume.channels)
+    out << fmt::format("  {}: coarse values {} those of their children\n", oneLine(channel.name, 60),
+                       coarseEqualsChildren(volume, channel.name) ? "equal" : "differ from");
+
   Memory const memory = memoryOf(*volume.object);
   auto const active = activeVoxels(volume);
   out << fmt::format("\n  memory: {:.2f} MB used, {:.2f} MB allocated", double(memory.used) / 1e6,
@@ -176,7 +212,8 @@ void printTables(VdbImport const& content) {
   std::cout << content.file << "\n";
   std::size_t n = 0;
   for (auto const& volume : content.volumes) printVolume(volume, ++n);
-  if (content.volumes.empty()) std::cout << "\nno float grid\n";
+  for (auto const& volume : content.points) printPoints(volume, ++n);
+  if (n == 0) std::cout << "\nno grid came in\n";
   if (content.skipped.empty()) return;
   std::cout << "\nskipped\n";
   for (auto const& s : content.skipped)
@@ -205,16 +242,17 @@ void info(InfoOptions const& options) {
   VdbImport content;
   {
     ProgressBar bar;
-    content = importVdb(options.file, options.limits, bar.progress());
+    if (isPointsFile(options.file)) {
+      PointsInput input;
+      input.file = content.file = options.file;
+      content.points = readPointVolumes(input, bar.progress());
+    } else {
+      content = importVdb(options.file, options.limits, bar.progress());
+    }
   }
+  for (auto const& volume : content.points) noteLosses(content.file, volume);
   if (options.json) {
     printJson(content);
-    // The report has no place for it.
-    for (auto const& volume : content.volumes)
-      if (!volume.transform.empty())
-        std::cerr << fmt::format("vln: {}: note: the transform is {}; world positions leave out all but the "
-                                 "voxel size\n",
-                                 content.file, volume.transform);
   } else {
     printTables(content);
   }

@@ -1,12 +1,12 @@
 // vln: looks at volumes from the command line.
 //
 // Whatever goes wrong at the edges ends in one line on standard error and exit code 1.
+#include "Commands.h"
 #include "GeometryVolume/core/Version.h"
 #include "Interop/FileError.h"
 #include "Interop/OutputFile.h"
 #include "Interop/VdbFile.h"
 #include "Interop/VdbMake.h"
-#include "vln/Commands.h"
 
 #include <CLI/CLI.hpp>
 
@@ -51,13 +51,18 @@ void addMemoryLimit(CLI::App& command, VLN::Interop::VdbReadLimits& limits) {
 struct Options {
   Vln::InfoOptions info;
   Vln::SliceOptions slice;
+  Vln::ConvertOptions convert;
+  Vln::ProbeOptions probe;
   Vln::MakeOptions make;
   Vln::ChurnOptions churn;
+  Vln::PointsOptions points;
+  Vln::TilesOptions tiles;
+  Vln::AdvectOptions advect;
 };
 
 void addInfo(CLI::App& app, Vln::InfoOptions& o) {
   auto* command = app.add_subcommand("info", "Report what a volume file holds");
-  command->add_option("FILE", o.file, "A .vdb file")->required();
+  command->add_option("FILE", o.file, "A .vdb or .ply file")->required();
   auto* json = command->add_flag("--json", o.json, "One JSON object instead of tables");
   command->add_flag("--memory", o.memory, "Also what accounts for memory: objects, their data, and the pools")
       ->excludes(json);
@@ -85,10 +90,36 @@ void addSlice(CLI::App& app, Vln::SliceOptions& o) {
       ->check(CLI::Range(VLN::Interop::kSmallestSlice, VLN::Interop::kLargestSlice))
       ->capture_default_str()
       ->type_name("N");
+  command->add_flag("--nearest", o.plane.nearest, "Draw the nearest sample instead of blending linearly");
+  command->add_flag("--gradient", o.plane.gradient, "Draw the length of the gradient")->excludes("--nearest");
   command->add_option("-o,--output", o.output, "The PNG file to write")->required()->type_name("OUT.png");
   addMemoryLimit(*command, o.limits);
   command->footer("Example:\n  vln slice smoke.vdb --channel density --axis z -o slice.png");
   command->callback([&o] { Vln::slice(o); });
+}
+
+void addConvert(CLI::App& app, Vln::ConvertOptions& o) {
+  auto* command = app.add_subcommand("convert", "Write a volume file again, through the tree and back");
+  command->add_option("IN", o.file, "A .vdb file")->required()->type_name("IN.vdb");
+  command->add_option("OUT", o.output, "The .vdb file to write")->required()->type_name("OUT.vdb");
+  addMemoryLimit(*command, o.limits);
+  command->footer("Example:\n  vln convert smoke.vdb copy.vdb");
+  command->callback([&o] { Vln::convert(o); });
+}
+
+void addProbe(CLI::App& app, Vln::ProbeOptions& o) {
+  auto* command =
+      app.add_subcommand("probe", "Print value and gradient of a channel at world positions as CSV");
+  command->add_option("FILE", o.file, "A .vdb file")->required();
+  command->add_option("X Y Z", o.positions, "World positions, three numbers each")->type_name("...");
+  command->add_option("--channel", o.channel, "Name of the channel, as info tells it")
+      ->required()
+      ->type_name("NAME");
+  command->add_option("--points", o.points, "A file with a line x,y,z for each position, without header")
+      ->type_name("FILE.csv");
+  addMemoryLimit(*command, o.limits);
+  command->footer("Example:\n  vln probe smoke.vdb --channel density 0.5 1.25 -3");
+  command->callback([&o] { Vln::probe(o); });
 }
 
 void addMake(CLI::App& app, Vln::MakeOptions& o) {
@@ -130,6 +161,71 @@ void addChurn(CLI::App& app, Vln::ChurnOptions& o) {
   command->callback([&o] { Vln::churn(o); });
 }
 
+void addPointsInput(CLI::App& command, Vln::PointsInput& o) {
+  command.add_option("FILE", o.file, "A .ply file, or a .vdb file with points")->required();
+  command.add_option("--grid", o.grid, "Points grid of a .vdb file that has more than one")
+      ->type_name("NAME");
+  auto* size = command.add_option("--voxel-size", o.voxelSize, "World length of a voxel, for .ply files")
+                   ->check(CLI::PositiveNumber)
+                   ->type_name("W");
+  command
+      .add_option("--points-per-tile", o.pointsPerTile,
+                  "Choose the voxel size of a .ply file so that a tile holds about so many points")
+      ->check(CLI::Range(2.0, 1e9))
+      ->capture_default_str()
+      ->excludes(size)
+      ->type_name("N");
+  addMemoryLimit(command, o.limits);
+}
+
+void addPoints(CLI::App& app, Vln::PointsOptions& o) {
+  auto* command = app.add_subcommand("points", "Write points as boxes, or into another format");
+  addPointsInput(*command, o.input);
+  command->add_option("-o,--output", o.output, "The file to write: .obj, .ply or .vdb")
+      ->required()
+      ->type_name("OUT");
+  command
+      ->add_option("--size", o.size,
+                   "Half-width of the cubes of an .obj file (default: a quarter of a voxel)")
+      ->check(CLI::PositiveNumber)
+      ->type_name("W");
+  command->footer("Example:\n  vln points scan.ply -o scan.vdb");
+  command->callback([&o] { Vln::points(o); });
+}
+
+void addTiles(CLI::App& app, Vln::TilesOptions& o) {
+  auto* command = app.add_subcommand("tiles", "Write the tiles of a depth as boxes");
+  addPointsInput(*command, o.input);
+  command->add_option("--depth", o.depth, "Depth of the tiles, as info tells them")
+      ->required()
+      ->check(CLI::Range(0, 28))
+      ->type_name("D");
+  command->add_option("-o,--output", o.output, "The file to write; tile_tree.mtl goes beside it")
+      ->required()
+      ->type_name("OUT.obj");
+  command->footer("Example:\n  vln tiles smoke.vdb --depth 28 -o tiles.obj");
+  command->callback([&o] { Vln::tiles(o); });
+}
+
+void addAdvect(CLI::App& app, Vln::AdvectOptions& o) {
+  auto* command =
+      app.add_subcommand("advect", "Move points, each step into the tiles where they then belong");
+  addPointsInput(*command, o.input);
+  command->add_option("--velocity", o.velocity, "World vector of a step")
+      ->required()
+      ->expected(3)
+      ->type_name("X Y Z");
+  command->add_option("--steps", o.steps, "Number of steps")
+      ->check(CLI::Range(0, 1000000))
+      ->capture_default_str()
+      ->type_name("N");
+  command->add_option("-o,--output", o.output, "Write the moved points: .obj, .ply or .vdb")
+      ->type_name("OUT");
+  command->add_flag("--json", o.json, "One JSON object instead of text");
+  command->footer("Example:\n  vln advect scan.ply --velocity 0.1 0 0 --steps 100");
+  command->callback([&o] { Vln::advect(o); });
+}
+
 } // namespace
 
 int main(int argc, char** argv) {
@@ -145,14 +241,21 @@ int main(int argc, char** argv) {
   app.footer("Examples:\n"
              "  vln info smoke.vdb\n"
              "  vln slice smoke.vdb --channel density --axis z -o slice.png\n"
+             "  vln convert smoke.vdb copy.vdb\n"
+             "  vln probe smoke.vdb --channel density 0.5 1.25 -3\n"
              "  vln make cloud cloud.vdb --voxels 1000000\n"
              "  vln churn smoke.vdb --limit 512MB --rounds 30\n"
              "\n'vln COMMAND --help' tells the options of a command.");
   Options options;
   addInfo(app, options.info);
   addSlice(app, options.slice);
+  addConvert(app, options.convert);
+  addProbe(app, options.probe);
   addMake(app, options.make);
   addChurn(app, options.churn);
+  addPoints(app, options.points);
+  addTiles(app, options.tiles);
+  addAdvect(app, options.advect);
 
   try {
     app.parse(argc, argv);

@@ -127,7 +127,9 @@ template <class TraitsT> void Container<TraitsT>::dump(std::ostream& os) const {
   };
   for (auto const& root : m_data->m_roots) writeTile("root[", root.second);
   for (int d = 0; d <= kMaxDepth; ++d) {
-    for (std::int64_t n = 0; n < tileCount(d); ++n) writeTile("tile[", {n, d});
+    for (std::int64_t n = 0; n < tileCount(d); ++n) {
+      if (tile(n, d).valid()) writeTile("tile[", {n, d});
+    }
   }
 }
 

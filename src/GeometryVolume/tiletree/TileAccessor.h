@@ -57,8 +57,13 @@ public:
     return m_depth >= 0 ? m_container->tile(m_index, m_depth) : invalidTile();
   }
 
+  /// Corner of the tile found last, without touching its record. After a lookup that found no tile it is that
+  /// of the tile where the search ended, or of an earlier one.
+  int3 const& cursorCorner() const { return m_corner; }
+
   // Neighbours
   /// The tile next to `t` at its depth, or the deepest one above that holds the place; the invalid tile else.
+  /// @edges The invalid tile has no neighbours.
   TileType const& tileNeighbor(TileType const& t, NeighborDirection n) const;
   /// The tile at `t`'s corner plus (di, dj, dk) tile widths of `depth`.
   TileType const& tileNeighbor(TileType const& t, int di, int dj, int dk, int depth, bool exact) const;

@@ -37,8 +37,8 @@ public:
   void setOwner(Ostil::String const& name) { m_owner = name; }
 
 protected:
-  /// For classes whose memUse() follows pointers: a report that another thread writes leaves the object's size
-  /// out until it is told that the object is complete.
+  /// For classes whose memUse() follows pointers: a report that another thread writes leaves the object's
+  /// size out until it is told that the object is complete.
   struct Incomplete {};
   Component(Ostil::String const& name, Incomplete)
       : VLN::Component(name) {

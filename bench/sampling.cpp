@@ -1,0 +1,186 @@
+// Trilinear samples: this library, OpenVDB's BoxSampler on a ValueAccessor and NanoVDB's trilinear sampler on
+// the same grid at the same positions, at random in the narrow band and along rays through it.
+//
+// The grid is the first float grid of the file that VLN_BENCH_GRID names, else the level set of a sphere
+// about 500 voxels wide.
+#include "GeometryVolume/channels/Halo.h"
+#include "GeometryVolume/sampling/VoxelSamplerLinear.h"
+#include "Interop/VdbFileImpl.h"
+#include "Interop/VdbImportImpl.h"
+
+#include <benchmark/benchmark.h>
+#include <openvdb/tools/Interpolation.h>
+#include <openvdb/tools/LevelSetSphere.h>
+
+#include <algorithm>
+#include <cstdlib>
+#include <random>
+
+#include <nanovdb/util/OpenToNanoVDB.h>
+#include <nanovdb/util/SampleFromVoxels.h>
+
+namespace {
+
+using namespace VLN;
+using namespace VLN::TileTree3D;
+using Shape = PowerOfTwoTraits;
+using Core = Channel<Shape, float, 4, 0>;
+using Wide = Channel<Shape, float, 5, 0>;
+using Tree = Container<Shape>;
+using Sampler = FloatVoxelSamplerLinear<Shape>;
+
+constexpr std::size_t kPositions = 1 << 19;
+
+struct Data {
+  openvdb::FloatGrid::Ptr grid;
+  nanovdb::GridHandle<nanovdb::HostBuffer> nano;
+  Interop::VdbImport content;
+  Ostil::Ptr<Tree> tree;
+  Ostil::Ptr<VoxelTopology<Shape>> topology;
+  Ostil::Ptr<Core> core;
+  std::unique_ptr<Tree> accelerated; ///< the tree with an acceleration grid
+  std::unique_ptr<Wide> wide;
+  std::vector<float3> random, rays;
+
+  Data() {
+    openvdb::initialize();
+    Interop::VdbFile file;
+    if (char const* const path = std::getenv("VLN_BENCH_GRID")) {
+      file = Interop::readVdbFile(path);
+      for (auto const& candidate : file.grids)
+        if (candidate->isType<openvdb::FloatGrid>() && !grid)
+          grid = openvdb::gridPtrCast<openvdb::FloatGrid>(candidate);
+    } else {
+      grid = openvdb::tools::createLevelSetSphere<openvdb::FloatGrid>(250.0f, openvdb::Vec3f(0), 1.0f, 3.0f);
+      grid->setName("sphere");
+    }
+    file.grids = {grid};
+    content = Interop::importGrids(file);
+    nano = nanovdb::openToNanoVDB(*grid);
+    auto const& volume = content.volumes.at(0);
+    tree = volume.object->component<Tree>(Interop::kVdbContainerName);
+    topology = volume.object->component<VoxelTopology<Shape>>(Interop::kVdbTopologyName);
+    core = volume.object->component<Core>(volume.channels.at(0).name);
+    accelerated = std::make_unique<Tree>(*tree);
+    accelerated->buildAccessorAccelerationStructure(Shape::kMaxDepth);
+    float const background = core->defaultValue();
+    wide = std::make_unique<Wide>("", &background, kInitializeDefaultValue, true, true, core->minDepth(),
+                                  core->depth());
+    wide->update(*topology);
+    computeHalo<Shape, float, 0, 0, 1, 0>(*core, *tree, *wide, -1, -1);
+    makePositions();
+  }
+
+  // Cells whose eight voxels are all active.
+  void makePositions() {
+    auto values = grid->getConstAccessor();
+    auto const active = [&](openvdb::Coord const& c) {
+      for (int n = 0; n < 8; ++n)
+        if (!values.isValueOn(c.offsetBy(n & 1, n >> 1 & 1, n >> 2))) return false;
+      return true;
+    };
+    std::mt19937 generator(7);
+    std::uniform_real_distribution<float> inside(0.0f, 1.0f);
+    std::vector<openvdb::Coord> voxels;
+    for (auto it = grid->cbeginValueOn(); it; ++it)
+      if (it.isVoxelValue()) voxels.push_back(it.getCoord());
+    while (random.size() < kPositions) {
+      auto const c = voxels[generator() % voxels.size()];
+      if (active(c))
+        random.push_back({float(c.x()) + inside(generator), float(c.y()) + inside(generator),
+                          float(c.z()) + inside(generator)});
+    }
+    // Rays across the box in steps of half a voxel, of which the part in the band is kept.
+    auto const box = grid->evalActiveVoxelBoundingBox();
+    while (rays.size() < kPositions) {
+      openvdb::Vec3d from, to;
+      for (int a = 0; a < 3; ++a) {
+        double const low = box.min()[a], extent = box.dim()[a];
+        from[a] = low + double(inside(generator)) * extent, to[a] = low + double(inside(generator)) * extent;
+      }
+      auto const direction = (to - from).unit();
+      double const length = (to - from).length();
+      for (double t = 0; t < length; t += 0.5) {
+        auto const p = from + t * direction;
+        if (active(openvdb::Coord::floor(p))) rays.push_back({float(p.x()), float(p.y()), float(p.z())});
+      }
+    }
+  }
+};
+
+Data const& data() {
+  static auto const* const made = new Data;
+  return *made;
+}
+
+// Calls f for each position of the pattern: 0 at random, 1 along rays.
+template <class F> void forPositions(benchmark::State& state, F const& f) {
+  auto const& positions = state.range(0) ? data().rays : data().random;
+  for (auto _ : state) {
+    float sum = 0;
+    for (float3 const& p : positions) sum += f(p);
+    benchmark::DoNotOptimize(sum);
+  }
+  double const samples = static_cast<double>(state.iterations()) * static_cast<double>(positions.size());
+  // Seconds for a sample; shown with its unit.
+  state.counters["sample"] =
+      benchmark::Counter(samples, benchmark::Counter::kIsRate | benchmark::Counter::kInvert);
+  state.SetLabel(state.range(0) ? "along rays" : "at random");
+}
+
+template <class ChannelT> void ours(benchmark::State& state, Tree const& tree, ChannelT const& channel) {
+  Sampler const sampler(tree, *data().topology, channel);
+  forPositions(state, [&](float3 const& p) { return sampler.sample(p, kSamplerTileSpace); });
+}
+template <class ChannelT>
+void oursGradient(benchmark::State& state, Tree const& tree, ChannelT const& channel) {
+  Sampler const sampler(tree, *data().topology, channel);
+  forPositions(state, [&](float3 const& p) {
+    float3 g;
+    float const value = sampler.sampleGradient(p, kSamplerTileSpace, &g);
+    return value + g.x + g.y + g.z;
+  });
+}
+
+void wideChannel(benchmark::State& s) { ours(s, *data().tree, *data().wide); }
+void wideAccelerated(benchmark::State& s) { ours(s, *data().accelerated, *data().wide); }
+void wideGradient(benchmark::State& s) { oursGradient(s, *data().accelerated, *data().wide); }
+void coreChannel(benchmark::State& s) { ours(s, *data().tree, *data().core); }
+void coreAccelerated(benchmark::State& s) { ours(s, *data().accelerated, *data().core); }
+void coreGradient(benchmark::State& s) { oursGradient(s, *data().accelerated, *data().core); }
+
+void boxSampler(benchmark::State& state) {
+  auto const values = data().grid->getConstAccessor();
+  forPositions(state, [&](float3 const& p) {
+    return openvdb::tools::BoxSampler::sample(values, openvdb::Vec3d(double(p.x), double(p.y), double(p.z)));
+  });
+}
+
+void nanoSampler(benchmark::State& state) {
+  auto const values = data().nano.grid<float>()->getAccessor();
+  auto const sampler = nanovdb::createSampler<1>(values);
+  forPositions(state, [&](float3 const& p) { return sampler(nanovdb::Vec3f(p.x, p.y, p.z)); });
+}
+void nanoGradient(benchmark::State& state) {
+  auto const values = data().nano.grid<float>()->getAccessor();
+  auto const sampler = nanovdb::createSampler<1>(values);
+  forPositions(state, [&](float3 const& p) {
+    auto const q = nanovdb::Vec3f(p.x, p.y, p.z);
+    auto const g = sampler.gradient(q);
+    return sampler(q) + g[0] + g[1] + g[2];
+  });
+}
+
+#define VLN_BENCHMARK(function, name)                                                                        \
+  BENCHMARK(function)->Name(name)->ArgName("rays")->Arg(0)->Arg(1)->Unit(benchmark::kMillisecond)
+VLN_BENCHMARK(boxSampler, "OpenVDB BoxSampler");
+VLN_BENCHMARK(nanoSampler, "NanoVDB trilinear");
+VLN_BENCHMARK(wideChannel, "wide channel");
+VLN_BENCHMARK(wideAccelerated, "wide channel, acceleration grid");
+VLN_BENCHMARK(coreChannel, "core channel");
+VLN_BENCHMARK(coreAccelerated, "core channel, acceleration grid");
+VLN_BENCHMARK(nanoGradient, "NanoVDB trilinear with gradient");
+VLN_BENCHMARK(wideGradient, "wide channel with gradient, acceleration grid");
+VLN_BENCHMARK(coreGradient, "core channel with gradient, acceleration grid");
+
+} // namespace

@@ -1,0 +1,60 @@
+// ElementOps: what a pass over tiles needs of an element type, behind function pointers. Everything that only
+// moves bytes is shared by element size instead (HaloKernels).
+#pragma once
+
+#include "GeometryVolume/channels/HaloKernels.h"
+#include "GeometryVolume/channels/HaloRegions.h"
+#include "GeometryVolume/core/Export.h"
+#include "GeometryVolume/tiletree/TreeIndex.h"
+
+#include <cstddef>
+
+namespace VLN::TileTree3D::Internal {
+
+/// A box of a target tile, filled by trilinear reads of its parent's tile of the same layout.
+struct ParentBlend {
+  void* target;       ///< first element of the box
+  void const* parent; ///< coordinate (0,0,0) of the parent's tile
+  int width;          ///< of both tiles
+  HaloAxis const* i;
+  HaloAxis const* j;
+  HaloAxis const* k;
+  std::array<int, 3> count;
+};
+
+/// One trilinear read: the corners with i fastest, and the fractions.
+struct CornerBlend {
+  void const* corners[8];
+  double fraction[3];
+};
+
+struct ElementOps {
+  std::size_t size;
+  HaloKernels const* kernels;
+  /// Elements of a tile; null for one that the arrays lack, or that holds fewer than `count`.
+  void const* (*elements)(void const* tileArrays, TreeIndex const& at, int count);
+  void (*blendParent)(ParentBlend const&);
+  void (*blendCorners)(CornerBlend const&, void* out);
+  /// Every component of an element times a factor, in place.
+  void (*scale)(void* element, float factor);
+  /// The constant in every component.
+  void (*broadcast)(float constant, void* out);
+  double (*distance)(void const* a, void const* b);
+};
+
+/// A channel's tiles, with the element type erased.
+struct ErasedTiles {
+  ElementOps const* ops = nullptr;
+  void const* arrays = nullptr; ///< TileArrays of the element type
+  void const* defaultValue = nullptr;
+  int minDepth = 0, maxDepth = 0;
+  int tileSize = 0; ///< elements that a tile must hold to count as present
+
+  bool inRange(int depth) const { return depth >= minDepth && depth <= maxDepth; }
+  /// Null outside the range of depths and for tiles without data.
+  void const* elements(TreeIndex const& at) const {
+    return inRange(at.depth) ? ops->elements(arrays, at, tileSize) : nullptr;
+  }
+};
+
+} // namespace VLN::TileTree3D::Internal

@@ -1,0 +1,94 @@
+// The operations of one element type. Only the generated sources include this.
+#pragma once
+
+#include "GeometryVolume/channels/ChannelData.h"
+#include "GeometryVolume/channels/ElementOps.h"
+#include "GeometryVolume/channels/ElementTraits.h"
+
+#include <algorithm>
+
+namespace VLN::TileTree3D::Internal {
+
+/// Trilinear blend of eight elements, given as corner(n) with i fastest: along i, then j, then k.
+/// @numeric Formed in the type that the elements blend in and converted once. 64-bit integers, which that
+/// type does not hold exactly, are kept within the range of their corners.
+template <class T, class Corner>
+inline T blendEight(Corner const& corner, typename ElementTraits<T>::Blend fi,
+                    typename ElementTraits<T>::Blend fj, typename ElementTraits<T>::Blend fk) {
+  using Traits = ElementTraits<T>;
+  using Blend = typename Traits::Blend;
+  T result;
+  for (int c = 0; c < Traits::kComponents; ++c) {
+    auto const value = [&](int n) { return Traits::toBlend(Traits::component(corner(n), c)); };
+    auto const lerp = [](Blend a, Blend b, Blend f) { return (b - a) * f + a; };
+    Blend const v00 = lerp(value(0), value(1), fi), v10 = lerp(value(2), value(3), fi);
+    Blend const v01 = lerp(value(4), value(5), fi), v11 = lerp(value(6), value(7), fi);
+    auto blended = Traits::fromBlend(lerp(lerp(v00, v10, fj), lerp(v01, v11, fj), fk));
+    if constexpr (Traits::kIsInteger && sizeof(blended) == 8) {
+      auto low = Traits::component(corner(0), c), high = low;
+      for (int n = 1; n < 8; ++n) {
+        low = std::min(low, Traits::component(corner(n), c));
+        high = std::max(high, Traits::component(corner(n), c));
+      }
+      blended = std::clamp(blended, low, high);
+    }
+    Traits::component(result, c) = blended;
+  }
+  return result;
+}
+
+template <class T> struct TypedElementOps {
+  using Traits = ElementTraits<T>;
+  using Blend = typename Traits::Blend;
+
+  static void const* elements(void const* tileArrays, TreeIndex const& at, int count) {
+    auto const& tiles = (*static_cast<TileArrays<T> const*>(tileArrays))[static_cast<std::size_t>(at.depth)];
+    if (at.index < 0 || static_cast<std::size_t>(at.index) >= tiles.size()) return nullptr;
+    auto const& tile = tiles[static_cast<std::size_t>(at.index)];
+    return tile.size() >= static_cast<std::size_t>(count) ? tile.data() : nullptr;
+  }
+
+  static void blendParent(ParentBlend const& b) {
+    auto* const target = static_cast<T*>(b.target);
+    auto const* const parent = static_cast<T const*>(b.parent);
+    int const w = b.width;
+    int const offsets[8] = {0, 1, w, w + 1, w * w, w * w + 1, w * w + w, w * w + w + 1};
+    for (int k = 0; k < b.count[2]; ++k)
+      for (int j = 0; j < b.count[1]; ++j)
+        for (int i = 0; i < b.count[0]; ++i) {
+          T const* const low = parent + b.i[i].at + (b.j[j].at + b.k[k].at * w) * w;
+          target[i + (j + k * w) * w] =
+              blendEight<T>([&](int n) -> T const& { return low[offsets[n]]; }, Blend(b.i[i].fraction),
+                            Blend(b.j[j].fraction), Blend(b.k[k].fraction));
+        }
+  }
+
+  static void blendCorners(CornerBlend const& b, void* out) {
+    *static_cast<T*>(out) =
+        blendEight<T>([&](int n) -> T const& { return *static_cast<T const*>(b.corners[n]); },
+                      Blend(b.fraction[0]), Blend(b.fraction[1]), Blend(b.fraction[2]));
+  }
+
+  static void scale(void* element, float factor) {
+    auto& value = *static_cast<T*>(element);
+    value = Traits::scaled(value, Blend(factor));
+  }
+
+  static void broadcast(float constant, void* out) {
+    auto& value = *static_cast<T*>(out);
+    for (int c = 0; c < Traits::kComponents; ++c)
+      Traits::component(value, c) = Traits::fromBlend(Blend(constant));
+  }
+
+  static double distance(void const* a, void const* b) {
+    return Traits::distance(*static_cast<T const*>(a), *static_cast<T const*>(b));
+  }
+
+  static ElementOps const& get() {
+    static ElementOps const ops{
+        sizeof(T), &haloKernels(sizeof(T)), elements, blendParent, blendCorners, scale, broadcast, distance};
+    return ops;
+  }
+};
+
+} // namespace VLN::TileTree3D::Internal

@@ -1,0 +1,247 @@
+#include "GeometryVolume/channels/HaloDriver.h"
+
+#include <algorithm>
+
+namespace VLN::TileTree3D::Internal {
+
+template <class TraitsT>
+TreeIndex HaloDriver<TraitsT>::neighbor(TileType const& tile, NeighborDirection d) const {
+  if (auto const* table = m_accessor.container()->neighborData())
+    return (*table)[static_cast<std::size_t>(tile.depth())][static_cast<std::size_t>(tile.index())]
+                   [static_cast<std::size_t>(d)];
+  int3 const step = neighborOffset(d);
+  std::int64_t const w = TraitsT::width(tile.depth());
+  std::int64_t const i = tile.ti() + step.x * w, j = tile.tj() + step.y * w, k = tile.tk() + step.z * w;
+  auto const outside = [](std::int64_t c) {
+    return c < TraitsT::kMinTileCoord || c > TraitsT::kMaxTileCoord;
+  };
+  if (outside(i) || outside(j) || outside(k)) return {};
+  return m_accessor.treeIndex(static_cast<int>(i), static_cast<int>(j), static_cast<int>(k), tile.depth(),
+                              false);
+}
+
+template <class TraitsT>
+auto HaloDriver<TraitsT>::withData(TileType const* tile, void const*& elements) const -> TileType const* {
+  while (tile->valid() && tile->depth() >= m_source.minDepth) {
+    elements = m_source.elements(tile->treeIndex());
+    if (elements) return tile;
+    if (tile->isRoot()) break;
+    tile = &m_accessor.tile(tile->parentTreeIndex());
+  }
+  return nullptr;
+}
+
+template <class TraitsT>
+void HaloDriver<TraitsT>::copy(HaloBox const& box, void* target, void const* source) const {
+  m_source.ops->kernels->copy(
+      {at(target, box.target), m_table.targetWidth, at(source, box.source), m_table.sourceWidth, box.count});
+}
+
+template <class TraitsT>
+void HaloDriver<TraitsT>::set(HaloBox const& box, void* target, void const* value) const {
+  m_source.ops->kernels->fill({at(target, box.target), m_table.targetWidth, value, 0, box.count});
+}
+
+template <class TraitsT> void HaloDriver<TraitsT>::replicate(HaloBox const& box, void* target) const {
+  int flat[3][HaloTable::kLargestWidth];
+  int stride = 1;
+  for (std::size_t a = 0; a < 3; ++a, stride *= m_table.targetWidth)
+    for (int n = 0; n < box.count[a]; ++n)
+      flat[a][n] = stride * std::clamp(box.low[a] + n, 0, m_table.tileDataWidth - 1);
+  m_source.ops->kernels->gather({at(target, box.target), m_table.targetWidth,
+                                 at(target, m_table.targetOrigin), flat[0], flat[1], flat[2], box.count});
+}
+
+template <class TraitsT>
+void HaloDriver<TraitsT>::blend(HaloBox const& box, HaloTarget<TraitsT> const& target,
+                                int3 const& child) const {
+  auto const axis = [&](std::size_t a, int c) {
+    return &m_table
+                .parentAxis[static_cast<std::size_t>(c)][static_cast<std::size_t>(box.low[a] + m_table.halo)];
+  };
+  m_source.ops->blendParent({at(target.elements, box.target), at(target.parentElements, m_table.targetOrigin),
+                             m_table.targetWidth, axis(0, child.x), axis(1, child.y), axis(2, child.z),
+                             box.count});
+}
+
+template <class TraitsT>
+void HaloDriver<TraitsT>::nearest(HaloBox const& box, TileType const& tile, void* target,
+                                  TileType const& coarse, void const* source) const {
+  int flat[3][HaloTable::kLargestWidth];
+  int stride = 1;
+  for (int a = 0; a < 3; ++a, stride *= m_table.sourceWidth) {
+    auto const axis = static_cast<std::size_t>(a);
+    for (int n = 0; n < box.count[axis]; ++n) {
+      // Both corners lie in the domain, but their difference may not fit when the depths are far apart.
+      std::int64_t const c = tile.tijk()[a] + std::int64_t(box.low[axis] + n) * tile.voxelDataWidth();
+      flat[a][n] = stride * static_cast<int>((c - coarse.tijk()[a]) / coarse.voxelDataWidth());
+    }
+  }
+  m_source.ops->kernels->gather({at(target, box.target), m_table.targetWidth,
+                                 at(source, m_table.sourceOrigin), flat[0], flat[1], flat[2], box.count});
+}
+
+template <class TraitsT>
+void HaloDriver<TraitsT>::sample(HaloBox const& box, TileType const& tile, void* target, float scale,
+                                 HaloSampler<TraitsT>& sampler) const {
+  int const s = tile.voxelDataWidth(), w = m_table.targetWidth;
+  for (int k = 0; k < box.count[2]; ++k)
+    for (int j = 0; j < box.count[1]; ++j)
+      for (int i = 0; i < box.count[0]; ++i) {
+        int3 const p{tile.ti() + s * (box.low[0] + i), tile.tj() + s * (box.low[1] + j),
+                     tile.tk() + s * (box.low[2] + k)};
+        sampler.sample(p, scale, at(target, box.target + i + (j + k * w) * w));
+      }
+}
+
+template <class TraitsT>
+void HaloDriver<TraitsT>::fill(HaloTarget<TraitsT> const& target, HaloMode mode) const {
+  TileType const& tile = target.tile;
+  if (void const* const own = m_source.elements(tile.treeIndex()))
+    copy(m_table.core, target.elements, own);
+  else
+    set(m_table.core, target.elements, m_source.defaultValue);
+
+  int3 child{-1, 0, 0};
+  for (int n = 0; n < m_table.regionCount; ++n) {
+    HaloRegion const& region = m_table.regions[static_cast<std::size_t>(n)];
+    TreeIndex const beside = neighbor(tile, region.direction);
+    void const* const source = beside.depth == tile.depth() ? m_source.elements(beside) : nullptr;
+    if (source) {
+      copy(region, target.elements, source);
+    } else if (target.parent && target.parentElements) {
+      if (child.x < 0) child = target.parent->childIJK(tile);
+      blend(region, target, child);
+    } else if (mode == kHaloModeReplicate) {
+      replicate(region, target.elements);
+    } else {
+      set(region, target.elements, m_source.defaultValue);
+    }
+  }
+}
+
+template <class TraitsT>
+void HaloDriver<TraitsT>::fillRegion(HaloRegion const& region, TileType const& tile, void* target,
+                                     HaloFill const& fill, HaloSampler<TraitsT>& sampler) const {
+  TreeIndex const beside = neighbor(tile, region.direction);
+  if (beside.depth == tile.depth()) {
+    if (void const* const source = m_source.elements(beside)) return copy(region, target, source);
+  }
+  if (!beside.valid() || beside.depth < m_source.minDepth || fill.mode == kHaloModeDefault)
+    return set(region, target, m_source.defaultValue);
+  switch (fill.mode) {
+  case kHaloModeDeepOnly:
+    if (beside.depth > m_source.maxDepth) sample(region, tile, target, fill.scale, sampler);
+    return;
+  case kHaloModeReplicate:
+    return replicate(region, target);
+  case kHaloModeNearestCoarse: {
+    void const* source = nullptr;
+    TileType const* const coarse = withData(&m_accessor.tile(beside), source);
+    if (coarse) return nearest(region, tile, target, *coarse, source);
+    return set(region, target, m_source.defaultValue);
+  }
+  case kHaloModeLinearCoarse:
+    return sample(region, tile, target, fill.scale, sampler);
+  case kHaloModeConstant: {
+    alignas(16) std::byte value[64];
+    m_source.ops->broadcast(fill.constant, value);
+    return set(region, target, value);
+  }
+  default:
+    return;
+  }
+}
+
+template <class TraitsT>
+void HaloDriver<TraitsT>::fill(TileType const& tile, void* target, HaloFill const& fill,
+                               HaloSampler<TraitsT>& sampler) const {
+  if (fill.mode < kHaloModeDeepOnly || fill.mode > kHaloModeConstant) return;
+  if (fill.type & kHaloCore) {
+    if (tile.depth() > m_source.maxDepth)
+      sample(m_table.core, tile, target, fill.scale, sampler);
+    else if (void const* const own = m_source.elements(tile.treeIndex()))
+      copy(m_table.core, target, own);
+    else
+      set(m_table.core, target, m_source.defaultValue);
+  }
+  for (int n = 0; n < m_table.regionCount; ++n) {
+    HaloRegion const& region = m_table.regions[static_cast<std::size_t>(n)];
+    if (!(fill.type & (region.face ? kHaloFaces : kHaloEdges)) || fill.type & haloSkip(region.direction))
+      continue;
+    fillRegion(region, tile, target, fill, sampler);
+  }
+}
+
+namespace {
+
+// One worker of a pass. Each clone has an accessor and a sampler of its own.
+template <class TraitsT> class HaloVisitor final : public Visitor<Container<TraitsT>> {
+public:
+  using TileType = Tile<TraitsT, TraitsT::kTileSize>;
+
+  HaloVisitor(HaloPass const& pass, HaloFill const* fill, Container<TraitsT> const& tree)
+      : m_pass(pass)
+      , m_fill(fill)
+      , m_tree(tree)
+      , m_accessor(tree.tileAccessor())
+      , m_driver(pass.source, *pass.table, m_accessor)
+      , m_sampler(pass.source, pass.table->sourceWidth, pass.table->sourceOrigin,
+                  fill ? fill->offsetType : kVoxelOffsetCorner, m_accessor) {
+    this->setEndTileOverridden(false);
+  }
+
+  HaloVisitor* clone() const override { return new HaloVisitor(m_pass, m_fill, m_tree); }
+
+  using Visitor<Container<TraitsT>>::beginTile;
+  void beginTile(TileType const& tile) override {
+    void* const target = const_cast<void*>(m_pass.target.elements(tile.treeIndex()));
+    if (!target) return;
+    if (m_fill) return m_driver.fill(tile, target, *m_fill, m_sampler);
+    HaloTarget<TraitsT> plain{tile, target};
+    if (!tile.isRoot() && tile.depth() > m_pass.firstDepth) {
+      plain.parent = &m_tree.tile(tile.parentTreeIndex());
+      plain.parentElements = m_pass.target.elements(tile.parentTreeIndex());
+    }
+    m_driver.fill(plain, kHaloModeReplicate);
+  }
+
+private:
+  HaloPass const& m_pass;
+  HaloFill const* m_fill;
+  Container<TraitsT> const& m_tree;
+  ConstTileAccessorOf<TraitsT> m_accessor;
+  HaloDriver<TraitsT> m_driver;
+  HaloSampler<TraitsT> m_sampler;
+};
+
+template <class TraitsT> void run(HaloPass pass, HaloFill const* fill, Container<TraitsT> const& tree) {
+  int const low = std::max({pass.source.minDepth, pass.target.minDepth, 0});
+  int const high = std::min({pass.source.maxDepth, pass.target.maxDepth, TraitsT::kMaxDepth});
+  pass.firstDepth = pass.firstDepth == -1 ? low : std::max(pass.firstDepth, low);
+  pass.lastDepth = pass.lastDepth == -1 ? high : std::min(pass.lastDepth, high);
+  if (pass.firstDepth > pass.lastDepth) return;
+  HaloVisitor<TraitsT> visitor(pass, fill, tree);
+  TraversalRange range;
+  range.minDepth = pass.firstDepth, range.maxDepth = pass.lastDepth;
+  range.voxelEnd = 0; // tiles alone
+  tree.traverse(visitor, kParallelTopDown, range);
+}
+
+} // namespace
+
+template <class TraitsT> void runHaloPass(HaloPass const& pass, Container<TraitsT> const& tree) {
+  run(pass, nullptr, tree);
+}
+template <class TraitsT>
+void runHaloPass(HaloPass const& pass, HaloFill const& fill, Container<TraitsT> const& tree) {
+  run(pass, &fill, tree);
+}
+
+#define VLN_INSTANTIATE(TraitsT)                                                                             \
+  template class HaloDriver<TraitsT>;                                                                        \
+  template void runHaloPass<TraitsT>(HaloPass const&, Container<TraitsT> const&);                            \
+  template void runHaloPass<TraitsT>(HaloPass const&, HaloFill const&, Container<TraitsT> const&);
+VLN_FOR_EACH_SHAPE(VLN_INSTANTIATE)
+
+} // namespace VLN::TileTree3D::Internal

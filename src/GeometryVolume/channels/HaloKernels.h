@@ -1,0 +1,39 @@
+// Moves of boxes of elements whose type takes no part: one set of kernels for each element size.
+#pragma once
+
+#include <array>
+#include <cstddef>
+
+namespace VLN::TileTree3D::Internal {
+
+/// A box inside two flat arrays. Pointers lie on the first element; widths are those of the tiles.
+struct BoxMove {
+  void* target;
+  int targetWidth;
+  void const* source;
+  int sourceWidth;
+  std::array<int, 3> count;
+};
+
+/// A box whose elements come from anywhere in a source tile, axis by axis: element (i,j,k) takes the one at
+/// i[i] + j[j] + k[k]. The source may be the target's own tile, read where the box does not write.
+struct BoxGather {
+  void* target;
+  int targetWidth;
+  void const* source;
+  int const* i;
+  int const* j;
+  int const* k;
+  std::array<int, 3> count;
+};
+
+struct HaloKernels {
+  void (*copy)(BoxMove const&);
+  void (*fill)(BoxMove const&); ///< every element takes the one at `source`
+  void (*gather)(BoxGather const&);
+};
+
+/// @pre One of the sizes of the element types.
+HaloKernels const& haloKernels(std::size_t elementSize);
+
+} // namespace VLN::TileTree3D::Internal

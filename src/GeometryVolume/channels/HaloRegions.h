@@ -1,0 +1,130 @@
+// HaloTable: the boxes that a halo computation moves, for one pair of tile layouts.
+//
+//          low halo      tile data of the tree      plane of an extended tile and high halo
+//   i:   -H ........ -1 | 0 ................ W-1 | W ............ W+X+H-1      X: 1 when extended, else 0
+//
+// The centre is the "core", filled from the source's own tile. Each of the 26 boxes round it belongs to a
+// direction and reads from the neighbour there, W further on. Boxes without elements are left out, so that a
+// target without halo keeps the seven directions without a negative step, and one that is not extended none.
+#pragma once
+
+#include "GeometryVolume/channels/ChannelTypes.h"
+#include "GeometryVolume/tiletree/TreeIndex.h"
+
+#include <array>
+
+namespace VLN::TileTree3D::Internal {
+
+using Velorn::Math::int3;
+
+/// A box of a target tile, and where its elements come from in a source tile.
+struct HaloBox {
+  std::array<int, 3> low{};   ///< first coordinate on each axis
+  std::array<int, 3> count{}; ///< elements along each axis
+  int target = 0;             ///< flat index of the first element in the target
+  int source = 0;             ///< and in the source's tile in that direction
+};
+
+struct HaloRegion : HaloBox {
+  NeighborDirection direction = kNeighborSelf;
+  bool face = false;
+};
+
+/// One axis of a read from the parent: the low one of two samples, and the fraction of the high one.
+struct HaloAxis {
+  int at = 0;
+  float fraction = 0;
+};
+
+struct HaloTable {
+  static constexpr int kLargestWidth = 9;
+  static constexpr int kLargestTileWidth = 5;
+
+  int tileDataWidth = 0; ///< W
+  int halo = 0;          ///< of the target
+  int targetWidth = 0, sourceWidth = 0;
+  int targetSize = 0, sourceSize = 0;
+  int targetOrigin = 0, sourceOrigin = 0; ///< flat index of coordinate (0,0,0)
+  HaloBox core;
+  std::array<HaloRegion, 26> regions{}; ///< those without a negative step first, beginning with +i, +j, +k
+  int regionCount = 0;
+  /// For a tile that is child c of its parent along an axis: where each coordinate lies in the parent, whose
+  /// tile has the target's layout. [c][coordinate + halo]
+  std::array<std::array<HaloAxis, kLargestWidth>, kLargestTileWidth> parentAxis{};
+};
+
+/// Where coordinate `at` of child `child` lies among the samples of the parent, with samples on low corners.
+/// @formula x = (child * W + at) / kTW: the distance of the corners and of the samples in units of the
+/// child's samples, divided by the samples' ratio. The floor is limited so that the second sample stays in
+/// the tile.
+constexpr HaloAxis parentAxisAt(int child, int at, int tileDataWidth, int tileWidth, int largest) {
+  int const numerator = child * tileDataWidth + at;
+  float const x = static_cast<float>(numerator) / static_cast<float>(tileWidth);
+  int low = numerator / tileWidth - (numerator % tileWidth < 0 ? 1 : 0);
+  if (low > largest) low = largest;
+  return {low, x - static_cast<float>(low)};
+}
+
+/// @param tileWidth Children along a tile's edge.
+constexpr HaloTable makeHaloTable(ChannelLayout const& source, ChannelLayout const& target, int tileWidth) {
+  HaloTable t;
+  int const w = target.tileDataWidth;
+  auto const widthOf = [](ChannelLayout const& l) { return l.core + 2 * l.halo; };
+  auto const originOf = [&](ChannelLayout const& l) {
+    int const width = widthOf(l);
+    return l.halo * (1 + width + width * width);
+  };
+  t.tileDataWidth = w;
+  t.halo = target.halo;
+  t.targetWidth = widthOf(target), t.sourceWidth = widthOf(source);
+  t.targetSize = target.size, t.sourceSize = source.size;
+  t.targetOrigin = originOf(target), t.sourceOrigin = originOf(source);
+  t.core = {{0, 0, 0}, {w, w, w}, t.targetOrigin, t.sourceOrigin};
+
+  auto const add = [&](int3 const& step) {
+    HaloRegion r;
+    r.direction = neighborDirection(step.x, step.y, step.z);
+    int const moved = (step.x != 0) + (step.y != 0) + (step.z != 0);
+    r.face = moved == 1;
+    int const steps[3] = {step.x, step.y, step.z};
+    int targetStride = 1, sourceStride = 1;
+    r.target = t.targetOrigin, r.source = t.sourceOrigin;
+    for (std::size_t a = 0; a < 3; ++a) {
+      r.low[a] = steps[a] < 0 ? -target.halo : steps[a] > 0 ? w : 0;
+      r.count[a] = steps[a] < 0 ? target.halo : steps[a] > 0 ? target.extended + target.halo : w;
+      if (r.count[a] == 0) return;
+      r.target += r.low[a] * targetStride;
+      r.source += (r.low[a] - steps[a] * w) * sourceStride;
+      targetStride *= t.targetWidth, sourceStride *= t.sourceWidth;
+    }
+    t.regions[static_cast<std::size_t>(t.regionCount++)] = r;
+  };
+  for (int3 const step : {int3{1, 0, 0}, int3{0, 1, 0}, int3{0, 0, 1}, int3{1, 1, 0}, int3{1, 0, 1},
+                          int3{0, 1, 1}, int3{1, 1, 1}})
+    add(step);
+  for (int d = 0; d < kNeighborCount; ++d) {
+    int3 const step = neighborOffset(d);
+    if (step.x < 0 || step.y < 0 || step.z < 0) add(step);
+  }
+
+  int const largest =
+      target.core - 1 < target.core + target.halo - 2 ? target.core - 1 : target.core + target.halo - 2;
+  for (int child = 0; child < tileWidth; ++child)
+    for (int n = 0; n < t.targetWidth; ++n)
+      t.parentAxis[static_cast<std::size_t>(child)][static_cast<std::size_t>(n)] =
+          parentAxisAt(child, n - target.halo, w, tileWidth, largest);
+  return t;
+}
+
+/// Layouts of the tiles of a tree with W samples along a tile.
+constexpr ChannelLayout haloLayout(int tileDataWidth, int extended, int halo) {
+  int const width = tileDataWidth + extended + 2 * halo;
+  return {tileDataWidth + extended, halo, extended, tileDataWidth, width * width * width, 0};
+}
+
+template <class TraitsT, int SourceExtended, int SourceHalo, int TargetExtended, int TargetHalo>
+inline constexpr HaloTable kHaloTable = makeHaloTable(haloLayout(TraitsT::kTDW, SourceExtended, SourceHalo),
+                                                      haloLayout(TraitsT::kTDW, TargetExtended, TargetHalo),
+                                                      TraitsT::kTW);
+
+} // namespace VLN::TileTree3D::Internal

@@ -1,0 +1,109 @@
+// VoxelSampler: from a continuous position to a tile, a sample in it, and the weights of the next ones.
+//
+//   tile of depth d, D samples along its edge          l = (p - corner) * D / W[d] - offset
+//
+//    corner                                            i = floor(l), at most D-1      the cell's low sample
+//      |----+----|----+----|----+----|----+----|       weight = l - i                  of the next sample
+//           0         1         2         3            samples at + when the offset is one half,
+//      0         1         2         3                 at | when it is 0
+//
+// Beyond the last sample the weight reaches and passes 1; before the first, with an offset, i is -1.
+#pragma once
+
+#include "GeometryVolume/core/Numeric.h"
+#include "GeometryVolume/tiletree/Container.h"
+#include "GeometryVolume/topology/VoxelTopology.h"
+
+#include <algorithm>
+#include <array>
+
+namespace VLN::TileTree3D {
+
+/// What a position is given in.
+enum SamplerSpace : std::int32_t {
+  kSamplerTileSpace = 0,
+  kSamplerVoxelSpace = 1, ///< taken as tile space
+  kSamplerWorldSpace = 2,
+};
+
+/// @threads A sampler belongs to one thread, const operations included: it remembers the last tile. Any
+/// number of samplers may read one volume while nothing changes it.
+template <class TraitsT, class Real, class Position> class VLN_API VoxelSampler {
+  static_assert(std::is_same_v<Real, float> && std::is_same_v<Position, float3>, "instantiated for float");
+
+public:
+  using ContainerT = Container<TraitsT>;
+  using Accessor = typename ContainerT::ConstTileAccessor;
+
+  VoxelSampler() = default;
+  VoxelSampler(ContainerT const& container, VoxelTopology<TraitsT> const& topology)
+      : m_accessor(container.tileAccessor())
+      , m_worldToTile(container.voxelSize() == 0.0f ? 0.0f : 1.0f / container.voxelSize())
+      , m_offset(topology.offset())
+      , m_offsetType(topology.offsetType()) {}
+  VoxelSampler(VoxelSampler const&) = default;
+  VoxelSampler& operator=(VoxelSampler const&) = default;
+  virtual ~VoxelSampler();
+
+  /// "kNone".
+  virtual char const* idString() const;
+
+  /// Finds the deepest tile at or above `depth` that holds the position, the sample at or below it on each
+  /// axis, and the weights of the next samples.
+  /// @param invVoxelWidth If given, 1 / width of the tile's voxels in tile space.
+  /// @return false without a tile: `out` is then invalid, and the others stay as they were.
+  /// @edges NaN and positions that no int32 holds have no tile.
+  /// @numeric A place up to 1e-5 of a sample below the tile's first sample counts as on it.
+  bool prepareToSample(Position position, SamplerSpace space, TreeIndex& out, int3& ijk, Position& weights,
+                       int depth, Real* invVoxelWidth) const {
+    if (space == kSamplerWorldSpace) position = position * m_worldToTile;
+    int const ci = toIntFloor(position.x), cj = toIntFloor(position.y), ck = toIntFloor(position.z);
+    if (depth < 0) {
+      out = {};
+      return false;
+    }
+    out = m_accessor.treeIndex(ci, cj, ck, depth, false);
+    if (out.depth < 0) return false;
+    Scale const& scale = kScales[static_cast<std::size_t>(out.depth)];
+    if (invVoxelWidth) *invVoxelWidth = scale.invVoxelWidth;
+    int3 const corner = m_accessor.cursorCorner();
+    place(position.x, corner.x, scale.samples, m_offset.x, ijk.x, weights.x);
+    place(position.y, corner.y, scale.samples, m_offset.y, ijk.y, weights.y);
+    place(position.z, corner.z, scale.samples, m_offset.z, ijk.z, weights.z);
+    return true;
+  }
+
+protected:
+  static constexpr int D = TraitsT::kTDW;
+
+  static void place(float p, int corner, float samples, float offset, int& i, float& weight) {
+    float l = (p - static_cast<float>(corner)) * samples - offset;
+    if (l > -1e-5f) l = std::max(0.0f, l);
+    i = std::min(toIntFloor(l), D - 1);
+    weight = l - static_cast<float>(i);
+  }
+
+  Accessor m_accessor;
+  Real m_worldToTile = 1.0f;
+  Position m_offset{0.0f, 0.0f, 0.0f};
+  VoxelOffsetType m_offsetType = kVoxelOffsetCorner;
+
+private:
+  struct Scale {
+    float invVoxelWidth; // kTW / W
+    float samples;       // D / W
+  };
+  static constexpr auto kScales = [] {
+    std::array<Scale, static_cast<std::size_t>(TraitsT::kDepths)> scales{};
+    for (int d = 0; d < TraitsT::kDepths; ++d) {
+      auto const r = static_cast<float>(double(TraitsT::kTW) / TraitsT::width(d));
+      scales[static_cast<std::size_t>(d)] = {
+          r, TraitsT::kTDW == 2 * TraitsT::kTW
+                 ? r + r
+                 : static_cast<float>(double(TraitsT::kTDW) / TraitsT::width(d))};
+    }
+    return scales;
+  }();
+};
+
+} // namespace VLN::TileTree3D

@@ -1,0 +1,275 @@
+#include "GeometryVolume/sampling/VoxelSamplerLinear.h"
+
+#include "GeometryVolume/channels/Halo.h"
+
+namespace VLN::TileTree3D {
+
+int const kCacheSizeCoarserLevels = 1;
+
+#define VLN_SAMPLER_TEMPLATE                                                                                 \
+  template <class TraitsT, class Value, int Components, class Real, class Position, int A, int B>
+#define VLN_SAMPLER VoxelSamplerLinear<TraitsT, Value, Components, Real, Position, A, B>
+
+VLN_SAMPLER_TEMPLATE VLN_SAMPLER::VoxelSamplerLinear() { forgetTiles(); }
+VLN_SAMPLER_TEMPLATE VLN_SAMPLER::~VoxelSamplerLinear() = default;
+
+VLN_SAMPLER_TEMPLATE VLN_SAMPLER::VoxelSamplerLinear(ContainerT const& container, Topology const& topology,
+                                                     WideChannel const& channel)
+    : Base(container, topology)
+    , m_tileAccessor(container.tileAccessor())
+    , m_offsetTypeLinear(topology.offsetType())
+    , m_container(&container)
+    , m_topology(&topology)
+    , m_invVoxelSize(1.0f / container.voxelSize()) {
+  bind(nullptr, &channel);
+}
+
+VLN_SAMPLER_TEMPLATE VLN_SAMPLER::VoxelSamplerLinear(ContainerT const& container, Topology const& topology,
+                                                     CoreChannel const& channel)
+    : Base(container, topology)
+    , m_tileAccessor(container.tileAccessor())
+    , m_offsetTypeLinear(topology.offsetType())
+    , m_cacheOneSided(kDepths)
+    , m_cacheTwoSided(kDepths)
+    , m_container(&container)
+    , m_topology(&topology)
+    , m_invVoxelSize(1.0f / container.voxelSize()) {
+  bind(&channel, nullptr);
+}
+
+VLN_SAMPLER_TEMPLATE VLN_SAMPLER::VoxelSamplerLinear(VoxelSamplerLinear const& other)
+    : Base(other) {
+  *this = other;
+}
+
+VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::operator=(VoxelSamplerLinear const& other) -> VoxelSamplerLinear& {
+  if (this == &other) return *this;
+  Base::operator=(other);
+  m_tileAccessor = other.m_tileAccessor;
+  m_offsetTypeLinear = other.m_offsetTypeLinear;
+  m_cacheOneSided = Cache<OneSidedTile>(other.m_cacheOneSided.size());
+  m_cacheTwoSided = Cache<TwoSidedTile>(other.m_cacheTwoSided.size());
+  m_container = other.m_container;
+  m_channelCore = other.m_channelCore;
+  m_channelWide = other.m_channelWide;
+  m_topology = other.m_topology;
+  m_invVoxelSize = other.m_invVoxelSize;
+  m_defaultValue = other.m_defaultValue;
+  m_minDepth = other.m_minDepth;
+  m_maxDepth = other.m_maxDepth;
+  forgetTiles();
+  return *this;
+}
+
+VLN_SAMPLER_TEMPLATE char const* VLN_SAMPLER::idString() const { return "kLinear"; }
+
+VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::bind(CoreChannel const* core, WideChannel const* wide) {
+  m_channelCore = core, m_channelWide = wide;
+  auto const take = [this](auto const& channel) {
+    m_defaultValue = channel.defaultValue();
+    m_minDepth = channel.minDepth();
+    m_maxDepth = std::min(channel.depth(), TraitsT::kMaxDepth);
+  };
+  if (core)
+    take(*core);
+  else
+    take(*wide);
+  forgetTiles();
+}
+
+VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::forgetTiles() {
+  m_accessCount = 0;
+  m_lastTile.fill(-1);
+  m_lastSlot.fill(-1);
+}
+
+VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::findTile(int i, int j, int k, int depth) const
+    -> ConstTileData<float, D, 0> {
+  TreeIndex const at = m_tileAccessor.treeIndex(i, j, k, depth, true);
+  if (!at.valid() || depth < m_minDepth || depth > m_maxDepth ||
+      at.index >= m_channelCore->tileCount(at.depth))
+    return {};
+  return m_channelCore->tileData(at);
+}
+
+VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::cachedCell(TreeIndex const& tile, int3 const& ijk,
+                                                  Position const& weights) const -> Cell {
+  auto const entry = [&](auto& cache) -> auto& {
+    auto const d = static_cast<std::size_t>(tile.depth);
+    if (m_lastTile[d] == tile.index) return cache[static_cast<std::size_t>(m_lastSlot[d])];
+    return updateCache(tile.index, tile.depth, cache);
+  };
+  if (this->m_offsetType == kVoxelOffsetCorner) {
+    constexpr int w = D + 1;
+    float const* const data = entry(m_cacheOneSided).data.data()->data();
+    return {data + ijk.x + w * (ijk.y + w * ijk.z), w, weights};
+  }
+  constexpr int w = D + 2;
+  float const* const data = entry(m_cacheTwoSided).data.data()->data();
+  return {data + (ijk.x + 1) + w * ((ijk.y + 1) + w * (ijk.z + 1)), w, weights};
+}
+
+// The entry that holds the tile, or null.
+VLN_SAMPLER_TEMPLATE template <class Tile>
+auto VLN_SAMPLER::probe(std::int64_t tile, int depth, Cache<Tile>& cache) const -> CacheEntry<Tile>* {
+  auto const d = static_cast<std::size_t>(depth);
+  if (m_lastTile[d] == tile) return &cache[static_cast<std::size_t>(m_lastSlot[d])];
+  for (int n = depth; n < depth + kCacheSizeCoarserLevels; ++n) {
+    auto& entry = cache[static_cast<std::size_t>(n)];
+    if (entry.tile != tile) continue;
+    entry.lastUse = m_accessCount;
+    m_lastTile[d] = tile, m_lastSlot[d] = n;
+    return &entry;
+  }
+  return nullptr;
+}
+
+// The first empty entry of the depth, else the one not used for longest.
+VLN_SAMPLER_TEMPLATE template <class Tile> int VLN_SAMPLER::chooseSlot(int depth, Cache<Tile>& cache) const {
+  int slot = depth;
+  for (int n = depth; n < depth + kCacheSizeCoarserLevels; ++n) {
+    auto const& entry = cache[static_cast<std::size_t>(n)];
+    if (entry.tile < 0) return n;
+    if (entry.lastUse < cache[static_cast<std::size_t>(slot)].lastUse) slot = n;
+  }
+  return slot;
+}
+
+// Names what the entry now holds: only when it is complete, so that nothing meets it half-filled.
+VLN_SAMPLER_TEMPLATE template <class Tile>
+auto VLN_SAMPLER::keep(std::int64_t tile, int depth, int slot, Cache<Tile>& cache) const
+    -> CacheEntry<Tile>& {
+  auto& entry = cache[static_cast<std::size_t>(slot)];
+  entry.tile = tile;
+  m_lastTile[static_cast<std::size_t>(depth)] = tile;
+  m_lastSlot[static_cast<std::size_t>(depth)] = slot;
+  return entry;
+}
+
+VLN_SAMPLER_TEMPLATE bool VLN_SAMPLER::hasUsableParent(typename ContainerT::TileType const& tile) const {
+  return tile.depth() != 0 && tile.parentIndex() >= 0 && tile.depth() > m_minDepth;
+}
+
+VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::updateCache(std::int64_t index, int depth,
+                                                   std::vector<CacheEntry<OneSidedTile>>& cache) const
+    -> CacheEntry<OneSidedTile>& {
+  if (auto* const found = probe(index, depth, cache)) return *found;
+  int const slot = chooseSlot(depth, cache);
+  auto& entry = cache[static_cast<std::size_t>(slot)];
+  entry.tile = -1, entry.lastUse = m_accessCount;
+  if (!entry.data) entry.data = OneSidedTile(OneSidedTile::kSize);
+  auto const& tile = m_container->tile(index, depth);
+  auto& accessor = const_cast<Accessor&>(m_tileAccessor);
+  if (hasUsableParent(tile)) {
+    auto& parent = updateCache(tile.parentIndex(), depth - 1, cache);
+    setHaloTile<TraitsT, float, 0, 0, 1, 0>(tile, &m_container->tile(tile.parentTreeIndex()), *m_channelCore,
+                                            entry.data, kHaloModeReplicate, accessor, parent.data);
+  } else {
+    OneSidedTile none;
+    setHaloTile<TraitsT, float, 0, 0, 1, 0>(tile, nullptr, *m_channelCore, entry.data, kHaloModeReplicate,
+                                            accessor, none);
+  }
+  return keep(index, depth, slot, cache);
+}
+
+VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::updateCache(std::int64_t index, int depth,
+                                                   std::vector<CacheEntry<TwoSidedTile>>& cache) const
+    -> CacheEntry<TwoSidedTile>& {
+  if (auto* const found = probe(index, depth, cache)) return *found;
+  int const slot = chooseSlot(depth, cache);
+  auto& entry = cache[static_cast<std::size_t>(slot)];
+  entry.tile = -1, entry.lastUse = m_accessCount;
+  if (!entry.data) entry.data = TwoSidedTile(TwoSidedTile::kSize);
+  auto const& tile = m_container->tile(index, depth);
+  if (hasUsableParent(tile))
+    fillTwoSided(tile, updateCache(tile.parentIndex(), depth - 1, cache).data, entry.data);
+  else
+    fillTwoSidedRoot(tile, entry.data);
+  return keep(index, depth, slot, cache);
+}
+
+// Core from the tile; a halo sample on the low sides from the tile found two units of tile space away, where
+// that is another one; all else blended from the parent's widened tile.
+VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::fillTwoSided(typename ContainerT::TileType const& tile,
+                                                    TwoSidedTile const& parent, TwoSidedTile& out) const {
+  int const depth = tile.depth();
+  auto const own = m_channelCore->tileData(tile.treeIndex());
+  std::array<ConstTileData<float, D, 0>, kNeighborCount> around;
+  for (int n = 0; n < kNeighborCount; ++n) {
+    int3 const step = neighborOffset(n);
+    // Two units never leave a tile upwards, not even the narrowest: nothing can be found there.
+    if (n == kNeighborSelf || step.x > 0 || step.y > 0 || step.z > 0) continue;
+    auto found = findTile(tile.ti() + 2 * step.x, tile.tj() + 2 * step.y, tile.tk() + 2 * step.z, depth);
+    if (found && found.data() != own.data()) around[static_cast<std::size_t>(n)] = found;
+  }
+
+  struct Axis {
+    int low;
+    float fraction;
+  };
+  int3 const child = m_container->tile(tile.parentTreeIndex()).childIJK(tile);
+  std::array<std::array<Axis, static_cast<std::size_t>(D + 2)>, 3> axes;
+  for (int a = 0; a < 3; ++a) {
+    float const o = this->m_offset[a];
+    for (int q = -1; q <= D; ++q) {
+      float const x = (static_cast<float>(child[a] * D + q) + o) / static_cast<float>(TraitsT::kTW) - o;
+      int const low = std::min(toIntFloor(x), D - 1);
+      axes[static_cast<std::size_t>(a)][static_cast<std::size_t>(q + 1)] = {low, x - static_cast<float>(low)};
+    }
+  }
+
+  auto const side = [](int q) { return q < 0 ? -1 : q >= D ? 1 : 0; };
+  auto const flat = [](int i, int j, int k) { return (i + 1) + (D + 2) * ((j + 1) + (D + 2) * (k + 1)); };
+  for (int k = -1; k <= D; ++k)
+    for (int j = -1; j <= D; ++j)
+      for (int i = -1; i <= D; ++i) {
+        int const si = side(i), sj = side(j), sk = side(k);
+        float& value = out(flat(i, j, k));
+        if (si == 0 && sj == 0 && sk == 0) {
+          value = own(i, j, k);
+        } else if (auto const& there = around[static_cast<std::size_t>(neighborDirection(si, sj, sk))];
+                   there) {
+          value = there(i - si * D, j - sj * D, k - sk * D);
+        } else {
+          Axis const &x = axes[0][static_cast<std::size_t>(i + 1)],
+                     &y = axes[1][static_cast<std::size_t>(j + 1)],
+                     &z = axes[2][static_cast<std::size_t>(k + 1)];
+          float const* const low = parent.data()->data() + flat(x.low, y.low, z.low);
+          value = Cell{low, D + 2, {x.fraction, y.fraction, z.fraction}}.value();
+        }
+      }
+}
+
+// Without a coarser tile the field ends at the default value: reflected about it for samples inside the
+// voxel, and equal to it on the low and far faces for samples on them.
+VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::fillTwoSidedRoot(typename ContainerT::TileType const& tile,
+                                                        TwoSidedTile& out) const {
+  auto const own = m_channelCore->tileData(tile.treeIndex());
+  for (int k = 0; k < D; ++k)
+    for (int j = 0; j < D; ++j)
+      for (int i = 0; i < D; ++i) out(i + 1, j + 1, k + 1) = own(i, j, k);
+  for (int a = 0; a < 3; ++a) {
+    int const u = (a + 1) % 3, v = (a + 2) % 3;
+    int3 p{};
+    auto const at = [&](int c) -> float& {
+      int3 q = p;
+      q[a] = c;
+      return out(q);
+    };
+    for (p[v] = 0; p[v] < D + 2; ++p[v])
+      for (p[u] = 0; p[u] < D + 2; ++p[u]) {
+        if (this->m_offsetType & 1 << a) {
+          at(0) = at(1) = at(D + 1) = m_defaultValue;
+        } else {
+          at(0) = 2.0f * m_defaultValue - at(1);
+          at(D + 1) = 2.0f * m_defaultValue - at(D);
+        }
+      }
+  }
+}
+
+#define VLN_INSTANTIATE(TraitsT)                                                                             \
+  template class VLN_API VoxelSamplerLinear<TraitsT, float, 1, float, float3, 0, 0>;
+VLN_FOR_EACH_SHAPE(VLN_INSTANTIATE)
+
+} // namespace VLN::TileTree3D

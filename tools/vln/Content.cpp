@@ -1,0 +1,37 @@
+#include "Content.h"
+
+#include "Interop/FileError.h"
+
+#include <fmt/format.h>
+
+namespace Vln {
+
+namespace {
+
+using namespace VLN::Interop;
+
+// Distinct channels of all objects in the file's order.
+std::string names(VdbImport const& content) {
+  std::string list;
+  for (auto const& volume : content.volumes)
+    for (auto const& channel : volume.channels) list += (list.empty() ? "" : ", ") + channel.name;
+  return list.empty() ? "it has none" : "it has " + list;
+}
+
+} // namespace
+
+VdbVolume const& volumeWith(VdbImport const& content, std::string const& channel) {
+  for (auto const& volume : content.volumes)
+    if (volume.channel(channel)) return volume;
+  for (auto const& skipped : content.skipped)
+    if (skipped.grid == channel) throw FileError(content.file, "'" + channel + "': " + skipped.reason);
+  throw FileError(content.file, "has no channel '" + channel + "'; " + names(content));
+}
+
+std::string transformNote(VdbImport const& content, VdbVolume const& volume) {
+  if (volume.transform.empty()) return {};
+  return fmt::format("vln: {}: note: its transform is {}; positions are voxel size times index only\n",
+                     content.file, volume.transform);
+}
+
+} // namespace Vln
