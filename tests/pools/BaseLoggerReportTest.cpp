@@ -1,10 +1,12 @@
 // The layout of the report.
+#include "ChannelPoolFixture.h"
 #include "ControlGroup.h"
 #include "LoggerFixture.h"
 
 #include "GeometryVolume/pools/PoolUtils.h"
 
 #include <algorithm>
+#include <cstdio>
 #include <regex>
 #include <vector>
 
@@ -97,6 +99,32 @@ TEST_F(LoggerReport, RequirementAllocator) {
   for (std::size_t i = 0; i < 6; ++i)
     EXPECT_TRUE(std::regex_match(lines[2 + i], std::regex(expected[i]))) << lines[2 + i];
   EXPECT_NE(lines[2], "Total jemalloc mem active = 0MB");
+}
+
+TEST_F(LoggerReport, RequirementTheChannelPoolsShare) {
+  namespace ChannelPool = VLN::TileTree3D::ChannelPool;
+  ChannelPool::enable();
+  Sized const a("a", kMB, kMB);
+  {
+    auto const channel =
+        ChannelPool::allocate<test::PowerOfTwoTraits, float, 4, 1>(0.0f, false, true, 0, 28, 0, nullptr);
+    channel->update(test::Tiles(2000));
+  }
+  double const pooled = double(ChannelPool::allocatedMemory()) / double(kMB);
+  ASSERT_GT(pooled, 1.8);
+  Lines const lines = between(report(), "BaseLogger.stats.begin", "BaseLogger.stats.end");
+  ChannelPool::disable();
+  ASSERT_GT(lines.size(), 2u);
+  EXPECT_EQ(lines[0], "Total mem occupied by data: used = 1MB (allocated = 1)")
+      << "pooled channels are apart";
+  double size = 0, percent = 0;
+  ASSERT_EQ(std::sscanf(lines[1].c_str(),
+                        "Total mem occupied by channel pool = %lfMB = %lf%% of total mem usage", &size,
+                        &percent),
+            2)
+      << lines[1];
+  EXPECT_NEAR(size, pooled, 1e-4);
+  EXPECT_NEAR(percent, 100 * pooled / (pooled + 1), 1e-2);
 }
 
 TEST_F(LoggerReport, RequirementDataThatDoesNotLiveInJemalloc) {

@@ -69,6 +69,14 @@ TEST(ChannelMemoryPool, RequirementBlocksAreWritableToTheirRequestAfterEveryReus
   Pool::freeAllMemory();
 }
 
+TEST(ChannelMemoryPool, RequirementSlack) {
+  Pool::setExtra(0.5f);
+  Pool::deallocate(Pool::allocate(1000));
+  EXPECT_EQ(Pool::freeStoreAvailableMemory(), 1500u);
+  Pool::freeAllMemory();
+  Pool::setExtra(0.1f);
+}
+
 TEST(ChannelMemoryPool, RequirementManyThreads) {
   std::vector<std::thread> threads;
   for (int t = 0; t < 8; ++t) {

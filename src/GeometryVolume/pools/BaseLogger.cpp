@@ -7,6 +7,7 @@
 
 #include <algorithm>
 #include <chrono>
+#include <memory>
 #include <mutex>
 #include <set>
 #include <shared_mutex>
@@ -36,8 +37,11 @@ struct HashAddress {
   }
   static bool equal(void const* a, void const* b) { return a == b; }
 };
-using BaseMap = tbb::concurrent_hash_map<Base const*, Record, HashAddress>;
-using PointerMap = tbb::concurrent_hash_map<void const*, Owners, HashAddress>;
+// The standard allocator: leak checkers see what it hands out, and follow it.
+template <class Key, class Value>
+using Map = tbb::concurrent_hash_map<Key, Value, HashAddress, std::allocator<std::pair<Key const, Value>>>;
+using BaseMap = Map<Base const*, Record>;
+using PointerMap = Map<void const*, Owners>;
 
 /// A debugger may break where this registration number is met. No object gets -1.
 constexpr std::int32_t kTrap = -1;
