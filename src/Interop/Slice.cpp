@@ -1,6 +1,7 @@
 #include "Interop/Slice.h"
 
 #include "GeometryVolume/channels/Channel.h"
+#include "GeometryVolume/core/ElementTypes.h"
 #include "GeometryVolume/core/Numeric.h"
 #include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/sampling/VoxelSamplerLinear.h"
@@ -10,6 +11,7 @@
 #include <algorithm>
 #include <cmath>
 #include <cstdio>
+#include <functional>
 #include <memory>
 #include <stdexcept>
 #include <vector>
@@ -20,8 +22,10 @@ namespace {
 
 using VdbTraits = TileTree3D::Traits<2, 4, 0, 1>;
 using Container = TileTree3D::Container<VdbTraits>;
-using FloatChannel = TileTree3D::Channel<VdbTraits, float, 4, 0>;
+using TileTree3D::ChannelBase;
+using TileTree3D::TreeIndex;
 using Topology = TileTree3D::VoxelTopology<VdbTraits>;
+using FloatChannel = TileTree3D::Channel<VdbTraits, float, 4, 0>;
 using Sampler = TileTree3D::FloatVoxelSamplerLinear<VdbTraits>;
 using Velorn::Math::float3;
 using Velorn::Math::int3;
@@ -38,6 +42,43 @@ std::string number(double value) {
   char text[32];
   std::snprintf(text, sizeof text, "%.6g", value);
   return text;
+}
+
+// Gives a sample as a number: a vector by its length.
+using Reader = std::function<float(TreeIndex const&, int3 const&)>;
+
+float asNumber(auto const& value) {
+  using T = std::remove_cvref_t<decltype(value)>;
+  if constexpr (std::is_arithmetic_v<T>)
+    return static_cast<float>(value);
+  else
+    return static_cast<float>(std::hypot(double(value.x), double(value.y), double(value.z)));
+}
+
+template <class T> bool readerIfOf(ChannelBase const& channel, Reader& reader) {
+  auto const* typed = dynamic_cast<TileTree3D::Channel<VdbTraits, T, 4, 0> const*>(&channel);
+  if (!typed) return false;
+  reader = [typed](TreeIndex const& tile, int3 const& sample) {
+    return asNumber(typed->tileData(tile)(sample));
+  };
+  return true;
+}
+
+Reader readerOf(ChannelBase const& channel) {
+  Reader reader;
+  bool const known = readerIfOf<float>(channel, reader) ||
+                     readerIfOf<Velorn::Math::float3>(channel, reader) || readerIfOf<int>(channel, reader) ||
+                     readerIfOf<std::int64_t>(channel, reader) ||
+                     readerIfOf<unsigned char>(channel, reader) ||
+#if VLN_HAS_ELEMENT_INT3
+                     readerIfOf<int3>(channel, reader) ||
+#endif
+#if VLN_HAS_ELEMENT_DOUBLE
+                     readerIfOf<double>(channel, reader) ||
+#endif
+                     readerIfOf<Velorn::Math::double3>(channel, reader);
+  if (!known) throw std::invalid_argument("channel '" + channel.name() + "' has a type that cannot be drawn");
+  return reader;
 }
 
 // The plane in samples and in pixels.
@@ -72,6 +113,24 @@ struct Plane {
   }
 };
 
+// World position, on the plane's axis, of the point of index `at` on the line through the middle of the box.
+double worldOn(VdbVolume const& volume, Plane const& plane, double at) {
+  Velorn::Math::double3 index{};
+  for (int a = 0; a < 3; ++a) index[a] = 0.5 * (double(plane.box.min[a]) + plane.box.max[a] - 1);
+  index[plane.axis] = at;
+  return volume.indexToWorld.toWorld(index)[plane.axis];
+}
+
+// Index of the point of that line which lies at a world position.
+double indexAt(VdbVolume const& volume, Plane const& plane, double world) {
+  int const low = plane.box.min[plane.axis], high = plane.box.max[plane.axis];
+  double const first = worldOn(volume, plane, low), last = worldOn(volume, plane, high);
+  if (first == last)
+    throw std::invalid_argument(std::string("its transform turns axis ") + "xyz"[plane.axis] +
+                                " away, so that a position on it names no plane; leave --at out");
+  return low + (world - first) / (last - first) * (double(high) - low);
+}
+
 Plane planeFor(VdbVolume const& volume, VdbChannel const& channel, SliceOptions const& options) {
   Plane plane{};
   plane.axis = options.axis;
@@ -79,14 +138,14 @@ Plane planeFor(VdbVolume const& volume, VdbChannel const& channel, SliceOptions 
   plane.up = options.axis == 2 ? 1 : 2;
   plane.box = channel.activeBox;
   int const low = plane.box.min[plane.axis], high = plane.box.max[plane.axis] - 1;
-  double const at = options.at ? *options.at / volume.voxelSize : 0.5 * (double(low) + high);
+  double const at = options.at ? indexAt(volume, plane, *options.at) : 0.5 * (double(low) + high);
   plane.at = toIntFloor(at + 0.5);
   plane.where = at;
   if (plane.at < low || plane.at > high)
-    throw std::invalid_argument("position " + number(options.at.value_or(0)) + " on axis " +
-                                std::string(1, "xyz"[plane.axis]) +
-                                " misses the active voxels, which lie in " + number(low * volume.voxelSize) +
-                                ".." + number(high * volume.voxelSize));
+    throw std::invalid_argument(
+        "position " + number(options.at.value_or(0)) + " on axis " + std::string(1, "xyz"[plane.axis]) +
+        " misses the active voxels, which lie in " + number(worldOn(volume, plane, low)) + ".." +
+        number(worldOn(volume, plane, high)));
   double const across = plane.extent(plane.across), up = plane.extent(plane.up);
   double const scale = options.size / std::max(across, up);
   plane.width = std::max(1, static_cast<int>(std::lround(across * scale)));
@@ -98,8 +157,9 @@ std::size_t pixelCount(Plane const& plane) {
   return static_cast<std::size_t>(plane.width) * static_cast<std::size_t>(plane.height);
 }
 
-std::vector<Sample> nearestSamples(Plane const& plane, Container const& tree, FloatChannel const& channel) {
+std::vector<Sample> nearestSamples(Plane const& plane, Container const& tree, ChannelBase const& channel) {
   std::vector<Sample> samples(pixelCount(plane));
+  Reader const read = readerOf(channel);
   parallelFor(0, plane.height,
               [&](std::int64_t begin, std::int64_t end) {
                 auto accessor = tree.tileAccessor();
@@ -109,7 +169,7 @@ std::vector<Sample> nearestSamples(Plane const& plane, Container const& tree, Fl
                     auto const& tile = accessor.tile(p, Container::kMaxDepth, false);
                     if (!tile.valid()) continue;
                     samples[static_cast<std::size_t>(y * plane.width + x)] = {
-                        channel.tileData(tile.treeIndex())(tile.childDataIJK(p)), true};
+                        read(tile.treeIndex(), tile.childDataIJK(p)), true};
                   }
               },
               {.grain = 8});
@@ -152,7 +212,7 @@ std::vector<Sample> linearSamples(Plane const& plane, Sampler const& cold, bool 
 
 Slice drawSlice(VdbVolume const& volume, std::string const& name, SliceOptions const& options) {
   VdbChannel const* info = volume.channel(name);
-  auto const channel = volume.object->component<FloatChannel>(name);
+  auto const channel = volume.object->component<ChannelBase>(name);
   auto const container = volume.object->component<Container>(kVdbContainerName);
   auto const topology = volume.object->component<Topology>(kVdbTopologyName);
   if (!info || !channel || !container || !topology)
@@ -164,12 +224,16 @@ Slice drawSlice(VdbVolume const& volume, std::string const& name, SliceOptions c
                                 std::to_string(kLargestSlice));
 
   Plane const plane = planeFor(volume, *info, options);
-  auto const samples = options.nearest && !options.gradient
-                           ? nearestSamples(plane, *container, *channel)
-                           : linearSamples(plane, {*container, *topology, *channel}, options.gradient);
+  auto const* floats = dynamic_cast<FloatChannel const*>(channel.get());
+  if (options.gradient && !floats)
+    throw std::invalid_argument("channel '" + name +
+                                "' is no float channel, so that it has no gradient here");
+  // Channels of other types than float are drawn by their nearest samples.
+  bool const nearest = !floats || (options.nearest && !options.gradient);
+  auto const samples = nearest ? nearestSamples(plane, *container, *channel)
+                               : linearSamples(plane, {*container, *topology, *floats}, options.gradient);
 
-  double const at = options.nearest && !options.gradient ? plane.at : plane.where;
-  Slice slice{Image(1, 1), at * volume.voxelSize, 0, 0, 0, 0};
+  Slice slice{Image(1, 1), worldOn(volume, plane, nearest ? plane.at : plane.where), 0, 0, 0, 0};
   std::vector<float> numbers;
   for (Sample const& s : samples) {
     slice.drawn += s.found;

@@ -4,9 +4,11 @@
 #include "Interop/VdbFileImpl.h"
 
 #include <openvdb/io/Stream.h>
+#include <tbb/global_control.h>
 
 #include <algorithm>
 #include <cerrno>
+#include <csignal>
 #include <cstring>
 #include <fstream>
 #include <new>
@@ -14,6 +16,7 @@
 
 #include <fcntl.h>
 #include <poll.h>
+#include <sys/prctl.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -135,8 +138,12 @@ void onNoMemory() {
 // The child's whole life. It writes "ok", or the reason why not, and never returns.
 [[noreturn]] void runChild(std::string const& path, VdbReadLimits const& limits, Memory const& start,
                            int fd) {
+  // The parent's worker threads do not exist here: loops that OpenVDB runs while it reads or gives up must
+  // not wait for them.
+  tbb::global_control const alone(tbb::global_control::max_allowed_parallelism, 1);
   verdictEnd = fd, memoryVerdict = memoryReason(limits.memoryBytes);
   std::set_new_handler(onNoMemory);
+  prctl(PR_SET_PDEATHSIG, SIGKILL); // nobody waits for the verdict of an orphan
   // A sanitizer reserves address space by the terabyte; there the parent's watch over resident memory is the
   // only bound.
   if (start.space < (std::uint64_t(1) << 40))
@@ -151,6 +158,7 @@ void onNoMemory() {
   try {
     VdbFile file = readWhole(path);
     writeAll(fd, "ok");
+    _exit(0);
   } catch (...) { writeAll(fd, currentReason(limits.memoryBytes)); }
   _exit(0);
 }
@@ -214,7 +222,11 @@ VdbReadLimits probe(std::string const& path, VdbReadLimits const& asked) {
   std::string const verdict = watchChild(ends[0], child, limits, start, reason);
   close(ends[0]);
   int status = 0;
-  while (waitpid(child, &status, 0) < 0 && errno == EINTR) {}
+  rusage usage = {};
+  while (wait4(child, &status, 0, &usage) < 0 && errno == EINTR) {}
+  // A child that was quicker than the watch; its greatest size is told in kB.
+  if (!reason && static_cast<std::uint64_t>(usage.ru_maxrss) * 1024 > start.resident + limits.memoryBytes)
+    reason = memoryReason(limits.memoryBytes);
 
   if (reason) throw FileError(path, *reason);
   if (WIFSIGNALED(status)) {
@@ -236,7 +248,9 @@ void probeVdbFile(std::string const& path, VdbReadLimits const& limits) { probe(
 VdbFile readVdbFile(std::string const& path, VdbReadLimits const& asked) {
   VdbReadLimits const limits = probe(path, asked);
   try {
-    return readWhole(path);
+    VdbFile file = readWhole(path);
+    file.memoryBytes = limits.memoryBytes;
+    return file;
   } catch (...) { throw FileError(path, currentReason(limits.memoryBytes)); }
 }
 

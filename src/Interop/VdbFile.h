@@ -15,7 +15,8 @@
 namespace VLN::Interop {
 
 struct VdbReadLimits {
-  /// Most memory that reading the file may take. 0: three quarters of what the machine has available.
+  /// Most memory that reading the file may take, and then again most for the volumes made of it. 0: three
+  /// quarters of what the machine has available.
   std::uint64_t memoryBytes = 0;
   /// Most processor time that reading the file may take. 0: ten seconds, and one more for each MB.
   unsigned seconds = 0;

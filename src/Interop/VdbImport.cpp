@@ -6,27 +6,27 @@
 #include "GeometryVolume/topology/Command.h"
 #include "GeometryVolume/topology/VoxelTopology.h"
 #include "Interop/FileError.h"
+#include "Interop/IndexToWorldImpl.h"
 #include "Interop/VdbImportImpl.h"
+#include "Interop/VdbRecord.h"
 
 #include <algorithm>
 #include <cmath>
 #include <set>
+#include <sstream>
 
 namespace VLN::Interop {
 
 namespace {
 
-using openvdb::FloatGrid;
-using TileTree3D::TreeIndex;
 using Velorn::Math::int3;
-using Container = TileTree3D::Container<VdbTraits>;
-using Topology = TileTree3D::VoxelTopology<VdbTraits>;
-using FloatChannel = TileTree3D::Channel<VdbTraits, float, 4, 0>;
+using Container = VdbContainer;
+using Topology = VdbTopology;
 
 // Grids that share a transform, and so an object.
 struct Group {
   openvdb::math::Transform::ConstPtr transform;
-  std::vector<FloatGrid::ConstPtr> grids;
+  std::vector<std::unique_ptr<GridSource>> grids;
   std::vector<GridSummary> summaries;
 };
 
@@ -37,30 +37,27 @@ void tell(Progress const& progress, char const* stage, double done) {
   if (progress) progress(stage, done);
 }
 
-std::string typeOf(openvdb::GridBase const& grid) {
-  if (grid.type() == "Tree_ptdataidx32_5_4_3") return "points";
-  return grid.valueType();
-}
-
 std::vector<Group> groupByTransform(VdbFile const& file, std::vector<SkippedGrid>& skipped) {
   std::vector<Group> groups;
   for (auto const& base : file.grids) {
-    auto const grid = openvdb::gridConstPtrCast<FloatGrid>(base);
-    if (!grid) {
-      skipped.push_back({base->getName(), "grids of type " + typeOf(*base) + " are not read yet"});
+    std::string type;
+    auto source = makeGridSource(base, type);
+    if (!source) {
+      if (isPointGrid(*base)) continue;
+      skipped.push_back({base->getName(), "grids of type " + oneLine(type) + " are not read"});
       continue;
     }
-    if (auto const reason = whyNotPlaced(*grid)) {
+    if (auto const reason = source->whyNotPlaced()) {
       skipped.push_back({base->getName(), *reason});
       continue;
     }
     auto group = std::find_if(groups.begin(), groups.end(),
-                              [&](Group const& g) { return *g.transform == grid->transform(); });
+                              [&](Group const& g) { return *g.transform == base->transform(); });
     if (group == groups.end()) {
-      groups.push_back({grid->constTransformPtr(), {}, {}});
+      groups.push_back({base->constTransformPtr(), {}, {}});
       group = groups.end() - 1;
     }
-    group->grids.push_back(grid);
+    group->grids.push_back(std::move(source));
   }
   return groups;
 }
@@ -80,30 +77,72 @@ void addTiles(Container& container, TileCorners const& corners) {
     for (int3 const& corner : corners[static_cast<std::size_t>(depth)]) accessor.addTile(corner, depth);
 }
 
-// Calls `done(tiles)` after each part.
-template <class Done>
-void fillChannel(FloatChannel& channel, Container const& container, FloatGrid const& grid, Done const& done) {
-  constexpr std::int64_t kPart = 1 << 16;
-  for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth)
-    for (std::int64_t first = 0; first < container.tileCount(depth); first += kPart) {
-      std::int64_t const last = std::min(first + kPart, container.tileCount(depth));
-      parallelFor(first, last,
-                  [&](std::int64_t begin, std::int64_t end) {
-                    auto accessor = grid.getConstAccessor();
-                    for (std::int64_t n = begin; n < end; ++n) {
-                      TreeIndex const at{n, depth};
-                      fillTile(accessor, container.tile(at).tijk(), depth, &*channel.tileData(at).begin());
-                    }
-                  },
-                  {.grain = 256});
-      done(last - first);
-    }
+std::size_t countOf(TileCorners const& corners) {
+  std::size_t count = 0;
+  for (auto const& list : corners) count += list.size();
+  return count;
 }
 
-VdbVolume buildVolume(Group const& group, Progress const& progress, double from, double to) {
+// Adds the corners of the tiles that inactive tiles of the file need. Roots stay at one depth, if need be a
+// shallower one. A new tile makes finer what stands above its neighbours, so that these are looked at again.
+void addUnreadTiles(TileCorners& corners, Group const& group, int rootDepth) {
+  for (bool added = true; added;) {
+    added = false;
+    Container tree("unread", 1.0f);
+    addTiles(tree, corners);
+    for (auto const& grid : group.grids) {
+      TileCorners const missing = grid->unreadTiles(tree);
+      for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth) {
+        auto const& list = missing[static_cast<std::size_t>(depth)];
+        auto& all = corners[static_cast<std::size_t>(depth)];
+        all.insert(all.end(), list.begin(), list.end());
+        if (list.empty()) continue;
+        added = true;
+        rootDepth = std::min(rootDepth, depth);
+      }
+    }
+    if (added) completeCorners(corners, rootDepth);
+  }
+}
+
+// About what a volume takes: records of tiles and of their vectors, child tables and samples. Many grids that
+// lie apart share one large tree, so a small file can ask for much.
+std::uint64_t bytesFor(std::size_t tiles, Group const& group) {
+  std::uint64_t bytesPerTile = 160;
+  for (auto const& grid : group.grids)
+    bytesPerTile += VdbTraits::kTileDataSize * (grid->bytesPerSample() + 1) + 2 * 64;
+  return tiles * bytesPerTile;
+}
+
+void checkMemory(VdbFile const& file, std::uint64_t bytes, std::uint64_t memoryLeft) {
+  if (bytes > memoryLeft)
+    throw FileError(file.path, "its volumes need more than " + std::to_string(file.memoryBytes / 1000000) +
+                                   " MB of memory");
+}
+
+std::string metadataBytes(openvdb::MetaMap const& metadata) {
+  std::ostringstream out(std::ios::binary);
+  metadata.writeMeta(out);
+  return out.str();
+}
+
+// `memoryLeft` falls by what the volume takes.
+VdbVolume buildVolume(VdbFile const& file, Group const& group, std::uint64_t& memoryLeft,
+                      Progress const& progress, double from, double to) {
+  tell(progress, "building the tree", from);
+  int const root = rootDepth(group.summaries);
+  TileCorners corners;
+  for (auto const& grid : group.grids) grid->collectTiles(root < VdbTraits::kMaxDepth, corners);
+  completeCorners(corners, root);
+  checkMemory(file, bytesFor(countOf(corners), group), memoryLeft);
+  addUnreadTiles(corners, group, root);
+  std::uint64_t const bytes = bytesFor(countOf(corners), group);
+  checkMemory(file, bytes, memoryLeft);
+  memoryLeft -= bytes;
   VdbVolume volume;
-  volume.transform = transformBesidesScale(*group.transform);
-  double const size = group.transform->voxelSize().x();
+  volume.indexToWorld = IndexToWorld(transformBytes(*group.transform));
+  volume.transform = volume.indexToWorld.besidesScale();
+  double const size = volume.indexToWorld.voxelSize().x;
   auto const sizeInFloat = static_cast<float>(size);
   if (sizeInFloat > 0 && std::isfinite(sizeInFloat)) volume.voxelSize = size;
 
@@ -111,29 +150,41 @@ VdbVolume buildVolume(Group const& group, Progress const& progress, double from,
                                                                static_cast<float>(volume.voxelSize),
                                                                TileTree3D::kVoxelOffsetCorner);
   auto container = object->extractComponent<Container>(kVdbContainerName);
-  tell(progress, "building the tree", from);
-  addTiles(*container, tileCorners(group.grids, rootDepth(group.summaries)));
+  addTiles(*container, corners);
   auto topology = object->extractComponent<Topology>(kVdbTopologyName);
   topology->update(*container);
 
   std::set<std::string> taken{kVdbContainerName, kVdbTopologyName};
   double const tilesToFill = double(container->tileCount(-1)) * double(group.grids.size());
   double filled = 0;
+  // Grids come first to their names, channels of states after them.
+  std::vector<std::string> names;
+  for (auto const& source : group.grids) names.push_back(freeName(source->grid().getName(), taken));
+  Ostil::Array<VdbGridRecord> records;
   for (std::size_t n = 0; n < group.grids.size(); ++n) {
-    FloatGrid const& grid = *group.grids[n];
+    GridSource const& source = *group.grids[n];
+    openvdb::GridBase const& grid = source.grid();
     GridSummary const& summary = group.summaries[n];
-    std::string const name = freeName(grid.getName(), taken);
-    auto channel = TileTree3D::Command::createChannel<float, 2, 4, 4, 0, 0>(
-        name, *topology, *object, grid.background(), TileTree3D::kInitializeNone, 0, VdbTraits::kMaxDepth);
-    fillChannel(*channel, *container, grid, [&](std::int64_t tiles) {
+    std::string const& name = names[n];
+    object->addComponent(source.makeChannel(name, *container, *topology, [&](std::int64_t tiles) {
       filled += double(tiles);
       tell(progress, "filling the channels", from + (to - from) * filled / tilesToFill);
-    });
-    volume.channels.push_back({name, grid.getName(), "float", 4, 0, summary.activeVoxels, summary.minimum,
-                               summary.maximum, summary.hasRange, summary.active});
+    }));
+    VdbGridRecord record{name, grid.valueType(), source.activeRule(), "", metadataBytes(grid)};
+    if (record.rule == VdbActiveRule::kChannel) {
+      record.stateChannel = freeName(name + "_active", taken);
+      object->addComponent(source.makeStateChannel(record.stateChannel, *container, *topology));
+    }
+    records.append(record);
+    volume.channels.push_back({name, grid.getName(), source.type(), 4, 0, summary.activeVoxels,
+                               summary.minimum, summary.maximum, summary.hasRange, summary.active});
     if (!summary.active.empty())
       volume.activeBox.grow(summary.active.min), volume.activeBox.grow(summary.active.max);
   }
+  object->setProperty(kVdbGridsProperty, Ostil::Any(std::move(records)));
+  object->setProperty(kVdbTransformProperty, Ostil::Any(Ostil::String(volume.indexToWorld.bytes())));
+  if (file.metadata)
+    object->setProperty(kVdbMetadataProperty, Ostil::Any(Ostil::String(metadataBytes(*file.metadata))));
   object->putComponent(std::move(topology));
   object->putComponent(std::move(container));
   volume.object = std::move(object);
@@ -146,28 +197,6 @@ VdbChannel const* VdbVolume::channel(std::string const& name) const {
   for (VdbChannel const& c : channels)
     if (c.name == name) return &c;
   return nullptr;
-}
-
-void fillTile(FloatGrid::ConstAccessor& grid, int3 const& corner, int depth, float* samples) {
-  using Leaf = openvdb::FloatTree::LeafNodeType;
-  int const step = VdbTraits::width(depth) / VdbTraits::kTDW;
-  openvdb::Coord const origin(corner.x, corner.y, corner.z);
-  if (step == 1) {
-    // The tile lies in one leaf or in one tile of the file's tree.
-    Leaf const* leaf = grid.probeConstLeaf(origin);
-    if (!leaf) {
-      std::fill(samples, samples + VdbTraits::kTileDataSize, grid.getValue(origin));
-      return;
-    }
-    openvdb::Index const first = Leaf::coordToOffset(origin);
-    for (openvdb::Index k = 0; k < 4; ++k)
-      for (openvdb::Index j = 0; j < 4; ++j)
-        for (openvdb::Index i = 0; i < 4; ++i) *samples++ = leaf->getValue(first + 64 * i + 8 * j + k);
-    return;
-  }
-  for (int k = 0; k < 4; ++k)
-    for (int j = 0; j < 4; ++j)
-      for (int i = 0; i < 4; ++i) *samples++ = grid.getValue(origin.offsetBy(i * step, j * step, k * step));
 }
 
 std::string transformBesidesScale(openvdb::math::Transform const& transform) {
@@ -198,13 +227,15 @@ VdbImport importGrids(VdbFile const& file, Progress const& progress) {
   for (Group& group : groups)
     for (auto const& grid : group.grids) {
       tell(progress, "looking through the grids", kReadDone);
-      group.summaries.push_back(summarize(*grid));
+      group.summaries.push_back(grid->summarize());
     }
+  std::uint64_t memoryLeft = file.memoryBytes > 0 ? file.memoryBytes : ~std::uint64_t(0);
   for (std::size_t n = 0; n < groups.size(); ++n) {
     double const share = (1 - kTreeDone) / double(groups.size());
-    result.volumes.push_back(
-        buildVolume(groups[n], progress, kTreeDone + share * double(n), kTreeDone + share * double(n + 1)));
+    result.volumes.push_back(buildVolume(file, groups[n], memoryLeft, progress, kTreeDone + share * double(n),
+                                         kTreeDone + share * double(n + 1)));
   }
+  result.points = importPointGrids(file, result.skipped);
   tell(progress, "done", 1);
   return result;
 }

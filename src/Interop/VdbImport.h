@@ -11,16 +11,23 @@
 //   active tile, 4096 wide           a sample of a tile at depth 16
 //
 // Above them stands the chain of ancestors up to one depth of roots, the deepest at which the whole box is at
-// most 64 tiles wide on each axis and no active tile lies higher. Grids of one object share the union of
-// their trees. Every sample of every tile holds the grid's value at the sample's corner.
+// most 64 tiles wide on each axis and no tile that the file needs lies higher. Grids of one object share the
+// union of their trees. Every sample of every tile holds the grid's value at the sample's corner.
+//
+// An inactive tile of the file gets a coarse tile like an active one where a reader of the tree would not
+// find its value without.
 //
 // A quarter block of a leaf (4 voxels wide) is left out where that loses nothing: all its voxels are inactive
 // and equal to what a reader finds there without it. So reading the deepest tile at a voxel, or the channel's
-// default value where there is no tile, gives exactly the grid's value for all voxels of leaves and active
-// tiles.
+// default value where there is no tile, gives exactly the grid's value for all voxels of leaves and tiles.
+//
+// What else the file holds is kept as plain properties of the object, see VdbRecord.h. Where values do not
+// tell which samples are active, a channel of bytes beside the grid's own does.
 #pragma once
 
 #include "GeometryVolume/core/Object.h"
+#include "Interop/IndexToWorld.h"
+#include "Interop/PointVolume.h"
 #include "Interop/Progress.h"
 #include "Interop/VdbFile.h"
 #include "Velorn/Math.h"
@@ -40,11 +47,12 @@ using IndexBox = Velorn::Math::bbox<Velorn::Math::int3, int>;
 struct VdbChannel {
   std::string name;     ///< of the channel in its object; unlike the grid's only where that is taken
   std::string gridName; ///< as in the file
-  std::string type;     ///< "float"
+  std::string
+      type; ///< of the grid's values: "float", "double", "int32", "int64", "bool", "vec3s", "vec3d", "vec3i"
   int core = 0;
   int halo = 0;
   std::int64_t activeVoxels = 0; ///< of the grid, those of active tiles included
-  double minimum = 0;            ///< of the active values that are numbers
+  double minimum = 0;            ///< of the active values that are numbers; of the lengths of vectors
   double maximum = 0;
   bool hasRange = false; ///< whether there are such values
   IndexBox activeBox;    ///< empty() without an active voxel
@@ -53,8 +61,10 @@ struct VdbChannel {
 struct VdbVolume {
   Ostil::Ptr<Object> object;
   double voxelSize = 1; ///< as in the file; the container holds it as a float
-  /// Empty when the transform is one uniform scale. Otherwise what it is; world positions leave out all of it
-  /// but the voxel size along x.
+  /// The transform of all grids, whole. World positions of reports go through it; the container knows the
+  /// voxel size alone.
+  IndexToWorld indexToWorld;
+  /// Empty when the transform is one uniform scale, else what it is.
   std::string transform;
   IndexBox activeBox;
   std::vector<VdbChannel> channels;
@@ -69,12 +79,13 @@ struct SkippedGrid {
 
 struct VdbImport {
   std::string file;
-  std::vector<VdbVolume> volumes; ///< in the order in which their first grids come
+  std::vector<VdbVolume> volumes;  ///< in the order in which their first grids come
+  std::vector<PointVolume> points; ///< one for each points grid
   std::vector<SkippedGrid> skipped;
 };
 
-/// Reads a file and builds its volumes: each float grid becomes a Channel<Traits<2,4,0,1>, float, 4, 0> whose
-/// default value is the grid's background.
+/// Reads a file and builds its volumes: each grid of a supported type becomes a Channel<Traits<2,4,0,1>, T,
+/// 4, 0> of its type (bool as unsigned char) whose default value is the grid's background.
 /// @numeric The same trees and values for any number of threads.
 /// @error FileError; see probeVdbFile().
 VLN_API VdbImport importVdb(std::string const& path, VdbReadLimits const& limits = {},

@@ -2,17 +2,17 @@
 #pragma once
 
 #include "Interop/VdbFileImpl.h"
+#include "Interop/VdbGridImpl.h"
 #include "Interop/VdbImport.h"
-#include "Interop/VdbTopologyImpl.h"
 
 namespace VLN::Interop {
 
 /// Builds the volumes of a file that is in memory. Grids that cannot come in are named as skipped.
 VLN_API VdbImport importGrids(VdbFile const& file, Progress const& progress = {});
 
-/// Values of a tile's samples, i fastest: the grid's value at the corner of each.
-void fillTile(openvdb::FloatGrid::ConstAccessor& grid, Velorn::Math::int3 const& corner, int depth,
-              float* samples);
+/// A volume for each points grid of the file. Those that cannot come in are named as skipped.
+std::vector<PointVolume> importPointGrids(VdbFile const& file, std::vector<SkippedGrid>& skipped);
+bool isPointGrid(openvdb::GridBase const& grid);
 
 /// Empty when the transform is one uniform scale along the axes; otherwise what it is, on one line.
 std::string transformBesidesScale(openvdb::math::Transform const& transform);

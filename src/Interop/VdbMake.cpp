@@ -2,19 +2,15 @@
 
 #include "GeometryVolume/core/Parallel.h"
 #include "Interop/FileError.h"
-#include "Interop/Noise.h"
-#include "Interop/OutputFile.h"
+#include "Interop/NoiseImpl.h"
+#include "Interop/VdbWriteImpl.h"
 
-#include <openvdb/io/File.h>
 #include <openvdb/openvdb.h>
 #include <openvdb/tools/SignedFloodFill.h>
 
 #include <algorithm>
 #include <array>
 #include <cmath>
-#include <cstdio>
-#include <fstream>
-#include <iterator>
 #include <memory>
 
 namespace VLN::Interop {
@@ -55,36 +51,10 @@ void fillLeaves(openvdb::FloatGrid& grid, Coord const& low, Coord const& high, E
   }
 }
 
-// The library gives each file an arbitrary identity; one computed from the content makes equal volumes
-// equal files. It stands behind the magic number, the versions and a flag.
-void setIdentity(std::vector<char>& bytes) {
-  constexpr std::size_t kBegin = 8 + 4 + 4 + 4 + 1, kLength = 36;
-  if (bytes.size() < kBegin + kLength) return;
-  std::uint64_t hash[2] = {0xcbf29ce484222325u, 0x84222325cbf29ce4u};
-  for (std::size_t n = kBegin + kLength; n < bytes.size(); ++n)
-    for (auto& h : hash) h = (h ^ static_cast<unsigned char>(bytes[n])) * 0x100000001b3u;
-  char text[kLength + 1];
-  std::snprintf(text, sizeof text, "%08x-%04x-5%03x-8%03x-%012llx", unsigned(hash[0] >> 32),
-                unsigned(hash[0] >> 16 & 0xffff), unsigned(hash[0] & 0xfff), unsigned(hash[1] >> 48 & 0xfff),
-                static_cast<unsigned long long>(hash[1] & 0xffffffffffffu));
-  std::copy(text, text + kLength, bytes.begin() + kBegin);
-}
-
 void writeGrid(std::string const& path, openvdb::FloatGrid::Ptr grid, Progress const& progress) {
   if (progress) progress("writing", 0);
   OutputFile file(path);
-  try {
-    openvdb::io::File archive(file.temporaryPath());
-    archive.write(openvdb::GridPtrVec{grid});
-    archive.close();
-  } catch (openvdb::Exception const& error) {
-    throw FileError(path, "cannot be written: " + oneLine(error.what()));
-  }
-  std::ifstream in(file.temporaryPath(), std::ios::binary);
-  std::vector<char> bytes((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
-  setIdentity(bytes);
-  file.write(bytes.data(), bytes.size());
-  file.commit();
+  writeVdbFile(file, {grid});
   if (progress) progress("writing", 1);
 }
 

@@ -1,7 +1,7 @@
 #include "Interop/VdbMake.h"
 #include "GeometryVolume/core/Parallel.h"
 #include "Interop/FileError.h"
-#include "Interop/Noise.h"
+#include "Interop/NoiseImpl.h"
 #include "Interop/VdbFileImpl.h"
 #include "support/TempFolder.h"
 

@@ -22,7 +22,10 @@ public:
   ~CoutCapture() override { std::cout.rdbuf(m_before); }
 
   std::vector<std::string> const& lines() const { return m_lines; }
-  std::vector<std::string> take() { return std::exchange(m_lines, {}); }
+  std::vector<std::string> take() {
+    std::lock_guard const lock(m_mutex);
+    return std::exchange(m_lines, {});
+  }
   /// Number of lines that begin with `text`.
   int count(std::string const& text) const {
     int n = 0;

@@ -90,6 +90,21 @@ TEST_F(ControlGroup, BoundaryUsageBeyondTheLimitLeavesNothing) {
   EXPECT_EQ(stats().availablePhysical, 0u);
 }
 
+TEST_F(ControlGroup, RequirementAProcessLimitCountsWhatIsResident) {
+  std::uint64_t const resident = residentMemory();
+  ASSERT_GT(resident, std::uint64_t(1) << 20);
+  setProcessLimit(resident + (std::uint64_t(16) << 20));
+  MemoryStats const s = stats();
+  EXPECT_LE(s.totalPhysical, resident + (std::uint64_t(16) << 20));
+  EXPECT_LE(s.availablePhysical, std::uint64_t(17) << 20);
+  EXPECT_GE(s.availablePhysical, std::uint64_t(12) << 20);
+  setProcessLimit(1);
+  EXPECT_EQ(stats().availablePhysical, 0u);
+  setProcessLimit(0);
+  EXPECT_EQ(processLimit(), 0u);
+  EXPECT_EQ(stats().totalPhysical, m_machine.totalPhysical);
+}
+
 TEST_F(ControlGroup, NegativeUnreadableGroupGivesNoFigures) {
   put("memory.max", "lots");
   expectNoFigures();

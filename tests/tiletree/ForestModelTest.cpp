@@ -9,6 +9,9 @@
 
 #include <limits>
 #include <map>
+#include <thread>
+#include <utility>
+#include <vector>
 
 using namespace VLN::TileTree3D;
 using Support::Access;
@@ -25,9 +28,7 @@ template <class TileT> VoxelCoord coordOf(TileT const& t) {
 }
 
 /// Records, links, roots and counts of the tree are those of the model.
-template <class T> void expectSameShape(Forest<T>& forest) {
-  auto const& tree = std::as_const(forest.tree());
-  auto const& model = forest.model();
+template <class T> void expectSameShape(Container<T> const& tree, Support::ForestModel<T> const& model) {
   std::int64_t total = 0;
   std::set<VoxelCoord> found;
   for (int d = 0; d <= T::kMaxDepth; ++d) {
@@ -142,7 +143,7 @@ template <class T> void run(std::uint32_t seed) {
   for (int batch = 0; batch < 4; ++batch) {
     int const additions = forest.pick(1, batch == 0 ? 4 : 14);
     for (int n = 0; n < additions; ++n) forest.grow();
-    expectSameShape(forest);
+    expectSameShape<T>(forest.tree(), forest.model());
     if (::testing::Test::HasFatalFailure()) return;
     ASSERT_TRUE(forest.tree().checkConsistency(false));
     for (int caches = 0; caches < 4; ++caches) {
@@ -191,5 +192,62 @@ TYPED_TEST(ForestModel, CursorsSurviveGrowthThroughOtherAccessors) {
             << p << " depth " << d << " after " << n;
       }
     }
+  }
+}
+
+// requirement: copies taken while the forest grows keep the shape of their moment
+TYPED_TEST(ForestModel, SnapshotsKeepTheShapeOfTheirMoment) {
+  using T = TypeParam;
+  for (std::uint32_t seed = 1; seed <= 8; ++seed) {
+    SCOPED_TRACE("seed " + std::to_string(seed));
+    Forest<T> forest(2000 + seed);
+    std::vector<std::pair<Container<T>, Support::ForestModel<T>>> snapshots;
+    for (int n = 0; n < 40; ++n) {
+      forest.grow();
+      if (n % 8 == 3) snapshots.emplace_back(forest.tree(), forest.model());
+      if (n % 8 == 5) { // and one that goes its own way
+        auto& [tree, model] = snapshots.back();
+        int3 const p = forest.point();
+        Access::addTile(tree, p, forest.minDepth());
+        model.add(p, forest.minDepth());
+      }
+    }
+    expectSameShape<T>(forest.tree(), forest.model());
+    for (auto const& [tree, model] : snapshots) {
+      expectSameShape<T>(tree, model);
+      EXPECT_TRUE(tree.checkConsistency(false));
+    }
+    if (this->HasFatalFailure()) return;
+  }
+}
+
+// requirement: readers run side by side, each with an accessor of its own
+TYPED_TEST(ForestModel, ThreadsReadSideBySide) {
+  using T = TypeParam;
+  Forest<T> forest(3001);
+  for (int n = 0; n < 25; ++n) forest.grow();
+  auto const& tree = std::as_const(forest.tree());
+  std::vector<std::pair<VoxelCoord, TreeIndex>> questions;
+  for (int n = 0; n < 500; ++n) {
+    int3 const p = forest.point();
+    int const d = forest.depth();
+    questions.push_back({{p.x, p.y, p.z, d}, Access::tileIndex(tree, p, d)});
+  }
+  for (bool caches : {false, true}) {
+    if (caches) {
+      forest.tree().precomputeTileNeighbors();
+      forest.tree().buildAccessorAccelerationStructure(T::kMaxDepth);
+    }
+    std::vector<std::thread> threads;
+    for (std::size_t t = 0; t < 4; ++t) {
+      threads.emplace_back([&, t] {
+        auto const accessor = tree.tileAccessor();
+        for (std::size_t n = 0; n < questions.size(); ++n) {
+          auto const& [at, expected] = questions[(n * (t + 1) + t) % questions.size()];
+          EXPECT_EQ(accessor.tile(at, false).treeIndex(), expected) << at;
+        }
+      });
+    }
+    for (auto& thread : threads) thread.join();
   }
 }

@@ -68,6 +68,7 @@ TYPED_TEST(TileGeometry, ChildrenAndTheirPositionsAgree) {
       t.childIndex(child) = child.index();
       ASSERT_EQ(t.childTreeIndex(slot), child.treeIndex());
       ASSERT_EQ(t.childTreeIndex(ijk), child.treeIndex());
+      ASSERT_EQ(t.childTreeIndex(ijk.x, ijk.y, ijk.z), child.treeIndex());
       ASSERT_EQ(t.childTreeIndex(child), child.treeIndex());
       ASSERT_FALSE(t.isLeaf(ijk));
       ASSERT_EQ(child.parentIJK(), ijk);
@@ -95,6 +96,27 @@ TYPED_TEST(TileGeometry, SamplesAndTheirPositionsAgree) {
       EXPECT_EQ(t.childDataIJK(corner), ijk);
       EXPECT_EQ(t.childDataIJK(corner.x + s - 1, corner.y + s - 1, corner.z + s - 1), ijk);
     }
+  }
+}
+
+// requirement: the member forms take the tile's own depth
+TYPED_TEST(TileGeometry, WidthsOfATileAreThoseOfItsDepth) {
+  using T = TypeParam;
+  using TileT = typename Container<T>::TileType;
+  for (int d = 0; d <= T::kMaxDepth; ++d) {
+    SCOPED_TRACE(d);
+    auto const t = tileAt<T>(0, 0, 0, d);
+    TileT const& base = t;
+    EXPECT_EQ(base.tileVoxelWidth(), T::width(d));
+    EXPECT_EQ(base.voxelWidth(), TileT::voxelWidth(d));
+    EXPECT_EQ(base.voxelDataWidth(), TileT::voxelDataWidth(d));
+    EXPECT_EQ(base.childTileVoxelWidth(), TileT::childTileVoxelWidth(d));
+    EXPECT_EQ(base.childVoxelWidth(), TileT::childVoxelWidth(d));
+    EXPECT_EQ(base.childVoxelDataWidth(), TileT::childVoxelDataWidth(d));
+    EXPECT_EQ(base.parentTileVoxelWidth(), TileT::parentTileVoxelWidth(d));
+    EXPECT_EQ(base.parentVoxelWidth(), TileT::parentVoxelWidth(d));
+    EXPECT_EQ(base.parentVoxelDataWidth(), TileT::parentVoxelDataWidth(d));
+    EXPECT_EQ(base.voxelCoord(), (VoxelCoord{t.ti(), t.tj(), t.tk(), d}));
   }
 }
 
@@ -269,6 +291,8 @@ TYPED_TEST(TileGeometry, IteratorsVisitTheOccupiedSlots) {
       EXPECT_EQ(it.treeIndex(), (TreeIndex{100 + *it, 2}));
     }
     for (auto it = t.rbegin(); it != t.rend(); --it) backward.insert(backward.begin(), *it);
+    EXPECT_FALSE(t.begin().reverse());
+    EXPECT_TRUE(t.rbegin().reverse());
     EXPECT_EQ(forward, slots);
     EXPECT_EQ(backward, slots);
     if (!slots.empty()) {

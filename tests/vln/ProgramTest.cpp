@@ -63,7 +63,7 @@ TEST_F(ProgramTest, TellsItsVersionAndItsUse) {
   EXPECT_EQ(std::count(version.out.begin(), version.out.end(), '\n'), 1);
   RunResult const help = vln({"--help"});
   EXPECT_EQ(help.code, 0);
-  for (char const* command : {"info", "slice", "probe", "make"}) {
+  for (char const* command : {"info", "slice", "probe", "make", "churn"}) {
     EXPECT_NE(help.out.find("\n  vln " + std::string(command) + " "), std::string::npos) << help.out;
     RunResult const one = vln({command, "--help"});
     EXPECT_EQ(one.code, 0);
@@ -132,32 +132,45 @@ TEST_F(ProgramTest, InfoPrintsTables) {
   EXPECT_EQ(run.out.find('\r'), std::string::npos);
 }
 
+// requirement: through the tree and back, and nothing left where it cannot be
+TEST_F(ProgramTest, ConvertWritesTheGridsAgain) {
+  std::string const path = torus(), copy = m_folder / "copy.vdb";
+  RunResult const run = vln({"convert", path, copy});
+  ASSERT_EQ(run.code, 0) << run.err;
+  EXPECT_EQ(run.out, copy + ": 1 grid written\n");
+  RunResult const before = vln({"info", path, "--json"}), after = vln({"info", copy, "--json"});
+  Json a = Json::parse(before.out), b = Json::parse(after.out);
+  a.erase("file"), b.erase("file");
+  EXPECT_EQ(a, b);
+  std::string const nowhere = m_folder / "none/copy.vdb";
+  expectFailure(vln({"convert", path, nowhere}), nowhere + ": cannot be written: No such file or directory");
+}
+
 // boundary: grids that do not come in, an empty one, and a transform that is more than a scale
 TEST_F(ProgramTest, InfoNamesWhatIsLeftOut) {
   openvdb::initialize();
-  auto vectors = openvdb::Vec3SGrid::create();
-  vectors->setName("velocity");
+  auto mask = openvdb::MaskGrid::create();
+  mask->setName("mask");
   auto empty = openvdb::FloatGrid::create(2.0f);
   empty->setName("empty");
   empty->transform().postTranslate(openvdb::Vec3d(1, 2, 3));
   std::string const path = m_folder / "odd.vdb";
-  openvdb::io::File(path).write(openvdb::GridPtrVec{vectors, empty});
+  openvdb::io::File(path).write(openvdb::GridPtrVec{mask, empty});
 
   RunResult const text = vln({"info", path});
   EXPECT_EQ(text.code, 0);
-  EXPECT_NE(text.out.find("velocity: grids of type vec3s are not read yet"), std::string::npos) << text.out;
-  EXPECT_NE(text.out.find("note: the transform is a uniform scale with a translation"), std::string::npos);
+  EXPECT_NE(text.out.find("mask: grids of type Tree_mask_5_4_3 are not read"), std::string::npos) << text.out;
+  EXPECT_NE(text.out.find("transform: a uniform scale with a translation"), std::string::npos);
   EXPECT_NE(text.out.find("no voxel is active"), std::string::npos);
 
   RunResult const json = vln({"info", path, "--json"});
   Json const j = Json::parse(json.out);
   ASSERT_EQ(j["skipped"].size(), 1u);
   EXPECT_EQ(keysOf(j["skipped"][0]), (std::vector<std::string>{"grid", "reason"}));
-  EXPECT_EQ(j["skipped"][0]["grid"], "velocity");
+  EXPECT_EQ(j["skipped"][0]["grid"], "mask");
   EXPECT_EQ(j["objects"][0]["world_bounds"], nullptr);
   EXPECT_EQ(j["objects"][0]["channels"][0]["active"], 0);
   EXPECT_EQ(j["objects"][0]["channels"][0]["min"], nullptr);
-  EXPECT_NE(json.err.find("note: the transform"), std::string::npos);
 }
 
 // requirement: a picture that shows something
@@ -277,8 +290,13 @@ TEST_F(ProgramTest, BadFilesEndInOneLine) {
     expectFailure(vln({"slice", c.file, "--channel", "surface", "--axis", "x", "-o", picture}),
                   c.file + ": " + c.reason);
   }
-  expectFailure(vln({"info", whole, "--max-memory", "1"}),
-                whole + ": is damaged, or needs more than 1 MB of memory");
+  std::string const large = m_folder / "large.vdb";
+  ASSERT_EQ(vln({"make", "torus", large, "--voxels", "400000"}).code, 0);
+  // Which bound is met first, that of the reading or that of the volumes, depends on the build.
+  RunResult const bounded = vln({"info", large, "--max-memory", "1"});
+  EXPECT_EQ(bounded.code, 1);
+  EXPECT_EQ(bounded.out, "");
+  EXPECT_NE(bounded.err.find("more than 1 MB of memory\n"), std::string::npos) << bounded.err;
   EXPECT_FALSE(std::filesystem::exists(picture));
 }
 
@@ -349,8 +367,10 @@ TEST_P(RealFile, IsReportedAndDrawn) {
   RunResult const run = vln({"info", path, "--json"});
   ASSERT_EQ(run.code, 0) << run.err;
   Json const j = Json::parse(run.out);
+  int drawn = 0;
   for (Json const& object : j["objects"])
     for (Json const& channel : object["channels"]) {
+      if (channel["active"] != 0 && ++drawn > 4) continue; // one file has two dozen
       std::string const name = channel["name"], picture = folder / "p.png";
       RunResult const slice =
           vln({"slice", path, "--channel", name, "--axis", "z", "--size", "200", "-o", picture});
@@ -362,7 +382,7 @@ TEST_P(RealFile, IsReportedAndDrawn) {
       EXPECT_GT(distinctColors(readPng(picture)), 20) << name;
     }
   for (Json const& skipped : j["skipped"])
-    EXPECT_NE(skipped["reason"].get<std::string>().find("are not read yet"), std::string::npos);
+    EXPECT_NE(skipped["reason"].get<std::string>().find("are not read"), std::string::npos);
 }
 
 INSTANTIATE_TEST_SUITE_P(Shared, RealFile,

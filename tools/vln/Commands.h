@@ -13,6 +13,7 @@ namespace Vln {
 struct InfoOptions {
   std::string file;
   bool json = false;
+  bool memory = false;
   VLN::Interop::VdbReadLimits limits;
 };
 void info(InfoOptions const& options);
@@ -25,6 +26,13 @@ struct SliceOptions {
   VLN::Interop::VdbReadLimits limits;
 };
 void slice(SliceOptions const& options);
+
+struct ConvertOptions {
+  std::string file;
+  std::string output;
+  VLN::Interop::VdbReadLimits limits;
+};
+void convert(ConvertOptions const& options);
 
 struct ProbeOptions {
   std::string file;
@@ -41,5 +49,52 @@ struct MakeOptions {
   std::int64_t voxels = 1000000;
 };
 void make(MakeOptions const& options);
+
+struct ChurnOptions {
+  std::string file;
+  std::uint64_t limitBytes = 0;
+  int rounds = 20;
+  bool json = false;
+  std::string only; ///< "with" or "without": one of the two runs, for the program itself
+  VLN::Interop::VdbReadLimits limits;
+};
+void churn(ChurnOptions const& options);
+
+/// Why the program fails has been said already.
+struct AlreadyTold {};
+
+/// How the points of a file become a volume.
+struct PointsInput {
+  std::string file; ///< .ply, or .vdb with a points grid
+  std::string grid; ///< of a .vdb file; empty: its only points grid
+  double voxelSize = 0;
+  double pointsPerTile = 64;
+  VLN::Interop::VdbReadLimits limits;
+};
+struct PointsOptions {
+  PointsInput input;
+  std::string output; ///< .obj, .ply or .vdb
+  double size = 0;    ///< half-width of a cube in an .obj file; 0: a quarter of a voxel
+};
+void points(PointsOptions const& options);
+
+struct TilesOptions {
+  PointsInput input;
+  int depth = 28;
+  std::string output;
+};
+void tiles(TilesOptions const& options);
+
+struct AdvectOptions {
+  PointsInput input;
+  std::vector<double> velocity;
+  int steps = 1;
+  bool json = false;
+  std::string output;
+};
+void advect(AdvectOptions const& options);
+
+/// Whether `info` has points to tell of: a .ply file.
+bool isPointsFile(std::string const& path);
 
 } // namespace Vln

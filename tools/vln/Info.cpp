@@ -1,15 +1,23 @@
+#include "Commands.h"
 #include "GeometryVolume/channels/Channel.h"
 #include "GeometryVolume/channels/NonLeafValues.h"
+#include "GeometryVolume/pools/ArrayPool.h"
+#include "GeometryVolume/pools/BaseLogger.h"
+#include "GeometryVolume/pools/ChannelMemoryPool.h"
+#include "GeometryVolume/pools/ChannelPool.h"
 #include "GeometryVolume/tiletree/Container.h"
 #include "GeometryVolume/topology/VoxelTopology.h"
 #include "Interop/FileError.h"
 #include "Interop/VdbImport.h"
 #include "vln/Commands.h"
+#include "vln/InfoPoints.h"
+#include "vln/PointsFile.h"
 #include "vln/ProgressBar.h"
 
 #include <array>
 #include <cstdlib>
 #include <iostream>
+#include <limits>
 
 #include <fmt/format.h>
 #include <nlohmann/json.hpp>
@@ -19,6 +27,9 @@ namespace Vln {
 namespace {
 
 using namespace VLN::Interop;
+namespace ArrayPool = VLN::TileTree3D::ArrayPool;
+namespace ChannelPool = VLN::TileTree3D::ChannelPool;
+namespace ChannelMemoryPool = VLN::TileTree3D::ChannelMemoryPool;
 using VdbTraits = VLN::TileTree3D::Traits<2, 4, 0, 1>;
 using Container = VLN::TileTree3D::Container<VdbTraits>;
 using Json = nlohmann::ordered_json;
@@ -58,15 +69,23 @@ std::int64_t activeVoxels(VdbVolume const& volume) {
 
 using Bounds = std::array<std::array<double, 3>, 2>;
 
-// World box of the finest tiles that hold active voxels; their corners are multiples of the tile's width.
+// World box of the finest tiles that hold active voxels: of their eight corners, through the whole transform.
+// Corners of tiles are multiples of their width.
 Bounds worldBounds(VdbVolume const& volume) {
-  Bounds bounds{};
-  constexpr int kWidth = VdbTraits::width(VdbTraits::kMaxDepth);
-  for (int a = 0; a < 3; ++a) {
-    auto const axis = static_cast<std::size_t>(a);
-    auto const tiles = [&](int c) { return std::int64_t(VdbTraits::align(c, VdbTraits::kMaxDepth)); };
-    bounds[0][axis] = double(tiles(volume.activeBox.min[a])) * volume.voxelSize;
-    bounds[1][axis] = double(tiles(volume.activeBox.max[a] - 1) + kWidth) * volume.voxelSize;
+  constexpr double kFar = std::numeric_limits<double>::infinity();
+  Bounds bounds{{{kFar, kFar, kFar}, {-kFar, -kFar, -kFar}}};
+  constexpr int kDepth = VdbTraits::kMaxDepth, kWidth = VdbTraits::width(kDepth);
+  for (int corner = 0; corner < 8; ++corner) {
+    double index[3];
+    for (int a = 0; a < 3; ++a)
+      index[a] = corner >> a & 1 ? double(VdbTraits::align(volume.activeBox.max[a] - 1, kDepth)) + kWidth
+                                 : double(VdbTraits::align(volume.activeBox.min[a], kDepth));
+    auto const world = volume.indexToWorld.toWorld({index[0], index[1], index[2]});
+    for (int a = 0; a < 3; ++a) {
+      auto const axis = static_cast<std::size_t>(a);
+      bounds[0][axis] = std::min(bounds[0][axis], world[a]);
+      bounds[1][axis] = std::max(bounds[1][axis], world[a]);
+    }
   }
   return bounds;
 }
@@ -111,6 +130,7 @@ Json volumeJson(VdbVolume const& volume) {
 void printJson(VdbImport const& content) {
   Json j = {{"file", content.file}, {"objects", Json::array()}, {"skipped", Json::array()}};
   for (auto const& volume : content.volumes) j["objects"].push_back(volumeJson(volume));
+  for (auto const& volume : content.points) j["objects"].push_back(pointsJson(volume));
   for (auto const& s : content.skipped) j["skipped"].push_back({{"grid", s.grid}, {"reason", s.reason}});
   // Names in a file may be of any bytes.
   std::cout << j.dump(2, ' ', false, Json::error_handler_t::replace) << "\n";
@@ -133,10 +153,7 @@ void printVolume(VdbVolume const& volume, std::size_t n) {
   auto const container = volume.object->component<Container>(kVdbContainerName);
   auto& out = std::cout;
   out << fmt::format("\nobject {}: voxel size {} world units\n", n, number(volume.voxelSize));
-  if (!volume.transform.empty())
-    out << fmt::format(
-        "  note: the transform is {};\n        world positions leave out all but the voxel size\n",
-        volume.transform);
+  if (!volume.transform.empty()) out << fmt::format("  transform: {}\n", volume.transform);
   if (volume.activeBox.empty()) {
     out << "  world box: none, no voxel is active\n";
   } else {
@@ -185,32 +202,51 @@ void printTables(VdbImport const& content) {
   std::cout << content.file << "\n";
   std::size_t n = 0;
   for (auto const& volume : content.volumes) printVolume(volume, ++n);
-  if (content.volumes.empty()) std::cout << "\nno float grid\n";
+  for (auto const& volume : content.points) printPoints(volume, ++n);
+  if (n == 0) std::cout << "\nno grid came in\n";
   if (content.skipped.empty()) return;
   std::cout << "\nskipped\n";
   for (auto const& s : content.skipped)
     std::cout << fmt::format("  {}: {}\n", oneLine(s.grid, 60), oneLine(s.reason));
 }
 
+void printMemory() {
+  std::cout << "\nmemory\n\n";
+  VLN::BaseLogger::dump();
+  ArrayPool::dump();
+  ChannelPool::dump();
+  std::cout << fmt::format("blocks: {} in use, {} free with {:.2f} MB\n", ChannelMemoryPool::usedStoreSize(),
+                           ChannelMemoryPool::freeStoreSize(),
+                           double(ChannelMemoryPool::freeStoreAvailableMemory()) / 1e6);
+}
+
 } // namespace
 
 void info(InfoOptions const& options) {
+  if (options.memory) {
+    VLN::BaseLogger::enable();
+    ArrayPool::enable();
+    ChannelPool::enable();
+    ChannelMemoryPool::enable();
+  }
   VdbImport content;
   {
     ProgressBar bar;
-    content = importVdb(options.file, options.limits, bar.progress());
+    if (isPointsFile(options.file)) {
+      PointsInput input;
+      input.file = content.file = options.file;
+      content.points = readPointVolumes(input, bar.progress());
+    } else {
+      content = importVdb(options.file, options.limits, bar.progress());
+    }
   }
+  for (auto const& volume : content.points) noteLosses(content.file, volume);
   if (options.json) {
     printJson(content);
-    // The report has no place for it.
-    for (auto const& volume : content.volumes)
-      if (!volume.transform.empty())
-        std::cerr << fmt::format("vln: {}: note: the transform is {}; world positions leave out all but the "
-                                 "voxel size\n",
-                                 content.file, volume.transform);
   } else {
     printTables(content);
   }
+  if (options.memory) printMemory();
 }
 
 } // namespace Vln

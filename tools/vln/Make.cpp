@@ -1,6 +1,6 @@
+#include "Commands.h"
 #include "Interop/VdbMake.h"
-#include "vln/Commands.h"
-#include "vln/ProgressBar.h"
+#include "ProgressBar.h"
 
 namespace Vln {
 

@@ -1,4 +1,4 @@
-#include "vln/ProgressBar.h"
+#include "ProgressBar.h"
 
 #include <algorithm>
 #include <cstdio>

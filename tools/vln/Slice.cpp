@@ -1,3 +1,4 @@
+#include "Commands.h"
 #include "Interop/FileError.h"
 #include "Interop/OutputFile.h"
 #include "Interop/VdbImport.h"
@@ -16,7 +17,7 @@ using namespace VLN::Interop;
 
 void slice(SliceOptions const& options) {
   checkOutput(options.output);
-  std::string summary, note;
+  std::string summary;
   {
     ProgressBar bar;
     auto const content = importVdb(options.file, options.limits, bar.progress());
@@ -29,10 +30,8 @@ void slice(SliceOptions const& options) {
                             "xyz"[options.plane.axis], result.at, result.low, result.high,
                             result.image.width(), result.image.height());
     } catch (std::invalid_argument const& error) { throw FileError(options.file, error.what()); }
-    note = transformNote(content, volume);
   }
   std::cout << summary;
-  std::cerr << note;
 }
 
 } // namespace Vln

@@ -11,6 +11,7 @@
 // elements in every tile.
 #pragma once
 
+#include "GeometryVolume/channels/ElementIterator.h"
 #include "GeometryVolume/channels/TileData.h"
 #include "GeometryVolume/channels/TypedChannel.h"
 #include "GeometryVolume/tiletree/Tile.h"
@@ -52,6 +53,33 @@ public:
     ConstTile tileData(std::int64_t flat) const { return tileData(this->indexToTreeIndex(flat)); }
   };
 
+  /// Direct growth of single tiles. Owns nothing; the channel must outlive it.
+  class TileDataAccessor {
+  public:
+    using DynamicTile = DynamicTileData<WritableTile>;
+
+    TileDataAccessor(TileDataAccessor&&) noexcept = default;
+    TileDataAccessor& operator=(TileDataAccessor&&) noexcept = default;
+
+    /// A handle whose operations change the element count of the tile inside the channel.
+    DynamicTile tileData(TreeIndex const& tile) { return DynamicTile(&m_channel->tileVector(tile)); }
+    DynamicTile tileData(std::int64_t flat) { return tileData(m_channel->indexToTreeIndex(flat)); }
+
+  protected:
+    explicit TileDataAccessor(Channel& channel)
+        : m_channel(&channel) {}
+
+  private:
+    friend class Channel;
+    Channel* m_channel;
+  };
+
+  template <class TD, class VecIterator, class Reference, class Pointer, class ChannelPointer>
+  using IteratorBase = TileTree3D::IteratorBase<TD, VecIterator, Reference, Pointer, ChannelPointer>;
+  using iterator = IteratorBase<WritableTile, typename TileVector<T>::iterator, T&, T*, Channel*>;
+  using const_iterator =
+      IteratorBase<ConstTile, typename TileVector<T>::const_iterator, T const&, T const*, Channel const*>;
+
   /// A channel without tiles. An empty name becomes Const::TileTreeChannelName, a null default value zero.
   /// With static allocation, the tiles of one update lie in one block.
   Channel(Ostil::String const& name, T const* defaultValue, DataElementInitializerType initializer,
@@ -92,7 +120,19 @@ public:
   WritableTile tileData(std::int64_t index, int depth) { return tileData(TreeIndex{index, depth}); }
   ConstTile tileData(std::int64_t index, int depth) const { return tileData(TreeIndex{index, depth}); }
 
+  TileDataAccessor tileDataAccessor() { return TileDataAccessor(*this); }
+
+  // All elements, depth by depth and tile by tile
+  iterator begin() { return iterator(this, TreeIndex{0, 0}); }
+  iterator end() { return iterator(this, TreeIndex()); }
+  const_iterator begin() const { return cbegin(); }
+  const_iterator end() const { return cend(); }
+  const_iterator cbegin() const { return const_iterator(this, TreeIndex{0, 0}); }
+  const_iterator cend() const { return const_iterator(this, TreeIndex()); }
+
 protected:
+  template <class, class, class, class, class> friend class TileTree3D::IteratorBase;
+
   Ostil::Ptr<Data> getData() const { return Ostil::staticCast<Data>(this->m_data); }
 
 private:

@@ -1,11 +1,141 @@
 #include "GeometryVolume/channels/ChannelBase.h"
 
+#include "GeometryVolume/core/LoggerHooks.h"
+#include "GeometryVolume/core/Streaming.h"
+#include "GeometryVolume/tiletree/Traits.h"
+
+#include <algorithm>
+#include <iostream>
+
 namespace VLN::TileTree3D {
 
 ChannelBase::~ChannelBase() = default;
 
 void ChannelBase::memUse(std::uint64_t& used, std::uint64_t& allocated, bool notShared) const {
   VLN::Component::memUse(used, allocated, notShared);
+}
+
+void ChannelBase::dumpCounts(std::ostream& os) const {
+  auto const pad = Streaming::pad(os);
+  auto const line = [&](char const* what, auto const& countOf) {
+    os << pad << what << " {" << kChannelDepths - 1 << "} =";
+    for (int d = 0; d < kChannelDepths; ++d) os << (d == 0 ? "" : ", ") << countOf(d);
+    os << '\n';
+  };
+  line("tileCount", [&](int d) { return tileCount(d); });
+  line("elementCount", [&](int d) { return elementCount(d); });
+}
+
+void ChannelBase::announceCopy(ChannelBase const& copy) const {
+  if (loggingEnabled())
+    std::cout << "ERROR: Copying " << name() << " from ptr " << static_cast<void const*>(this) << " to ptr "
+              << static_cast<void const*>(&copy) << '\n';
+}
+
+void ChannelBase::addShared(std::uint64_t& used, std::uint64_t& allocated, std::uint64_t dataUsed,
+                            std::uint64_t dataAllocated, std::int64_t sharers, bool notShared,
+                            void const* storage) {
+  auto const divisor = static_cast<std::uint64_t>(notShared ? 1 : std::max<std::int64_t>(1, sharers));
+  used += dataUsed / divisor;
+  allocated += dataAllocated / divisor;
+  if (!loggerDumpInProgress() || sharers <= 1) return;
+  auto const megabytes = [](std::uint64_t bytes) {
+    return static_cast<float>(static_cast<double>(bytes) / 1e6);
+  };
+  std::cout << " Data shared by " << sharers << " channels, raw data ptr = " << storage << '\n'
+            << " Total shared data = " << megabytes(dataUsed)
+            << "MB (total shared data allocated = " << megabytes(dataAllocated) << "MB)";
+}
+
+void ChannelBase::computePermutation(std::vector<ElementToFrom>& moves, std::vector<std::uint64_t>& order,
+                                     std::vector<std::uint64_t>& tiles, TileArrivals& arrivals, int depth,
+                                     bool sorted) const {
+  if (!sorted) Internal::sortMoves(moves);
+  Internal::groupByDestination(moves, order, tiles, arrivals, [&](std::int64_t tile) {
+    return elementCount(TreeIndex{tile, depth});
+  });
+}
+
+void ChannelBase::computePermutation(ElementMoves& moves, ElementOrder& order, DestinationTiles& tiles,
+                                     ArrivalMap& arrivals, bool sorted) const {
+  moves.resize(kChannelDepths);
+  order.resize(kChannelDepths);
+  tiles.resize(kChannelDepths);
+  arrivals.resize(kChannelDepths);
+  for (std::size_t d = 0; d < kChannelDepths; ++d)
+    computePermutation(moves[d], order[d], tiles[d], arrivals[d], static_cast<int>(d), sorted);
+}
+
+void ChannelBase::updateElementsNoDispatch(std::vector<ElementToFrom> const& moves,
+                                           std::vector<std::uint64_t> const& order,
+                                           std::vector<std::uint64_t> const& tiles,
+                                           TileArrivals const& arrivals, int depth) {
+  updateElementsNoDispatch(ElementPermutation{ElementPermutation::kOneDepth, &moves, &order, &tiles,
+                                              &arrivals, depth, depth, nullptr, nullptr, nullptr, nullptr,
+                                              nullptr});
+}
+
+void ChannelBase::updateElementsNoDispatch(ElementPermutation const& p) {
+  auto const forEachList = [&](auto const& body) {
+    if (p.kind == ElementPermutation::kOneDepth) {
+      body(*p.moves, *p.order, *p.tiles, *p.arrivals, p.firstDepth);
+      return;
+    }
+    std::size_t const n = std::min({p.allMoves->size(), p.allOrders->size(), p.allTiles->size(),
+                                    p.allArrivals->size(), std::size_t(kChannelDepths)});
+    for (std::size_t d = 0; d < n; ++d)
+      body((*p.allMoves)[d], (*p.allOrders)[d], (*p.allTiles)[d], (*p.allArrivals)[d], static_cast<int>(d));
+  };
+  // Sources are read by position, so nothing is removed before everything is copied.
+  forEachList([&](auto const& moves, auto const&, auto const& tiles, auto const& arrivals, int d) {
+    allocateElementStorage(tiles, arrivals, moves.size(), d);
+  });
+  forEachList([&](auto const& moves, auto const& order, auto const& tiles, auto const& arrivals, int d) {
+    copyElements(moves, order, tiles, arrivals, d);
+  });
+  ElementRemovals collected;
+  ElementRemovals const* removals = p.removals;
+  if (p.kind != ElementPermutation::kRecorded) {
+    forEachList([&](auto const& moves, auto const&, auto const&, auto const&, int) {
+      Internal::addSources(moves, collected);
+    });
+    Internal::finishRemovals(collected);
+    removals = &collected;
+  }
+  for (std::size_t d = 0; d < removals->size(); ++d) removeElements((*removals)[d], static_cast<int>(d));
+}
+
+void ChannelBase::update(std::vector<ElementToFrom>& moves, int first, int last, bool sorted) {
+  std::vector<std::uint64_t> order, tiles;
+  TileArrivals arrivals;
+  computePermutation(moves, order, tiles, arrivals, first, sorted);
+  ElementPermutation p{ElementPermutation::kOneDepth, &moves, &order, &tiles, &arrivals, first, last};
+  updateElementsNoDispatch(p);
+}
+void ChannelBase::update(std::vector<ElementToFrom>& moves, int depth, bool sorted) {
+  update(moves, depth, depth, sorted);
+}
+
+void ChannelBase::update(ElementMoves& moves, bool sorted) {
+  ElementOrder order;
+  DestinationTiles tiles;
+  ArrivalMap arrivals;
+  computePermutation(moves, order, tiles, arrivals, sorted);
+  updateElements(moves, order, tiles, arrivals);
+}
+
+void ChannelBase::update(TileDataElementAccessor& recorded) {
+  Internal::finishRemovals(recorded.elementsFrom());
+  ElementMoves& moves = recorded.elementsTo();
+  for (auto& list : moves) Internal::sortMoves(list);
+  ElementOrder order;
+  DestinationTiles tiles;
+  ArrivalMap arrivals;
+  computePermutation(moves, order, tiles, arrivals, true);
+  ElementPermutation p{ElementPermutation::kRecorded};
+  p.allMoves = &moves, p.allOrders = &order, p.allTiles = &tiles, p.allArrivals = &arrivals;
+  p.removals = &recorded.elementsFrom();
+  updateElementsNoDispatch(p);
 }
 
 } // namespace VLN::TileTree3D

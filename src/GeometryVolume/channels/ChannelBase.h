@@ -2,9 +2,12 @@
 #pragma once
 
 #include "GeometryVolume/channels/ChannelTypes.h"
+#include "GeometryVolume/channels/ElementMoves.h"
+#include "GeometryVolume/channels/TileDataElementAccessor.h"
 #include "Ostil/Any.h"
 #include "Ostil/Ptr.h"
 
+#include <iosfwd>
 #include <typeindex>
 
 namespace VLN::TileTree3D {
@@ -52,6 +55,49 @@ public:
   /// are skipped.
   /// @cost Parallel over the tiles.
   virtual void fillTiles(int depth, std::vector<std::int64_t> const& tiles) = 0;
+
+  using Component::elementCount;
+  using Component::update;
+  /// Moves elements to tiles of depth `first`. The moves are sorted by source unless they are so already. An
+  /// element that leaves a tile is replaced by the tile's last one: the order in a tile is not kept.
+  void update(std::vector<ElementToFrom>& moves, int first, int last, bool sorted);
+  void update(std::vector<ElementToFrom>& moves, int depth, bool sorted);
+  /// Moves elements between any depths: all destinations grow, all elements are copied, then all are removed.
+  void update(ElementMoves& moves, bool sorted);
+  /// Applies what an accessor has recorded.
+  void update(TileDataElementAccessor& recorded);
+  /// Prepares order, destination tiles and arrivals for moves to one depth.
+  void computePermutation(std::vector<ElementToFrom>& moves, std::vector<std::uint64_t>& order,
+                          std::vector<std::uint64_t>& tiles, TileArrivals& arrivals, int depth,
+                          bool sorted) const;
+  /// The same for each depth.
+  void computePermutation(ElementMoves& moves, ElementOrder& order, DestinationTiles& tiles,
+                          ArrivalMap& arrivals, bool sorted) const;
+
+protected:
+  void updateElementsNoDispatch(std::vector<ElementToFrom> const& moves,
+                                std::vector<std::uint64_t> const& order,
+                                std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals,
+                                int depth);
+  void updateElementsNoDispatch(ElementPermutation const& permutation);
+  /// Grows the destination tiles of one depth by what arrives there.
+  virtual void allocateElementStorage(std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals,
+                                      std::size_t moveCount, int depth) = 0;
+  /// Writes the arrivals of one depth behind the elements that its tiles had.
+  virtual void copyElements(std::vector<ElementToFrom> const& moves, std::vector<std::uint64_t> const& order,
+                            std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals,
+                            int depth) = 0;
+  /// Removes elements, filling the holes from each tile's tail.
+  /// @pre Sorted by tile and element.
+  virtual void removeElements(std::vector<ElementInTile> const& elements, int depth) = 0;
+
+  void dumpCounts(std::ostream& os) const;
+  /// Tells of a deep copy while the logger is on.
+  void announceCopy(ChannelBase const& copy) const;
+  /// A sharer's part of shared data; tells of the sharing while the logger dumps.
+  static void addShared(std::uint64_t& used, std::uint64_t& allocated, std::uint64_t dataUsed,
+                        std::uint64_t dataAllocated, std::int64_t sharers, bool notShared,
+                        void const* storage);
 };
 
 } // namespace VLN::TileTree3D

@@ -177,7 +177,7 @@ private:
                int skipLast);
   void separateWithout(int skipFirst, int skipLast);
   void importValues(TileValues values);
-  std::vector<std::vector<std::int64_t>> tileOffsets() const;
+  Internal::TileSlots tileOffsets() const;
 
   T m_defaultValue{};
   DataElementInitializerType m_initializer = kInitializeDefaultValue;

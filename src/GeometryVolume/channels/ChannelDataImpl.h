@@ -109,38 +109,31 @@ template <class T>
 void ChannelData<T>::rebuild(TileArrays<T> const& source, Counts const& counts, TileValues values,
                              int skipFirst, int skipLast) {
   auto const skipped = [&](int d) { return d >= skipFirst && d <= skipLast; };
-  // Slots of a static block, one after the other; the offset of each tile in elements.
-  std::vector<std::vector<std::int64_t>> offsets(kChannelDepths);
-  std::int64_t total = 0;
-  if (m_useStaticAllocation) {
-    for (int d = firstDepth(); d <= lastDepth(); ++d) {
-      if (skipped(d)) continue;
-      auto& list = offsets[static_cast<std::size_t>(d)];
-      for (Vector const& tile : source[static_cast<std::size_t>(d)]) {
-        list.push_back(total);
-        if (!tile.empty()) total += slotElements(tile.size());
-      }
-    }
-  }
-  void* const block = total > 0 ? Internal::allocateBlock(total, sizeof(T)) : nullptr;
+  Counts kept{};
+  for (int d = firstDepth(); d <= lastDepth(); ++d)
+    if (!skipped(d)) kept[static_cast<std::size_t>(d)] = counts[static_cast<std::size_t>(d)];
+  Internal::TileSlots slots;
+  if (m_useStaticAllocation)
+    slots = Internal::planSlots(
+        firstDepth(), lastDepth(), kept,
+        [&](int d, std::int64_t i) {
+          return source[static_cast<std::size_t>(d)][static_cast<std::size_t>(i)].size();
+        },
+        [&](std::size_t n) { return slotElements(n); });
+  void* const block = slots.total > 0 ? Internal::allocateBlock(slots.total, sizeof(T)) : nullptr;
   auto fresh = Ostil::makePtr<TileStorage<T>>();
   m_tileCounts.fill(0);
-  if (block || total == 0) {
-    Spans spans;
-    for (int d = firstDepth(); d <= lastDepth(); ++d) {
-      if (skipped(d)) continue;
-      count(d) = counts[static_cast<std::size_t>(d)];
-      spans.add(d, 0, count(d));
-    }
+  if (block || slots.total == 0) {
+    m_tileCounts = kept;
     Internal::forEachDepth(firstDepth(), lastDepth(), [&](int d) {
       (*fresh)[static_cast<std::size_t>(d)].resize(static_cast<std::size_t>(count(d)));
     });
-    spans.forEach(Internal::tileGrain(tileBytes()), [&](int d, std::int64_t begin, std::int64_t end) {
+    allTiles().forEach(Internal::tileGrain(tileBytes()), [&](int d, std::int64_t begin, std::int64_t end) {
       auto const depth = static_cast<std::size_t>(d);
       for (auto i = static_cast<std::size_t>(begin); i < static_cast<std::size_t>(end); ++i) {
         std::size_t const n = source[depth][i].size();
         if (n == 0) continue;
-        T* const slot = block ? static_cast<T*>(block) + offsets[depth][i] : nullptr;
+        T* const slot = block ? static_cast<T*>(block) + slots.at(d, static_cast<std::int64_t>(i)) : nullptr;
         Vector tile = unwrittenTile(static_cast<std::int64_t>(n), slot);
         std::memcpy(static_cast<void*>(tile.data()), values(d, static_cast<std::int64_t>(i)), n * sizeof(T));
         (*fresh)[depth][i].swap(tile);

@@ -10,18 +10,11 @@
 namespace VLN::TileTree3D {
 
 /// Position of each tile's first element in the flat export.
-template <class T> std::vector<std::vector<std::int64_t>> ChannelData<T>::tileOffsets() const {
-  std::vector<std::vector<std::int64_t>> offsets(kChannelDepths);
-  std::int64_t at = 0;
-  for (int d = firstDepth(); d <= lastDepth(); ++d) {
-    auto& list = offsets[static_cast<std::size_t>(d)];
-    list.reserve(static_cast<std::size_t>(count(d)));
-    for (Vector const& tile : depthTiles(d)) {
-      list.push_back(at);
-      at += static_cast<std::int64_t>(tile.size());
-    }
-  }
-  return offsets;
+template <class T> Internal::TileSlots ChannelData<T>::tileOffsets() const {
+  return Internal::planSlots(
+      firstDepth(), lastDepth(), m_tileCounts,
+      [&](int d, std::int64_t i) { return depthTiles(d)[static_cast<std::size_t>(i)].size(); },
+      [](std::size_t n) { return static_cast<std::int64_t>(n); });
 }
 
 template <class T> Ostil::Ptr<Ostil::Array<T>> ChannelData<T>::exportFlat() const {
@@ -35,7 +28,7 @@ template <class T> Ostil::Ptr<Ostil::Array<T>> ChannelData<T>::exportFlat() cons
   allTiles().forEach(Internal::tileGrain(tileBytes()), [&](int d, std::int64_t begin, std::int64_t end) {
     for (auto i = static_cast<std::size_t>(begin); i < static_cast<std::size_t>(end); ++i) {
       Vector const& tile = depthTiles(d)[i];
-      std::copy(tile.begin(), tile.end(), to + offsets[static_cast<std::size_t>(d)][i]);
+      std::copy(tile.begin(), tile.end(), to + offsets.at(d, static_cast<std::int64_t>(i)));
     }
   });
   return array;
@@ -77,10 +70,8 @@ template <class T> void ChannelData<T>::importValues(TileValues values) {
 
 template <class T> void ChannelData<T>::importFlat(Ostil::Array<T> const& array) {
   if (static_cast<std::int64_t>(array.size()) != elementCount(-1)) return;
-  auto const offsets = m_data ? tileOffsets() : std::vector<std::vector<std::int64_t>>();
-  importValues([&](int d, std::int64_t i) {
-    return array.data() + offsets[static_cast<std::size_t>(d)][static_cast<std::size_t>(i)];
-  });
+  auto const offsets = m_data ? tileOffsets() : Internal::TileSlots();
+  importValues([&](int d, std::int64_t i) { return array.data() + offsets.at(d, i); });
 }
 
 template <class T> void ChannelData<T>::importNested(NestedArrays<T> const& nested) {

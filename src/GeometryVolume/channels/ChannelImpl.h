@@ -14,12 +14,17 @@ Channel<TraitsT, T, E, H>::Channel(Ostil::String const& name, T const* defaultVa
                                       minDepth, depth)) {}
 
 template <class TraitsT, class T, int E, int H>
-Channel<TraitsT, T, E, H>::Channel(Channel const& other) = default;
+Channel<TraitsT, T, E, H>::Channel(Channel const& other)
+    : Base(other) {}
 
 template <class TraitsT, class T, int E, int H>
-Channel<TraitsT, T, E, H>& Channel<TraitsT, T, E, H>::operator=(Channel const& other) = default;
+Channel<TraitsT, T, E, H>& Channel<TraitsT, T, E, H>::operator=(Channel const& other) {
+  Base::operator=(other);
+  return *this;
+}
 
-template <class TraitsT, class T, int E, int H> Channel<TraitsT, T, E, H>::~Channel() = default;
+// Not defaulted: a defaulted destructor cannot be instantiated alone.
+template <class TraitsT, class T, int E, int H> Channel<TraitsT, T, E, H>::~Channel() {}
 
 template <class TraitsT, class T, int E, int H>
 void Channel<TraitsT, T, E, H>::copyTo(Ostil::Ptr<VLN::Component>& target) const {

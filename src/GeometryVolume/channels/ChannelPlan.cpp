@@ -74,11 +74,58 @@ void forEachDepth(int first, int last, FunctionRef<void(int)> body) {
   });
 }
 
-bool isInjective(std::vector<std::int64_t> const& list, std::int64_t count) {
-  std::vector<bool> seen(static_cast<std::size_t>(count));
-  for (std::int64_t index : list) {
-    if (index < 0 || index >= count || seen[static_cast<std::size_t>(index)]) return false;
-    seen[static_cast<std::size_t>(index)] = true;
+TileSlots planSlots(int first, int last, DepthCounts const& counts,
+                    FunctionRef<std::size_t(int, std::int64_t)> elements,
+                    FunctionRef<std::int64_t(std::size_t)> slotOf) {
+  TileSlots slots;
+  for (int d = first; d <= last; ++d) {
+    auto& list = slots.offsets[static_cast<std::size_t>(d)];
+    std::int64_t const n = counts[static_cast<std::size_t>(d)];
+    list.reserve(static_cast<std::size_t>(n));
+    for (std::int64_t i = 0; i < n; ++i) {
+      list.push_back(slots.total);
+      if (std::size_t const size = elements(d, i)) slots.total += slotOf(size);
+    }
+  }
+  return slots;
+}
+
+GrowthPlan planGrowth(int first, int last, DepthCounts const& own, TileCounts const& source, bool fixedSize,
+                      std::int64_t stride) {
+  GrowthPlan plan;
+  for (int d = first; d <= last; ++d) {
+    auto const depth = static_cast<std::size_t>(d);
+    std::int64_t const n = std::max<std::int64_t>(0, source.tileCount(d));
+    plan.wanted[depth] = n;
+    plan.changes = plan.changes || n != own[depth];
+    plan.added.add(d, own[depth], n);
+    if (stride == 0) continue;
+    plan.base[depth] = plan.blockElements;
+    if (fixedSize) {
+      plan.blockElements += std::max<std::int64_t>(0, n - own[depth]) * stride;
+      continue;
+    }
+    for (auto i = own[depth]; i < n; ++i) {
+      plan.slots.offsets[depth].push_back(plan.blockElements);
+      plan.blockElements += std::max<std::int64_t>(0, source.elementCount(TreeIndex{i, d}));
+    }
+  }
+  return plan;
+}
+
+bool isPermutation(std::vector<std::vector<std::int64_t>> const& lists, int first, int last,
+                   DepthCounts const& counts) {
+  for (int d = first; d <= last; ++d) {
+    auto const& list = lists[static_cast<std::size_t>(d)];
+    auto const n = static_cast<std::size_t>(counts[static_cast<std::size_t>(d)]);
+    if (list.empty()) continue;
+    if (list.size() != n) return false;
+    std::vector<bool> seen(n);
+    for (std::int64_t index : list) {
+      if (index < 0 || static_cast<std::size_t>(index) >= n || seen[static_cast<std::size_t>(index)])
+        return false;
+      seen[static_cast<std::size_t>(index)] = true;
+    }
   }
   return true;
 }

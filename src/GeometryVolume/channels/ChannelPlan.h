@@ -67,6 +67,40 @@ private:
   DepthCounts m_ends;
 };
 
+/// Where tiles lie in a static block, in elements from its start.
+struct TileSlots {
+  std::array<std::vector<std::int64_t>, kChannelDepths> offsets;
+  std::int64_t total = 0;
+
+  std::int64_t at(int depth, std::int64_t tile) const {
+    return offsets[static_cast<std::size_t>(depth)][static_cast<std::size_t>(tile)];
+  }
+};
+/// Slots one behind the other for the first `counts[d]` tiles of each depth. Tiles without elements take
+/// none; `slotOf(elements)` gives the room of the others.
+VLN_API TileSlots planSlots(int first, int last, DepthCounts const& counts,
+                            FunctionRef<std::size_t(int depth, std::int64_t tile)> elements,
+                            FunctionRef<std::int64_t(std::size_t elements)> slotOf);
+
+/// How a channel comes into step with other tile counts.
+struct GrowthPlan {
+  bool changes = false;
+  DepthCounts wanted{};
+  TileSpans added;
+  /// Slots of the added tiles: at a fixed stride from `base[d]`, or at their own offsets.
+  DepthCounts base{};
+  TileSlots slots;
+  std::int64_t blockElements = 0;
+};
+/// `stride` is 0 without a block, else the slot of a tile of fixed size. Tiles of a size of their own lie one
+/// behind the other.
+VLN_API GrowthPlan planGrowth(int first, int last, DepthCounts const& own, TileCounts const& source,
+                              bool fixedSize, std::int64_t stride);
+
+/// Whether each list of the depths [first, last] is empty or names every tile once.
+VLN_API bool isPermutation(std::vector<std::vector<std::int64_t>> const& lists, int first, int last,
+                           DepthCounts const& counts);
+
 /// Tiles of `bytes` each that are worth a task of their own.
 inline std::int64_t tileGrain(std::size_t bytes) {
   return bytes >= 32768 ? 1 : static_cast<std::int64_t>(32768 / (bytes + 64)) + 1;
@@ -74,8 +108,5 @@ inline std::int64_t tileGrain(std::size_t bytes) {
 
 /// Runs `body(depth)` for each depth of [first, last] in parallel.
 VLN_API void forEachDepth(int first, int last, FunctionRef<void(int)> body);
-
-/// Whether the list names no index twice and only indices below `count`.
-VLN_API bool isInjective(std::vector<std::int64_t> const& list, std::int64_t count);
 
 } // namespace VLN::TileTree3D::Internal

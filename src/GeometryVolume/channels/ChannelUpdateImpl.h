@@ -36,71 +36,39 @@ template <class T> void assignTile(TileVector<T>& to, TileVector<T> const& from)
 
 template <class T> bool ChannelData<T>::resizeTiles(Internal::TileCounts const& source) {
   if (!m_data) return true;
-  Counts wanted{};
-  bool changes = false;
-  for (int d = firstDepth(); d <= lastDepth(); ++d) {
-    auto& n = wanted[static_cast<std::size_t>(d)];
-    n = std::max<std::int64_t>(0, source.tileCount(d));
-    changes = changes || n != count(d);
-  }
-  if (!changes) {
+  bool const fill = !m_allocateEmptyTileData;
+  bool const fixed = m_layout.fixedSize();
+  std::int64_t const stride = m_useStaticAllocation && fill ? slotElements(0) : 0;
+  auto const plan = Internal::planGrowth(firstDepth(), lastDepth(), m_tileCounts, source, fixed, stride);
+  if (!plan.changes) {
     sumCounts();
     return true;
   }
-
-  bool const fill = !m_allocateEmptyTileData;
-  bool const fixed = m_layout.fixedSize();
-  auto const size = [&](int d, std::int64_t i) -> std::int64_t {
-    return fixed ? m_layout.size : std::max<std::int64_t>(0, source.elementCount(TreeIndex{i, d}));
-  };
-
-  // Where the new tiles of each depth lie in a static block: at a fixed stride, or one behind the other.
-  std::int64_t const stride = slotElements(0);
-  Counts base{};
-  std::vector<std::vector<std::int64_t>> offsets(kChannelDepths);
   void* block = nullptr;
-  if (m_useStaticAllocation && fill) {
-    std::int64_t total = 0;
-    for (int d = firstDepth(); d <= lastDepth(); ++d) {
-      auto const depth = static_cast<std::size_t>(d);
-      base[depth] = total;
-      std::int64_t const added = std::max<std::int64_t>(0, wanted[depth] - count(d));
-      if (fixed) {
-        total += added * stride;
-        continue;
-      }
-      for (auto i = count(d); i < wanted[depth]; ++i) {
-        offsets[depth].push_back(total);
-        total += size(d, i);
-      }
-    }
-    if (total > 0 && !(block = Internal::allocateBlock(total, sizeof(T)))) return false;
-  }
+  if (plan.blockElements > 0 && !(block = Internal::allocateBlock(plan.blockElements, sizeof(T))))
+    return false;
 
   cloneData();
   if (block) m_allocations.push_back(block);
-  Spans added;
   Counts const before = m_tileCounts;
-  for (int d = firstDepth(); d <= lastDepth(); ++d)
-    added.add(d, count(d), wanted[static_cast<std::size_t>(d)]);
   Internal::forEachDepth(firstDepth(), lastDepth(), [&](int d) {
-    auto const n = wanted[static_cast<std::size_t>(d)];
+    auto const n = plan.wanted[static_cast<std::size_t>(d)];
     if (n == count(d)) return;
     Internal::resizeDepthTiles(depthTiles(d), n, !m_useStaticAllocation);
     count(d) = n;
   });
   if (fill) {
-    added.forEach(Internal::tileGrain(tileBytes()), [&](int d, std::int64_t begin, std::int64_t end) {
+    plan.added.forEach(Internal::tileGrain(tileBytes()), [&](int d, std::int64_t begin, std::int64_t end) {
       auto const depth = static_cast<std::size_t>(d);
       auto& tiles = depthTiles(d);
       for (auto i = begin; i < end; ++i) {
-        std::int64_t const n = size(d, i);
+        std::int64_t const n =
+            fixed ? m_layout.size : std::max<std::int64_t>(0, source.elementCount(TreeIndex{i, d}));
         if (n == 0) continue;
         T* slot = nullptr;
         if (block) {
           std::int64_t const nth = i - before[depth];
-          slot = static_cast<T*>(block) +
-                 (fixed ? base[depth] + nth * stride : offsets[depth][static_cast<std::size_t>(nth)]);
+          slot = static_cast<T*>(block) + (fixed ? plan.base[depth] + nth * stride : plan.slots.at(d, nth));
         }
         tiles[static_cast<std::size_t>(i)] = newTile(n, slot);
       }
@@ -159,12 +127,8 @@ template <class T> bool ChannelData<T>::permuteTiles(TilePermutation const& newT
 
   // A channel that holds its storage alone hands its tiles on; else, or into a static block, they are copied.
   bool const shared = storageIsShared();
-  bool steal = !m_useStaticAllocation && !shared;
-  for (int d = firstDepth(); d <= last && steal; ++d) {
-    auto const& list = newToOld[static_cast<std::size_t>(d)];
-    steal = list.empty() ||
-            (static_cast<std::int64_t>(list.size()) == count(d) && Internal::isInjective(list, count(d)));
-  }
+  bool const steal = !m_useStaticAllocation && !shared &&
+                     Internal::isPermutation(newToOld, firstDepth(), last, m_tileCounts);
 
   auto const old = m_data;
   auto const source = [&](int d, std::int64_t i) -> Vector& {
@@ -174,18 +138,13 @@ template <class T> bool ChannelData<T>::permuteTiles(TilePermutation const& newT
     return at >= 0 && at < static_cast<std::int64_t>(tiles.size()) ? tiles[static_cast<std::size_t>(at)]
                                                                    : const_cast<Vector&>(none);
   };
-  std::vector<std::vector<std::int64_t>> offsets(kChannelDepths);
-  std::int64_t total = 0;
-  if (m_useStaticAllocation) {
-    for (int d = firstDepth(); d <= lastDepth(); ++d)
-      for (std::int64_t i = 0; i < count(d); ++i) {
-        offsets[static_cast<std::size_t>(d)].push_back(total);
-        std::size_t const n = source(d, i).size();
-        if (n > 0) total += slotElements(n);
-      }
-  }
-  void* const block = total > 0 ? Internal::allocateBlock(total, sizeof(T)) : nullptr;
-  if (total > 0 && !block) return false;
+  Internal::TileSlots slots;
+  if (m_useStaticAllocation)
+    slots = Internal::planSlots(
+        firstDepth(), lastDepth(), m_tileCounts, [&](int d, std::int64_t i) { return source(d, i).size(); },
+        [&](std::size_t n) { return slotElements(n); });
+  void* const block = slots.total > 0 ? Internal::allocateBlock(slots.total, sizeof(T)) : nullptr;
+  if (slots.total > 0 && !block) return false;
 
   auto fresh = Ostil::makePtr<TileStorage<T>>();
   Internal::forEachDepth(firstDepth(), lastDepth(), [&](int d) {
@@ -199,8 +158,7 @@ template <class T> bool ChannelData<T>::permuteTiles(TilePermutation const& newT
       if (steal) {
         to.swap(from);
       } else if (!from.empty()) {
-        T* const slot =
-            block ? static_cast<T*>(block) + offsets[depth][static_cast<std::size_t>(i)] : nullptr;
+        T* const slot = block ? static_cast<T*>(block) + slots.at(d, i) : nullptr;
         Vector tile = unwrittenTile(static_cast<std::int64_t>(from.size()), slot);
         std::memcpy(static_cast<void*>(tile.data()), from.data(), from.size() * sizeof(T));
         to.swap(tile);

@@ -74,9 +74,39 @@ void sortRemovals(std::vector<ElementInTile>& elements) {
   sortRecords(elements, [](ElementInTile const& a, ElementInTile const& b) { return a < b; });
 }
 
-void groupByDestination(std::vector<ElementToFrom> const& moves, std::vector<std::uint64_t>& order,
-                        std::vector<std::uint64_t>& tiles, TileArrivals& arrivals,
-                        FunctionRef<int(std::int64_t)> elementCount) {
+namespace {
+
+struct Run {
+  std::int64_t tile;
+  std::uint64_t start;
+};
+
+/// Sorts by counting: linear, where the destinations are few. @return false when they are not.
+bool countByDestination(std::vector<ElementToFrom> const& moves, std::vector<std::uint64_t>& order,
+                        std::vector<Run>& runs) {
+  std::int64_t lowest = 0, highest = 0;
+  for (ElementToFrom const& move : moves) {
+    lowest = std::min(lowest, move.to);
+    highest = std::max(highest, move.to);
+  }
+  constexpr std::int64_t kLowest = -2; // dropped, or without a tile
+  if (lowest < kLowest || highest - kLowest >= static_cast<std::int64_t>(4 * moves.size())) return false;
+  std::vector<std::uint64_t> next(static_cast<std::size_t>(highest - kLowest + 2));
+  for (ElementToFrom const& move : moves) ++next[static_cast<std::size_t>(move.to - kLowest + 1)];
+  for (std::size_t bucket = 1; bucket < next.size(); ++bucket) {
+    bool const holdsAny = next[bucket] > 0;
+    auto const tile = static_cast<std::int64_t>(bucket) - 1 + kLowest;
+    if (holdsAny && tile >= 0) runs.push_back({tile, next[bucket - 1]});
+    next[bucket] += next[bucket - 1];
+  }
+  order.resize(moves.size());
+  for (std::uint64_t at = 0; at < moves.size(); ++at)
+    order[next[static_cast<std::size_t>(moves[at].to - kLowest)]++] = at;
+  return true;
+}
+
+void sortByDestination(std::vector<ElementToFrom> const& moves, std::vector<std::uint64_t>& order,
+                       std::vector<Run>& runs) {
   auto const n = static_cast<std::int64_t>(moves.size());
   fillWithPositions(order, moves.size());
   auto const byDestination = [&](std::uint64_t a, std::uint64_t b) {
@@ -86,37 +116,41 @@ void groupByDestination(std::vector<ElementToFrom> const& moves, std::vector<std
     std::sort(order.begin(), order.end(), byDestination);
   else
     parallelSortPositions(order.data(), n, byDestination);
-
-  struct Run {
-    std::int64_t tile;
-    std::uint64_t start;
-    int firstFree;
-  };
-  constexpr std::int64_t kGrain = 4096;
-  std::vector<std::vector<Run>> parts(static_cast<std::size_t>(chunkCount(0, n, kGrain)));
   auto const destination = [&](std::int64_t at) { return moves[order[static_cast<std::size_t>(at)]].to; };
-  parallelChunks(0, n, kGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-    auto& runs = parts[static_cast<std::size_t>(chunk)];
-    for (auto at = begin; at < end; ++at) {
-      std::int64_t const to = destination(at);
-      if (to < 0 || (at > 0 && destination(at - 1) == to)) continue;
-      runs.push_back({to, static_cast<std::uint64_t>(at), elementCount(to)});
-    }
-  });
+  for (std::int64_t at = 0; at < n; ++at) {
+    std::int64_t const to = destination(at);
+    if (to >= 0 && (at == 0 || destination(at - 1) != to))
+      runs.push_back({to, static_cast<std::uint64_t>(at)});
+  }
+}
+
+} // namespace
+
+void groupByDestination(std::vector<ElementToFrom> const& moves, std::vector<std::uint64_t>& order,
+                        std::vector<std::uint64_t>& tiles, TileArrivals& arrivals,
+                        FunctionRef<int(std::int64_t)> elementCount) {
+  // Both ways give the same order: by destination, then by position.
+  std::vector<Run> runs;
+  if (moves.size() < kParallelSortFrom || !countByDestination(moves, order, runs)) {
+    runs.clear();
+    sortByDestination(moves, order, runs);
+  }
   tiles.clear();
   arrivals.clear();
-  for (auto const& runs : parts)
-    for (Run const& run : runs) {
-      auto const tile = static_cast<std::uint64_t>(run.tile);
-      arrivals.emplace_hint(arrivals.end(), tile, std::pair(run.start, run.firstFree));
-      tiles.push_back(tile);
-    }
+  tiles.reserve(runs.size());
+  for (Run const& run : runs) {
+    auto const tile = static_cast<std::uint64_t>(run.tile);
+    arrivals.emplace_hint(arrivals.end(), tile, std::pair(run.start, elementCount(run.tile)));
+    tiles.push_back(tile);
+  }
 }
 
 void addSources(std::vector<ElementToFrom> const& moves, ElementRemovals& removals) {
   removals.resize(kChannelDepths);
-  for (ElementToFrom const& move : moves)
-    removals[static_cast<std::size_t>(move.fromDepth)].push_back({move.from, move.fromElement});
+  for (ElementToFrom const& move : moves) {
+    auto const depth = static_cast<std::size_t>(move.fromDepth);
+    if (depth < removals.size()) removals[depth].push_back({move.from, move.fromElement});
+  }
 }
 
 void finishRemovals(ElementRemovals& removals) {
@@ -124,6 +158,55 @@ void finishRemovals(ElementRemovals& removals) {
     sortRemovals(list);
     list.erase(std::unique(list.begin(), list.end()), list.end());
   }
+}
+
+ArrivalPlan planArrivals(std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals,
+                         std::size_t moveCount) {
+  ArrivalPlan plan;
+  plan.starts.reserve(tiles.size());
+  for (std::uint64_t tile : tiles) plan.starts.push_back(arrivals.find(tile)->second.first);
+  plan.end = moveCount;
+  return plan;
+}
+
+void ArrivalPlan::forEachRun(FunctionRef<void(std::size_t, std::uint64_t, std::uint64_t)> body) const {
+  if (starts.empty()) return;
+  ParallelOptions options;
+  options.grain = 1024;
+  parallelFor(
+      static_cast<std::int64_t>(starts.front()), static_cast<std::int64_t>(end),
+      [&](std::int64_t first, std::int64_t last) {
+        auto at = static_cast<std::uint64_t>(first);
+        auto run =
+            static_cast<std::size_t>(std::upper_bound(starts.begin(), starts.end(), at) - starts.begin() - 1);
+        for (; at < static_cast<std::uint64_t>(last); ++run) {
+          std::uint64_t const stop = std::min(starts[run] + count(run), static_cast<std::uint64_t>(last));
+          body(run, at, stop);
+          at = stop;
+        }
+      },
+      options);
+}
+
+void forEachTileRun(std::vector<ElementInTile> const& elements,
+                    FunctionRef<void(std::int64_t, std::int64_t)> body) {
+  auto const n = static_cast<std::int64_t>(elements.size());
+  auto const tile = [&](std::int64_t at) { return elements[static_cast<std::size_t>(at)].tile; };
+  ParallelOptions options;
+  options.grain = 512;
+  parallelFor(
+      0, n,
+      [&](std::int64_t begin, std::int64_t end) {
+        // Each tile belongs to the range in which its run begins.
+        while (begin > 0 && begin < n && tile(begin) == tile(begin - 1)) ++begin;
+        while (begin < end) {
+          std::int64_t stop = begin + 1;
+          while (stop < n && tile(stop) == tile(begin)) ++stop;
+          body(begin, stop);
+          begin = stop;
+        }
+      },
+      options);
 }
 
 } // namespace Internal

@@ -75,5 +75,24 @@ VLN_API void addSources(std::vector<ElementToFrom> const& moves, ElementRemovals
 /// Sorts each depth's list and drops repetitions.
 VLN_API void finishRemovals(ElementRemovals& removals);
 
+/// The runs of one depth's order that arrive in one tile each.
+struct VLN_API ArrivalPlan {
+  std::vector<std::uint64_t> starts;
+  std::uint64_t end = 0;
+
+  /// Elements that arrive in the n-th destination tile: up to the next run, or to the end of the order.
+  std::uint64_t count(std::size_t n) const {
+    return (n + 1 < starts.size() ? starts[n + 1] : end) - starts[n];
+  }
+  /// Calls `body(n, from, to)` in parallel for pieces of the order that lie in the n-th run.
+  void forEachRun(FunctionRef<void(std::size_t n, std::uint64_t from, std::uint64_t to)> body) const;
+};
+VLN_API ArrivalPlan planArrivals(std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals,
+                                 std::size_t moveCount);
+
+/// Calls `body(begin, end)` in parallel for each run of elements of one tile.
+VLN_API void forEachTileRun(std::vector<ElementInTile> const& elements,
+                            FunctionRef<void(std::int64_t begin, std::int64_t end)> body);
+
 } // namespace Internal
 } // namespace VLN::TileTree3D

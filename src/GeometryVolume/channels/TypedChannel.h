@@ -4,8 +4,6 @@
 
 #include "GeometryVolume/channels/ChannelBase.h"
 #include "GeometryVolume/channels/ChannelData.h"
-#include "GeometryVolume/channels/ElementMoves.h"
-#include "GeometryVolume/channels/TileDataElementAccessor.h"
 
 #include <cassert>
 #include <typeindex>
@@ -25,6 +23,7 @@ public:
   void memUse(std::uint64_t& used, std::uint64_t& allocated, bool notShared) const override;
   /// Elements of all depths. Walks the tiles.
   std::uint64_t size() const override;
+  using ChannelBase::update;
   /// As updateTilesAdded(); a component that counts no tiles is ignored.
   void update(VLN::Component const& source) override;
   /// Walks the tiles of the depth, or of all depths for -1.
@@ -90,21 +89,6 @@ public:
   /// Puts tiles in a new order: new tile i of depth d is old tile newToOld[d][i]. Returns true.
   bool permute(TilePermutation const* newToOld);
 
-  /// Moves elements to tiles of depth `first`. The moves are sorted by source unless they are so already. An
-  /// element that leaves a tile is replaced by the tile's last one: the order in a tile is not kept.
-  void update(std::vector<ElementToFrom>& moves, int first, int last, bool sorted);
-  void update(std::vector<ElementToFrom>& moves, int depth, bool sorted);
-  /// Moves elements between any depths: all destinations grow, all elements are copied, then all are removed.
-  void update(ElementMoves& moves, bool sorted);
-  /// Applies what an accessor has recorded.
-  void update(TileDataElementAccessor& recorded);
-  /// Prepares order, destination tiles and arrivals for moves to one depth.
-  void computePermutation(std::vector<ElementToFrom>& moves, std::vector<std::uint64_t>& order,
-                          std::vector<std::uint64_t>& tiles, TileArrivals& arrivals, int depth,
-                          bool sorted) const;
-  void computePermutation(ElementMoves& moves, ElementOrder& order, DestinationTiles& tiles,
-                          ArrivalMap& arrivals, bool sorted) const;
-
 protected:
   TypedChannel(Ostil::String const& name, Ostil::Ptr<ChannelData<T>> data);
   /// A Data of its own on the same storage.
@@ -117,13 +101,12 @@ protected:
   void updateTilesNoDispatch(TileRemovalList const* removed);
   void updateTilePermuteNoDispatch(TilePermutation const* newToOld);
   void updateElementResizeNoDispatch(Component const& source);
-  void updateElementsNoDispatch(std::vector<ElementToFrom> const& moves,
-                                std::vector<std::uint64_t> const& order,
-                                std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals,
-                                int depth);
-  void updateElementsNoDispatch(ElementPermutation const& permutation);
   void allocateElementStorage(std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals,
-                              std::size_t moveCount, int depth);
+                              std::size_t moveCount, int depth) override;
+  void copyElements(std::vector<ElementToFrom> const& moves, std::vector<std::uint64_t> const& order,
+                    std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals,
+                    int depth) override;
+  void removeElements(std::vector<ElementInTile> const& elements, int depth) override;
   void remove(int firstDepth, int lastDepth);
 
   std::int64_t treeIndexToIndex(TreeIndex const& tile) const { return m_data->treeIndexToIndex(tile); }

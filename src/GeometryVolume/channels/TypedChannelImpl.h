@@ -9,9 +9,7 @@
 #include "GeometryVolume/core/Const.h"
 #include "GeometryVolume/core/LoggerHooks.h"
 #include "GeometryVolume/core/Parallel.h"
-#include "GeometryVolume/core/Streaming.h"
 
-#include <iostream>
 #include <limits>
 #include <utility>
 
@@ -19,23 +17,26 @@ namespace VLN::TileTree3D {
 
 template <class T>
 TypedChannel<T>::TypedChannel(Ostil::String const& name, Ostil::Ptr<ChannelData<T>> data)
-    : ChannelBase(name)
+    : ChannelBase(name, Incomplete())
     , m_data(std::move(data)) {
   replaceEmptyName();
   pointerAllocated(dataPtr(), this);
+  objectComplete(this);
 }
 
 template <class T>
 TypedChannel<T>::TypedChannel(TypedChannel const& other)
-    : ChannelBase(other)
+    : ChannelBase(other, Incomplete())
     , m_data(other.m_data) {
   pointerAllocated(dataPtr(), this);
   replaceEmptyName();
   write([](ChannelData<T>&) {});
+  objectComplete(this);
 }
 
 template <class T> TypedChannel<T>& TypedChannel<T>::operator=(TypedChannel const& other) {
   if (this == &other) return *this;
+  ObjectChange const change(this);
   ChannelBase::operator=(other);
   pointerDeAllocated(dataPtr(), this);
   m_data = other.m_data;
@@ -43,13 +44,17 @@ template <class T> TypedChannel<T>& TypedChannel<T>::operator=(TypedChannel cons
   return *this;
 }
 
-template <class T> TypedChannel<T>::~TypedChannel() { pointerDeAllocated(dataPtr(), this); }
+template <class T> TypedChannel<T>::~TypedChannel() {
+  objectIncomplete(this);
+  pointerDeAllocated(dataPtr(), this);
+}
 
 template <class T> void TypedChannel<T>::replaceEmptyName() {
   if (name().empty()) setName(Const::TileTreeChannelName);
 }
 
 template <class T> void TypedChannel<T>::write(FunctionRef<void(ChannelData<T>&)> change) {
+  ObjectChange const accounted(this);
   void const* const before = dataPtr();
   if (m_data && !m_data.unique()) m_data = Ostil::MutablePtr<ChannelData<T>>(std::move(m_data));
   change(*m_data);
@@ -65,22 +70,13 @@ template <class T> Ostil::Ptr<TileStorage<T>> const& TypedChannel<T>::cloneData(
 }
 
 template <class T> void TypedChannel<T>::deepCopyTo(TypedChannel& copy) const {
-  if (loggingEnabled())
-    std::cout << "ERROR: Copying " << name() << " from ptr " << static_cast<void const*>(this) << " to ptr "
-              << static_cast<void const*>(&copy) << '\n';
+  announceCopy(copy);
   copy.write([&](ChannelData<T>& data) { data.deepCopy(*m_data); });
 }
 
 template <class T> void TypedChannel<T>::dump(std::ostream& os) const {
   ChannelBase::dump(os);
-  auto const pad = Streaming::pad(os);
-  auto const line = [&](char const* what, auto const& countOf) {
-    os << pad << what << " {" << kChannelDepths - 1 << "} =";
-    for (int d = 0; d < kChannelDepths; ++d) os << (d == 0 ? "" : ", ") << countOf(d);
-    os << '\n';
-  };
-  line("tileCount", [&](int d) { return tileCount(d); });
-  line("elementCount", [&](int d) { return elementCount(d); });
+  dumpCounts(os);
 }
 
 template <class T>
@@ -91,17 +87,7 @@ void TypedChannel<T>::memUse(std::uint64_t& used, std::uint64_t& allocated, bool
   if (!m_data) return;
   std::uint64_t dataUsed = 0, dataAllocated = 0;
   m_data->memUse(dataUsed, dataAllocated);
-  std::int64_t const sharers = m_data.useCount();
-  auto const divisor = static_cast<std::uint64_t>(notShared ? 1 : std::max<std::int64_t>(1, sharers));
-  used += dataUsed / divisor;
-  allocated += dataAllocated / divisor;
-  if (loggerDumpInProgress() && sharers > 1) {
-    std::cout << " Data shared by " << sharers
-              << " channels, raw data ptr = " << static_cast<void const*>(dataPtr()) << '\n'
-              << " Total shared data = " << static_cast<float>(static_cast<double>(dataUsed) / 1e6)
-              << "MB (total shared data allocated = "
-              << static_cast<float>(static_cast<double>(dataAllocated) / 1e6) << "MB)";
-  }
+  addShared(used, allocated, dataUsed, dataAllocated, m_data.useCount(), notShared, dataPtr());
 }
 
 template <class T> std::uint64_t TypedChannel<T>::size() const {
@@ -235,6 +221,7 @@ template <class T> bool TypedChannel<T>::permute(TilePermutation const* newToOld
   return true;
 }
 template <class T> void TypedChannel<T>::updateTilePermuteNoDispatch(TilePermutation const* newToOld) {
+  ObjectChange const accounted(this);
   void const* const before = dataPtr();
   if (m_data && !m_data.unique()) m_data = Ostil::MutablePtr<ChannelData<T>>(std::move(m_data));
   m_data->permuteTiles(*newToOld);
@@ -282,115 +269,27 @@ template <class T> bool TypedChannel<T>::resize(std::int64_t const* tileCounts, 
 // Element moves
 
 template <class T>
-void TypedChannel<T>::computePermutation(std::vector<ElementToFrom>& moves, std::vector<std::uint64_t>& order,
-                                         std::vector<std::uint64_t>& tiles, TileArrivals& arrivals, int depth,
-                                         bool sorted) const {
-  if (!sorted) Internal::sortMoves(moves);
-  Internal::groupByDestination(moves, order, tiles, arrivals, [&](std::int64_t tile) {
-    return elementCount(TreeIndex{tile, depth});
-  });
+void TypedChannel<T>::updateElements(ElementMoves const& moves, ElementOrder const& order,
+                                     DestinationTiles const& tiles, ArrivalMap const& arrivals) {
+  ElementPermutation p{ElementPermutation::kAllDepths};
+  p.allMoves = &moves, p.allOrders = &order, p.allTiles = &tiles, p.allArrivals = &arrivals;
+  this->updateElementsNoDispatch(p);
 }
-
-template <class T>
-void TypedChannel<T>::computePermutation(ElementMoves& moves, ElementOrder& order, DestinationTiles& tiles,
-                                         ArrivalMap& arrivals, bool sorted) const {
-  moves.resize(kChannelDepths);
-  order.resize(kChannelDepths);
-  tiles.resize(kChannelDepths);
-  arrivals.resize(kChannelDepths);
-  for (std::size_t d = 0; d < kChannelDepths; ++d)
-    computePermutation(moves[d], order[d], tiles[d], arrivals[d], static_cast<int>(d), sorted);
-}
-
 template <class T>
 void TypedChannel<T>::allocateElementStorage(std::vector<std::uint64_t> const& tiles,
                                              TileArrivals const& arrivals, std::size_t moveCount, int depth) {
   write([&](ChannelData<T>& data) { data.allocateElements(tiles, arrivals, moveCount, depth); });
 }
-
 template <class T>
-void TypedChannel<T>::updateElementsNoDispatch(std::vector<ElementToFrom> const& moves,
-                                               std::vector<std::uint64_t> const& order,
-                                               std::vector<std::uint64_t> const& tiles,
-                                               TileArrivals const& arrivals, int depth) {
-  updateElementsNoDispatch(ElementPermutation{ElementPermutation::kOneDepth, &moves, &order, &tiles,
-                                              &arrivals, depth, depth, nullptr, nullptr, nullptr, nullptr,
-                                              nullptr});
+void TypedChannel<T>::copyElements(std::vector<ElementToFrom> const& moves,
+                                   std::vector<std::uint64_t> const& order,
+                                   std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals,
+                                   int depth) {
+  m_data->copyElements(moves, order, tiles, arrivals, depth);
 }
-
-template <class T> void TypedChannel<T>::updateElementsNoDispatch(ElementPermutation const& p) {
-  write([&](ChannelData<T>& data) {
-    auto const forEachList = [&](auto const& body) {
-      if (p.kind == ElementPermutation::kOneDepth) {
-        body(*p.moves, *p.order, *p.tiles, *p.arrivals, p.firstDepth);
-        return;
-      }
-      std::size_t const n = std::min({p.allMoves->size(), p.allOrders->size(), p.allTiles->size(),
-                                      p.allArrivals->size(), std::size_t(kChannelDepths)});
-      for (std::size_t d = 0; d < n; ++d)
-        body((*p.allMoves)[d], (*p.allOrders)[d], (*p.allTiles)[d], (*p.allArrivals)[d], static_cast<int>(d));
-    };
-    // Sources are read by position, so nothing is removed before everything is copied.
-    forEachList([&](auto const& moves, auto const&, auto const& tiles, auto const& arrivals, int d) {
-      data.allocateElements(tiles, arrivals, moves.size(), d);
-    });
-    forEachList([&](auto const& moves, auto const& order, auto const& tiles, auto const& arrivals, int d) {
-      data.copyElements(moves, order, tiles, arrivals, d);
-    });
-    ElementRemovals collected;
-    ElementRemovals const* removals = p.removals;
-    if (p.kind != ElementPermutation::kRecorded) {
-      forEachList([&](auto const& moves, auto const&, auto const&, auto const&, int) {
-        Internal::addSources(moves, collected);
-      });
-      Internal::finishRemovals(collected);
-      removals = &collected;
-    }
-    for (std::size_t d = 0; d < removals->size(); ++d)
-      data.removeElements((*removals)[d], static_cast<int>(d));
-  });
-}
-
 template <class T>
-void TypedChannel<T>::updateElements(ElementMoves const& moves, ElementOrder const& order,
-                                     DestinationTiles const& tiles, ArrivalMap const& arrivals) {
-  ElementPermutation p{ElementPermutation::kAllDepths};
-  p.allMoves = &moves, p.allOrders = &order, p.allTiles = &tiles, p.allArrivals = &arrivals;
-  updateElementsNoDispatch(p);
-}
-
-template <class T>
-void TypedChannel<T>::update(std::vector<ElementToFrom>& moves, int first, int last, bool sorted) {
-  std::vector<std::uint64_t> order, tiles;
-  TileArrivals arrivals;
-  computePermutation(moves, order, tiles, arrivals, first, sorted);
-  ElementPermutation p{ElementPermutation::kOneDepth, &moves, &order, &tiles, &arrivals, first, last};
-  updateElementsNoDispatch(p);
-}
-template <class T> void TypedChannel<T>::update(std::vector<ElementToFrom>& moves, int depth, bool sorted) {
-  update(moves, depth, depth, sorted);
-}
-
-template <class T> void TypedChannel<T>::update(ElementMoves& moves, bool sorted) {
-  ElementOrder order;
-  DestinationTiles tiles;
-  ArrivalMap arrivals;
-  computePermutation(moves, order, tiles, arrivals, sorted);
-  TypedChannel::updateElements(moves, order, tiles, arrivals);
-}
-
-template <class T> void TypedChannel<T>::update(TileDataElementAccessor& recorded) {
-  Internal::finishRemovals(recorded.elementsFrom());
-  ElementMoves& moves = recorded.elementsTo();
-  for (auto& list : moves) Internal::sortMoves(list);
-  ElementOrder order;
-  DestinationTiles tiles;
-  ArrivalMap arrivals;
-  computePermutation(moves, order, tiles, arrivals, true);
-  ElementPermutation p{ElementPermutation::kRecorded};
-  p.allMoves = &moves, p.allOrders = &order, p.allTiles = &tiles, p.allArrivals = &arrivals;
-  p.removals = &recorded.elementsFrom();
-  updateElementsNoDispatch(p);
+void TypedChannel<T>::removeElements(std::vector<ElementInTile> const& elements, int depth) {
+  write([&](ChannelData<T>& data) { data.removeElements(elements, depth); });
 }
 
 } // namespace VLN::TileTree3D

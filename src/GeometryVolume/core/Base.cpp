@@ -2,6 +2,7 @@
 
 #include "GeometryVolume/core/LoggerHooks.h"
 #include "GeometryVolume/core/Streaming.h"
+#include "GeometryVolume/core/Version.h"
 
 #include <ostream>
 #include <utility>
@@ -9,6 +10,9 @@
 namespace VLN {
 
 namespace {
+/// Brings the source of the version banner into programs that link the library statically.
+[[gnu::used]] bool (*const g_bannerAnchor)() noexcept = &versionBannerAsked;
+
 void registerBase(Base const* base) {
   if (auto const* hooks = loggerHooks()) hooks->baseBuilt(base);
 }

@@ -17,6 +17,9 @@ struct LoggerHooks {
   void (*pointerDeAllocated)(void const* block, Base const* owner);
   void (*pointerReAllocated)(void const* from, void const* to);
   bool (*isDumpInProgress)();
+  /// May be null in a table of one's own.
+  void (*baseIncomplete)(Base const*) = nullptr;
+  void (*baseComplete)(Base const*) = nullptr;
 };
 
 namespace Internal {
@@ -31,6 +34,31 @@ inline bool loggerDumpInProgress() {
   auto const* hooks = loggerHooks();
   return hooks && hooks->isDumpInProgress();
 }
+/// For classes whose memUse() follows pointers: between objectIncomplete() and objectComplete(), which may
+/// nest, a report that another thread writes does not ask the object for its size. A base class tells the
+/// first in its constructors; the class that completes it tells the second at the end of its constructors,
+/// and the first again at the beginning of its destructor.
+inline void objectIncomplete(Base const* base) {
+  if (auto const* hooks = loggerHooks(); hooks && hooks->baseIncomplete) hooks->baseIncomplete(base);
+}
+inline void objectComplete(Base const* base) {
+  if (auto const* hooks = loggerHooks(); hooks && hooks->baseComplete) hooks->baseComplete(base);
+}
+/// Both, around a change.
+class ObjectChange {
+public:
+  explicit ObjectChange(Base const* base)
+      : m_base(base) {
+    objectIncomplete(base);
+  }
+  ~ObjectChange() { objectComplete(m_base); }
+  ObjectChange(ObjectChange const&) = delete;
+  ObjectChange& operator=(ObjectChange const&) = delete;
+
+private:
+  Base const* m_base;
+};
+
 inline void pointerAllocated(void const* block, Base const* owner) {
   if (auto const* hooks = loggerHooks()) hooks->pointerAllocated(block, owner);
 }

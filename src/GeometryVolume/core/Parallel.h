@@ -59,15 +59,18 @@ inline std::int64_t chunkCount(std::int64_t begin, std::int64_t end, std::int64_
 template <class T, class Map, class Join>
 T parallelReduce(std::int64_t begin, std::int64_t end, std::int64_t grain, T identity, Map const& map,
                  Join const& join, Cancellation cancellation = Cancellation::kSuppress) {
-  std::vector<T> parts(static_cast<std::size_t>(chunkCount(begin, end, grain)), identity);
+  struct Part { // so that parts of bool are objects of their own too
+    T value;
+  };
+  std::vector<Part> parts(static_cast<std::size_t>(chunkCount(begin, end, grain)), Part{identity});
   parallelChunks(
       begin, end, grain,
       [&](std::int64_t chunk, std::int64_t b, std::int64_t e) {
-        parts[static_cast<std::size_t>(chunk)] = map(b, e);
+        parts[static_cast<std::size_t>(chunk)].value = map(b, e);
       },
       cancellation);
   T result = std::move(identity);
-  for (T& part : parts) result = join(std::move(result), std::move(part));
+  for (Part& part : parts) result = join(std::move(result), std::move(part.value));
   return result;
 }
 

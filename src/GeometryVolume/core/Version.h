@@ -1,6 +1,7 @@
 #pragma once
 
 #include "GeometryVolume/core/Export.h"
+#include "Ostil/String.h"
 
 namespace VLN {
 
@@ -17,5 +18,11 @@ struct VersionInfo {
 
 /// The version of the library that is loaded, not of the headers that were compiled against.
 VLN_API const VersionInfo& versionInfo() noexcept;
+
+/// The version in one line: product, numbers, build date, build, commit and branch. It is written to standard
+/// error at load when the environment variable KERRATE_DUMP_VERSION_INFO holds a number other than 0.
+VLN_API Ostil::String versionBanner();
+/// Whether that variable asked for the line.
+VLN_API bool versionBannerAsked() noexcept;
 
 } // namespace VLN

@@ -3,6 +3,8 @@
 #include "vljemalloc/vljemalloc.h"
 
 #include <atomic>
+#include <chrono>
+#include <memory>
 #include <mutex>
 #include <sstream>
 #include <tbb/parallel_for.h>
@@ -19,19 +21,44 @@ std::atomic<bool> g_flushing{false};
 
 void flushOwnCache() { vlje_mallctl("thread.tcache.flush", nullptr, nullptr, nullptr, 0); }
 
-/// A cache can be flushed by its own thread only: spread one flush over each worker.
+/// Shared with a task that may come to run only after the flush is over.
+struct WorkerFlush {
+  explicit WorkerFlush(int n)
+      : threads(n) {}
+  /// Runs the flush unless somebody else has begun it.
+  bool run() {
+    if (claimed.exchange(true, std::memory_order_acq_rel)) return false;
+    tbb::parallel_for(
+        0, threads - 1, 1, [](int) { flushOwnCache(); }, tbb::simple_partitioner());
+    done.store(true, std::memory_order_release);
+    return true;
+  }
+
+  int const threads;
+  std::atomic<bool> claimed{false};
+  std::atomic<bool> done{false};
+};
+
+/// How long the workers may leave the task lying.
+constexpr std::chrono::milliseconds kPatience(10);
+
+/// A cache can be flushed by its own thread only: spread one flush over each worker. Workers that all wait
+/// for a lock which the flushing thread holds never come for the task, so it does not wait for them for ever.
 void flushWorkers() {
   int const threads = tbb::this_task_arena::max_concurrency();
   if (threads < 2) return;
   tbb::task_arena arena(threads, 1);
   arena.initialize();
-  std::atomic<bool> done{false};
-  arena.enqueue([&] {
-    tbb::parallel_for(
-        0, threads - 1, 1, [](int) { flushOwnCache(); }, tbb::simple_partitioner());
-    done.store(true, std::memory_order_release);
-  });
-  while (!done.load(std::memory_order_acquire)) std::this_thread::yield();
+  auto const flush = std::make_shared<WorkerFlush>(threads);
+  arena.enqueue([flush] { flush->run(); });
+  auto const until = std::chrono::steady_clock::now() + kPatience;
+  bool waited = false;
+  while (!flush->done.load(std::memory_order_acquire)) {
+    std::this_thread::yield();
+    if (waited || std::chrono::steady_clock::now() < until) continue;
+    waited = true;
+    arena.execute([&] { flush->run(); });
+  }
   vlje_mallctl("arenas.purge", nullptr, nullptr, nullptr, 0);
   arena.terminate();
 }

@@ -1,6 +1,9 @@
 #include "GeometryVolume/pools/PoolUtils.h"
 
+#include "GeometryVolume/pools/PoolLogImpl.h"
+
 #include <algorithm>
+#include <atomic>
 #include <charconv>
 #include <cstdlib>
 #include <filesystem>
@@ -10,6 +13,7 @@
 #include <stdexcept>
 #include <string>
 #include <string_view>
+#include <unistd.h>
 
 namespace VLN::TileTree3D::PoolUtils {
 
@@ -69,6 +73,13 @@ std::optional<std::string> groupValue(std::filesystem::path const& directory, ch
   return line;
 }
 
+constinit std::atomic<std::uint64_t> g_processLimit{0};
+
+void narrow(MemoryStats& stats, std::uint64_t most, std::uint64_t usage) {
+  stats.totalPhysical = std::min(stats.totalPhysical, most);
+  stats.availablePhysical = std::min(stats.availablePhysical, most - std::min(most, usage));
+}
+
 void narrow(MemoryStats& stats, std::filesystem::path const& group) {
   if (!std::filesystem::is_directory(group)) throw std::runtime_error("no control group");
   auto limit = groupValue(group, "memory.max");
@@ -80,20 +91,26 @@ void narrow(MemoryStats& stats, std::filesystem::path const& group) {
   if (!limit || *limit == "max") return;
   std::uint64_t const most = parseBytes(*limit);
   auto const used = groupValue(group, usageName);
-  std::uint64_t const usage = used ? parseBytes(*used) : 0;
-  stats.totalPhysical = std::min(stats.totalPhysical, most);
-  stats.availablePhysical = std::min(stats.availablePhysical, most - std::min(most, usage));
+  narrow(stats, most, used ? parseBytes(*used) : 0);
 }
 
 } // namespace
 
 bool getMemoryStats(MemoryStats& out) {
+  bool const logging = loggingEnabled();
   try {
     MemoryStats stats = machineStats();
-    if (auto const group = cgroupPath(); !group.empty()) narrow(stats, group);
+    if (auto const group = cgroupPath(); !group.empty()) narrow(stats, std::filesystem::path(group));
+    if (auto const limit = processLimit()) narrow(stats, limit, residentMemory());
     out = stats;
+    if (logging)
+      Internal::writeLine("PoolUtils: total physical memory = ", toMB(stats.totalPhysical),
+                          "MB, available physical memory = ", toMB(stats.availablePhysical), "MB");
     return true;
-  } catch (...) { return false; }
+  } catch (...) {
+    if (logging) Internal::writeLine("PoolUtils: unable to retrieve memory stats");
+    return false;
+  }
 }
 
 float toMB(std::uint64_t bytes) { return static_cast<float>(bytes) * 0.0009765625f * 0.0009765625f; }
@@ -110,6 +127,16 @@ void setCgroupPath(Ostil::String const& path) {
   auto& e = environment();
   std::lock_guard const lock(e.mutex);
   e.cgroupPath = path;
+}
+
+void setProcessLimit(std::uint64_t bytes) { g_processLimit.store(bytes, std::memory_order_relaxed); }
+std::uint64_t processLimit() { return g_processLimit.load(std::memory_order_relaxed); }
+
+std::uint64_t residentMemory() {
+  std::ifstream file("/proc/self/statm");
+  std::uint64_t total = 0, resident = 0;
+  file >> total >> resident;
+  return file ? resident * static_cast<std::uint64_t>(sysconf(_SC_PAGESIZE)) : 0;
 }
 
 } // namespace VLN::TileTree3D::PoolUtils

@@ -23,8 +23,8 @@ VLN_API bool getMemoryStats(MemoryStats& out);
 /// @units 1 MB = 1,048,576 bytes.
 VLN_API float toMB(std::uint64_t bytes);
 
-/// Whether VELORN_ENABLE_VLN_POOL_UTILS_LOGGING held a number other than 0 at load. Nothing in this library
-/// reads it; the pools have log switches of their own.
+/// Whether VELORN_ENABLE_VLN_POOL_UTILS_LOGGING held a number other than 0 at load. Then each reading of the
+/// statistics writes one line to standard output.
 VLN_API bool loggingEnabled();
 
 /// Directory of the control group whose limit and usage narrow getMemoryStats(); empty for none. At load it
@@ -38,5 +38,15 @@ VLN_API Ostil::String cgroupPath();
 /// Names another control group.
 /// @threads Any thread; a call of getMemoryStats() that runs already keeps the old one.
 VLN_API void setCgroupPath(Ostil::String const& path);
+
+/// Narrows getMemoryStats() to what this process may have resident; 0, as at load, for no such limit. The
+/// pools then let go of idle memory before the process goes beyond it.
+/// @units Bytes.
+/// @threads Any thread.
+VLN_API void setProcessLimit(std::uint64_t bytes);
+VLN_API std::uint64_t processLimit();
+/// Memory of this process that is resident now; 0 when the system does not tell.
+/// @units Bytes.
+VLN_API std::uint64_t residentMemory();
 
 } // namespace VLN::TileTree3D::PoolUtils

@@ -33,14 +33,17 @@ public:
     this->setEndTileOverridden(false);
   }
   using Visitor<Container<TraitsT>>::beginTile;
-  void beginTile(TileType const& tile) override {
-    ++m_numTiles;
-    for (auto child = tile.begin(); child != tile.end(); ++child) {
-      TreeIndex const at = child.treeIndex();
-      if (at.index >= m_tree.tileCount(at.depth) || m_tree.tile(at).parentIndex() != tile.index() ||
-          tile.childI(m_tree.tile(at)) != *child)
-        m_failed = true;
-    }
+  void beginTile(TileType const&) override { ++m_numTiles; }
+  using Visitor<Container<TraitsT>>::visitInteriorVoxel;
+  /// A link that leads nowhere, or to another's child, is not followed.
+  bool visitInteriorVoxel(TileType const& tile, int3 const& ijk) override {
+    if (tile.isLeaf(ijk)) return true;
+    TreeIndex const at = tile.childTreeIndex(ijk);
+    if (at.index < m_tree.tileCount(at.depth) && m_tree.tile(at).parentIndex() == tile.index() &&
+        tile.childIJK(m_tree.tile(at)) == ijk)
+      return true;
+    m_failed = true;
+    return false;
   }
   CountingVisitor* clone() const override { return new CountingVisitor(m_tree); }
 

@@ -1,6 +1,7 @@
 #include "GeometryVolume/tiletree/Container.h"
 
 #include "GeometryVolume/core/Const.h"
+#include "GeometryVolume/core/LoggerHooks.h"
 #include "GeometryVolume/core/Streaming.h"
 #include "GeometryVolume/tiletree/Consistency.h"
 #include "GeometryVolume/tiletree/ContainerRefineImpl.h"
@@ -38,27 +39,30 @@ Container<TraitsT>::Container()
 
 template <class TraitsT>
 Container<TraitsT>::Container(Ostil::String const& name, float voxelSize)
-    : Component(nameOrDefault(name))
+    : Component(nameOrDefault(name), Incomplete())
     , m_data(Ostil::makePtr<Data>()) {
   setVoxelSize(voxelSize);
+  objectComplete(this);
 }
 
 template <class TraitsT>
 Container<TraitsT>::Container(Container const& other)
-    : Component(other)
+    : Component(other, Incomplete())
     , m_data(other.m_data) {
   cloneData();
+  objectComplete(this);
 }
 
 template <class TraitsT> Container<TraitsT>& Container<TraitsT>::operator=(Container const& other) {
   if (this == &other) return *this;
+  ObjectChange const change(this);
   Component::operator=(other);
   m_data = other.m_data;
   cloneData();
   return *this;
 }
 
-template <class TraitsT> Container<TraitsT>::~Container() = default;
+template <class TraitsT> Container<TraitsT>::~Container() { objectIncomplete(this); }
 
 template <class TraitsT> void Container<TraitsT>::cloneData() {
   if (!m_data.unique()) m_data = Ostil::makePtr<Data>(*m_data);
@@ -67,6 +71,7 @@ template <class TraitsT> void Container<TraitsT>::cloneData() {
 template <class TraitsT> void Container<TraitsT>::copyTo(Ostil::Ptr<VLN::Component>& target) const {
   if (target.get() == this) return;
   auto copy = Ostil::makePtr<Container>(name(), voxelSize());
+  ObjectChange const change(copy.get());
   copy->m_data = Ostil::makePtr<Data>(*m_data);
   target = copy;
   Component::copyTo(target);
@@ -122,7 +127,9 @@ template <class TraitsT> void Container<TraitsT>::dump(std::ostream& os) const {
   };
   for (auto const& root : m_data->m_roots) writeTile("root[", root.second);
   for (int d = 0; d <= kMaxDepth; ++d) {
-    for (std::int64_t n = 0; n < tileCount(d); ++n) writeTile("tile[", {n, d});
+    for (std::int64_t n = 0; n < tileCount(d); ++n) {
+      if (tile(n, d).valid()) writeTile("tile[", {n, d});
+    }
   }
 }
 
@@ -204,8 +211,9 @@ void Container<TraitsT>::reduce(VisitorType& visitor, TraversalMode mode, Traver
   TraversalEngine<false, TraitsT>::run(*this, visitor, mode, range, VisitorResults::kJoin);
 }
 template <class TraitsT> void Container<TraitsT>::setBranchSizes() {
+  // Tiles of the deepest depth have no children and keep the size that they were made with.
   BranchSizeVisitor<TraitsT> visitor(*m_data);
-  traverse(visitor, kParallelBottomUp);
+  traverse(visitor, kParallelBottomUp, {.maxDepth = kMaxDepth - 1});
 }
 template <class TraitsT> bool Container<TraitsT>::checkBranchSizes(bool verbose) const {
   return TileTree3D::checkBranchSizes(*this, verbose);

@@ -195,6 +195,12 @@ public:
   void computeMortonPermutations(std::vector<std::vector<std::int64_t>>& perms) const;
   void sortIntoMortonOrder(std::vector<std::vector<std::int64_t>>* permutations = nullptr);
 
+  /// Writes the tiles of a depth as boxes of a Wavefront OBJ file, in three colours that tell neighbours
+  /// apart, and the materials as "tile_tree.mtl" in the current directory.
+  /// @space World space.
+  /// @error None: a file that cannot be written is left out silently.
+  void dumpObj(Ostil::String const& filename, int depth) const;
+
   // Scratch containers for parallel builders
   /// Hands out a private container; it begins with one tile at depth 0 unless `keepEmpty` is not 0.
   Container* threadLocalContainer(int keepEmpty);
@@ -279,7 +285,9 @@ private:
   std::vector<std::int64_t> findMissing(std::int64_t count, int depth,
                                         FunctionRef<int3 const*(std::int64_t)> cornerAt) const;
   /// Makes the tiles of distinct aligned corners that do not exist yet.
-  void createTiles(std::vector<int3> const& corners, int depth, TileLists* newTiles);
+  /// @param parents If given, the parent of each where it is known; -1 where it has to be searched.
+  void createTiles(std::vector<int3> const& corners, int depth, TileLists* newTiles,
+                   std::vector<std::int64_t> const* parents = nullptr);
   /// Hangs roots deeper than `depth` below roots of `depth` that hold them.
   void adoptDeeperRoots(int depth);
   /// Takes a tile or its branch out of the tree; returns how many tiles died.

@@ -62,7 +62,8 @@ Container<TraitsT>::findMissing(std::int64_t count, int depth,
 }
 
 template <class TraitsT>
-void Container<TraitsT>::createTiles(std::vector<int3> const& corners, int depth, TileLists* newTiles) {
+void Container<TraitsT>::createTiles(std::vector<int3> const& corners, int depth, TileLists* newTiles,
+                                     std::vector<std::int64_t> const* parents) {
   auto const count = static_cast<std::int64_t>(corners.size());
   if (count == 0) return;
   Counts const before = m_data->m_tileCounts;
@@ -83,10 +84,14 @@ void Container<TraitsT>::createTiles(std::vector<int3> const& corners, int depth
       std::int64_t const index = first + n;
       std::int64_t parent = -1;
       TreeIndex nearest;
-      if (depth > 0) {
+      if (parents && (*parents)[static_cast<std::size_t>(n)] >= 0) {
+        // Each slot belongs to exactly one tile: no two workers write the same.
+        parent = (*parents)[static_cast<std::size_t>(n)];
+        TileType& above = editTile({parent, depth - 1});
+        above.childIndex(above.childIJK(p)) = index;
+      } else if (depth > 0) {
         TileType const& above = accessor.tile(p, depth - 1, false);
         if (above.valid() && above.depth() == depth - 1) {
-          // Each slot belongs to exactly one tile: no two workers write the same.
           parent = above.index();
           editTile(above.treeIndex()).childIndex(above.childIJK(p)) = index;
         } else if (above.valid()) {
@@ -136,16 +141,54 @@ template <class TraitsT>
 void Container<TraitsT>::refineInternal(Container const& source, bool last, TileLists* newTiles) {
   if (&source != this) {
     tilesAdded();
+    // For each source tile of the depth above, and of this one, the index of its counterpart here. A tile
+    // with a parent in the source is found through the parent's counterpart, without a search.
+    std::vector<std::int64_t> above, here;
     for (int d = 0; d <= kMaxDepth; ++d) {
       auto const& tiles = source.m_data->tiles(d);
-      auto const missing = findMissing(
-          tiles.size(), d, [&](std::int64_t n) { return tiles[n].valid() ? &tiles[n].tijk() : nullptr; });
+      here.assign(static_cast<std::size_t>(tiles.size()), -1);
+      struct Missing {
+        std::int64_t index, parent;
+      };
+      std::vector<std::vector<Missing>> parts(static_cast<std::size_t>(
+          tiles.size() >= Internal::kParallelTiles ? chunkCount(0, tiles.size(), Internal::kRefineGrain)
+                                                   : 1));
+      Internal::refinePass(tiles.size(), [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+        Container const& tree = *this;
+        auto const accessor = tree.tileAccessor();
+        for (std::int64_t n = begin; n < end; ++n) {
+          TileType const& wanted = tiles[n];
+          if (!wanted.valid()) continue;
+          std::int64_t parent = -1, found = -1;
+          if (wanted.isRoot()) {
+            TreeIndex const at = accessor.treeIndex(wanted.ti(), wanted.tj(), wanted.tk(), d, false);
+            if (at.depth == d) found = at.index;
+          } else {
+            parent = above[static_cast<std::size_t>(wanted.parentIndex())];
+            TileType const& over = tree.tile(parent, d - 1);
+            found = over.childIndex(over.childIJK(wanted));
+          }
+          if (found >= 0)
+            here[static_cast<std::size_t>(n)] = found;
+          else
+            parts[static_cast<std::size_t>(chunk)].push_back({n, parent});
+        }
+      });
       Internal::refineCheckpoint();
+      // Chunks are consecutive: new tiles lie in the order of the source.
       std::vector<int3> corners;
-      corners.reserve(missing.size());
-      for (std::int64_t const n : missing) corners.push_back(tiles[n].tijk());
-      createTiles(corners, d, newTiles);
+      std::vector<std::int64_t> parents;
+      std::int64_t const first = tileCount(d);
+      for (auto const& part : parts) {
+        for (Missing const& missing : part) {
+          here[static_cast<std::size_t>(missing.index)] = first + static_cast<std::int64_t>(corners.size());
+          corners.push_back(tiles[missing.index].tijk());
+          parents.push_back(missing.parent);
+        }
+      }
+      createTiles(corners, d, newTiles, &parents);
       Internal::refineCheckpoint();
+      above.swap(here);
     }
   }
   if (last) setBranchSizes();

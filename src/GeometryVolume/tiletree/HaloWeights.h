@@ -17,7 +17,7 @@ struct HaloCompression {
   std::uint8_t sameDepthBits = 5; ///< count of directions served at the tile's own depth
   std::uint8_t coarserBits = 6;   ///< count of weighted entries from coarser tiles
 
-  HaloCompression();
+  VLN_API HaloCompression();
 };
 
 /// The table.

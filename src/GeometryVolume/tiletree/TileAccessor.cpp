@@ -86,6 +86,7 @@ TreeIndex ConstTileAccessorOf<TraitsT>::find(int i, int j, int k, int depth, boo
 template <class TraitsT>
 auto ConstTileAccessorOf<TraitsT>::tileNeighbor(TileType const& t, NeighborDirection n) const
     -> TileType const& {
+  if (t.depth() < 0 || t.index() < 0) return invalidTile();
   if (auto const* table = m_container->neighborData()) {
     TreeIndex const at = (*table)[static_cast<std::size_t>(t.depth())][static_cast<std::size_t>(t.index())]
                                  [static_cast<std::size_t>(n)];
@@ -108,6 +109,7 @@ auto ConstTileAccessorOf<TraitsT>::tileNeighbor(TileType const& t, int di, int d
 template <class TraitsT>
 void ConstTileAccessorOf<TraitsT>::tileNeighbors(TileType const& t, std::vector<TreeIndex>& list, int depth,
                                                  bool recursive) const {
+  if (!t.valid()) return;
   NeighborSearch<TraitsT> search(*this, list);
   if (recursive)
     search.aroundLeafVoxels(t);

@@ -63,6 +63,7 @@ public:
 
   // Neighbours
   /// The tile next to `t` at its depth, or the deepest one above that holds the place; the invalid tile else.
+  /// @edges The invalid tile has no neighbours.
   TileType const& tileNeighbor(TileType const& t, NeighborDirection n) const;
   /// The tile at `t`'s corner plus (di, dj, dk) tile widths of `depth`.
   TileType const& tileNeighbor(TileType const& t, int di, int dj, int dk, int depth, bool exact) const;

@@ -13,8 +13,10 @@
 
 namespace VLN::TileTree3D {
 
-/// Neighbours of a tile with the number of levels that each is coarser.
+/// Neighbours of a tile with the number of levels that each is coarser. A dead tile has none.
 template <class TraitsT> struct TileHalo {
+  TileHalo() { levelDifference.fill(-1); }
+
   std::array<TreeIndex, kNeighborCount> neighbors;
   std::array<std::int8_t, kNeighborCount> levelDifference; ///< 0 same depth, -1 no tile
 };

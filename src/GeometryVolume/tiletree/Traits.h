@@ -14,6 +14,8 @@
 // Every grid of tiles is anchored at kMinTileCoord, not at 0.
 #pragma once
 
+#include "GeometryVolume/core/Export.h"
+
 #include <array>
 #include <cstddef>
 #include <cstdint>
@@ -22,7 +24,8 @@ namespace VLN::TileTree3D {
 
 __extension__ using DoubleWord = unsigned __int128;
 
-template <int TileWidth, int TileDataWidth, int, int> struct Traits {
+// Exported, or every template over it would stay hidden in the library.
+template <int TileWidth, int TileDataWidth, int, int> struct VLN_API Traits {
   static constexpr int kTileWidth = TileWidth;
   static constexpr int kTileDataWidth = TileDataWidth;
   static constexpr int kTW = TileWidth;

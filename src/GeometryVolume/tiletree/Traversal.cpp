@@ -45,6 +45,9 @@ template <class TraitsT> constexpr std::int64_t kSplitThreshold = 2 * TraitsT::k
 /// Branches to make before the rest runs in parallel: enough to balance, few enough to keep copies cheap.
 constexpr std::size_t kBranches = 512;
 
+/// More items than any range has, and few enough to count with.
+constexpr std::uint64_t kMaxGrain = std::uint64_t(1) << 48;
+
 /// Chunks of one depth whose results are joined in order.
 constexpr std::int64_t kJoinedChunks = 256;
 
@@ -66,7 +69,7 @@ TraversalEngine<IsConst, TraitsT>::TraversalEngine(ContainerRef container, Visit
   m_range.maxDepth = std::min(range.maxDepth, TraitsT::kMaxDepth);
   m_range.voxelBegin = std::clamp(range.voxelBegin, 0, TraitsT::kTW);
   m_range.voxelEnd = std::clamp(range.voxelEnd, m_range.voxelBegin, TraitsT::kTW);
-  m_range.grain = std::max<std::uint64_t>(range.grain, 1);
+  m_range.grain = std::clamp<std::uint64_t>(range.grain, 1, kMaxGrain);
   m_wholeTiles = m_range.voxelBegin == 0 && m_range.voxelEnd == TraitsT::kTW;
 }
 

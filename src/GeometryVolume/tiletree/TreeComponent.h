@@ -2,6 +2,7 @@
 #pragma once
 
 #include "GeometryVolume/core/Component.h"
+#include "GeometryVolume/core/LoggerHooks.h"
 #include "GeometryVolume/tiletree/TreeIndex.h"
 
 namespace VLN::TileTree3D {
@@ -34,6 +35,19 @@ public:
   /// Name of the tree component that this component belongs to.
   Ostil::String const& owner() const { return m_owner; }
   void setOwner(Ostil::String const& name) { m_owner = name; }
+
+protected:
+  /// For classes whose memUse() follows pointers: a report that another thread writes leaves the object's size
+  /// out until it is told that the object is complete.
+  struct Incomplete {};
+  Component(Ostil::String const& name, Incomplete)
+      : VLN::Component(name) {
+    objectIncomplete(this);
+  }
+  Component(Component const& other, Incomplete)
+      : Component(other) {
+    objectIncomplete(this);
+  }
 
 private:
   Ostil::String m_owner;

@@ -1,0 +1,312 @@
+#include "GeometryVolume/channels/ElementReTile.h"
+
+#include "GeometryVolume/channels/UpdateDispatch.h"
+#include "GeometryVolume/core/ElementTypes.h"
+#include "GeometryVolume/core/Numeric.h"
+#include "GeometryVolume/core/Parallel.h"
+#include "GeometryVolume/tiletree/Visitor.h"
+
+#if VLN_HAS_ELEMENT_FLOAT3
+
+#include <algorithm>
+#include <cmath>
+#include <optional>
+#include <tuple>
+
+namespace VLN::TileTree3D {
+
+namespace {
+
+constexpr float kReach = 5.368709e+08f;
+constexpr std::int64_t kTilesOfARange = 50;
+constexpr std::int64_t kDropped = -1, kWaiting = -2;
+
+template <class TraitsT> using PositionsOf = Channel<TraitsT, float3, TraitsT::kTileDataWidth, 0>;
+
+/// What a scan of some tiles found.
+struct Found {
+  std::vector<ElementToFrom> moves;
+  std::vector<std::uint64_t> waiting; // positions in `moves` whose tile does not exist yet
+  std::vector<int3> missing;          // corners of those tiles
+
+  void append(Found const& b) {
+    std::uint64_t const offset = moves.size();
+    moves.insert(moves.end(), b.moves.begin(), b.moves.end());
+    for (std::uint64_t const at : b.waiting) waiting.push_back(offset + at);
+    missing.insert(missing.end(), b.missing.begin(), b.missing.end());
+  }
+};
+
+/// The positions on an axis that stay in a tile.
+struct StayRange {
+  double low, high;
+  bool holds(float q) const { return (double(q) >= low) & (double(q) < high); }
+};
+
+template <class TraitsT>
+void scanTile(Tile<TraitsT, TraitsT::kTileSize> const& tile, PositionsOf<TraitsT> const& positions, float s,
+              ConstTileAccessorOf<TraitsT> const& accessor, Found& found) {
+  auto const data = positions.tileData(tile.treeIndex());
+  float3 const* const points = data.data()->data();
+  int const count = data.size();
+  int const depth = tile.depth();
+
+  // Within the reach, q lies in the tile exactly when floor(q) does.
+  StayRange stay[3];
+  for (int a = 0; a < 3; ++a) {
+    double const low = tile.tijk()[a], high = low + tile.tileVoxelWidth();
+    stay[a] = {std::max(low, double(std::nextafter(-kReach, 0.0f))), std::min(high, double(kReach))};
+  }
+  for (int n = 0; n < count; ++n) {
+    float3 const q{points[n].x * s, points[n].y * s, points[n].z * s};
+    if (stay[0].holds(q.x) & stay[1].holds(q.y) & stay[2].holds(q.z)) continue;
+    std::int64_t to = kDropped;
+    // Written so that what is no number is out of reach.
+    if (std::abs(q.x) < kReach && std::abs(q.y) < kReach && std::abs(q.z) < kReach) {
+      int3 corner;
+      for (int a = 0; a < 3; ++a) corner[a] = TraitsT::align(toIntFloor(q[a]), depth);
+      TreeIndex const there = accessor.treeIndex(corner.x, corner.y, corner.z, depth, true);
+      if (there.valid()) {
+        to = there.index;
+      } else {
+        to = kWaiting;
+        found.waiting.push_back(found.moves.size());
+        if (found.missing.empty() || found.missing.back() != corner) found.missing.push_back(corner);
+      }
+    }
+    found.moves.push_back({to, tile.index(), n, depth});
+  }
+}
+
+template <class TraitsT>
+Found scanDepth(Container<TraitsT> const& tree, PositionsOf<TraitsT> const& positions, int depth) {
+  float const s = 1.0f / tree.voxelSize();
+  std::int64_t const tiles = std::min(tree.tileCount(depth), positions.tileCount(depth));
+  std::vector<Found> parts(static_cast<std::size_t>(chunkCount(0, tiles, kTilesOfARange)));
+  parallelChunks(0, tiles, kTilesOfARange, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+    auto const accessor = tree.tileAccessor();
+    for (std::int64_t n = begin; n < end; ++n) {
+      auto const& tile = tree.tile(n, depth);
+      if (tile.valid()) scanTile(tile, positions, s, accessor, parts[static_cast<std::size_t>(chunk)]);
+    }
+  });
+  // Chunks are consecutive: the moves are sorted by source.
+  Found all;
+  std::size_t count = 0;
+  for (Found const& part : parts) count += part.moves.size();
+  all.moves.reserve(count);
+  for (Found const& part : parts) all.append(part);
+  return all;
+}
+
+/// Fills the scratch tree with the listed tiles and those between them and its first tile.
+template <class TraitsT>
+void collectTiles(Container<TraitsT>& scratch, typename Container<TraitsT>::TileLists& corners) {
+  auto const less = [](int3 const& a, int3 const& b) {
+    return std::tie(a.x, a.y, a.z) < std::tie(b.x, b.y, b.z);
+  };
+  for (int d = TraitsT::kMaxDepth; d > 0; --d) {
+    auto& list = corners[static_cast<std::size_t>(d)];
+    std::sort(list.begin(), list.end(), less);
+    list.resize(static_cast<std::uint64_t>(std::unique(list.begin(), list.end()) - list.begin()));
+    auto& above = corners[static_cast<std::size_t>(d - 1)];
+    for (int3 const& p : list) {
+      int3 const corner{TraitsT::align(p.x, d - 1), TraitsT::align(p.y, d - 1), TraitsT::align(p.z, d - 1)};
+      if (above.empty() || above.back() != corner) above.append(corner);
+    }
+  }
+  scratch.tileAccessor().addTiles(corners);
+}
+
+/// Settles the waiting points, now that their tiles exist.
+template <class TraitsT>
+void settle(Container<TraitsT> const& tree, PositionsOf<TraitsT> const& positions, int depth, Found& found) {
+  parallelFor(0, static_cast<std::int64_t>(found.waiting.size()), [&](std::int64_t begin, std::int64_t end) {
+    auto const accessor = tree.tileAccessor();
+    for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+      ElementToFrom& move = found.moves[found.waiting[n]];
+      float3 const& p = positions[ElementTreeIndex(move.from, move.fromDepth, move.fromElement)];
+      // The position as it stands: the voxel size plays no part here.
+      TreeIndex const there =
+          accessor.treeIndex(toIntFloor(p.x), toIntFloor(p.y), toIntFloor(p.z), depth, true);
+      move.to = there.valid() ? there.index : kDropped;
+    }
+  });
+}
+
+/// Finds the tiles that neither hold points nor have a descendant that does.
+template <class TraitsT> class DetermineActiveTilesVisitor final : public Visitor<Container<TraitsT>> {
+  using Base = Visitor<Container<TraitsT>>;
+
+public:
+  using TileType = typename Container<TraitsT>::TileType;
+  /// For each depth, a byte for each child slot of each tile.
+  using ChildMasks = std::vector<std::vector<std::uint8_t>>;
+
+  DetermineActiveTilesVisitor(PositionsOf<TraitsT> const& positions, ChildMasks& masks)
+      : m_positions(positions)
+      , m_masks(masks)
+      , m_inactive(static_cast<std::size_t>(TraitsT::kDepths)) {
+    this->setBeginTileOverridden(false);
+  }
+  using Base::endTile;
+  void endTile(TileType const& tile) override {
+    bool active =
+        tile.index() < m_positions.tileCount(tile.depth()) && m_positions.elementCount(tile.treeIndex()) > 0;
+    if (!active && !tile.isLeaf()) {
+      // The children have reported: a parent's end comes after theirs.
+      auto const* mask = childMask(tile.treeIndex());
+      active = std::any_of(mask, mask + TraitsT::kTileSize, [](std::uint8_t child) { return child != 0; });
+    }
+    if (!active)
+      m_inactive[static_cast<std::size_t>(tile.depth())].push_back(tile.index());
+    else if (!tile.isRoot())
+      childMask(tile.parentTreeIndex())[slotInParent(tile)] = 1;
+  }
+  void join(Base const& other) override {
+    auto const& b = static_cast<DetermineActiveTilesVisitor const&>(other);
+    for (std::size_t d = 0; d < m_inactive.size(); ++d)
+      m_inactive[d].insert(m_inactive[d].end(), b.m_inactive[d].begin(), b.m_inactive[d].end());
+  }
+  DetermineActiveTilesVisitor* clone() const override {
+    return new DetermineActiveTilesVisitor(m_positions, m_masks);
+  }
+  TileIndexLists& inactive() { return m_inactive; }
+
+private:
+  std::uint8_t* childMask(TreeIndex const& tile) const {
+    return m_masks[static_cast<std::size_t>(tile.depth)].data() + tile.index * TraitsT::kTileSize;
+  }
+  static int slotInParent(TileType const& tile) {
+    int3 const p = tile.parentIJK();
+    return TileType::slotOf(p.x, p.y, p.z);
+  }
+
+  PositionsOf<TraitsT> const& m_positions;
+  ChildMasks& m_masks;
+  TileIndexLists m_inactive;
+};
+
+template <class TraitsT>
+TileIndexLists tilesWithoutPoints(Container<TraitsT> const& tree, PositionsOf<TraitsT> const& positions) {
+  typename DetermineActiveTilesVisitor<TraitsT>::ChildMasks masks(
+      static_cast<std::size_t>(TraitsT::kMaxDepth));
+  for (int d = 0; d < TraitsT::kMaxDepth; ++d)
+    masks[static_cast<std::size_t>(d)].resize(
+        static_cast<std::size_t>(tree.tileCount(d) * TraitsT::kTileSize));
+  DetermineActiveTilesVisitor<TraitsT> visitor(positions, masks);
+  TraversalRange range;
+  range.maxDepth = positions.depth();
+  tree.reduce(visitor, kParallelDepthFirst, range);
+  return std::move(visitor.inactive());
+}
+
+/// Takes a component that lies in the object out of it for as long as this lives.
+class SetAside {
+public:
+  SetAside(VLN::Component const& component, VLN::Object& object)
+      : m_object(object) {
+    for (auto const& name : object.componentRange()) {
+      m_component = object.component(name);
+      if (m_component.get() == &component) {
+        m_name = name;
+        object.setProperty(name, Ostil::Any());
+        return;
+      }
+    }
+    m_component = nullptr;
+  }
+  ~SetAside() {
+    if (m_component) m_object.setProperty(m_name, Ostil::Any(std::move(m_component)));
+  }
+  SetAside(SetAside const&) = delete;
+  SetAside& operator=(SetAside const&) = delete;
+
+private:
+  VLN::Object& m_object;
+  Ostil::String m_name;
+  Ostil::Ptr<VLN::Component> m_component;
+};
+
+} // namespace
+
+template <class TraitsT>
+void channelElementReTile(Container<TraitsT>& tree, PointTopology<TraitsT>& topology,
+                          PositionsOf<TraitsT>& positions, VLN::Object& object, bool prune,
+                          TreeChanged changed) {
+  SetAside const aside(positions, object);
+  Container<TraitsT> const& reading = tree;
+  PositionsOf<TraitsT> const& points = positions;
+
+  // Scan. Nothing is shared that changes: the tree grows once, afterwards.
+  std::vector<Found> found(kChannelDepths);
+  typename Container<TraitsT>::TileLists missing;
+  for (int d = TraitsT::kMaxDepth; d >= 0; --d) {
+    auto const at = static_cast<std::size_t>(d);
+    if (points.elementCount(d) == 0) continue;
+    found[at] = scanDepth(reading, points, d);
+    for (int3 const& corner : found[at].missing) missing[at].append(corner);
+  }
+
+  // Grow.
+  Container<TraitsT> scratch("tmp", tree.voxelSize());
+  scratch.tileAccessor().addTile(0, 0, 0, 0);
+  if (missing != typename Container<TraitsT>::TileLists{}) collectTiles(scratch, missing);
+  if (scratch.tileCount(-1) > 1) {
+    tree.refine({&scratch}, nullptr, true);
+    topology.update(tree);
+    positions.updateTilesAdded(topology);
+    updateTilesAdded(topology, object);
+    changed(nullptr);
+  }
+
+  // Settle and move.
+  ElementMoves moves(kChannelDepths);
+  bool anyMove = false;
+  for (int d = TraitsT::kMaxDepth; d >= 0; --d) {
+    auto const at = static_cast<std::size_t>(d);
+    if (!found[at].waiting.empty()) settle(reading, points, d, found[at]);
+    moves[at] = std::move(found[at].moves);
+    anyMove |= !moves[at].empty();
+  }
+  if (anyMove) {
+    ElementOrder order;
+    DestinationTiles tiles;
+    ArrivalMap arrivals;
+    positions.computePermutation(moves, order, tiles, arrivals, true);
+    positions.updateElements(moves, order, tiles, arrivals);
+    topology.update(positions);
+    updateElements(moves, order, tiles, arrivals, topology, object);
+  } else {
+    topology.update(positions);
+  }
+  if (!prune) return;
+
+  // Prune.
+  TileIndexLists const inactive = tilesWithoutPoints(reading, points);
+  if (std::all_of(inactive.begin(), inactive.end(), [](auto const& list) { return list.empty(); })) return;
+  TileMoves removed;
+  tree.tileAccessor().removeTiles(inactive, true, &removed);
+  topology.update(tree);
+  positions.updateTilesRemoved(removed, topology);
+  topology.update(positions); // tiles have moved, and their counts with them
+  updateTilesRemoved(removed, topology, object);
+  changed(&removed);
+}
+
+template <class TraitsT>
+void channelElementReTile(Container<TraitsT>& tree, PointTopology<TraitsT>& topology,
+                          PositionsOf<TraitsT>& positions, VLN::Object& object, bool prune) {
+  channelElementReTile(tree, topology, positions, object, prune, [](TileRemovalList const*) {});
+}
+
+#define VLN_INSTANTIATE(TraitsT)                                                                             \
+  template VLN_API void channelElementReTile(Container<TraitsT>&, PointTopology<TraitsT>&,                   \
+                                             PositionsOf<TraitsT>&, VLN::Object&, bool);                     \
+  template VLN_API void channelElementReTile(Container<TraitsT>&, PointTopology<TraitsT>&,                   \
+                                             PositionsOf<TraitsT>&, VLN::Object&, bool, TreeChanged);
+VLN_FOR_EACH_SHAPE(VLN_INSTANTIATE)
+
+} // namespace VLN::TileTree3D
+
+#endif

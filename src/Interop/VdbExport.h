@@ -1,0 +1,16 @@
+// From volumes back to a .vdb file.
+#pragma once
+
+#include "Interop/VdbImport.h"
+
+namespace VLN::Interop {
+
+/// Writes the grids of volumes that importVdb() made: names, types, classes, transforms, metadata, half
+/// storage, active voxels and tiles, and values, bit for bit. The file is written beside its name and renamed
+/// when it is whole.
+/// @error FileError; what was there before stays untouched. A volume that no longer holds what its records
+/// name is told as std::runtime_error.
+VLN_API void exportVdb(std::vector<VdbVolume> const& volumes, std::string const& path,
+                       Progress const& progress = {});
+
+} // namespace VLN::Interop

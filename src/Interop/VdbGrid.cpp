@@ -1,0 +1,92 @@
+#include "Interop/VdbGridImpl.h"
+
+#include <algorithm>
+
+namespace VLN::Interop {
+
+namespace {
+
+using Velorn::Math::int3;
+
+constexpr int kMaxDepth = VdbTraits::kMaxDepth;
+constexpr int kMostRootsAnAxis = 64;
+
+void grow(IndexBox& box, IndexBox const& other) {
+  if (other.empty()) return;
+  box.grow(other.min), box.grow(other.max);
+}
+
+// Whether a comes before b along the Z-shaped curve: the axis whose coordinates differ in the highest bit
+// decides.
+bool mortonLess(int3 const& a, int3 const& b) {
+  std::uint32_t highest = 0;
+  int axis = 0;
+  for (int n = 0; n < 3; ++n) {
+    auto const differ = static_cast<std::uint32_t>(a[n]) ^ static_cast<std::uint32_t>(b[n]);
+    if (highest < differ && highest < (highest ^ differ)) highest = differ, axis = n;
+  }
+  return a[axis] < b[axis];
+}
+
+} // namespace
+
+GridSummary joinSummaries(GridSummary a, GridSummary const& b) {
+  grow(a.stored, b.stored), grow(a.active, b.active);
+  a.shallowest = std::min(a.shallowest, b.shallowest);
+  a.activeVoxels += b.activeVoxels;
+  a.activeTiles += b.activeTiles;
+  if (b.hasRange) {
+    a.minimum = a.hasRange ? std::min(a.minimum, b.minimum) : b.minimum;
+    a.maximum = a.hasRange ? std::max(a.maximum, b.maximum) : b.maximum;
+    a.hasRange = true;
+  }
+  return a;
+}
+
+std::unique_ptr<GridSource> makeGridSource(openvdb::GridBase::ConstPtr const& grid, std::string& type) {
+  type = grid->type() == "Tree_ptdataidx32_5_4_3" ? "points" : grid->type();
+  // A grid of another node configuration has the value type, but none of the nodes.
+  auto source = makeScalarSource(grid);
+  return source ? std::move(source) : makeVectorSource(grid);
+}
+
+openvdb::GridBase::Ptr makeGrid(std::string const& type, GridToWrite const& from) {
+  auto grid = makeScalarGrid(type, from);
+  return grid ? grid : makeVectorGrid(type, from);
+}
+
+int rootDepth(std::vector<GridSummary> const& grids) {
+  IndexBox box;
+  int depth = kMaxDepth;
+  for (auto const& s : grids) {
+    grow(box, s.stored);
+    depth = std::min(depth, s.shallowest);
+  }
+  if (box.empty()) return depth;
+  auto tooWide = [&](int d) {
+    for (int a = 0; a < 3; ++a) {
+      std::int64_t const first = VdbTraits::align(box.min[a], d), last = VdbTraits::align(box.max[a] - 1, d);
+      if ((last - first) / VdbTraits::width(d) + 1 > kMostRootsAnAxis) return true;
+    }
+    return false;
+  };
+  while (depth > 0 && tooWide(depth)) --depth;
+  return depth;
+}
+
+void completeCorners(TileCorners& corners, int rootDepth) {
+  auto at = [&](int depth) -> std::vector<int3>& { return corners[static_cast<std::size_t>(depth)]; };
+  // From the bottom up, each tile brings its parent.
+  for (int depth = kMaxDepth; depth >= rootDepth; --depth) {
+    std::sort(at(depth).begin(), at(depth).end(), mortonLess);
+    at(depth).erase(std::unique(at(depth).begin(), at(depth).end()), at(depth).end());
+    if (depth == rootDepth) break;
+    for (int3 const& c : at(depth)) {
+      int3 const parent{VdbTraits::align(c.x, depth - 1), VdbTraits::align(c.y, depth - 1),
+                        VdbTraits::align(c.z, depth - 1)};
+      if (at(depth - 1).empty() || at(depth - 1).back() != parent) at(depth - 1).push_back(parent);
+    }
+  }
+}
+
+} // namespace VLN::Interop

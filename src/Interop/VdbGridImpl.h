@@ -1,0 +1,108 @@
+// GridSource: a grid of any supported type, as the importer sees it.
+#pragma once
+
+#include "GeometryVolume/channels/Channel.h"
+#include "GeometryVolume/core/FunctionRef.h"
+#include "GeometryVolume/tiletree/Container.h"
+#include "GeometryVolume/topology/VoxelTopology.h"
+#include "Interop/VdbImport.h"
+#include "Interop/VdbRecord.h"
+
+#include <openvdb/openvdb.h>
+
+#include <array>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace VLN::Interop {
+
+using VdbTraits = TileTree3D::PowerOfTwoTraits;
+using VdbContainer = TileTree3D::Container<VdbTraits>;
+using VdbTopology = TileTree3D::VoxelTopology<VdbTraits>;
+using StateChannel = TileTree3D::Channel<VdbTraits, unsigned char, 4, 0>;
+
+/// Width of a node of the file's tree, of 8 (leaf), 128 and 4096 voxels, and what goes with it here.
+inline constexpr int kNodeWidths[3] = {8, 128, 4096};
+
+/// Depth of the tiles whose samples are `width` wide.
+constexpr int depthOfSamples(int width) {
+  int depth = VdbTraits::kMaxDepth;
+  for (; width > 1; width /= 2) --depth;
+  return depth;
+}
+static_assert(depthOfSamples(8) == 25 && depthOfSamples(128) == 21 && depthOfSamples(4096) == 16);
+
+/// What one grid holds, in the measures of the tree.
+struct GridSummary {
+  IndexBox stored;                       ///< leaves and active tiles, whole
+  int shallowest = VdbTraits::kMaxDepth; ///< depth that the widest active tile asks for
+  IndexBox active;
+  std::int64_t activeVoxels = 0;
+  std::int64_t activeTiles = 0;
+  double minimum = 0, maximum = 0; ///< of values, or of the lengths of vectors
+  bool hasRange = false;
+};
+
+/// Corners of tiles by depth.
+using TileCorners = std::array<std::vector<Velorn::Math::int3>, VdbTraits::kDepths>;
+
+/// Reports tiles as they are filled.
+using FilledTiles = FunctionRef<void(std::int64_t tiles)>;
+
+class GridSource {
+public:
+  virtual ~GridSource() = default;
+  virtual openvdb::GridBase const& grid() const = 0;
+  /// As reports name the type: "float", "int32", "vec3s", ...
+  virtual std::string type() const = 0;
+  virtual std::size_t bytesPerSample() const = 0;
+
+  /// Why the grid cannot be placed in the tree; nothing when it can.
+  virtual std::optional<std::string> whyNotPlaced() const = 0;
+  virtual GridSummary summarize() const = 0;
+  /// Appends the corners of the tiles that leaves and active tiles need.
+  /// @param leavesHaveTile Whether a tile as wide as a leaf stands above each leaf's quarters.
+  virtual void collectTiles(bool leavesHaveTile, TileCorners& corners) const = 0;
+  /// Corners, by depth, of tiles that inactive tiles of the file need: those whose value a reader of the tree
+  /// would not find.
+  virtual TileCorners unreadTiles(VdbContainer const& container) const = 0;
+  /// The rule by which values tell what is active, or kChannel.
+  virtual VdbActiveRule activeRule() const = 0;
+  /// A channel with the grid's values for every sample of the tree.
+  virtual Ostil::Ptr<TileTree3D::ChannelBase> makeChannel(std::string const& name,
+                                                          VdbContainer const& container,
+                                                          VdbTopology const& topology,
+                                                          FilledTiles filled) const = 0;
+  virtual Ostil::Ptr<StateChannel> makeStateChannel(std::string const& name, VdbContainer const& container,
+                                                    VdbTopology const& topology) const = 0;
+};
+
+/// Null for a type that is not supported; `type` then tells its name.
+std::unique_ptr<GridSource> makeGridSource(openvdb::GridBase::ConstPtr const& grid, std::string& type);
+
+/// What export reads of one grid.
+struct GridToWrite {
+  VdbContainer const& container;
+  TileTree3D::ChannelBase const& channel;
+  StateChannel const* state; ///< null unless the rule is kChannel
+  VdbActiveRule rule;
+};
+
+/// A grid with the values and the active states of a channel; null for an unsupported type name.
+openvdb::GridBase::Ptr makeGrid(std::string const& type, GridToWrite const& from);
+
+// The two halves of makeGridSource() and makeGrid(), compiled apart.
+std::unique_ptr<GridSource> makeScalarSource(openvdb::GridBase::ConstPtr const& grid);
+std::unique_ptr<GridSource> makeVectorSource(openvdb::GridBase::ConstPtr const& grid);
+openvdb::GridBase::Ptr makeScalarGrid(std::string const& type, GridToWrite const& from);
+openvdb::GridBase::Ptr makeVectorGrid(std::string const& type, GridToWrite const& from);
+
+/// Depth of all roots for grids with these summaries.
+int rootDepth(std::vector<GridSummary> const& grids);
+/// Adds each tile's parents down from `rootDepth`, sorts each depth along the Z-shaped curve and drops
+/// duplicates.
+void completeCorners(TileCorners& corners, int rootDepth);
+
+} // namespace VLN::Interop

@@ -1,0 +1,24 @@
+#include "GeometryVolume/core/ElementTypes.h"
+#include "Interop/VdbGridTypedImpl.h"
+
+namespace VLN::Interop {
+
+std::unique_ptr<GridSource> makeScalarSource(openvdb::GridBase::ConstPtr const& grid) {
+  return sourceAmong<openvdb::FloatGrid, openvdb::Int32Grid, openvdb::Int64Grid, openvdb::BoolGrid
+#if VLN_HAS_ELEMENT_DOUBLE
+                     ,
+                     openvdb::DoubleGrid
+#endif
+                     >(grid);
+}
+
+openvdb::GridBase::Ptr makeScalarGrid(std::string const& type, GridToWrite const& from) {
+  return gridAmong<openvdb::FloatGrid, openvdb::Int32Grid, openvdb::Int64Grid, openvdb::BoolGrid
+#if VLN_HAS_ELEMENT_DOUBLE
+                   ,
+                   openvdb::DoubleGrid
+#endif
+                   >(type, from);
+}
+
+} // namespace VLN::Interop

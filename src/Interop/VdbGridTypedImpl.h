@@ -1,0 +1,582 @@
+// TypedGrid: GridSource for one grid type, and the way back from a channel to such a grid.
+#pragma once
+
+#include "GeometryVolume/core/Parallel.h"
+#include "Interop/VdbGridImpl.h"
+
+#include <algorithm>
+#include <cmath>
+#include <cstring>
+#include <map>
+
+namespace VLN::Interop {
+
+using openvdb::Coord;
+using TileTree3D::TreeIndex;
+using Velorn::Math::int3;
+
+inline int3 toInt3(Coord const& c) { return {c.x(), c.y(), c.z()}; }
+inline Coord toCoord(int3 const& c) { return {c.x, c.y, c.z}; }
+
+// --- Values ---
+
+template <class T> struct ElementOf { using type = T; };
+template <> struct ElementOf<bool> { using type = unsigned char; };
+template <class S> struct ElementOf<openvdb::math::Vec3<S>> { using type = Velorn::Math::Vec3<S>; };
+
+template <class T> T toElement(T v) { return v; }
+inline unsigned char toElement(bool v) { return v ? 1 : 0; }
+template <class S> Velorn::Math::Vec3<S> toElement(openvdb::math::Vec3<S> const& v) {
+  return {v[0], v[1], v[2]};
+}
+
+template <class V, class T> V fromElement(T const& v) {
+  if constexpr (std::is_same_v<V, bool>)
+    return v != 0;
+  else if constexpr (std::is_same_v<V, T>)
+    return v;
+  else
+    return V(v.x, v.y, v.z);
+}
+
+/// Equal bit for bit, so that NaN and the sign of zero count.
+template <class V> bool sameBits(V const& a, V const& b) { return std::memcmp(&a, &b, sizeof(V)) == 0; }
+
+/// Value, or length of a vector.
+template <class T> double magnitude(T const& v) {
+  if constexpr (std::is_arithmetic_v<T>)
+    return static_cast<double>(v);
+  else
+    return std::sqrt(double(v[0]) * double(v[0]) + double(v[1]) * double(v[1]) + double(v[2]) * double(v[2]));
+}
+
+template <class V> bool followsRule(VdbActiveRule rule, V const& value, V const& background) {
+  if (rule == VdbActiveRule::kNotBackground) return !sameBits(value, background);
+  if constexpr (std::is_floating_point_v<V>)
+    return std::abs(value) < std::abs(background);
+  else
+    return false;
+}
+
+// --- Import ---
+
+/// Calls `f(corner, width, value, active)` for each tile of the file's tree, active or not.
+template <class TreeT, class F> void forEachTile(TreeT const& tree, F const& f) {
+  using Upper = typename TreeT::RootNodeType::ChildNodeType;
+  using Lower = typename Upper::ChildNodeType;
+  for (auto it = tree.root().cbeginValueAll(); it; ++it)
+    f(it.getCoord(), kNodeWidths[2], *it, it.isValueOn());
+  std::vector<Upper const*> uppers;
+  tree.getNodes(uppers);
+  for (Upper const* node : uppers)
+    for (auto it = node->cbeginValueAll(); it; ++it) f(it.getCoord(), kNodeWidths[1], *it, it.isValueOn());
+  std::vector<Lower const*> lowers;
+  tree.getNodes(lowers);
+  for (Lower const* node : lowers)
+    for (auto it = node->cbeginValueAll(); it; ++it) f(it.getCoord(), kNodeWidths[0], *it, it.isValueOn());
+}
+
+/// As forEachTile(), active ones alone.
+template <class TreeT, class F> void forEachActiveTile(TreeT const& tree, F const& f) {
+  using Upper = typename TreeT::RootNodeType::ChildNodeType;
+  using Lower = typename Upper::ChildNodeType;
+  for (auto it = tree.root().cbeginValueOn(); it; ++it) f(it.getCoord(), kNodeWidths[2], *it);
+  std::vector<Upper const*> uppers;
+  tree.getNodes(uppers);
+  for (Upper const* node : uppers)
+    for (auto it = node->cbeginValueOn(); it; ++it) f(it.getCoord(), kNodeWidths[1], *it);
+  std::vector<Lower const*> lowers;
+  tree.getNodes(lowers);
+  for (Lower const* node : lowers)
+    for (auto it = node->cbeginValueOn(); it; ++it) f(it.getCoord(), kNodeWidths[0], *it);
+}
+
+inline bool fitsTheTree(Coord const& corner, int width) {
+  for (int a = 0; a < 3; ++a) {
+    // The domain's ends are multiples of every node's width, so a corner inside means that all is.
+    if (!VdbTraits::inDomain(corner[a]) || (corner[a] & (width - 1)) != 0) return false;
+  }
+  return true;
+}
+
+inline void growBy(IndexBox& box, Coord const& corner, int width) {
+  box.grow(toInt3(corner));
+  box.grow(toInt3(corner.offsetBy(width)));
+}
+
+inline int3 alignTo(int3 const& c, int depth) {
+  return {VdbTraits::align(c.x, depth), VdbTraits::align(c.y, depth), VdbTraits::align(c.z, depth)};
+}
+
+GridSummary joinSummaries(GridSummary a, GridSummary const& b);
+
+template <class GridT> class TypedGrid final : public GridSource {
+public:
+  using TreeT = typename GridT::TreeType;
+  using Leaf = typename TreeT::LeafNodeType;
+  using Value = typename GridT::ValueType;
+  using Element = typename ElementOf<Value>::type;
+  using ChannelT = TileTree3D::Channel<VdbTraits, Element, 4, 0>;
+
+  explicit TypedGrid(typename GridT::ConstPtr grid)
+      : m_grid(std::move(grid)) {
+    m_grid->tree().getNodes(m_leaves);
+  }
+
+  openvdb::GridBase const& grid() const override { return *m_grid; }
+  std::string type() const override { return m_grid->valueType(); }
+  std::size_t bytesPerSample() const override { return sizeof(Element); }
+
+  std::optional<std::string> whyNotPlaced() const override {
+    bool ok = true;
+    for (Leaf const* leaf : m_leaves) ok = ok && fitsTheTree(leaf->origin(), Leaf::DIM);
+    forEachActiveTile(m_grid->tree(),
+                      [&](Coord const& c, int width, Value const&) { ok = ok && fitsTheTree(c, width); });
+    if (ok) return std::nullopt;
+    return "its voxels lie outside " + std::to_string(VdbTraits::kMinTileCoord) + ".." +
+           std::to_string(VdbTraits::kMaxTileCoord) + " or off the lattice of its nodes";
+  }
+
+  GridSummary summarize() const override {
+    GridSummary summary = parallelReduce(
+        0, std::int64_t(m_leaves.size()), 256, GridSummary{},
+        [&](std::int64_t begin, std::int64_t end) {
+          GridSummary s;
+          for (std::int64_t n = begin; n < end; ++n) {
+            Leaf const& leaf = *m_leaves[static_cast<std::size_t>(n)];
+            growBy(s.stored, leaf.origin(), Leaf::DIM);
+            s.activeVoxels += std::int64_t(leaf.onVoxelCount());
+            for (auto it = leaf.cbeginValueOn(); it; ++it) {
+              growRange(s, *it);
+              growBy(s.active, it.getCoord(), 1);
+            }
+          }
+          return s;
+        },
+        joinSummaries);
+    forEachActiveTile(m_grid->tree(), [&](Coord const& c, int width, Value const& value) {
+      growBy(summary.stored, c, width);
+      growBy(summary.active, c, width);
+      summary.shallowest = std::min(summary.shallowest, depthOfSamples(width));
+      summary.activeVoxels += std::int64_t(width) * width * width;
+      ++summary.activeTiles;
+      growRange(summary, value);
+    });
+    return summary;
+  }
+
+  void collectTiles(bool leavesHaveTile, TileCorners& corners) const override {
+    auto at = [&](int depth) -> std::vector<int3>& { return corners[static_cast<std::size_t>(depth)]; };
+    constexpr int kLeafDepth = VdbTraits::kMaxDepth - 1; // its tiles are as wide as a leaf
+    constexpr std::int64_t kGrain = 256;
+    auto const count = std::int64_t(m_leaves.size());
+    std::vector<std::vector<int3>> parts(static_cast<std::size_t>(chunkCount(0, count, kGrain)));
+    parallelChunks(0, count, kGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+      auto& part = parts[static_cast<std::size_t>(chunk)];
+      for (std::int64_t n = begin; n < end; ++n) {
+        Leaf const& leaf = *m_leaves[static_cast<std::size_t>(n)];
+        for (int slot = 0; slot < 8; ++slot) {
+          Coord const c = leaf.origin().offsetBy(4 * (slot & 1), 4 * (slot >> 1 & 1), 4 * (slot >> 2));
+          if (!isSpare(leaf, c, leavesHaveTile)) part.push_back(toInt3(c));
+        }
+      }
+    });
+    for (auto const& part : parts)
+      at(VdbTraits::kMaxDepth).insert(at(VdbTraits::kMaxDepth).end(), part.begin(), part.end());
+    if (leavesHaveTile)
+      for (Leaf const* leaf : m_leaves) at(kLeafDepth).push_back(toInt3(leaf->origin()));
+    forEachActiveTile(m_grid->tree(), [&](Coord const& c, int width, Value const&) {
+      at(depthOfSamples(width)).push_back(alignTo(toInt3(c), depthOfSamples(width)));
+    });
+  }
+
+  TileCorners unreadTiles(VdbContainer const& container) const override {
+    TileCorners corners;
+    auto tiles = container.tileAccessor();
+    auto grid = m_grid->getConstAccessor();
+    bbox3 bounds;
+    container.tileSpaceBounds(bounds);
+    forEachTile(m_grid->tree(), [&](Coord const& c, int width, Value const& value, bool active) {
+      if (active || !VdbTraits::inDomain(c.x(), c.y(), c.z())) return;
+      auto const& tile = tiles.tile(c.x(), c.y(), c.z(), VdbTraits::kMaxDepth, false);
+      if (tile.valid()) {
+        int const sample = tile.voxelDataWidth();
+        if (sample <= width) return;
+        int3 const corner = tile.childDataTIJK(tile.childDataIJK(toInt3(c)));
+        if (sameBits(value, Value(grid.getValue(toCoord(corner))))) return;
+      } else if (sameBits(value, Value(m_grid->background()))) {
+        return;
+      }
+      if (!fitsTheTree(c, width)) return;
+      int const depth = depthOfSamples(width);
+      corners[static_cast<std::size_t>(depth)].push_back(alignTo(toInt3(c), depth));
+    });
+    return corners;
+  }
+
+  VdbActiveRule activeRule() const override {
+    Value const background = m_grid->background();
+    bool activeTile = false;
+    forEachActiveTile(m_grid->tree(), [&](Coord const&, int, Value const&) { activeTile = true; });
+    if (activeTile) return VdbActiveRule::kChannel;
+    for (VdbActiveRule const rule : {VdbActiveRule::kNotBackground, VdbActiveRule::kInsideBand}) {
+      bool holds = parallelReduce(
+          0, std::int64_t(m_leaves.size()), 256, true,
+          [&](std::int64_t begin, std::int64_t end) {
+            for (std::int64_t n = begin; n < end; ++n)
+              for (auto it = m_leaves[static_cast<std::size_t>(n)]->cbeginValueAll(); it; ++it)
+                if (it.isValueOn() != followsRule<Value>(rule, *it, background)) return false;
+            return true;
+          },
+          [](bool a, bool b) { return a && b; });
+      if (holds)
+        forEachTile(m_grid->tree(), [&](Coord const&, int, Value const& value, bool) {
+          holds = holds && !followsRule<Value>(rule, value, background);
+        });
+      if (holds) return rule;
+    }
+    return VdbActiveRule::kChannel;
+  }
+
+  Ostil::Ptr<TileTree3D::ChannelBase> makeChannel(std::string const& name, VdbContainer const& container,
+                                                  VdbTopology const& topology,
+                                                  FilledTiles filled) const override {
+    Element const background = toElement(Value(m_grid->background()));
+    auto channel = makeOn<ChannelT>(name, background, topology);
+    constexpr std::int64_t kPart = 1 << 16;
+    for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth)
+      for (std::int64_t first = 0; first < container.tileCount(depth); first += kPart) {
+        std::int64_t const last = std::min(first + kPart, container.tileCount(depth));
+        parallelFor(first, last,
+                    [&](std::int64_t begin, std::int64_t end) {
+                      auto accessor = m_grid->getConstAccessor();
+                      for (std::int64_t n = begin; n < end; ++n)
+                        fillTile(accessor, container.tile(n, depth).tijk(), depth,
+                                 &*channel->tileData(n, depth).begin());
+                    },
+                    {.grain = 256});
+        filled(last - first);
+      }
+    return channel;
+  }
+
+  Ostil::Ptr<StateChannel> makeStateChannel(std::string const& name, VdbContainer const& container,
+                                            VdbTopology const& topology) const override {
+    auto channel = makeOn<StateChannel>(name, static_cast<unsigned char>(0), topology);
+    for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth)
+      parallelFor(0, container.tileCount(depth),
+                  [&](std::int64_t begin, std::int64_t end) {
+                    auto accessor = m_grid->getConstAccessor();
+                    for (std::int64_t n = begin; n < end; ++n)
+                      fillState(accessor, container.tile(n, depth).tijk(), depth,
+                                &*channel->tileData(n, depth).begin());
+                  },
+                  {.grain = 256});
+    return channel;
+  }
+
+private:
+  using bbox3 = Velorn::Math::bbox<int3, int>;
+
+  static void growRange(GridSummary& s, Value const& value) {
+    double const v = magnitude(value);
+    if (std::isnan(v)) return;
+    s.minimum = s.hasRange ? std::min(s.minimum, v) : v;
+    s.maximum = s.hasRange ? std::max(s.maximum, v) : v;
+    s.hasRange = true;
+  }
+
+  // Whether a quarter block of a leaf can go: see the rule in VdbImport.h. A coarser tile at the place holds
+  // the block's own values; without one a reader finds the background.
+  bool isSpare(Leaf const& leaf, Coord const& corner, bool underTile) const {
+    Value const first = underTile ? Value(leaf.getValue(corner)) : Value(m_grid->background());
+    for (int i = 0; i < 4; ++i)
+      for (int j = 0; j < 4; ++j)
+        for (int k = 0; k < 4; ++k) {
+          openvdb::Index const n = Leaf::coordToOffset(corner.offsetBy(i, j, k));
+          if (leaf.isValueOn(n) || !sameBits(Value(leaf.getValue(n)), first)) return false;
+        }
+    return true;
+  }
+
+  template <class C, class T>
+  static Ostil::Ptr<C> makeOn(std::string const& name, T const& value, VdbTopology const& topology) {
+    auto channel =
+        Ostil::makePtr<C>(name, &value, TileTree3D::kInitializeNone, false, true, 0, VdbTraits::kMaxDepth);
+    channel->setTargetName(topology.name());
+    channel->setOwner(topology.getTargetName());
+    channel->update(topology);
+    return channel;
+  }
+
+  using Accessor = typename GridT::ConstAccessor;
+
+  static void fillTile(Accessor& grid, int3 const& corner, int depth, Element* samples) {
+    int const step = VdbTraits::width(depth) / VdbTraits::kTDW;
+    Coord const origin = toCoord(corner);
+    if (step == 1) {
+      // The tile lies in one leaf or in one tile of the file's tree.
+      Leaf const* leaf = grid.probeConstLeaf(origin);
+      if (!leaf) {
+        std::fill(samples, samples + VdbTraits::kTileDataSize, toElement(Value(grid.getValue(origin))));
+        return;
+      }
+      openvdb::Index const first = Leaf::coordToOffset(origin);
+      for (openvdb::Index k = 0; k < 4; ++k)
+        for (openvdb::Index j = 0; j < 4; ++j)
+          for (openvdb::Index i = 0; i < 4; ++i)
+            *samples++ = toElement(Value(leaf->getValue(first + 64 * i + 8 * j + k)));
+      return;
+    }
+    for (int k = 0; k < 4; ++k)
+      for (int j = 0; j < 4; ++j)
+        for (int i = 0; i < 4; ++i)
+          *samples++ = toElement(Value(grid.getValue(origin.offsetBy(i * step, j * step, k * step))));
+  }
+
+  static void fillState(Accessor& grid, int3 const& corner, int depth, unsigned char* states) {
+    Coord const origin = toCoord(corner);
+    if (depth == VdbTraits::kMaxDepth) {
+      Leaf const* leaf = grid.probeConstLeaf(origin);
+      if (!leaf) return;
+      openvdb::Index const first = Leaf::coordToOffset(origin);
+      for (openvdb::Index k = 0; k < 4; ++k)
+        for (openvdb::Index j = 0; j < 4; ++j)
+          for (openvdb::Index i = 0; i < 4; ++i)
+            *states++ = static_cast<unsigned char>(
+                kVdbStateLeaf | (leaf->isValueOn(first + 64 * i + 8 * j + k) ? kVdbStateActive : 0));
+      return;
+    }
+    int const step = VdbTraits::width(depth) / VdbTraits::kTDW;
+    // Depth of the file's tree whose tiles are as wide as a sample: 2, 1 or 0 for 8, 128 or 4096.
+    int const level = step == kNodeWidths[0]   ? 2
+                      : step == kNodeWidths[1] ? 1
+                      : step == kNodeWidths[2] ? 0
+                                               : -2;
+    if (level == -2) return;
+    for (int k = 0; k < 4; ++k)
+      for (int j = 0; j < 4; ++j)
+        for (int i = 0; i < 4; ++i, ++states) {
+          Coord const c = origin.offsetBy(i * step, j * step, k * step);
+          if (grid.getValueDepth(c) == level && grid.isValueOn(c)) *states = kVdbStateActive;
+        }
+  }
+
+  typename GridT::ConstPtr m_grid;
+  std::vector<Leaf const*> m_leaves;
+};
+
+// --- Export ---
+
+/// Builds a grid from the channel that a TypedGrid made.
+template <class GridT> class GridBuilder {
+  using TreeT = typename GridT::TreeType;
+  using Leaf = typename TreeT::LeafNodeType;
+  using Value = typename GridT::ValueType;
+  using Element = typename ElementOf<Value>::type;
+  using ChannelT = TileTree3D::Channel<VdbTraits, Element, 4, 0>;
+  static constexpr int kMaxDepth = VdbTraits::kMaxDepth;
+  static constexpr int kLeafDepth = kMaxDepth - 1;
+
+public:
+  explicit GridBuilder(GridToWrite const& from)
+      : m_from(from)
+      , m_tree(from.container)
+      , m_channel(dynamic_cast<ChannelT const&>(from.channel))
+      , m_background(fromElement<Value>(m_channel.defaultValue()))
+      , m_grid(GridT::create(m_background)) {}
+
+  typename GridT::Ptr build() {
+    writeLeaves();
+    if (m_from.state)
+      for (int const width : kNodeWidths) writeActiveTiles(width);
+    writeInactiveTiles();
+    return m_grid;
+  }
+
+private:
+  using TileT = typename VdbContainer::TileType;
+
+  Value valueAt(TreeIndex const& tile, int3 const& sample) const {
+    return fromElement<Value>(m_channel.tileData(tile)(sample));
+  }
+  bool isActive(Value const& value) const { return followsRule<Value>(m_from.rule, value, m_background); }
+
+  // Quarter blocks of the place of a leaf, -1 where there is no tile.
+  struct Block {
+    Coord origin;
+    TreeIndex above; ///< tile as wide as the leaf; invalid when quarters are roots
+    std::array<std::int64_t, 8> quarters;
+  };
+
+  std::vector<Block> leafBlocks() const {
+    std::vector<Block> blocks;
+    for (std::int64_t n = 0; n < m_tree.tileCount(kLeafDepth); ++n) {
+      TileT const& tile = m_tree.tile(n, kLeafDepth);
+      if (tile.isLeaf()) continue;
+      Block block{toCoord(tile.tijk()), tile.treeIndex(), {}};
+      for (int slot = 0; slot < 8; ++slot)
+        block.quarters[static_cast<std::size_t>(slot)] = tile.childIndex(slot);
+      blocks.push_back(block);
+    }
+    // Quarters without a tile above: gathered by the place of their leaf, which lie side by side in Morton
+    // order.
+    auto tiles = m_tree.tileAccessor();
+    std::map<std::array<int, 3>, Block> loose;
+    for (auto root = m_tree.cbeginRoots(); root != m_tree.cendRoots(); ++root) {
+      if (root->first.depth != kMaxDepth) continue;
+      int3 const c = root->first.ijk(), o = alignTo(c, kLeafDepth);
+      auto const [at, isNew] = loose.try_emplace({o.x, o.y, o.z});
+      if (isNew) at->second = {toCoord(o), {}, {-1, -1, -1, -1, -1, -1, -1, -1}};
+      int const slot = (c.x - o.x) / 4 + 2 * ((c.y - o.y) / 4) + 4 * ((c.z - o.z) / 4);
+      at->second.quarters[static_cast<std::size_t>(slot)] = root->second.index;
+    }
+    for (auto const& entry : loose) blocks.push_back(entry.second);
+    return blocks;
+  }
+
+  // Whether the grid has a leaf of its own at a block.
+  bool hasLeaf(Block const& block) const {
+    for (std::int64_t const quarter : block.quarters) {
+      if (quarter < 0) continue;
+      TreeIndex const at{quarter, kMaxDepth};
+      if (m_from.state) {
+        for (unsigned char const s : m_from.state->tileData(at))
+          if (s & kVdbStateLeaf) return true;
+      } else {
+        for (Element const& v : m_channel.tileData(at))
+          if (!sameBits(fromElement<Value>(v), m_background)) return true;
+      }
+    }
+    return false;
+  }
+
+  void fillLeaf(Leaf& leaf, Block const& block) const {
+    for (int slot = 0; slot < 8; ++slot) {
+      int const qi = 4 * (slot & 1), qj = 4 * (slot >> 1 & 1), qk = 4 * (slot >> 2);
+      std::int64_t const quarter = block.quarters[static_cast<std::size_t>(slot)];
+      TreeIndex const at{quarter, kMaxDepth};
+      // A quarter that was left out has one value, which the tile above holds at its corner.
+      Value const uniform = quarter >= 0 || !block.above.valid()
+                                ? m_background
+                                : valueAt(block.above, {qi / 2, qj / 2, qk / 2});
+      for (int k = 0; k < 4; ++k)
+        for (int j = 0; j < 4; ++j)
+          for (int i = 0; i < 4; ++i) {
+            auto const n = Leaf::coordToOffset(Coord(qi + i, qj + j, qk + k));
+            Value const value = quarter < 0 ? uniform : valueAt(at, {i, j, k});
+            bool active = false;
+            if (quarter >= 0)
+              active = m_from.state ? (m_from.state->tileData(at)(i, j, k) & kVdbStateActive) != 0
+                                    : isActive(value);
+            leaf.setValueOnly(n, value);
+            leaf.setActiveState(n, active);
+          }
+    }
+  }
+
+  void writeLeaves() {
+    std::vector<Block> blocks = leafBlocks();
+    std::vector<std::unique_ptr<Leaf>> leaves(blocks.size());
+    parallelFor(0, std::int64_t(blocks.size()),
+                [&](std::int64_t begin, std::int64_t end) {
+                  for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+                    if (!hasLeaf(blocks[n])) continue;
+                    leaves[n] = std::make_unique<Leaf>(blocks[n].origin, m_background, false);
+                    fillLeaf(*leaves[n], blocks[n]);
+                  }
+                },
+                {.grain = 64});
+    for (auto& leaf : leaves)
+      if (leaf) m_grid->tree().addLeaf(leaf.release());
+  }
+
+  static openvdb::Index levelOf(int width) {
+    return width == kNodeWidths[0] ? 1 : width == kNodeWidths[1] ? 2 : 3;
+  }
+
+  void writeActiveTiles(int width) {
+    int const depth = depthOfSamples(width);
+    for (std::int64_t n = 0; n < m_tree.tileCount(depth); ++n) {
+      TileT const& tile = m_tree.tile(n, depth);
+      auto const states = m_from.state->tileData(tile.treeIndex());
+      for (int k = 0; k < 4; ++k)
+        for (int j = 0; j < 4; ++j)
+          for (int i = 0; i < 4; ++i)
+            if (states(i, j, k) & kVdbStateActive)
+              m_grid->tree().addTile(levelOf(width), toCoord(tile.childDataTIJK(i, j, k)),
+                                     valueAt(tile.treeIndex(), {i, j, k}), true);
+    }
+  }
+
+  // Fills the cube at `corner` with inactive tiles of the file's tree, as wide as fit. What is there already,
+  // leaf or active tile, stays.
+  void writeInactive(typename GridT::Accessor& grid, int3 const& corner, int width, Value const& value) {
+    if (sameBits(value, m_background)) return;
+    int const step = width < kNodeWidths[1]   ? kNodeWidths[0]
+                     : width < kNodeWidths[2] ? kNodeWidths[1]
+                                              : kNodeWidths[2];
+    for (int k = 0; k < width; k += step)
+      for (int j = 0; j < width; j += step)
+        for (int i = 0; i < width; i += step) {
+          Coord const c(corner.x + i, corner.y + j, corner.z + k);
+          if (grid.probeConstLeaf(c) || grid.isValueOn(c)) continue;
+          m_grid->tree().addTile(levelOf(step), c, value, false);
+          grid.clear();
+        }
+  }
+
+  void writeInactiveTiles() {
+    auto grid = m_grid->getAccessor();
+    // Wide ones first, so that narrow ones are cut out of them. Samples wider than the file's widest tiles
+    // stand for no place in it.
+    for (int depth = depthOfSamples(kNodeWidths[2]); depth <= kLeafDepth; ++depth) {
+      int const sample = VdbTraits::width(depth) / VdbTraits::kTDW;
+      for (std::int64_t n = 0; n < m_tree.tileCount(depth); ++n) {
+        TileT const& tile = m_tree.tile(n, depth);
+        if (depth == kLeafDepth) {
+          writeInactive(grid, tile.tijk(), kNodeWidths[0], valueAt(tile.treeIndex(), {0, 0, 0}));
+          continue;
+        }
+        for (int k = 0; k < 4; ++k)
+          for (int j = 0; j < 4; ++j)
+            for (int i = 0; i < 4; ++i) {
+              if (!tile.isLeaf(i / 2, j / 2, k / 2)) continue;
+              // Two samples of 4 voxels an axis make one narrowest tile.
+              if (sample < kNodeWidths[0] && ((i | j | k) & 1)) continue;
+              writeInactive(grid, tile.childDataTIJK(i, j, k), std::max(sample, kNodeWidths[0]),
+                            valueAt(tile.treeIndex(), {i, j, k}));
+            }
+      }
+    }
+  }
+
+  GridToWrite const& m_from;
+  VdbContainer const& m_tree;
+  ChannelT const& m_channel;
+  Value m_background;
+  typename GridT::Ptr m_grid;
+};
+
+/// Source or grid of the one type among `Grids` that fits.
+template <class... Grids> std::unique_ptr<GridSource> sourceAmong(openvdb::GridBase::ConstPtr const& grid) {
+  std::unique_ptr<GridSource> source;
+  auto const attempt = [&]<class GridT>(GridT const*) {
+    if (source) return;
+    if (auto typed = openvdb::gridConstPtrCast<GridT>(grid))
+      source = std::make_unique<TypedGrid<GridT>>(typed);
+  };
+  (attempt(static_cast<Grids const*>(nullptr)), ...);
+  return source;
+}
+template <class... Grids> openvdb::GridBase::Ptr gridAmong(std::string const& type, GridToWrite const& from) {
+  openvdb::GridBase::Ptr grid;
+  auto const attempt = [&]<class GridT>(GridT const*) {
+    if (!grid && type == openvdb::typeNameAsString<typename GridT::ValueType>())
+      grid = GridBuilder<GridT>(from).build();
+  };
+  (attempt(static_cast<Grids const*>(nullptr)), ...);
+  return grid;
+}
+
+} // namespace VLN::Interop

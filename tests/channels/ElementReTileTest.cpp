@@ -1,0 +1,203 @@
+// Points that move from tile to tile, with everything that follows them.
+#include "support/PointCloud.h"
+#include "support/Shapes.h"
+
+#include <limits>
+
+using namespace Support;
+using namespace VLN::TileTree3D;
+
+namespace {
+
+template <class TraitsT> class ReTile : public ::testing::Test {
+public:
+  using T = TraitsT;
+  using M = TreeModel<T>;
+  using Cloud = PointCloud<T>;
+
+  static VoxelCoord deepest(int i, int j, int k) { return M::holder({i, j, k}, T::kMaxDepth); }
+  /// Tiles of mixed depths in a few clusters, most of them with points.
+  static void fill(Cloud& cloud, std::uint32_t seed, int tiles) {
+    TilePlaces<T> places(seed);
+    cloud.addTiles(places.some(tiles));
+    for (VoxelCoord const& at : cloud.model.tiles()) {
+      for (int n = places.below(4) * places.below(6); n > 0; --n)
+        cloud.addPoint(at, Cloud::placeIn(at, cloud.tree.voxelSize(), places.random()));
+    }
+    cloud.counted();
+  }
+};
+TYPED_TEST_SUITE(ReTile, Shapes, ShapeNames);
+
+TYPED_TEST(ReTile, NothingChangesWhereNoPointLeftItsTile) {
+  for (float const voxelSize : {1.0f, 0.5f}) {
+    PointCloud<TypeParam> cloud(voxelSize);
+    TilePlaces<TypeParam> places(1);
+    VoxelCoord const at = this->deepest(7, -3, 12);
+    cloud.addTiles({at, this->deepest(100, 0, 0)});
+    for (int n = 0; n < 20; ++n) cloud.addPoint(at, cloud.placeIn(at, voxelSize, places.random()));
+    cloud.counted();
+    auto const before = cloud.contents();
+    cloud.reTile(false);
+    cloud.check();
+    EXPECT_EQ(cloud.contents(), before);
+  }
+}
+
+TYPED_TEST(ReTile, AnObjectWithoutPointsIsLeftAlone) {
+  PointCloud<TypeParam> cloud(1.0f);
+  cloud.reTile(true);
+  cloud.check();
+  cloud.addTiles({this->deepest(0, 0, 0)});
+  cloud.reTile(false);
+  cloud.check();
+  EXPECT_EQ(cloud.tree.tileCount(-1), 1);
+  cloud.reTile(true);
+  cloud.check();
+  EXPECT_EQ(cloud.tree.tileCount(-1), 0);
+}
+
+TYPED_TEST(ReTile, NegativePositionsRoundDown) {
+  PointCloud<TypeParam> cloud(1.0f);
+  VoxelCoord const home = this->deepest(100, 100, 100), below = this->deepest(-1, -1, -1),
+                   above = this->deepest(0, 0, 0);
+  cloud.addTiles({home, below, above});
+  cloud.addPoint(home, {-0.5f, -0.5f, -0.5f});
+  cloud.addPoint(home, {0.5f, 0.5f, 0.5f});
+  cloud.counted();
+  cloud.reTile(false);
+  cloud.check();
+  EXPECT_EQ(cloud.points[below].size(), TypeParam::kTW == 2 ? 1u : cloud.points[below].size());
+  EXPECT_EQ(cloud.pointCount(), 2u);
+}
+
+TYPED_TEST(ReTile, ANewTileBringsTheWholeChainUpToDepthZero) {
+  PointCloud<TypeParam> cloud(1.0f);
+  VoxelCoord const home = this->deepest(0, 0, 0);
+  cloud.addTiles({home});
+  cloud.addPoint(home, {1000.25f, 0, 0});
+  cloud.counted();
+  cloud.reTile(false);
+  cloud.check();
+  EXPECT_EQ(cloud.pointCount(), 1u);
+  EXPECT_EQ(cloud.tree.rootCount(), 1);
+  EXPECT_EQ(cloud.tree.rootCount(0), 1);
+}
+
+TYPED_TEST(ReTile, PointsOutOfReachAreDropped) {
+  constexpr float kReach = 536870912.0f, kInf = std::numeric_limits<float>::infinity(),
+                  kNan = std::numeric_limits<float>::quiet_NaN();
+  float const inside = std::nextafter(kReach, 0.0f);
+  for (float const voxelSize : {1.0f, 0.5f}) {
+    PointCloud<TypeParam> cloud(voxelSize);
+    VoxelCoord const home = this->deepest(0, 0, 0);
+    VoxelCoord const end = this->deepest(536870880, 0, 0), start = this->deepest(-536870880, 0, 0);
+    cloud.addTiles({home, end, start});
+    for (float const bad : {kReach, -kReach, kInf, -kInf, kNan, 3e38f}) {
+      for (int a = 0; a < 3; ++a) {
+        float3 p{0, 0, 0};
+        p[a] = bad * voxelSize;
+        cloud.addPoint(home, p);
+      }
+    }
+    cloud.addPoint(home, {inside * voxelSize, 0, 0});
+    cloud.addPoint(home, {-inside * voxelSize, 0, 0});
+    cloud.addPoint(home, {0.5f, 0.5f, 0.5f});
+    cloud.counted();
+    cloud.reTile(false);
+    cloud.check();
+    EXPECT_EQ(cloud.pointCount(), 3u);
+    EXPECT_EQ(cloud.points[end].size(), 1u);
+    EXPECT_EQ(cloud.points[start].size(), 1u);
+  }
+}
+
+TYPED_TEST(ReTile, PruningKeepsTheAncestorsOfPoints) {
+  PointCloud<TypeParam> cloud(1.0f);
+  std::vector<VoxelCoord> tiles;
+  for (int d = TypeParam::kMaxDepth - 4; d <= TypeParam::kMaxDepth; ++d)
+    tiles.push_back(TestFixture::M::holder({0, 0, 0}, d)),
+        tiles.push_back(TestFixture::M::holder({3000, 0, 0}, d));
+  cloud.addTiles(tiles);
+  VoxelCoord const leaf = this->deepest(0, 0, 0),
+                   coarse = TestFixture::M::holder({3000, 0, 0}, TypeParam::kMaxDepth - 2);
+  cloud.addPoint(leaf, {0.5f, 0.5f, 0.5f});
+  cloud.addPoint(coarse, {3000.5f, 0.5f, 0.5f});
+  cloud.counted();
+  cloud.reTile(true);
+  cloud.check();
+  EXPECT_TRUE(cloud.model.has(leaf));
+  EXPECT_TRUE(cloud.model.has(TestFixture::M::above(leaf, TypeParam::kMaxDepth - 4)));
+  EXPECT_FALSE(cloud.model.has(this->deepest(3000, 0, 0))) << "a leaf without points goes";
+  auto const once = cloud.contents();
+  cloud.reTile(true);
+  cloud.check();
+  EXPECT_EQ(cloud.contents(), once) << "pruning again changed something";
+}
+
+TYPED_TEST(ReTile, PositionsThatLieInTheObjectMoveOnce) {
+  PointCloud<TypeParam> cloud(1.0f);
+  auto positions = Ostil::makePtr<typename PointCloud<TypeParam>::Positions>(cloud.positions);
+  VoxelCoord const home = this->deepest(0, 0, 0), next = this->deepest(50, 0, 0);
+  cloud.addTiles({home, next});
+  positions->update(cloud.topology);
+  TreeIndex const at = cloud.tree.tileAccessor().tile(home, true).treeIndex();
+  positions->tileDataAccessor().tileData(at).push({50.5f, 0.5f, 0.5f});
+  cloud.topology.update(*positions);
+  auto ids = cloud.object.template extractComponent<typename PointCloud<TypeParam>::Ids>("ids");
+  ids->tileDataAccessor().tileData(at).push(1);
+  cloud.object.putComponent(std::move(ids));
+  cloud.object.addComponent(positions);
+  channelElementReTile(cloud.tree, cloud.topology, *positions, cloud.object, false);
+  EXPECT_EQ(positions->size(), 1u);
+  EXPECT_EQ(cloud.object.component("positions").get(), positions.get());
+  EXPECT_EQ(cloud.topology.elementCount(-1), 1);
+  EXPECT_EQ(cloud.object.template component<typename PointCloud<TypeParam>::Ids>("ids")->size(), 1u);
+}
+
+TYPED_TEST(ReTile, RandomMovesFollowTheRules) {
+  for (float const voxelSize : {1.0f, 0.5f, 2.0f}) {
+    for (std::uint32_t seed = 1; seed <= 6; ++seed) {
+      SCOPED_TRACE("seed " + std::to_string(seed) + ", voxel size " + std::to_string(voxelSize));
+      PointCloud<TypeParam> cloud(voxelSize);
+      this->fill(cloud, seed, 120);
+      cloud.check();
+      ASSERT_FALSE(this->HasFailure());
+      std::mt19937 random(seed);
+      for (int step = 0; step < 12; ++step) {
+        // Small moves mostly, now and then one of many tiles; all points alike, or each its own way.
+        float const far = voxelSize * (step % 4 == 3 ? 300.0f : 2.5f);
+        std::uniform_real_distribution<float> along(-far, far);
+        float3 const all{along(random), along(random), along(random)};
+        bool const same = step % 2 == 0;
+        cloud.move([&](float3 const& p) {
+          // A function of the position alone, so that model and channel agree.
+          if (same) return float3{p.x + all.x, p.y + all.y, p.z + all.z};
+          return float3{p.x + all.y * std::sin(p.z), p.y + all.z * std::sin(p.x),
+                        p.z + all.x * std::cos(p.y)};
+        });
+        cloud.reTile(step % 3 == 2);
+        cloud.check();
+        ASSERT_FALSE(this->HasFailure()) << "step " << step;
+      }
+    }
+  }
+}
+
+TYPED_TEST(ReTile, BytesAreEqualAtAnyNumberOfThreads) {
+  std::vector<std::int64_t> first;
+  for (int const threads : {1, 2, 8}) {
+    PointCloud<TypeParam> cloud(1.0f);
+    this->fill(cloud, 77, 800);
+    VLN::withThreads(threads, [&] {
+      for (int step = 0; step < 3; ++step) {
+        cloud.move([&](float3 const& p) { return float3{p.x + 1.3f, p.y - 2.1f, p.z + 0.7f}; });
+        channelElementReTile(cloud.tree, cloud.topology, cloud.positions, cloud.object, step == 2);
+      }
+    });
+    if (first.empty()) first = cloud.contents();
+    EXPECT_EQ(cloud.contents(), first) << threads;
+  }
+}
+
+} // namespace

@@ -1,0 +1,180 @@
+// Requirement tests: what is imported comes out again bit for bit, as OpenVDB reads it.
+#include "Interop/VdbExport.h"
+#include "GeometryVolume/core/ElementTypes.h"
+#include "Interop/VdbImportImpl.h"
+#include "support/VdbCompare.h"
+
+#include <gtest/gtest.h>
+
+#include <filesystem>
+#include <random>
+
+using namespace VLN::Interop;
+namespace fs = std::filesystem;
+
+namespace {
+
+fs::path scratch(std::string const& name) {
+  return fs::temp_directory_path() / (name + "." + std::to_string(::getpid()) + ".vdb");
+}
+
+/// Removes a file at the end of a test.
+struct Removed {
+  fs::path path;
+  ~Removed() { fs::remove(path); }
+};
+
+openvdb::GridPtrVec readBack(fs::path const& path, openvdb::MetaMap::Ptr& metadata) {
+  openvdb::io::File file(path.string());
+  file.open(false);
+  metadata = file.getMetadata();
+  return *file.getGrids();
+}
+
+/// Through import, export and reading; compared grid by grid in the order of names.
+void expectSame(openvdb::GridPtrVec const& grids, openvdb::MetaMap::Ptr const& metadata,
+                std::string const& what) {
+  VdbFile file;
+  file.path = what;
+  file.grids = grids;
+  file.metadata = metadata;
+  VdbImport const import = importGrids(file);
+  Removed const out{scratch("export-test")};
+  exportVdb(import.volumes, out.path.string());
+  openvdb::MetaMap::Ptr metadataBack;
+  auto back = readBack(out.path, metadataBack);
+  // Metadata of a file lives on its volumes.
+  if (metadata && !import.volumes.empty()) {
+    EXPECT_EQ(VdbCompare::metadataDifference(*metadata, *metadataBack), "") << what;
+  }
+  std::size_t expected = grids.size() - import.skipped.size();
+  ASSERT_EQ(back.size(), expected) << what;
+  auto const byName = [](auto const& a, auto const& b) { return a->getName() < b->getName(); };
+  auto sorted = grids;
+  std::erase_if(sorted, [&](auto const& grid) {
+    return std::any_of(import.skipped.begin(), import.skipped.end(),
+                       [&](auto const& s) { return s.grid == grid->getName(); });
+  });
+  std::stable_sort(sorted.begin(), sorted.end(), byName);
+  std::stable_sort(back.begin(), back.end(), byName);
+  for (std::size_t n = 0; n < sorted.size(); ++n)
+    EXPECT_EQ(VdbCompare::difference(*sorted[n], *back[n]), "") << what << ", grid " << sorted[n]->getName();
+}
+
+template <class V> V valueOf(std::mt19937& random) {
+  auto const number = [&] { return double(random() % 2001) / 8.0 - 125.0; };
+  if constexpr (std::is_same_v<V, bool>)
+    return random() % 2 == 0;
+  else if constexpr (std::is_arithmetic_v<V>)
+    return static_cast<V>(number());
+  else {
+    using S = typename V::ValueType;
+    return V(static_cast<S>(number()), static_cast<S>(number()), static_cast<S>(number()));
+  }
+}
+
+/// Active and inactive voxels and tiles at every level, at random.
+template <class GridT> typename GridT::Ptr randomGrid(unsigned seed) {
+  using V = typename GridT::ValueType;
+  std::mt19937 random(seed);
+  auto grid = GridT::create(valueOf<V>(random));
+  grid->setName("random_" + std::to_string(seed));
+  auto const coord = [&](int reach) {
+    auto const c = [&] { return int(random() % unsigned(2 * reach)) - reach; };
+    return openvdb::Coord(c(), c(), c());
+  };
+  for (int n = 0; n < 3; ++n) grid->tree().addTile(2, coord(3000), valueOf<V>(random), random() % 2 == 0);
+  for (int n = 0; n < 12; ++n) grid->tree().addTile(1, coord(400), valueOf<V>(random), random() % 2 == 0);
+  for (int n = 0; n < 400; ++n) {
+    auto const c = coord(200);
+    if (random() % 4 == 0)
+      grid->tree().setValueOff(c, valueOf<V>(random));
+    else
+      grid->tree().setValueOn(c, valueOf<V>(random));
+  }
+  return grid;
+}
+
+template <class GridT> void roundTripRandom() {
+  openvdb::initialize();
+  for (unsigned seed = 1; seed <= 4; ++seed)
+    expectSame({randomGrid<GridT>(seed)}, nullptr, "seed " + std::to_string(seed));
+}
+
+} // namespace
+
+TEST(VdbExport, RequirementFloatGridsWithTilesAtEveryLevel) { roundTripRandom<openvdb::FloatGrid>(); }
+TEST(VdbExport, RequirementInt32Grids) { roundTripRandom<openvdb::Int32Grid>(); }
+TEST(VdbExport, RequirementInt64Grids) { roundTripRandom<openvdb::Int64Grid>(); }
+TEST(VdbExport, RequirementBoolGrids) { roundTripRandom<openvdb::BoolGrid>(); }
+TEST(VdbExport, RequirementVec3SGrids) { roundTripRandom<openvdb::Vec3SGrid>(); }
+TEST(VdbExport, RequirementVec3DGrids) { roundTripRandom<openvdb::Vec3DGrid>(); }
+#if VLN_HAS_ELEMENT_DOUBLE
+TEST(VdbExport, RequirementDoubleGrids) { roundTripRandom<openvdb::DoubleGrid>(); }
+#endif
+#if VLN_HAS_ELEMENT_INT3
+TEST(VdbExport, RequirementVec3IGrids) { roundTripRandom<openvdb::Vec3IGrid>(); }
+#endif
+
+TEST(VdbExport, RequirementGridsOfOneObjectKeepApart) {
+  openvdb::initialize();
+  // An active tile of one grid where another has leaves, an empty grid, two grids of one name.
+  auto tiles = openvdb::FloatGrid::create(0.5f);
+  tiles->setName("tiles");
+  tiles->tree().addTile(2, {0, 0, 0}, 3.0f, true);
+  tiles->tree().addTile(1, {-8, 0, 0}, 4.0f, false);
+  auto voxels = openvdb::FloatGrid::create(-1.0f);
+  voxels->setName("voxels");
+  for (int n = 0; n < 40; ++n) voxels->tree().setValueOn({n, n / 2, 3 * n}, float(n));
+  auto empty = openvdb::FloatGrid::create(7.0f);
+  empty->setName("empty");
+  auto flags = randomGrid<openvdb::Int32Grid>(9);
+  expectSame({tiles, voxels, empty, flags}, nullptr, "grids of one object");
+}
+
+TEST(VdbExport, RequirementTransformsClassesMetadataAndHalf) {
+  openvdb::initialize();
+  auto a = randomGrid<openvdb::FloatGrid>(21);
+  a->setName("half");
+  a->setSaveFloatAsHalf(true);
+  for (auto it = a->beginValueAll(); it; ++it) it.setValue(float(int(*it)));
+  a->setGridClass(openvdb::GRID_FOG_VOLUME);
+  a->insertMeta("note", openvdb::StringMetadata("kept"));
+  auto b = randomGrid<openvdb::FloatGrid>(22);
+  b->setName("turned");
+  auto const turned = openvdb::math::Transform::createLinearTransform(0.1);
+  turned->preRotate(0.7, openvdb::math::Y_AXIS);
+  turned->postTranslate({1, 2, 3});
+  b->setTransform(turned);
+  b->setGridClass(openvdb::GRID_LEVEL_SET);
+  auto c = randomGrid<openvdb::Vec3SGrid>(23);
+  c->setName("frustum");
+  c->setTransform(openvdb::math::Transform::createFrustumTransform(openvdb::BBoxd({0, 0, 0}, {100, 100, 100}),
+                                                                   0.5, 10.0, 1.0));
+  c->setVectorType(openvdb::VEC_CONTRAVARIANT_RELATIVE);
+  auto metadata = std::make_shared<openvdb::MetaMap>();
+  metadata->insertMeta("author", openvdb::StringMetadata("somebody"));
+  metadata->insertMeta("frame", openvdb::Int32Metadata(12));
+  expectSame({a, b, c}, metadata, "transforms");
+}
+
+TEST(VdbExport, NegativeFailedWriteLeavesWhatWasThere) {
+  openvdb::initialize();
+  VdbFile file;
+  file.path = "memory";
+  file.grids = {randomGrid<openvdb::FloatGrid>(5)};
+  VdbImport const import = importGrids(file);
+  EXPECT_ANY_THROW(exportVdb(import.volumes, "/nonexistent-folder/out.vdb"));
+  EXPECT_ANY_THROW(exportVdb(import.volumes, fs::temp_directory_path().string()));
+}
+
+TEST(VdbExport, RequirementEveryRealFile) {
+  if (std::string(VLN_TEST_DATA_DIR).empty()) GTEST_SKIP() << "the real volumes are not here";
+  openvdb::initialize();
+  for (auto const& entry : fs::directory_iterator(fs::path(VLN_TEST_DATA_DIR) / "vdb")) {
+    if (entry.path().extension() != ".vdb") continue;
+    openvdb::MetaMap::Ptr metadata;
+    auto const grids = readBack(entry.path(), metadata);
+    expectSame(grids, metadata, entry.path().filename().string());
+  }
+}

@@ -1,0 +1,181 @@
+// The dense grid that enters the tree at one depth, and the distance measure over depths.
+#include "support/Print.h"
+#include "support/RandomForest.h"
+#include "support/Shapes.h"
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <cmath>
+#include <limits>
+#include <utility>
+
+using namespace VLN::TileTree3D;
+using Support::Access;
+
+VLN_SHAPE_SUITE(AccelerationGrid);
+
+// boundary
+TYPED_TEST(AccelerationGrid, EmptyContainerHasNone) {
+  using T = TypeParam;
+  Container<T> tree;
+  for (int d : {std::numeric_limits<int>::min(), -1, 0, 1, T::kMaxDepth, std::numeric_limits<int>::max()}) {
+    tree.buildAccessorAccelerationStructure(d);
+    EXPECT_EQ(Access::data(tree).m_gridDepth, -1) << d;
+  }
+  tree.clearAccessorAccelerationStructure();
+  EXPECT_EQ(Access::data(tree).m_gridDepth, -1);
+}
+
+// boundary: depth 0 never qualifies
+TYPED_TEST(AccelerationGrid, WalkEndsAtDepthOne) {
+  using T = TypeParam;
+  Container<T> tree;
+  tree.tileAccessor().addTile(0, 0, 0, 0);
+  tree.buildAccessorAccelerationStructure(T::kMaxDepth);
+  EXPECT_EQ(Access::data(tree).m_gridDepth, -1);
+  tree.tileAccessor().addTile(0, 0, 0, 1);
+  tree.buildAccessorAccelerationStructure(0);
+  EXPECT_EQ(Access::data(tree).m_gridDepth, -1);
+  tree.buildAccessorAccelerationStructure(1);
+  EXPECT_EQ(Access::data(tree).m_gridDepth, 1);
+}
+
+// requirement
+TYPED_TEST(AccelerationGrid, FieldsDescribeTheBoundsOfTheDepth) {
+  using T = TypeParam;
+  int const w = T::width(T::kMaxDepth), x = T::align(-1000, T::kMaxDepth);
+  Container<T> tree;
+  auto accessor = tree.tileAccessor();
+  accessor.addTile(x, x, x, T::kMaxDepth);
+  accessor.addTile(x + 4 * w, x + w, x + 2 * w, T::kMaxDepth);
+  tree.buildAccessorAccelerationStructure(std::numeric_limits<int>::max());
+  auto const& data = Access::data(tree);
+  EXPECT_EQ(data.m_gridDepth, T::kMaxDepth);
+  EXPECT_EQ(data.m_gridCellWidth, w);
+  EXPECT_EQ(data.m_gridOrigin, (int3{x, x, x}));
+  EXPECT_EQ(data.m_gridExtent, (int3{5 * w, 2 * w, 3 * w}));
+  EXPECT_EQ(data.m_gridSize, (std::array<std::int32_t, 3>{5, 2, 3}));
+  ASSERT_EQ(data.m_gridTable.size(), 30u);
+  EXPECT_EQ(data.m_gridTable.front(), 0);
+  EXPECT_EQ(data.m_gridTable[(2 * 2 + 1) * 5 + 4], 1) << "(k * ny + j) * nx + i";
+  EXPECT_EQ(std::count(data.m_gridTable.begin(), data.m_gridTable.end(), -1), 28);
+  tree.clearAccessorAccelerationStructure();
+  EXPECT_EQ(data.m_gridDepth, -1);
+  EXPECT_TRUE(data.m_gridTable.empty());
+}
+
+// boundary: 64 cells along an axis qualify, 65 do not
+TYPED_TEST(AccelerationGrid, SixtyFourCellsAreTheLimit) {
+  using T = TypeParam;
+  for (int d : {T::kMaxDepth, T::kMaxDepth - 2}) {
+    for (int axis = 0; axis < 3; ++axis) {
+      int const w = T::width(d), x = T::align(0, d);
+      Container<T> tree;
+      auto accessor = tree.tileAccessor();
+      int3 p{x, x, x};
+      accessor.addTile(p, d);
+      p[axis] += 63 * w;
+      accessor.addTile(p, d);
+      tree.buildAccessorAccelerationStructure(T::kMaxDepth);
+      EXPECT_EQ(Access::data(tree).m_gridDepth, d) << axis;
+      p[axis] += w;
+      accessor.addTile(p, d);
+      tree.buildAccessorAccelerationStructure(T::kMaxDepth);
+      EXPECT_EQ(Access::data(tree).m_gridDepth, -1) << axis;
+    }
+  }
+}
+
+// requirement: the deepest depth that qualifies, not above what was asked
+TYPED_TEST(AccelerationGrid, DeepestQualifyingDepthIsTaken) {
+  using T = TypeParam;
+  Container<T> tree;
+  auto accessor = tree.tileAccessor();
+  accessor.addTile(T::kMinTileCoord, 0, 0, 2);
+  accessor.addTile(T::kMinTileCoord, 0, 0, T::kMaxDepth);
+  accessor.addTile(T::kMaxTileCoord, 0, 0, 2);
+  accessor.addTile(T::kMaxTileCoord, 0, 0, T::kMaxDepth);
+  tree.buildAccessorAccelerationStructure(T::kMaxDepth);
+  int const chosen = Access::data(tree).m_gridDepth;
+  int expected = -1;
+  for (int d = 1; d <= T::kMaxDepth; ++d) {
+    if (tree.tileCount(d) > 0 && std::int64_t(T::width(0)) / T::width(d) <= 64) expected = d;
+  }
+  EXPECT_EQ(chosen, expected);
+  tree.buildAccessorAccelerationStructure(2);
+  EXPECT_EQ(Access::data(tree).m_gridDepth, 2);
+}
+
+// requirement: every lookup gives what it gave without the grid, at the rim and outside of it too
+TYPED_TEST(AccelerationGrid, LookupsAreThoseWithoutTheGrid) {
+  using T = TypeParam;
+  for (std::uint32_t seed = 1; seed <= 8; ++seed) {
+    SCOPED_TRACE("seed " + std::to_string(seed));
+    Support::RandomForest<T> forest(300 + seed);
+    auto accessor = forest.tree().tileAccessor();
+    int const d0 = T::kMaxDepth - 3, w = T::width(d0), x = T::align(5000, d0);
+    for (int n = 0; n < 40; ++n) {
+      int3 const p{x + forest.pick(0, 20 * w), x + forest.pick(0, 20 * w), x + forest.pick(0, 20 * w)};
+      accessor.addTile(p, d0 + forest.pick(0, 3));
+    }
+    auto const plain = forest.tree();
+    forest.tree().buildAccessorAccelerationStructure(forest.pick(d0, T::kMaxDepth));
+    ASSERT_GE(Access::data(forest.tree()).m_gridDepth, 0);
+    ASSERT_EQ(Access::data(plain).m_gridDepth, -1);
+    for (int n = 0; n < 4000; ++n) {
+      int3 p{};
+      for (int a = 0; a < 3; ++a) p[a] = x + forest.pick(-3 * w, 24 * w);
+      if (n % 50 == 0) p[n % 3] = n % 100 ? std::numeric_limits<int>::max() : std::numeric_limits<int>::min();
+      int const d = forest.pick(d0 - 2, T::kMaxDepth + 1);
+      ASSERT_EQ(Access::tileIndex(forest.tree(), p, d), Access::tileIndex(plain, p, d))
+          << p << " depth " << d;
+    }
+  }
+}
+
+// requirement
+TYPED_TEST(AccelerationGrid, DeadTilesAreLeftOut) {
+  using T = TypeParam;
+  int const w = T::width(T::kMaxDepth), x = T::align(0, T::kMaxDepth);
+  Container<T> tree;
+  auto accessor = tree.tileAccessor();
+  accessor.addTile(x, x, x, T::kMaxDepth);
+  TreeIndex const gone = accessor.addTile(x + w, x, x, T::kMaxDepth).treeIndex();
+  TreeIndex const far = accessor.addTile(T::kMaxTileCoord, x, x, T::kMaxDepth).treeIndex();
+  Access::killLeafTile(tree, gone);
+  Access::killLeafTile(tree, far);
+  tree.buildAccessorAccelerationStructure(T::kMaxDepth);
+  ASSERT_EQ(Access::data(tree).m_gridDepth, T::kMaxDepth) << "the far tile no longer counts";
+  EXPECT_FALSE(Access::tileIndex(tree, {x + w, x, x}, T::kMaxDepth).valid());
+  EXPECT_TRUE(Access::tileIndex(tree, {x, x, x}, T::kMaxDepth).valid());
+}
+
+// boundary
+TYPED_TEST(AccelerationGrid, TileDistanceIsZeroForAnEmptyTreeAndAtLeastOneElse) {
+  using T = TypeParam;
+  Container<T> tree;
+  EXPECT_EQ(tree.tileSpaceMaxTileDistance(), 0);
+  for (int d : {0, 1, T::kMaxDepth}) {
+    Container<T> one;
+    one.tileAccessor().addTile(0, 0, 0, d);
+    EXPECT_EQ(one.tileSpaceMaxTileDistance(), 2) << "a cube's diagonal is 1.73 widths";
+  }
+}
+
+// requirement
+TYPED_TEST(AccelerationGrid, TileDistanceIsTheLongestDiagonalInTiles) {
+  using T = TypeParam;
+  int const w = T::width(T::kMaxDepth), x = T::align(0, T::kMaxDepth);
+  Container<T> tree;
+  auto accessor = tree.tileAccessor();
+  accessor.addTile(x, x, x, T::kMaxDepth);
+  accessor.addTile(x + 9 * w, x + 4 * w, x, T::kMaxDepth);
+  EXPECT_EQ(tree.tileSpaceMaxTileDistance(), static_cast<int>(std::ceil(std::sqrt(100.0 + 25 + 1))));
+  Container<T> wide;
+  auto ends = wide.tileAccessor();
+  ends.addTile(T::kMinTileCoord, T::kMinTileCoord, T::kMinTileCoord, T::kMaxDepth);
+  ends.addTile(T::kMaxTileCoord, T::kMaxTileCoord, T::kMaxTileCoord, T::kMaxDepth);
+  double const cells = double(T::width(0)) / w;
+  EXPECT_EQ(wide.tileSpaceMaxTileDistance(), static_cast<int>(std::ceil(cells * std::sqrt(3.0))));
+}

@@ -1,0 +1,42 @@
+#include "Commands.h"
+#include "Interop/FileError.h"
+#include "Interop/OutputFile.h"
+#include "Interop/VdbExport.h"
+#include "ProgressBar.h"
+
+#include <iostream>
+
+#include <fmt/format.h>
+
+namespace Vln {
+
+using namespace VLN::Interop;
+
+namespace {
+
+std::string whyNot(VdbImport const& content) {
+  std::string reasons;
+  for (auto const& s : content.skipped) reasons += "; '" + oneLine(s.grid, 60) + "': " + oneLine(s.reason);
+  return reasons;
+}
+
+} // namespace
+
+void convert(ConvertOptions const& options) {
+  checkOutput(options.output);
+  VdbImport content;
+  std::size_t written = 0;
+  {
+    ProgressBar bar;
+    content = importVdb(options.file, options.limits, bar.progress());
+    for (auto const& volume : content.volumes) written += volume.channels.size();
+    if (written == 0) throw FileError(options.file, "has no grid that could be written" + whyNot(content));
+    exportVdb(content.volumes, options.output, bar.progress());
+  }
+  std::cout << fmt::format("{}: {} {} written\n", options.output, written, written == 1 ? "grid" : "grids");
+  for (auto const& s : content.skipped)
+    std::cerr << fmt::format("vln: {}: note: '{}' is left out: {}\n", options.file, oneLine(s.grid, 60),
+                             oneLine(s.reason));
+}
+
+} // namespace Vln

@@ -1,0 +1,29 @@
+#pragma once
+
+#include "Interop/PointVolume.h"
+#include "vln/Commands.h"
+
+#include <string>
+#include <vector>
+
+namespace Vln {
+
+/// Lower-case letters behind the last dot of the name.
+std::string extensionOf(std::string const& path);
+
+/// The points of a .ply file, or all points grids of a .vdb file.
+std::vector<VLN::Interop::PointVolume> readPointVolumes(PointsInput const& input,
+                                                        VLN::Interop::Progress const& progress);
+/// The one that the input names.
+/// @error FileError when there is none, or more than one without a name.
+VLN::Interop::PointVolume readPointVolume(PointsInput const& input, VLN::Interop::Progress const& progress);
+
+/// Tells on standard error what of the file did not come in.
+void noteLosses(std::string const& file, VLN::Interop::PointVolume const& volume);
+
+/// Writes points as the extension of the name asks.
+/// @error FileError, for an unknown extension too.
+void checkPointsOutput(std::string const& path);
+void writePoints(std::string const& path, VLN::Interop::PointVolume const& volume, double size);
+
+} // namespace Vln
