@@ -92,12 +92,16 @@ struct Plane {
   int extent(int a) const { return box.max[a] - box.min[a]; }
   double acrossAt(int x) const { return box.min[across] + (x + 0.5) * extent(across) / width; }
   double upAt(int y) const { return box.max[up] - (y + 0.5) * extent(up) / height; }
-  // A pixel in the middle of a sample's square lies on the sample.
+  // A pixel in the middle of a sample's square lies on the sample. The half squares at the border lie beyond
+  // the last samples, and show those.
   float3 placeOf(int x, int y) const {
+    auto const inside = [this](int a, double c) {
+      return static_cast<float>(std::clamp(c, double(box.min[a]), double(box.max[a] - 1)));
+    };
     float3 p{};
     p[axis] = static_cast<float>(where);
-    p[across] = static_cast<float>(acrossAt(x) - 0.5);
-    p[up] = static_cast<float>(upAt(y) - 0.5);
+    p[across] = inside(across, acrossAt(x) - 0.5);
+    p[up] = inside(up, upAt(y) - 0.5);
     return p;
   }
   int3 indexOf(int x, int y) const {
