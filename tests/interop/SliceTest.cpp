@@ -4,6 +4,7 @@
 
 #include <openvdb/tools/LevelSetSphere.h>
 
+#include <algorithm>
 #include <array>
 #include <cmath>
 #include <limits>
@@ -66,6 +67,38 @@ TEST(SliceTest, ShowsTheNearestSample) {
         }
     }
   }
+}
+
+// requirement: by default linear between samples, also off the samples' planes; the gradient is that of the
+// ramp
+TEST(SliceTest, BlendsLinearly) {
+  Coord const low(-5, 3, 10), high(10, 10, 13);
+  VdbVolume const volume = volumeOf(ramp(low, high, 0.5));
+  int const zoom = 8, wide = 16, tall = 8;
+  SliceOptions options{2, 11.25 * 0.5, zoom * wide};
+  Slice const slice = drawSlice(volume, "ramp", options);
+  EXPECT_NEAR(slice.at, 11.25 * 0.5, 1e-9);
+  EXPECT_EQ(slice.drawn, std::int64_t(zoom) * wide * zoom * tall);
+  ColorMap const map = ColorMap::forRange(slice.low, slice.top);
+  int const left = 8, top = (slice.image.height() - zoom * tall) / 2;
+  for (int y = 0; y < zoom * tall; ++y)
+    for (int x = 0; x < zoom * wide; ++x) {
+      auto const place = [](double c, int last) { return std::clamp(c, 0.0, double(last)); };
+      double const u = place((x + 0.5) / zoom - 0.5, wide - 1),
+                   v = place(tall - (y + 0.5) / zoom - 0.5, tall - 1);
+      Rgb const got = slice.image(left + x, top + y), expected = map.color(1 + u + 100 * v + 12500);
+      // Of 255: the values differ by rounding.
+      ASSERT_LE(std::abs(got.r - expected.r) + std::abs(got.g - expected.g) + std::abs(got.b - expected.b),
+                6);
+    }
+  options.gradient = true;
+  options.at = 11.25 * 0.5;
+  // In the middle; at the border the ramp falls to the background.
+  Slice const gradient = drawSlice(volume, "ramp", options);
+  Rgb const got = gradient.image(left + zoom * wide / 2, top + zoom * tall / 2);
+  Rgb const expected =
+      ColorMap::forRange(gradient.low, gradient.top).color(2 * std::sqrt(1 + 100.0 * 100 + 10000.0 * 10000));
+  EXPECT_LE(std::abs(got.r - expected.r) + std::abs(got.g - expected.g) + std::abs(got.b - expected.b), 6);
 }
 
 // requirement

@@ -9,6 +9,7 @@
 #include <algorithm>
 #include <array>
 #include <set>
+#include <sstream>
 
 namespace {
 
@@ -62,7 +63,7 @@ TEST_F(ProgramTest, TellsItsVersionAndItsUse) {
   EXPECT_EQ(std::count(version.out.begin(), version.out.end(), '\n'), 1);
   RunResult const help = vln({"--help"});
   EXPECT_EQ(help.code, 0);
-  for (char const* command : {"info", "slice", "make", "churn"}) {
+  for (char const* command : {"info", "slice", "probe", "make", "churn"}) {
     EXPECT_NE(help.out.find("\n  vln " + std::string(command) + " "), std::string::npos) << help.out;
     RunResult const one = vln({command, "--help"});
     EXPECT_EQ(one.code, 0);
@@ -123,8 +124,9 @@ TEST_F(ProgramTest, InfoPrintsTables) {
   ASSERT_EQ(run.code, 0) << run.err;
   EXPECT_EQ(run.err, "");
   EXPECT_EQ(run.out.rfind(path + "\n", 0), 0u);
-  for (char const* part : {"voxel size", "world box", "depth", "surface", "float", "active voxels", "MB used",
-                           "MB allocated", "bytes for each active voxel"})
+  for (char const* part :
+       {"voxel size", "world box", "depth", "surface", "float", "active voxels", "MB used", "MB allocated",
+        "bytes for each active voxel", "surface: coarse values equal those of their children"})
     EXPECT_NE(run.out.find(part), std::string::npos) << part << " in\n" << run.out;
   EXPECT_EQ(run.out.find('\r'), std::string::npos);
 }
@@ -186,6 +188,76 @@ TEST_F(ProgramTest, SliceWritesAPicture) {
       vln({"slice", path, "--channel", "surface", "--axis", "z", "--at", "0.2", "-o", picture});
   EXPECT_EQ(run.code, 0) << run.err;
   EXPECT_NE(run.out.find("surface at z = 0.2"), std::string::npos) << run.out;
+}
+
+// requirement: nearest samples, blends and gradients are three pictures
+TEST_F(ProgramTest, SliceDrawsInThreeWays) {
+  std::string const path = torus();
+  std::vector<std::string> pictures;
+  for (char const* way : {"--size", "--nearest", "--gradient"}) {
+    std::string const picture = m_folder / (std::string(way) + ".png");
+    std::vector<std::string> arguments{"slice", path, "--channel", "surface", "--axis",
+                                       "z",     "-o", picture,     "--size",  "300"};
+    if (std::string(way) != "--size") arguments.push_back(way);
+    RunResult const run = vln(arguments);
+    ASSERT_EQ(run.code, 0) << run.err;
+    EXPECT_EQ(run.out.rfind("gradient of surface", 0) == 0, std::string(way) == "--gradient") << run.out;
+    pictures.push_back(readAll(picture));
+  }
+  EXPECT_NE(pictures[0], pictures[1]);
+  EXPECT_NE(pictures[0], pictures[2]);
+}
+
+// requirement: CSV with a fixed header, from the command line and from a file
+TEST_F(ProgramTest, ProbePrintsValuesAndGradients) {
+  std::string const path = torus(), points = m_folder / "points.csv";
+  // On the middle of the tube, whose radius is 0.4 and which runs at 1 from the axis.
+  RunResult const run =
+      vln({"probe", path, "--channel", "surface", "1.4", "0", "0", "-1.4", "0", "0", "50", "0", "0"});
+  ASSERT_EQ(run.code, 0) << run.err;
+  EXPECT_EQ(run.err, "");
+  std::vector<std::vector<double>> rows;
+  std::istringstream lines(run.out);
+  std::string line;
+  ASSERT_TRUE(std::getline(lines, line));
+  EXPECT_EQ(line, "x,y,z,value,gx,gy,gz");
+  while (std::getline(lines, line)) {
+    rows.emplace_back();
+    std::istringstream cells(line);
+    for (std::string cell; std::getline(cells, cell, ',');) rows.back().push_back(std::stod(cell));
+    EXPECT_EQ(rows.back().size(), 7u);
+  }
+  ASSERT_EQ(rows.size(), 3u);
+  EXPECT_NEAR(rows[0][0], 1.4, 1e-6);
+  EXPECT_NEAR(rows[0][3], 0, 0.02);
+  EXPECT_NEAR(rows[0][4], 1, 0.05);
+  EXPECT_NEAR(rows[1][4], -1, 0.05);
+  EXPECT_NEAR(rows[0][5], 0, 0.1);
+  EXPECT_EQ(rows[2][4], 0); // far away: the background, and no gradient
+  EXPECT_GT(rows[2][3], 0);
+
+  writeAll(points, "1.4,0,0\n-1.4, 0 ,0\r\n\n50,0,0");
+  RunResult const file = vln({"probe", path, "--channel", "surface", "--points", points});
+  EXPECT_EQ(file.code, 0) << file.err;
+  EXPECT_EQ(file.out, run.out);
+  writeAll(points, "");
+  EXPECT_EQ(vln({"probe", path, "--channel", "surface", "--points", points}).out, "x,y,z,value,gx,gy,gz\n");
+}
+
+// negative
+TEST_F(ProgramTest, ProbeNamesBadPoints) {
+  std::string const path = torus(), points = m_folder / "points.csv";
+  for (char const* bad : {"1,2", "1,2,3,4", "x,y,z", "1,2,3 4", "1;2;3", ",,", "1,2,"}) {
+    writeAll(points, std::string("1,2,3\n") + bad + "\n");
+    expectFailure(vln({"probe", path, "--channel", "surface", "--points", points}),
+                  points + ": line 2 is not of the form x,y,z");
+  }
+  expectFailure(vln({"probe", path, "--channel", "surface", "--points", m_folder / "none.csv"}),
+                (m_folder / "none.csv") + ": No such file or directory");
+  expectFailure(vln({"probe", path, "--channel", "surface", "--points", m_folder.path()}),
+                m_folder.path() + ": is a directory");
+  expectFailure(vln({"probe", path, "--channel", "density", "1", "2", "3"}),
+                path + ": has no channel 'density'; it has surface");
 }
 
 // requirement
@@ -254,6 +326,11 @@ TEST_F(ProgramTest, BadOptionsEndInOneLine) {
       {"slice", "a.vdb", "--channel", "d", "--axis", "w", "-o", "p.png"},
       {"slice", "a.vdb", "--channel", "d", "--axis", "x", "--size", "9", "-o", "p.png"},
       {"slice", "a.vdb", "--channel", "d", "--axis", "x", "--at", "here", "-o", "p.png"},
+      {"slice", "a.vdb", "--channel", "d", "--axis", "x", "--nearest", "--gradient", "-o", "p.png"},
+      {"probe", "a.vdb", "--channel", "d"},
+      {"probe", "a.vdb", "--channel", "d", "1", "2"},
+      {"probe", "a.vdb", "--channel", "d", "1", "2", "three"},
+      {"probe", "a.vdb", "1", "2", "3"},
       {"make", "cube", "a.vdb"},
       {"make", "cloud", "a.vdb", "--voxels", "-5"},
       {"make", "cloud", "a.vdb", "--voxels", "many"},

@@ -7,12 +7,15 @@
 #include "Interop/VdbImport.h"
 #include "ProgressBar.h"
 
+#include <cerrno>
 #include <charconv>
 #include <cstring>
+#include <filesystem>
 #include <fstream>
 #include <iostream>
 #include <iterator>
 #include <memory>
+#include <stdexcept>
 #include <string_view>
 
 #include <fmt/format.h>
@@ -52,10 +55,12 @@ bool parse(std::string_view text, float& number) {
 }
 
 std::vector<float3> readPoints(std::string const& path) {
+  std::error_code unknown;
+  if (std::filesystem::is_directory(path, unknown)) throw FileError(path, "is a directory");
   std::ifstream in(path, std::ios::binary);
   if (!in) throw FileError(path, std::strerror(errno));
   std::string const text((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
-  if (in.bad() || (text.empty() && in.fail() && !in.eof())) throw FileError(path, "cannot be read");
+  if (in.bad()) throw FileError(path, "cannot be read");
   std::vector<float3> points;
   std::size_t line = 0;
   for (std::size_t begin = 0; begin < text.size();) {

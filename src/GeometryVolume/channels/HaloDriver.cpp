@@ -5,10 +5,7 @@
 namespace VLN::TileTree3D::Internal {
 
 template <class TraitsT>
-TreeIndex HaloDriver<TraitsT>::neighbor(TileType const& tile, NeighborDirection d) const {
-  if (auto const* table = m_accessor.container()->neighborData())
-    return (*table)[static_cast<std::size_t>(tile.depth())][static_cast<std::size_t>(tile.index())]
-                   [static_cast<std::size_t>(d)];
+TreeIndex HaloDriver<TraitsT>::searchNeighbor(TileType const& tile, NeighborDirection d) const {
   int3 const step = neighborOffset(d);
   std::int64_t const w = TraitsT::width(tile.depth());
   std::int64_t const i = tile.ti() + step.x * w, j = tile.tj() + step.y * w, k = tile.tk() + step.z * w;
@@ -18,6 +15,36 @@ TreeIndex HaloDriver<TraitsT>::neighbor(TileType const& tile, NeighborDirection 
   if (outside(i) || outside(j) || outside(k)) return {};
   return m_accessor.treeIndex(static_cast<int>(i), static_cast<int>(j), static_cast<int>(k), tile.depth(),
                               false);
+}
+
+template <class TraitsT> TreeIndex HaloDriver<TraitsT>::neighbor(TileType const& tile, NeighborDirection d) {
+  auto const& tree = *m_accessor.container();
+  if (auto const* table = tree.neighborData())
+    return (*table)[static_cast<std::size_t>(tile.depth())][static_cast<std::size_t>(tile.index())]
+                   [static_cast<std::size_t>(d)];
+  if (tile.isRoot()) return searchNeighbor(tile, d);
+  // The neighbour is a child of the parent, or of a neighbour of the parent.
+  auto const& parent = tree.tile(tile.parentTreeIndex());
+  if (m_parent != parent.treeIndex()) m_parent = parent.treeIndex(), m_known = 0;
+  int3 slot = parent.childIJK(tile), beside{};
+  int3 const step = neighborOffset(d);
+  for (int a = 0; a < 3; ++a) {
+    slot[a] += step[a];
+    beside[a] = slot[a] < 0 ? -1 : slot[a] >= TraitsT::kTW ? 1 : 0;
+    slot[a] -= beside[a] * TraitsT::kTW;
+  }
+  NeighborDirection const side = neighborDirection(beside.x, beside.y, beside.z);
+  TreeIndex holder = m_parent;
+  if (side != kNeighborSelf) {
+    auto& known = m_around[static_cast<std::size_t>(side)];
+    if (!(m_known >> side & 1)) known = searchNeighbor(parent, side), m_known |= 1u << side;
+    holder = known;
+  }
+  // A root of the tile's own depth may lie where there is no tile above it.
+  if (!holder.valid()) return tree.rootCount(tile.depth()) > 0 ? searchNeighbor(tile, d) : TreeIndex{};
+  if (holder.depth != m_parent.depth) return holder;
+  TreeIndex const child = tree.tile(holder).childTreeIndex(slot);
+  return child.index >= 0 ? child : holder;
 }
 
 template <class TraitsT>
@@ -94,8 +121,7 @@ void HaloDriver<TraitsT>::sample(HaloBox const& box, TileType const& tile, void*
       }
 }
 
-template <class TraitsT>
-void HaloDriver<TraitsT>::fill(HaloTarget<TraitsT> const& target, HaloMode mode) const {
+template <class TraitsT> void HaloDriver<TraitsT>::fill(HaloTarget<TraitsT> const& target, HaloMode mode) {
   TileType const& tile = target.tile;
   if (void const* const own = m_source.elements(tile.treeIndex()))
     copy(m_table.core, target.elements, own);
@@ -122,7 +148,7 @@ void HaloDriver<TraitsT>::fill(HaloTarget<TraitsT> const& target, HaloMode mode)
 
 template <class TraitsT>
 void HaloDriver<TraitsT>::fillRegion(HaloRegion const& region, TileType const& tile, void* target,
-                                     HaloFill const& fill, HaloSampler<TraitsT>& sampler) const {
+                                     HaloFill const& fill, HaloSampler<TraitsT>& sampler) {
   TreeIndex const beside = neighbor(tile, region.direction);
   if (beside.depth == tile.depth()) {
     if (void const* const source = m_source.elements(beside)) return copy(region, target, source);
@@ -155,7 +181,7 @@ void HaloDriver<TraitsT>::fillRegion(HaloRegion const& region, TileType const& t
 
 template <class TraitsT>
 void HaloDriver<TraitsT>::fill(TileType const& tile, void* target, HaloFill const& fill,
-                               HaloSampler<TraitsT>& sampler) const {
+                               HaloSampler<TraitsT>& sampler) {
   if (fill.mode < kHaloModeDeepOnly || fill.mode > kHaloModeConstant) return;
   if (fill.type & kHaloCore) {
     if (tile.depth() > m_source.maxDepth)

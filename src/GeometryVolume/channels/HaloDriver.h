@@ -38,13 +38,16 @@ public:
 
   /// The core, then each region: from the neighbour of the same depth; else blended from the parent; else,
   /// without a parent, replicated in mode kHaloModeReplicate and the default value in any other.
-  void fill(HaloTarget<TraitsT> const& target, HaloMode mode) const;
+  void fill(HaloTarget<TraitsT> const& target, HaloMode mode);
   /// What `fill.type` names, as `fill.mode` says.
-  void fill(TileType const& tile, void* target, HaloFill const& fill, HaloSampler<TraitsT>& sampler) const;
+  void fill(TileType const& tile, void* target, HaloFill const& fill, HaloSampler<TraitsT>& sampler);
 
 private:
   /// The neighbour at the tile's depth, or the deepest one above.
-  TreeIndex neighbor(TileType const& tile, NeighborDirection d) const;
+  /// @cost Tiles of one parent after the other share the searches round the parent.
+  TreeIndex neighbor(TileType const& tile, NeighborDirection d);
+  /// The same by a search from the accessor's last tile.
+  TreeIndex searchNeighbor(TileType const& tile, NeighborDirection d) const;
   /// The tile itself, or its deepest ancestor whose data the source holds.
   TileType const* withData(TileType const* tile, void const*& elements) const;
 
@@ -63,11 +66,16 @@ private:
   void sample(HaloBox const& box, TileType const& tile, void* target, float scale,
               HaloSampler<TraitsT>& sampler) const;
   void fillRegion(HaloRegion const& region, TileType const& tile, void* target, HaloFill const& fill,
-                  HaloSampler<TraitsT>& sampler) const;
+                  HaloSampler<TraitsT>& sampler);
 
   ErasedTiles const& m_source;
   HaloTable const& m_table;
   Accessor const& m_accessor;
+
+  // The last tile's parent, and what lies round it as far as it was asked for.
+  TreeIndex m_parent;
+  std::array<TreeIndex, kNeighborCount> m_around;
+  std::uint32_t m_known = 0;
 };
 
 /// A pass over the tiles of a range of depths, coarse to fine.

@@ -39,7 +39,7 @@ requires(Internal::isTileHalo(SourceExtended, SourceHalo, TargetExtended, Target
     typename Container<TraitsT>::ConstTileAccessor& accessor,
     Internal::HaloTile<TraitsT, T, TargetExtended, TargetHalo>& parentData) {
   auto const source = Internal::eraseTiles<T>(src);
-  Internal::HaloDriver<TraitsT> const driver(
+  Internal::HaloDriver<TraitsT> driver(
       source, Internal::kHaloTable<TraitsT, SourceExtended, SourceHalo, TargetExtended, TargetHalo>,
       accessor);
   driver.fill({tile, dst.data()->data(), parent, parent && parentData ? parentData.data()->data() : nullptr},
@@ -54,7 +54,7 @@ requires(Internal::isIndexHalo(SourceHalo, TargetHalo, SourceExtended, TargetExt
     VoxelOffsetType offsetType) {
   auto const source = Internal::eraseTiles<T>(src);
   auto const& table = Internal::kHaloTable<TraitsT, SourceExtended, SourceHalo, TargetExtended, TargetHalo>;
-  Internal::HaloDriver<TraitsT> const driver(source, table, accessor);
+  Internal::HaloDriver<TraitsT> driver(source, table, accessor);
   Internal::HaloSampler<TraitsT> sampler(source, table.sourceWidth, table.sourceOrigin, offsetType, accessor);
   driver.fill(accessor.tile(index), dst.data()->data(), {mode, type, constant, scale, offsetType}, sampler);
 }

@@ -79,7 +79,9 @@ protected:
   static void place(float p, int corner, float samples, float offset, int& i, float& weight) {
     float l = (p - static_cast<float>(corner)) * samples - offset;
     if (l > -1e-5f) l = std::max(0.0f, l);
-    i = std::min(toIntFloor(l), D - 1);
+    // In reach of int: the tile holds p.
+    auto const cut = static_cast<int>(l);
+    i = std::min(cut - (static_cast<float>(cut) > l ? 1 : 0), D - 1);
     weight = l - static_cast<float>(i);
   }
 
