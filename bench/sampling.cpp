@@ -1,5 +1,9 @@
 // Trilinear samples: this library, OpenVDB's BoxSampler on a ValueAccessor and NanoVDB's trilinear sampler on
-// the same grid at the same positions, at random in the narrow band and along rays through it.
+// the same grid at the same positions:
+//
+//   at random     in cells of the narrow band whose eight voxels are all active
+//   rays          across the grid's box in steps of half a voxel, in the band and beside it
+//   rays in band  of such rays the positions in the band alone: short runs, far from each other
 //
 // The grid is the first float grid of the file that VLN_BENCH_GRID names, else the level set of a sphere
 // about 500 voxels wide.
@@ -13,6 +17,7 @@
 #include <openvdb/tools/LevelSetSphere.h>
 
 #include <algorithm>
+#include <array>
 #include <cstdlib>
 #include <random>
 
@@ -40,7 +45,7 @@ struct Data {
   Ostil::Ptr<Core> core;
   std::unique_ptr<Tree> accelerated; ///< the tree with an acceleration grid
   std::unique_ptr<Wide> wide;
-  std::vector<float3> random, rays;
+  std::array<std::vector<float3>, 3> positions; ///< by pattern
 
   Data() {
     openvdb::initialize();
@@ -84,15 +89,15 @@ struct Data {
     std::vector<openvdb::Coord> voxels;
     for (auto it = grid->cbeginValueOn(); it; ++it)
       if (it.isVoxelValue()) voxels.push_back(it.getCoord());
+    auto& [random, rays, band] = positions;
     while (random.size() < kPositions) {
       auto const c = voxels[generator() % voxels.size()];
       if (active(c))
         random.push_back({float(c.x()) + inside(generator), float(c.y()) + inside(generator),
                           float(c.z()) + inside(generator)});
     }
-    // Rays across the box in steps of half a voxel, of which the part in the band is kept.
     auto const box = grid->evalActiveVoxelBoundingBox();
-    while (rays.size() < kPositions) {
+    while (band.size() < kPositions) {
       openvdb::Vec3d from, to;
       for (int a = 0; a < 3; ++a) {
         double const low = box.min()[a], extent = box.dim()[a];
@@ -102,7 +107,9 @@ struct Data {
       double const length = (to - from).length();
       for (double t = 0; t < length; t += 0.5) {
         auto const p = from + t * direction;
-        if (active(openvdb::Coord::floor(p))) rays.push_back({float(p.x()), float(p.y()), float(p.z())});
+        float3 const position{float(p.x()), float(p.y()), float(p.z())};
+        if (rays.size() < kPositions) rays.push_back(position);
+        if (active(openvdb::Coord::floor(p))) band.push_back(position);
       }
     }
   }
@@ -113,9 +120,10 @@ Data const& data() {
   return *made;
 }
 
-// Calls f for each position of the pattern: 0 at random, 1 along rays.
+// Calls f for each position of the pattern.
 template <class F> void forPositions(benchmark::State& state, F const& f) {
-  auto const& positions = state.range(0) ? data().rays : data().random;
+  auto const pattern = static_cast<std::size_t>(state.range(0));
+  auto const& positions = data().positions[pattern];
   for (auto _ : state) {
     float sum = 0;
     for (float3 const& p : positions) sum += f(p);
@@ -125,7 +133,8 @@ template <class F> void forPositions(benchmark::State& state, F const& f) {
   // Seconds for a sample; shown with its unit.
   state.counters["sample"] =
       benchmark::Counter(samples, benchmark::Counter::kIsRate | benchmark::Counter::kInvert);
-  state.SetLabel(state.range(0) ? "along rays" : "at random");
+  static constexpr char const* kNames[] = {"at random", "rays", "rays in band"};
+  state.SetLabel(kNames[pattern]);
 }
 
 template <class ChannelT> void ours(benchmark::State& state, Tree const& tree, ChannelT const& channel) {
@@ -172,7 +181,7 @@ void nanoGradient(benchmark::State& state) {
 }
 
 #define VLN_BENCHMARK(function, name)                                                                        \
-  BENCHMARK(function)->Name(name)->ArgName("rays")->Arg(0)->Arg(1)->Unit(benchmark::kMillisecond)
+  BENCHMARK(function)->Name(name)->ArgName("pattern")->Arg(0)->Arg(1)->Arg(2)->Unit(benchmark::kMillisecond)
 VLN_BENCHMARK(boxSampler, "OpenVDB BoxSampler");
 VLN_BENCHMARK(nanoSampler, "NanoVDB trilinear");
 VLN_BENCHMARK(wideChannel, "wide channel");

@@ -231,6 +231,8 @@ protected:
   friend struct ContainerTestAccess;
 
   Data const* getData() const { return m_data.get(); }
+  /// What leads from positions to tiles, built with the acceleration grid; else null.
+  PlaceTable<TraitsT> const* places() const { return m_data->m_places.get(); }
 
   // Lookup
   /// The deepest tile at or above `depth` that holds the point; invalid when there is none.

@@ -102,6 +102,66 @@ float haloWeight(Tile<TraitsT, TraitsT::kTileSize> const& tile, int direction, i
   return static_cast<float>(weight);
 }
 
+namespace {
+
+template <class TraitsT>
+std::shared_ptr<PlaceTable<TraitsT> const> computePlaces(Container<TraitsT> const& tree,
+                                                         ContainerData<TraitsT> const& data) {
+  using Table = PlaceTable<TraitsT>;
+  int const g = data.m_gridDepth, last = std::min(g + Table::kLevels, TraitsT::kMaxDepth);
+  for (int d = g; d <= last; ++d) {
+    if (tree.tileCount(d) > Table::kMostTiles) return nullptr;
+  }
+  auto table = std::make_shared<Table>();
+  table->gridDepth = g, table->lastDepth = last;
+  int const width = TraitsT::width(g) / TraitsT::width(last), size = width * width * width;
+  table->placeWidth = static_cast<std::uint32_t>(width), table->blockSize = static_cast<std::uint32_t>(size);
+  for (int a = 0; a < 3; ++a) {
+    auto const axis = static_cast<std::size_t>(a);
+    table->first[axis] = TraitsT::quotient(TraitsT::offset(data.m_gridOrigin[a]), g);
+    table->size[axis] = static_cast<std::uint32_t>(data.m_gridSize[axis]);
+  }
+  table->cells.assign(data.m_gridTable.size(), Table::kNothing);
+  std::int64_t const rows = std::int64_t(data.m_gridSize[1]) * data.m_gridSize[2];
+  parallelFor(0, rows, [&](std::int64_t begin, std::int64_t end) {
+    auto accessor = tree.tileAccessor();
+    for (std::int64_t row = begin; row < end; ++row)
+      for (int i = 0; i < data.m_gridSize[0]; ++i) {
+        auto const cell = static_cast<std::size_t>(row * data.m_gridSize[0] + i);
+        TreeIndex at{data.m_gridTable[cell], g};
+        if (at.index < 0) {
+          int const w = data.m_gridCellWidth;
+          at = accessor.treeIndex(data.m_gridOrigin.x + i * w,
+                                  data.m_gridOrigin.y + static_cast<int>(row % data.m_gridSize[1]) * w,
+                                  data.m_gridOrigin.z + static_cast<int>(row / data.m_gridSize[1]) * w, g,
+                                  false);
+        }
+        if (at.index >= 0) table->cells[cell] = at.index * Table::kDepthUnit + at.depth;
+      }
+  });
+  table->places.resize(static_cast<std::size_t>(tree.tileCount(g) * size));
+  parallelFor(0, tree.tileCount(g), [&](std::int64_t begin, std::int64_t end) {
+    for (std::int64_t n = begin; n < end; ++n) {
+      if (!tree.tile(n, g).valid()) continue;
+      auto* const block = &table->places[static_cast<std::size_t>(n * size)];
+      for (int place = 0; place < size; ++place) {
+        int const p[3] = {place % width, place / width % width, place / (width * width)};
+        TreeIndex at{n, g};
+        for (int divisor = width / TraitsT::kTW; at.depth < last; divisor /= TraitsT::kTW) {
+          auto const digit = [&](int a) { return p[a] / divisor % TraitsT::kTW; };
+          TreeIndex const child = tree.tile(at).childTreeIndex(digit(0), digit(1), digit(2));
+          if (child.index < 0) break;
+          at = child;
+        }
+        block[place] = static_cast<std::int32_t>(at.index * Table::kLevelUnit + (at.depth - g));
+      }
+    }
+  });
+  return table;
+}
+
+} // namespace
+
 template <class TraitsT>
 void buildAccelerationGrid(Container<TraitsT> const& tree, ContainerData<TraitsT>& data, int maxDepth) {
   for (int d = std::min(maxDepth, TraitsT::kMaxDepth); d >= 1; --d) {
@@ -113,6 +173,7 @@ void buildAccelerationGrid(Container<TraitsT> const& tree, ContainerData<TraitsT
     std::uint32_t const largest = std::max({extent(box, 0), extent(box, 1), extent(box, 2)});
     if (largest / w > kMaxGridCells) continue;
 
+    data.m_places.reset();
     data.m_gridDepth = d;
     data.m_gridOrigin = box.min;
     data.m_gridCellWidth = static_cast<std::int32_t>(w);
@@ -134,6 +195,7 @@ void buildAccelerationGrid(Container<TraitsT> const& tree, ContainerData<TraitsT
       }
       data.m_gridTable[at] = n;
     }
+    data.m_places = computePlaces(tree, data);
     return;
   }
 }

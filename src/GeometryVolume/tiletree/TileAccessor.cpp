@@ -73,7 +73,13 @@ TreeIndex ConstTileAccessorOf<TraitsT>::descend(TreeIndex at, int i, int j, int 
 template <class TraitsT>
 TreeIndex ConstTileAccessorOf<TraitsT>::find(int i, int j, int k, int depth, bool exact) const {
   if (!m_container || depth < 0 || !TraitsT::inDomain(i, j, k)) return {};
-  TreeIndex at = findNear(i, j, k, std::min(depth, TraitsT::kMaxDepth));
+  TreeIndex at;
+  if (auto const* places = m_container->places(); places && depth >= places->lastDepth)
+    at = places->find(i, j, k);
+  if (at.valid())
+    m_pathTop = at.depth;
+  else
+    at = findNear(i, j, k, std::min(depth, TraitsT::kMaxDepth));
   if (!at.valid()) {
     at = m_container->entry(i, j, k, depth);
     if (!at.valid()) return {};

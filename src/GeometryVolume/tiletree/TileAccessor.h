@@ -44,6 +44,14 @@ public:
   /// @cost As tile(), without touching the tile's record.
   TreeIndex treeIndex(int i, int j, int k, int depth, bool exact) const {
     if (depth == m_depth && holds(i, j, k)) return {m_index, m_depth};
+    if (auto const* places = m_container ? m_container->places() : nullptr) {
+      // Complete answers alone: a tile of the last depth may have deeper ones below it.
+      TreeIndex const at = depth >= places->lastDepth ? places->find(i, j, k) : TreeIndex{};
+      if (at.depth >= 0 && (at.depth < places->lastDepth || at.depth == depth)) {
+        moveTo(at, i, j, k);
+        return exact && at.depth != depth ? TreeIndex{} : at;
+      }
+    }
     return find(i, j, k, depth, exact);
   }
 
@@ -111,6 +119,12 @@ protected:
     m_corner = t.tijk(), m_depth = m_pathTop = t.depth(), m_index = t.index();
     if (m_depth >= 0) m_path[static_cast<std::size_t>(m_depth)] = m_index;
     return t;
+  }
+  /// The same for the tile that holds a point.
+  void moveTo(TreeIndex const& at, int i, int j, int k) const {
+    m_corner = {TraitsT::align(i, at.depth), TraitsT::align(j, at.depth), TraitsT::align(k, at.depth)};
+    m_depth = m_pathTop = at.depth, m_index = at.index;
+    m_path[static_cast<std::size_t>(at.depth)] = at.index;
   }
   void resetCursor() const { m_corner = {0, 0, 0}, m_depth = m_pathTop = kNoDepth, m_index = -1; }
   /// A tile at or above `depth` that holds the point, from the cursor's neighbours or its path; invalid when

@@ -1,0 +1,68 @@
+// PlaceTable: from a position straight to its tile, without a walk through the tile records.
+//
+//   acceleration grid                        block of a tile of the grid's depth g
+//   +----+----+----+----+                    +--+--+--+--+    a number for each place of lastDepth:
+//   | t3 | -- | t7 | c  |   t of depth g --> |  |  |  |  |    the deepest tile there, and its depth
+//   +----+----+----+----+                    +--+--+--+--+
+//                   c: coarser, the same tile in the whole cell; --: not known here, ask the tree
+//
+// Two loads in place of two for each level: at random places each of those is a miss of the processor's
+// caches.
+#pragma once
+
+#include "GeometryVolume/tiletree/Traits.h"
+#include "GeometryVolume/tiletree/TreeIndex.h"
+
+#include <array>
+#include <cstddef>
+#include <cstdint>
+#include <vector>
+
+namespace VLN::TileTree3D {
+
+template <class TraitsT> struct PlaceTable {
+  /// Levels below the grid's depth that a block resolves.
+  static constexpr int kLevels = TraitsT::kTW == 2 ? 2 : 1;
+  static constexpr int kNothing = -1;
+
+  int gridDepth = -1;
+  /// The deepest depth that is resolved. Deeper tiles lie below the answer when that has this depth.
+  int lastDepth = -1;
+  std::uint32_t placeWidth = 1; ///< places along a block
+  std::uint32_t blockSize = 1;
+  /// Cells of the grid's low corner and along its axes.
+  std::array<std::uint32_t, 3> first{}, size{};
+  /// index * kDepthUnit + depth of the deepest tile at or above the grid's depth; kNothing where there is
+  /// none.
+  std::vector<std::int64_t> cells;
+  /// For each tile of the grid's depth a block of index * kLevelUnit + levels below the grid.
+  std::vector<std::int32_t> places;
+
+  static constexpr std::int64_t kDepthUnit = 32;
+  static constexpr std::int32_t kLevelUnit = 4;
+  static constexpr std::int64_t kMostTiles = INT32_MAX / kLevelUnit;
+
+  /// The deepest tile that holds the point, down to lastDepth; invalid where the table does not know.
+  TreeIndex find(int i, int j, int k) const {
+    std::uint32_t const ui = TraitsT::offset(i), uj = TraitsT::offset(j), uk = TraitsT::offset(k);
+    std::uint32_t const ci = TraitsT::quotient(ui, gridDepth) - first[0],
+                        cj = TraitsT::quotient(uj, gridDepth) - first[1],
+                        ck = TraitsT::quotient(uk, gridDepth) - first[2];
+    if (ci >= size[0] || cj >= size[1] || ck >= size[2]) return {};
+    std::int64_t const cell = cells[ci + std::size_t(size[0]) * (cj + std::size_t(size[1]) * ck)];
+    if (cell < 0) return {};
+    auto const depth = static_cast<std::int32_t>(cell & (kDepthUnit - 1));
+    auto const index = static_cast<std::int64_t>(static_cast<std::uint64_t>(cell) / kDepthUnit);
+    if (depth != gridDepth) return {index, depth};
+    auto const at = [this](std::uint32_t u, std::uint32_t c) {
+      return TraitsT::quotient(u, lastDepth) - placeWidth * c;
+    };
+    std::uint32_t const place =
+        at(ui, ci + first[0]) + placeWidth * (at(uj, cj + first[1]) + placeWidth * at(uk, ck + first[2]));
+    auto const found =
+        static_cast<std::uint32_t>(places[static_cast<std::size_t>(index) * blockSize + place]);
+    return {found / std::uint32_t(kLevelUnit), gridDepth + static_cast<std::int32_t>(found % kLevelUnit)};
+  }
+};
+
+} // namespace VLN::TileTree3D
