@@ -11,8 +11,10 @@
 #include <csignal>
 #include <cstring>
 #include <fstream>
+#include <iterator>
 #include <new>
 #include <optional>
+#include <sstream>
 
 #include <fcntl.h>
 #include <poll.h>
@@ -108,6 +110,35 @@ Memory memoryOf(char const* process) {
   return {memory.space * page, memory.resident * page};
 }
 
+// What a process is doing, and its processor time so far in clock ticks.
+struct Activity {
+  char state = '?';
+  std::uint64_t ticks = 0;
+  bool operator==(Activity const&) const = default;
+};
+Activity activityOf(std::string const& process) {
+  std::ifstream in("/proc/" + process + "/stat");
+  std::string const text((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
+  // The name, in brackets, may hold anything.
+  std::size_t const name = text.rfind(')');
+  if (name == std::string::npos) return {};
+  std::istringstream fields(text.substr(name + 1));
+  Activity activity;
+  fields >> activity.state;
+  std::string other;
+  for (int n = 0; n < 10; ++n) fields >> other;
+  std::uint64_t user = 0, system = 0;
+  fields >> user >> system;
+  activity.ticks = user + system;
+  return activity;
+}
+
+double seconds() {
+  timespec now;
+  clock_gettime(CLOCK_MONOTONIC, &now);
+  return double(now.tv_sec) + 1e-9 * double(now.tv_nsec);
+}
+
 void setLimit(decltype(RLIMIT_AS) resource, std::uint64_t soft, std::uint64_t hard) {
   rlimit limit;
   if (getrlimit(resource, &limit) != 0) return;
@@ -163,35 +194,45 @@ void onNoMemory() {
   _exit(0);
 }
 
-// Collects what the child writes until it ends. Sets `reason` and stops the child when it takes too much.
-std::string watchChild(int fd, pid_t child, VdbReadLimits const& limits, Memory const& start,
-                       std::optional<std::string>& reason) {
+// What came of a child.
+struct Verdict {
+  std::string text;                  ///< what it wrote
+  std::optional<std::string> reason; ///< why it was stopped
+  bool stalled = false;              ///< it was stopped because it slept for `stallSeconds` without a break
+};
+
+// Collects what the child writes until it ends. Stops it when it takes too much.
+Verdict watchChild(int fd, pid_t child, VdbReadLimits const& limits, Memory const& start,
+                   double stallSeconds) {
   std::string const process = std::to_string(child);
   // The processor time is bounded by the system; this is for a child that waits for ever.
-  double const patience = 60 + 10.0 * limits.seconds;
-  timespec begin, now;
-  clock_gettime(CLOCK_MONOTONIC, &begin);
-  std::string text;
+  double const patience = 60 + 10.0 * limits.seconds, begin = seconds();
+  Verdict verdict;
+  Activity activity;
+  double activeAt = begin;
   for (;;) {
     pollfd wait{fd, POLLIN, 0};
     int const ready = poll(&wait, 1, 20);
-    if (ready < 0 && errno != EINTR) return text;
+    if (ready < 0 && errno != EINTR) return verdict;
     if (ready > 0) {
       char buffer[1024];
       ssize_t const n = read(fd, buffer, sizeof buffer);
       if (n < 0 && errno == EINTR) continue;
-      if (n <= 0) return text;
-      if (text.size() < 4096) text.append(buffer, static_cast<std::size_t>(n));
+      if (n <= 0) return verdict;
+      if (verdict.text.size() < 4096) verdict.text.append(buffer, static_cast<std::size_t>(n));
       continue;
     }
-    clock_gettime(CLOCK_MONOTONIC, &now);
+    double const now = seconds();
+    Activity const seen = activityOf(process);
+    if (seen.state != 'S' || !(seen == activity)) activity = seen, activeAt = now;
+    verdict.stalled = now - activeAt > stallSeconds;
     if (memoryOf(process.c_str()).resident > start.resident + limits.memoryBytes)
-      reason = memoryReason(limits.memoryBytes);
-    else if (double(now.tv_sec - begin.tv_sec) > patience)
-      reason = "cannot be read in " + std::to_string(static_cast<long>(patience)) + " s";
-    if (reason) {
+      verdict.reason = memoryReason(limits.memoryBytes);
+    else if (now - begin > patience)
+      verdict.reason = "cannot be read in " + std::to_string(static_cast<long>(patience)) + " s";
+    if (verdict.reason || verdict.stalled) {
       kill(child, SIGKILL);
-      return text;
+      return verdict;
     }
   }
 }
@@ -203,10 +244,9 @@ VdbReadLimits effective(VdbReadLimits limits, std::uint64_t fileSize) {
   return limits;
 }
 
-// Probes and returns the limits in force.
-VdbReadLimits probe(std::string const& path, VdbReadLimits const& asked) {
-  VdbReadLimits const limits = effective(asked, checkHeader(path));
-  openvdb::initialize();
+// Reads the file in one child.
+// @return Whether it stalled, and nothing is known of the file.
+bool probeOnce(std::string const& path, VdbReadLimits const& limits, double stallSeconds) {
   int ends[2];
   if (pipe2(ends, O_CLOEXEC) != 0) throw FileError(path, std::string("no pipe: ") + std::strerror(errno));
   Memory const start = memoryOf("self");
@@ -218,17 +258,18 @@ VdbReadLimits probe(std::string const& path, VdbReadLimits const& asked) {
   }
   if (child == 0) runChild(path, limits, start, ends[1]);
   close(ends[1]);
-  std::optional<std::string> reason;
-  std::string const verdict = watchChild(ends[0], child, limits, start, reason);
+  Verdict verdict = watchChild(ends[0], child, limits, start, stallSeconds);
   close(ends[0]);
   int status = 0;
   rusage usage = {};
   while (wait4(child, &status, 0, &usage) < 0 && errno == EINTR) {}
+  if (verdict.stalled && !verdict.reason) return true;
   // A child that was quicker than the watch; its greatest size is told in kB.
-  if (!reason && static_cast<std::uint64_t>(usage.ru_maxrss) * 1024 > start.resident + limits.memoryBytes)
-    reason = memoryReason(limits.memoryBytes);
+  if (!verdict.reason &&
+      static_cast<std::uint64_t>(usage.ru_maxrss) * 1024 > start.resident + limits.memoryBytes)
+    verdict.reason = memoryReason(limits.memoryBytes);
 
-  if (reason) throw FileError(path, *reason);
+  if (verdict.reason) throw FileError(path, *verdict.reason);
   if (WIFSIGNALED(status)) {
     int const number = WTERMSIG(status);
     if (number == SIGXCPU || number == SIGKILL)
@@ -236,8 +277,19 @@ VdbReadLimits probe(std::string const& path, VdbReadLimits const& asked) {
                                 " s of processor time");
     throw FileError(path, std::string("is damaged: reading it ends in \"") + strsignal(number) + "\"");
   }
-  if (verdict.empty()) throw FileError(path, "is damaged: reading it ends without a word");
-  if (verdict != "ok") throw FileError(path, verdict);
+  if (verdict.text.empty()) throw FileError(path, "is damaged: reading it ends without a word");
+  if (verdict.text != "ok") throw FileError(path, verdict.text);
+  return false;
+}
+
+// Probes and returns the limits in force.
+VdbReadLimits probe(std::string const& path, VdbReadLimits const& asked) {
+  VdbReadLimits const limits = effective(asked, checkHeader(path));
+  openvdb::initialize();
+  // A worker thread that happened to hold one of the scheduler's locks while the child was made does not
+  // exist in the child, which then waits for ever. Another child will not have that bad luck. One that waits
+  // for a slow disk looks the same, so that each has more time than the one before.
+  for (double stallSeconds = 0.25; probeOnce(path, limits, stallSeconds); stallSeconds *= 2) {}
   return limits;
 }
 

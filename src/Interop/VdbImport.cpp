@@ -37,6 +37,18 @@ void tell(Progress const& progress, char const* stage, double done) {
   if (progress) progress(stage, done);
 }
 
+// Why a transform cannot be kept, such as a singular matrix out of a damaged file; empty when it can.
+std::string whyNotKept(openvdb::math::Transform const& transform) {
+  try {
+    IndexToWorld const kept(transformBytes(transform));
+    kept.besidesScale();
+    kept.toIndex(kept.toWorld({1, 1, 1}));
+    return {};
+  } catch (std::exception const& error) {
+    return "its transform cannot be used: " + oneLine(error.what());
+  }
+}
+
 std::vector<Group> groupByTransform(VdbFile const& file, std::vector<SkippedGrid>& skipped) {
   std::vector<Group> groups;
   for (auto const& base : file.grids) {
@@ -49,6 +61,10 @@ std::vector<Group> groupByTransform(VdbFile const& file, std::vector<SkippedGrid
     }
     if (auto const reason = source->whyNotPlaced()) {
       skipped.push_back({base->getName(), *reason});
+      continue;
+    }
+    if (std::string const reason = whyNotKept(base->transform()); !reason.empty()) {
+      skipped.push_back({base->getName(), reason});
       continue;
     }
     auto group = std::find_if(groups.begin(), groups.end(),

@@ -85,6 +85,7 @@ PointVolume readGrid(PointDataGrid const& grid) {
       // Leaves are read by the first one's attributes.
       if (!(leaf->attributeSet().descriptor() == descriptor))
         throw std::runtime_error("its points have different attributes in different places");
+      leaf->validateOffsets(); // which handles do not
       AttributeHandle<openvdb::Vec3f> const handle(leaf->constAttributeArray(position));
       for (auto at = leaf->beginIndexOn(); at; ++at) {
         auto const p = openvdb::Vec3d(handle.get(*at)) + at.getCoord().asVec3d();
