@@ -157,7 +157,8 @@ std::size_t pixelCount(Plane const& plane) {
   return static_cast<std::size_t>(plane.width) * static_cast<std::size_t>(plane.height);
 }
 
-std::vector<Sample> nearestSamples(Plane const& plane, Container const& tree, ChannelBase const& channel) {
+std::vector<Sample> nearestSamples(Plane const& plane, Container const& tree, ChannelBase const& channel,
+                                   int depth) {
   std::vector<Sample> samples(pixelCount(plane));
   Reader const read = readerOf(channel);
   parallelFor(0, plane.height,
@@ -166,7 +167,7 @@ std::vector<Sample> nearestSamples(Plane const& plane, Container const& tree, Ch
                 for (std::int64_t y = begin; y < end; ++y)
                   for (int x = 0; x < plane.width; ++x) {
                     int3 const p = plane.indexOf(x, static_cast<int>(y));
-                    auto const& tile = accessor.tile(p, Container::kMaxDepth, false);
+                    auto const& tile = accessor.tile(p, depth, false);
                     if (!tile.valid()) continue;
                     samples[static_cast<std::size_t>(y * plane.width + x)] = {
                         read(tile.treeIndex(), tile.childDataIJK(p)), true};
@@ -176,7 +177,8 @@ std::vector<Sample> nearestSamples(Plane const& plane, Container const& tree, Ch
   return samples;
 }
 
-std::vector<Sample> linearSamples(Plane const& plane, Sampler const& cold, bool gradient) {
+std::vector<Sample> linearSamples(Plane const& plane, Sampler const& cold, int depth,
+                                  IndexToWorld const* gradientIn, float voxelSize) {
   std::vector<Sample> samples(pixelCount(plane));
   // Samplers keep tiles that they have widened: one for each thread, for all of its rows.
   std::vector<std::unique_ptr<Sampler>> samplers(static_cast<std::size_t>(parallelThreads()));
@@ -190,15 +192,18 @@ std::vector<Sample> linearSamples(Plane const& plane, Sampler const& cold, bool 
                     TileTree3D::TreeIndex tile;
                     int3 ijk;
                     float3 weights;
-                    if (!sampler->prepareToSample(p, TileTree3D::kSamplerTileSpace, tile, ijk, weights,
-                                                  Container::kMaxDepth, nullptr))
+                    if (!sampler->prepareToSample(p, TileTree3D::kSamplerTileSpace, tile, ijk, weights, depth,
+                                                  nullptr))
                       continue;
                     Sample& s = samples[static_cast<std::size_t>(y * plane.width + x)];
                     s.found = true;
-                    if (gradient) {
+                    if (gradientIn) {
+                      // The sampler knows one voxel size; the transform may have three, and a shear.
                       float3 g;
-                      sampler->sampleGradient(p, TileTree3D::kSamplerTileSpace, &g);
-                      s.value = std::hypot(g.x, g.y, g.z);
+                      sampler->sampleGradient(p, depth, TileTree3D::kSamplerTileSpace, &g);
+                      g *= voxelSize;
+                      auto const w = gradientIn->gradientToWorld({g.x, g.y, g.z}, {p.x, p.y, p.z});
+                      s.value = static_cast<float>(std::hypot(w.x, w.y, w.z));
                     } else {
                       s.value = sampler->sample(tile, ijk, weights);
                     }
@@ -230,8 +235,11 @@ Slice drawSlice(VdbVolume const& volume, std::string const& name, SliceOptions c
                                 "' is no float channel, so that it has no gradient here");
   // Channels of other types than float are drawn by their nearest samples.
   bool const nearest = !floats || (options.nearest && !options.gradient);
-  auto const samples = nearest ? nearestSamples(plane, *container, *channel)
-                               : linearSamples(plane, {*container, *topology, *floats}, options.gradient);
+  int const depth = std::min(options.depth, Container::kMaxDepth);
+  auto const samples =
+      nearest ? nearestSamples(plane, *container, *channel, depth)
+              : linearSamples(plane, {*container, *topology, *floats}, depth,
+                              options.gradient ? &volume.indexToWorld : nullptr, container->voxelSize());
 
   Slice slice{Image(1, 1), worldOn(volume, plane, nearest ? plane.at : plane.where), 0, 0, 0, 0};
   std::vector<float> numbers;
