@@ -43,10 +43,11 @@ template <class TraitsT> TreeIndex HaloDriver<TraitsT>::findBeside(TileType cons
   if (direction != kNeighborSelf) {
     auto& known = m_around[static_cast<std::size_t>(direction)];
     if (!(m_aroundKnown >> direction & 1)) {
-      known = searchBeside(tree.tile(m_parent), side);
+      TreeIndex const at = searchBeside(tree.tile(m_parent), side);
+      known = {at.index, nullptr, at.depth};
       m_aroundKnown |= 1u << direction;
     }
-    holder = known;
+    holder = known.at();
   }
   // A root of the tile's own depth may lie where there is no tile above it.
   if (!holder.valid()) return tree.rootCount(tile.depth()) > 0 ? searchBeside(tile, step) : TreeIndex{};
@@ -158,7 +159,9 @@ template <class TraitsT> void HaloDriver<TraitsT>::fill(HaloTarget<TraitsT> cons
 template <class TraitsT>
 void HaloDriver<TraitsT>::fillRegion(HaloRegion const& region, TileType const& tile, void* target,
                                      HaloFill const& fill, HaloSampler<TraitsT>& sampler) {
-  auto const& [there, source] = beside(tile, region);
+  Beside const& known = beside(tile, region);
+  TreeIndex const there = known.at();
+  void const* const source = known.elements;
   if (source) return copy(region, target, source);
   if (!there.valid() || there.depth < m_source.minDepth || fill.mode == kHaloModeDefault)
     return set(region, target, m_source.defaultValue);

@@ -50,9 +50,13 @@ public:
 
 private:
   /// A tile beside another, at its depth or the deepest one above; the source's elements of one at its depth.
+  /// Without initial values, so that a driver for one tile need not write a table of them.
   struct Beside {
-    TreeIndex at;
+    std::int64_t index;
     void const* elements;
+    std::int32_t depth;
+
+    TreeIndex at() const { return {index, depth}; }
   };
   /// @pre moveTo(tile).
   /// @cost Tiles of one parent after the other share the searches round the parent.
@@ -63,8 +67,8 @@ private:
     Beside& entry = m_beside[static_cast<std::size_t>(n)];
     if (!(m_known[word] & bit)) {
       m_known[word] |= bit;
-      entry.at = findBeside(tile, neighborOffset(region.direction));
-      entry.elements = entry.at.depth == tile.depth() ? m_source.elements(entry.at) : nullptr;
+      TreeIndex const at = findBeside(tile, neighborOffset(region.direction));
+      entry = {at.index, at.depth == tile.depth() ? m_source.elements(at) : nullptr, at.depth};
     }
     return entry;
   }
@@ -106,7 +110,7 @@ private:
   int m_place = 1 + kAcross * (1 + kAcross); ///< of the tile among them
   std::array<Beside, kPlaces> m_beside;
   std::array<std::uint64_t, (kPlaces + 63) / 64> m_known{};
-  std::array<TreeIndex, kNeighborCount> m_around;
+  std::array<Beside, kNeighborCount> m_around;
   std::uint32_t m_aroundKnown = 0;
 };
 
