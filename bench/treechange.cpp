@@ -1,6 +1,8 @@
 // Changing trees and moving points, beside OpenVDB on the same voxels and points in the same run.
 #include "GeometryVolume/channels/ElementReTile.h"
+#include "GeometryVolume/channels/Halo.h"
 #include "GeometryVolume/core/Parallel.h"
+#include "GeometryVolume/sampling/VoxelSamplerLinear.h"
 #include "GeometryVolume/topology/Command.h"
 
 #include <openvdb/points/PointConversion.h>
@@ -34,13 +36,16 @@ template <class Body> void timed(benchmark::State& state, Body const& body) {
 
 // --- Trees: the shell of a sphere, as leaves of 8 x 8 x 8 voxels there and as tiles of the same voxels here
 
-openvdb::MaskGrid::Ptr vdbShell(double offset) {
-  auto const sphere = openvdb::tools::createLevelSetSphere<openvdb::FloatGrid>(
+openvdb::FloatGrid::Ptr vdbFloatShell(double offset) {
+  auto sphere = openvdb::tools::createLevelSetSphere<openvdb::FloatGrid>(
       200.0f, openvdb::Vec3f(static_cast<float>(offset), 0, 0), 1.0f, 3.0f);
-  auto mask = openvdb::MaskGrid::create();
-  mask->tree().topologyUnion(sphere->tree());
   // Whole leaves on both sides.
-  for (auto leaf = mask->tree().beginLeaf(); leaf; ++leaf) leaf->setValuesOn();
+  for (auto leaf = sphere->tree().beginLeaf(); leaf; ++leaf) leaf->setValuesOn();
+  return sphere;
+}
+openvdb::MaskGrid::Ptr vdbShell(double offset) {
+  auto mask = openvdb::MaskGrid::create();
+  mask->tree().topologyUnion(vdbFloatShell(offset)->tree());
   return mask;
 }
 void addLeaves(Container<Shape>& tree, openvdb::MaskGrid const& shell) {
@@ -59,8 +64,8 @@ Container<Shape> privateCopy(Container<Shape> const& tree) {
   return copy;
 }
 
-void BM_TopologyUnion(benchmark::State& state) {
-  auto const a = vdbShell(0), b = vdbShell(24);
+template <class Shell> void unite(benchmark::State& state, Shell const& shell) {
+  auto const a = shell(0), b = shell(24);
   for (auto _ : state) {
     auto copy = a->deepCopy();
     timed(state, [&] { copy->tree().topologyUnion(b->tree()); });
@@ -68,7 +73,12 @@ void BM_TopologyUnion(benchmark::State& state) {
   state.counters["voxels"] = static_cast<double>(b->activeVoxelCount());
   state.counters["leaves"] = b->tree().leafCount();
 }
+/// Of trees that hold floats: new leaves come with their values.
+void BM_TopologyUnion(benchmark::State& state) { unite(state, vdbFloatShell); }
 BENCHMARK(BM_TopologyUnion)->Arg(1)->Arg(2)->UseManualTime()->Unit(benchmark::kMillisecond);
+/// Of trees that hold bits alone.
+void BM_TopologyUnionMask(benchmark::State& state) { unite(state, vdbShell); }
+BENCHMARK(BM_TopologyUnionMask)->Arg(1)->Arg(2)->UseManualTime()->Unit(benchmark::kMillisecond);
 
 void BM_Refine(benchmark::State& state) {
   Container<Shape> a, b;
@@ -82,6 +92,28 @@ void BM_Refine(benchmark::State& state) {
   state.counters["tiles"] = static_cast<double>(b.tileCount(-1));
 }
 BENCHMARK(BM_Refine)->Arg(1)->Arg(2)->UseManualTime()->Unit(benchmark::kMillisecond);
+
+/// The same, and a float channel that takes the new tiles in.
+void BM_RefineWithValues(benchmark::State& state) {
+  Container<Shape> a, b;
+  addLeaves(a, *vdbShell(0));
+  addLeaves(b, *vdbShell(24));
+  VoxelTopology<Shape> topology("voxels", kVoxelOffsetCenter);
+  topology.update(a);
+  Channel<Shape, float, 4, 0> const empty("field", nullptr, kInitializeDefaultValue, false, true, 0, 28);
+  for (auto _ : state) {
+    auto copy = privateCopy(a);
+    auto counts = topology;
+    auto field = empty;
+    field.update(counts);
+    timed(state, [&] {
+      copy.refine({&b}, nullptr, true);
+      counts.update(copy);
+      field.updateTilesAdded(counts);
+    });
+  }
+}
+BENCHMARK(BM_RefineWithValues)->Arg(1)->Arg(2)->UseManualTime()->Unit(benchmark::kMillisecond);
 
 void BM_RemoveThird(benchmark::State& state) {
   Container<Shape> tree;
@@ -157,6 +189,49 @@ void BM_ReadNeighbors(benchmark::State& state) {
   state.SetLabel(state.range(1) ? "Morton order" : "shuffled");
 }
 BENCHMARK(BM_ReadNeighbors)->ArgsProduct({{1, 2}, {0, 1}})->UseManualTime()->Unit(benchmark::kMillisecond);
+
+/// Trilinear samples in the shell, before and after the sort: at random, and along lines through space.
+void BM_Sample(benchmark::State& state) {
+  auto tree = shuffledTree();
+  if (state.range(0)) tree.sortIntoMortonOrder();
+  VoxelTopology<Shape> topology("voxels", kVoxelOffsetCenter);
+  topology.update(tree);
+  Channel<Shape, float, 4, 0> core("core", nullptr, kInitializeDefaultValue, false, true, 0, 28);
+  core.update(topology);
+  for (float& v : core) v = 1.0f;
+  Channel<Shape, float, 5, 0> wide("wide", nullptr, kInitializeDefaultValue, true, true, 0, 28);
+  wide.update(topology);
+  computeHalo<Shape, float, 0, 0, 1, 0>(core, tree, wide, -1, -1);
+  std::vector<float3> places;
+  std::mt19937 random(4);
+  std::uniform_real_distribution<float> inside(0.5f, 3.4f);
+  for (std::int64_t n = 0; n < tree.tileCount(28); ++n) {
+    int3 const p = std::as_const(tree).tile(n, 28).tijk();
+    for (int i = 0; i < 4; ++i)
+      places.push_back({static_cast<float>(p.x) + inside(random), static_cast<float>(p.y) + inside(random),
+                        static_cast<float>(p.z) + inside(random)});
+  }
+  std::shuffle(places.begin(), places.end(), random);
+  if (state.range(1)) {
+    // Line after line along i through rows of tiles.
+    auto const row = [](float3 const& p) { return std::pair(std::floor(p.z / 4), std::floor(p.y / 4)); };
+    std::sort(places.begin(), places.end(), [&](float3 const& a, float3 const& b) {
+      return row(a) != row(b) ? row(a) < row(b) : a.x < b.x;
+    });
+  }
+  FloatVoxelSamplerLinear<Shape> const sampler(tree, topology, wide);
+  for (auto _ : state) {
+    state.SetIterationTime(seconds([&] {
+      float sum = 0;
+      for (float3 const& p : places) sum += sampler.sample(p, kSamplerTileSpace);
+      benchmark::DoNotOptimize(sum);
+    }));
+  }
+  state.SetItemsProcessed(state.iterations() * static_cast<std::int64_t>(places.size()));
+  state.SetLabel(std::string(state.range(0) ? "Morton order" : "shuffled") +
+                 (state.range(1) ? ", along lines" : ", at random"));
+}
+BENCHMARK(BM_Sample)->ArgsProduct({{0, 1}, {0, 1}})->UseManualTime()->Unit(benchmark::kMillisecond);
 
 // --- Points: a ball of a million, with so many to a voxel
 

@@ -1,5 +1,6 @@
 # One Google Benchmark binary bench_<name> for each source of bench/. A source may write its own
 # main; otherwise it gets the library's.
+include(VlnTestData)
 vln_glob(sources bench/*.cpp)
 foreach(source IN LISTS sources)
   get_filename_component(name "${source}" NAME_WE)
@@ -8,6 +9,7 @@ foreach(source IN LISTS sources)
   vln_target(${target})
   set_target_properties(${target} PROPERTIES RUNTIME_OUTPUT_DIRECTORY "${PROJECT_BINARY_DIR}/bench")
   target_include_directories(${target} PRIVATE "${PROJECT_SOURCE_DIR}/bench")
+  target_compile_definitions(${target} PRIVATE "VLN_BENCH_DATA_DIR=\"${vln_test_data}\"")
   target_link_libraries(${target} PRIVATE
     GeometryVolume TBB::tbb benchmark::benchmark benchmark::benchmark_main)
   if(TARGET GeometryVolumeInterop)

@@ -8,9 +8,7 @@ if(sources)
   vln_target(GeometryVolumeInterop)
   target_link_libraries(GeometryVolumeInterop PUBLIC GeometryVolume)
   vln_uses_openvdb(GeometryVolumeInterop)
-  if(PNG_FOUND)
-    target_link_libraries(GeometryVolumeInterop PRIVATE PNG::PNG)
-  endif()
+  target_link_libraries(GeometryVolumeInterop PRIVATE PNG::PNG)
   set_target_properties(GeometryVolumeInterop PROPERTIES
     VERSION ${PROJECT_VERSION}
     SOVERSION ${PROJECT_VERSION_MAJOR}.${PROJECT_VERSION_MINOR}

@@ -2,6 +2,7 @@
 #include "FakeTree.h"
 #include "GeometryVolume/core/Parallel.h"
 #include "ProbeChannel.h"
+#include "UpdateModel.h"
 
 #include <gtest/gtest.h>
 #include <random>
@@ -203,6 +204,58 @@ TEST(ElementMovesThreads, RequirementResultDoesNotDependOnTheNumberOfThreads) {
   auto const one = run(1);
   EXPECT_EQ(run(2), one);
   EXPECT_EQ(run(8), one);
+}
+
+/// Below 500 records lists are sorted serially, from there on in parallel; and destinations are counted where
+/// they are few, sorted where they are many. All ways give what a map of vectors gives.
+TEST(ElementMovesThreads, BoundaryBothSidesOfTheParallelSort) {
+  for (int const records : {1, 498, 499, 500, 501, 1200}) {
+    for (int const tiles : {40, 20000}) {
+      for (bool const recorded : {false, true}) {
+        SCOPED_TRACE(std::to_string(records) + " records, " + std::to_string(tiles) + " tiles" +
+                     (recorded ? ", recorded" : ""));
+        std::mt19937 random(static_cast<unsigned>(records + tiles));
+        std::vector<int> sizes(static_cast<std::size_t>(tiles));
+        for (int& n : sizes) n = static_cast<int>(random() % (tiles == 40 ? 80u : 4u));
+        Points channel = points(sizes);
+        UpdateModel<int> model;
+        model.layout = Points::kLayout;
+        FakeTree tree;
+        tree.elements[3] = sizes;
+        model.resizeTiles(tree);
+        std::vector<std::pair<std::int64_t, int>> all;
+        for (std::int64_t i = 0; i < tiles; ++i) {
+          for (int n = 0; n < sizes[static_cast<std::size_t>(i)]; ++n) {
+            all.emplace_back(i, n);
+            model.tiles[3][static_cast<std::size_t>(i)][static_cast<std::size_t>(n)] = int(100 * i) + n;
+          }
+        }
+        std::shuffle(all.begin(), all.end(), random);
+        ASSERT_GE(all.size(), static_cast<std::size_t>(records));
+        all.resize(static_cast<std::size_t>(records));
+        TileTree3D::ElementMoves moves(kChannelDepths);
+        TileDataElementAccessor accessor;
+        for (auto const& [tile, element] : all) {
+          bool const goes = random() % 7 == 0;
+          auto const to = goes ? -1 : static_cast<std::int64_t>(random() % static_cast<unsigned>(tiles));
+          moves[3].push_back({to, tile, element, 3});
+          ElementTreeIndex const from(tile, 3, element);
+          if (goes)
+            accessor.remove(from);
+          else
+            accessor.move(from, TreeIndex{to, 3});
+        }
+        model.move(moves);
+        withThreads(2, [&] {
+          if (recorded)
+            channel.update(accessor);
+          else
+            channel.update(moves, false);
+        });
+        EXPECT_EQ(difference(std::as_const(channel), model), "");
+      }
+    }
+  }
 }
 
 } // namespace

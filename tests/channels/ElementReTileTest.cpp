@@ -144,9 +144,8 @@ TYPED_TEST(ReTile, PositionsThatLieInTheObjectMoveOnce) {
   TreeIndex const at = cloud.tree.tileAccessor().tile(home, true).treeIndex();
   positions->tileDataAccessor().tileData(at).push({50.5f, 0.5f, 0.5f});
   cloud.topology.update(*positions);
-  auto ids = cloud.object.template extractComponent<typename PointCloud<TypeParam>::Ids>("ids");
-  ids->tileDataAccessor().tileData(at).push(1);
-  cloud.object.putComponent(std::move(ids));
+  cloud.template pushTo<typename PointCloud<TypeParam>::Ids>("ids", at, 1);
+  cloud.template pushTo<typename PointCloud<TypeParam>::Weights>("weights", at, 1.0f);
   cloud.object.addComponent(positions);
   channelElementReTile(cloud.tree, cloud.topology, *positions, cloud.object, false);
   EXPECT_EQ(positions->size(), 1u);

@@ -14,6 +14,7 @@
 #include <random>
 #include <stdexcept>
 #include <string>
+#include <tuple>
 #include <vector>
 
 using namespace VLN;
@@ -105,6 +106,38 @@ TEST(Parallel, SortOfPositionsIsStable) {
   parallelSortPositions(order.data(), static_cast<std::int64_t>(order.size()),
                         [&](std::uint64_t a, std::uint64_t b) { return keys[a] < keys[b]; });
   EXPECT_EQ(order, expected);
+}
+
+// requirement: by key, then by value, however many records and whichever of their bits differ
+TEST(Parallel, SortOfRecordsIsByKeyThenValue) {
+  std::mt19937_64 random(11);
+  std::uint64_t const all = ~std::uint64_t(0);
+  struct Bits {
+    std::uint64_t high, low;
+  };
+  for (Bits const bits : {Bits{all, all}, Bits{0, 0xff}, Bits{0, 3}, Bits{0, 0}, Bits{all << 60, 0},
+                          Bits{0x249249, all << 37}}) {
+    for (std::size_t const n : {0u, 1u, 2u, 499u, 500u, 501u, 32768u, 32769u, 100000u}) {
+      for (bool const valuesRise : {true, false}) {
+        std::vector<SortRecord> records(n);
+        for (std::size_t i = 0; i < n; ++i)
+          records[i] = {random() & bits.high, random() & bits.low,
+                        valuesRise ? static_cast<std::int64_t>(i) - 50
+                                   : static_cast<std::int64_t>(random() >> 1)};
+        auto const key = [](SortRecord const& r) { return std::tuple(r.high, r.low, r.value); };
+        auto expected = records;
+        std::sort(expected.begin(), expected.end(),
+                  [&](auto const& a, auto const& b) { return key(a) < key(b); });
+        for (int const threads : {1, 2, 8}) {
+          auto sorted = records;
+          withThreads(threads, [&] { parallelSort(sorted.data(), static_cast<std::int64_t>(n)); });
+          ASSERT_TRUE(std::equal(sorted.begin(), sorted.end(), expected.begin(), expected.end(),
+                                 [&](auto const& a, auto const& b) { return key(a) == key(b); }))
+              << n << " records, bits " << std::hex << bits.high << ' ' << bits.low;
+        }
+      }
+    }
+  }
 }
 
 // requirement

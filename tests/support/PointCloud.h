@@ -7,8 +7,10 @@
 #include "GeometryVolume/topology/Command.h"
 #include "support/TreeModel.h"
 
+#include <algorithm>
 #include <cmath>
 #include <cstring>
+#include <iterator>
 #include <map>
 
 namespace Support {
@@ -23,7 +25,9 @@ public:
   using Tree = Container<TraitsT>;
   using Positions = VLN::TileTree3D::Channel<TraitsT, float3, kW, 0>;
   using Ids = VLN::TileTree3D::Channel<TraitsT, int, kW, 0>;
+  using Weights = VLN::TileTree3D::Channel<TraitsT, float, kW, 0>;
   using Voxels = VLN::TileTree3D::Channel<TraitsT, float, kW, 1>;
+  using Marks = Ids;
   using Model = TreeModel<TraitsT>;
   struct Less {
     bool operator()(VoxelCoord const& a, VoxelCoord const& b) const { return typename Model::Less()(a, b); }
@@ -40,11 +44,15 @@ public:
     using Shape = TraitsT;
     Command::createChannel<int, Shape::kTW, kW, kW, 0, 0>("ids", topology, object, 0,
                                                           VLN::TileTree3D::kInitializeDefaultValue, 0, 28);
+    Command::createChannel<float, Shape::kTW, kW, kW, 0, 0>("weights", topology, object, 0.0f,
+                                                            VLN::TileTree3D::kInitializeDefaultValue, 0, 28);
     auto voxels = Ostil::makePtr<VoxelTopology<TraitsT>>("voxels", VLN::TileTree3D::kVoxelOffsetCenter);
     voxels->setTargetName(tree.name());
     object.addComponent(voxels);
     Command::createChannel<float, Shape::kTW, kW, kW, 0, 1>("density", *voxels, object, 0.0f,
                                                             VLN::TileTree3D::kInitializeDefaultValue, 0, 28);
+    Command::createChannel<int, Shape::kTW, kW, kW, 0, 0>("marks", *voxels, object, 0,
+                                                          VLN::TileTree3D::kInitializeDefaultValue, 0, 28);
   }
 
   /// Adds tiles, then points to them.
@@ -52,21 +60,50 @@ public:
     auto accessor = tree.tileAccessor();
     for (VoxelCoord const& at : tiles) accessor.addTile(at), model.add(at);
     accessor.addTiles(typename Tree::TileLists{}); // branch sizes
+    grew();
+  }
+  /// Everything follows a tree that has grown.
+  void grew() {
     topology.update(tree);
     positions.updateTilesAdded(topology);
     VLN::TileTree3D::updateTilesAdded(topology, object);
     VLN::TileTree3D::updateTopologies(tree, object, nullptr, &topology);
-    labelVoxels();
+    labelNewVoxels();
+  }
+  /// Everything follows a tree that has lost tiles, and with them their points.
+  void shrank(VLN::TileTree3D::TileRemovalList const& moves) {
+    topology.update(tree);
+    positions.updateTilesRemoved(moves, topology);
+    topology.update(positions);
+    VLN::TileTree3D::updateTilesRemoved(moves, topology, object);
+    VLN::TileTree3D::updateTopologies(tree, object, &moves, &topology);
+    for (auto at = points.begin(); at != points.end();)
+      at = model.has(at->first) ? std::next(at) : points.erase(at);
+    labelNewVoxels();
+  }
+  /// Everything follows a tree in a new order.
+  void permuted(std::vector<std::vector<std::int64_t>> const& oldToNew) {
+    auto const newToOld = VLN::TileTree3D::invertPermutation(oldToNew);
+    positions.updateTilesPermuted(newToOld);
+    topology.update(positions);
+    VLN::TileTree3D::updateTilesPermuted(newToOld, topology, object);
+    auto const voxels = object.template component<VoxelTopology<TraitsT>>("voxels");
+    VLN::TileTree3D::updateTilesPermuted(newToOld, *voxels, object);
   }
   void addPoint(VoxelCoord const& at, float3 const& p) {
     TreeIndex const tile = tree.tileAccessor().tile(at, true).treeIndex();
     ASSERT_TRUE(tile.valid());
     int const id = static_cast<int>(m_next++);
     positions.tileDataAccessor().tileData(tile).push(p);
-    auto ids = object.template extractComponent<Ids>("ids");
-    ids->tileDataAccessor().tileData(tile).push(id);
-    object.putComponent(std::move(ids));
+    pushTo<Ids>("ids", tile, id);
+    pushTo<Weights>("weights", tile, weight(id));
     points[at][id] = p;
+  }
+  /// Appends to a tile of one of the object's channels.
+  template <class C, class V> void pushTo(char const* name, TreeIndex const& tile, V value) {
+    auto channel = object.template extractComponent<C>(name);
+    channel->tileDataAccessor().tileData(tile).push(value);
+    object.putComponent(std::move(channel));
   }
   void counted() { topology.update(positions); }
   /// A place in a tile, in world space.
@@ -95,9 +132,9 @@ public:
             EXPECT_EQ(tree.tileCount(d), positions.tileCount(d));
             EXPECT_EQ(tree.tileCount(d), object.template component<Ids>("ids")->tileCount(d));
           }
-          if (removed) compareCounts();
+          compareCounts();
           VLN::TileTree3D::updateTopologies(tree, object, removed, &topology);
-          if (!removed) labelVoxels();
+          labelNewVoxels();
         });
   }
 
@@ -106,16 +143,31 @@ public:
     ASSERT_TRUE(tree.checkBranchSizes(false));
     compareCounts();
     auto const ids = object.template component<Ids>("ids");
+    auto const weights = object.template component<Weights>("weights");
     auto const voxels = object.template component<Voxels>("density");
+    auto const marks = object.template component<Marks>("marks");
     PointsByTile found;
     for (auto t = tree.cbeginTiles(); t != tree.cendTiles(); ++t) {
       TreeIndex const at = (*t).treeIndex();
       auto const p = std::as_const(positions).tileData(at);
       auto const id = std::as_const(*ids).tileData(at);
+      auto const w = std::as_const(*weights).tileData(at);
       ASSERT_EQ(p.size(), id.size());
-      for (int n = 0; n < p.size(); ++n)
+      ASSERT_EQ(p.size(), w.size());
+      for (int n = 0; n < p.size(); ++n) {
         ASSERT_TRUE(found[(*t).voxelCoord()].emplace(id[n], p[n]).second) << "doubled point " << id[n];
-      ASSERT_EQ(std::as_const(*voxels).tileData(at)[0], label((*t).voxelCoord())) << "voxels out of step";
+        ASSERT_EQ(w[n], weight(id[n]));
+      }
+      float const expected = label((*t).voxelCoord());
+      auto const density = std::as_const(*voxels).tileData(at);
+      auto const mark = std::as_const(*marks).tileData(at);
+      ASSERT_EQ(density.size(), Voxels::kSize);
+      ASSERT_EQ(mark.size(), Marks::kSize);
+      ASSERT_TRUE(std::all_of(density.begin(), density.end(), [&](float v) { return v == expected; }))
+          << "voxels out of step at " << (*t).voxelCoord();
+      ASSERT_TRUE(
+          std::all_of(mark.begin(), mark.end(), [&](int v) { return v == static_cast<int>(expected); }))
+          << "marks out of step at " << (*t).voxelCoord();
     }
     auto const& expected = points;
     auto a = found.begin();
@@ -163,14 +215,26 @@ private:
   static float label(VoxelCoord const& at) {
     return static_cast<float>(at.i % 1009 + at.j % 1013 + at.k % 1019 + at.depth);
   }
-  void labelVoxels() {
+  static float weight(int id) { return 0.5f * static_cast<float>(id); }
+  /// Gives the voxels of new tiles their values; the others must keep theirs through every change.
+  void labelNewVoxels() {
     auto voxels = object.template extractComponent<Voxels>("density");
+    auto marks = object.template extractComponent<Marks>("marks");
+    typename Model::Set live;
     for (auto t = tree.cbeginTiles(); t != tree.cendTiles(); ++t) {
+      VoxelCoord const at = (*t).voxelCoord();
+      live.insert(at);
+      if (m_labelled.count(at)) continue;
       auto data = voxels->tileData((*t).treeIndex());
+      auto mark = marks->tileData((*t).treeIndex());
       ASSERT_EQ(data.size(), Voxels::kSize);
-      data[0] = label((*t).voxelCoord());
+      ASSERT_EQ(mark.size(), Marks::kSize);
+      std::fill(data.begin(), data.end(), label(at));
+      std::fill(mark.begin(), mark.end(), static_cast<int>(label(at)));
     }
+    m_labelled = std::move(live);
     object.putComponent(std::move(voxels));
+    object.putComponent(std::move(marks));
   }
   void compareCounts() const {
     std::int64_t total = 0;
@@ -243,6 +307,7 @@ private:
   }
 
   std::uint32_t m_next = 1;
+  typename Model::Set m_labelled;
 };
 
 } // namespace Support

@@ -1,5 +1,6 @@
 #include "GeometryVolume/tiletree/Container.h"
 
+#include "GeometryVolume/core/Canceller.h"
 #include "GeometryVolume/core/Const.h"
 #include "GeometryVolume/core/LoggerHooks.h"
 #include "GeometryVolume/core/Streaming.h"
@@ -211,8 +212,32 @@ void Container<TraitsT>::reduce(VisitorType& visitor, TraversalMode mode, Traver
   TraversalEngine<false, TraitsT>::run(*this, visitor, mode, range, VisitorResults::kJoin);
 }
 template <class TraitsT> void Container<TraitsT>::setBranchSizes() {
-  BranchSizeVisitor<TraitsT> visitor(*m_data);
-  traverse(visitor, kParallelBottomUp);
+  // What a bottom-up traversal would do, as one loop over each array: nothing but sums of children.
+  Canceller::cancelID(Canceller::kTraverse);
+  m_data->detachTiles();
+  for (int d = kMaxDepth; d >= 0; --d) {
+    auto& tiles = m_data->editTiles(d);
+    auto const* const below = d < kMaxDepth ? m_data->tiles(d + 1).begin() : nullptr;
+    bool const belowIsDeepest = d + 1 == kMaxDepth; // whose sizes are known
+    parallelFor(0, tiles.size(),
+                [&](std::int64_t begin, std::int64_t end) {
+                  for (std::int64_t n = begin; n < end; ++n) {
+                    TileType& t = tiles[n];
+                    if (!t.valid()) continue;
+                    std::int64_t size = TraitsT::kTileSize;
+                    if (below) {
+                      for (int slot = 0; slot < TraitsT::kTileSize; ++slot) {
+                        std::int64_t const child = t.childIndex(slot);
+                        if (child >= 0)
+                          size += belowIsDeepest ? TraitsT::kTileSize : below[child].branchSize();
+                      }
+                    }
+                    if (t.branchSize() != size) t.setBranchSize(size);
+                  }
+                },
+                {.grain = 1024, .cancellation = Cancellation::kPoll});
+    Canceller::cancelID(Canceller::kTraverse);
+  }
 }
 template <class TraitsT> bool Container<TraitsT>::checkBranchSizes(bool verbose) const {
   return TileTree3D::checkBranchSizes(*this, verbose);

@@ -286,10 +286,23 @@ private:
   /// Indices n whose corner has no tile at `depth`; a null corner is left out.
   std::vector<std::int64_t> findMissing(std::int64_t count, int depth,
                                         FunctionRef<int3 const*(std::int64_t)> cornerAt) const;
+  /// A new tile without parent: a root, or one that hangs below a coarser tile with tiles between.
+  struct Unlinked {
+    std::int64_t index;
+    TreeIndex above;
+  };
+  /// Grows a depth by `n` tiles, of which the caller runs makeAt() for each index.
+  void allocateForMaking(int depth, std::int64_t n);
+  /// Makes the tile of a new index and links it to its parent, when that is known (not -1) or found.
+  /// @return false when it has none; `unlinked` then tells where it belongs.
+  /// @threads Tiles of one depth are made in parallel: each slot belongs to exactly one tile.
+  bool makeAt(std::int64_t index, int depth, int3 const& corner, std::int64_t parent,
+              ConstTileAccessor const& accessor, Unlinked& unlinked);
+  /// Links what makeAt() could not, and lists what is new since the counts were `before`.
+  void finishMaking(int depth, std::vector<std::vector<Unlinked>> const& parts, Counts const& before,
+                    TileLists* newTiles);
   /// Makes the tiles of distinct aligned corners that do not exist yet.
-  /// @param parents If given, the parent of each where it is known; -1 where it has to be searched.
-  void createTiles(std::vector<int3> const& corners, int depth, TileLists* newTiles,
-                   std::vector<std::int64_t> const* parents = nullptr);
+  void createTiles(std::vector<int3> const& corners, int depth, TileLists* newTiles);
   /// Hangs roots deeper than `depth` below roots of `depth` that hold them.
   void adoptDeeperRoots(int depth);
   /// Takes a tile or its branch out of the tree; returns how many tiles died.

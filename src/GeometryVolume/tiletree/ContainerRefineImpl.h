@@ -7,7 +7,9 @@
 #include "Ostil/Job.h"
 #include "Velorn/ExceptionMessage.h"
 
+#include <new>
 #include <stdexcept>
+#include <utility>
 
 namespace VLN::TileTree3D {
 
@@ -17,12 +19,30 @@ namespace Internal {
 inline constexpr std::int64_t kParallelTiles = 100;
 inline constexpr std::int64_t kRefineGrain = 50;
 
+inline std::int64_t refineChunks(std::int64_t count) {
+  return count >= kParallelTiles ? chunkCount(0, count, kRefineGrain) : 1;
+}
+/// @param work Number of tiles that decides between the paths, where it is not the count.
 inline void refinePass(std::int64_t count,
-                       FunctionRef<void(std::int64_t chunk, std::int64_t, std::int64_t)> body) {
-  if (count >= kParallelTiles)
+                       FunctionRef<void(std::int64_t chunk, std::int64_t, std::int64_t)> body,
+                       std::int64_t work = kParallelTiles) {
+  if (count >= kParallelTiles && work >= kParallelTiles) {
     parallelChunks(0, count, kRefineGrain, body);
-  else if (count > 0)
-    body(0, 0, count);
+  } else {
+    std::int64_t const chunk = count >= kParallelTiles ? kRefineGrain : count;
+    for (std::int64_t n = 0, c = 0; n < count; n += chunk, ++c) body(c, n, std::min(count, n + chunk));
+  }
+}
+
+/// Slot of the child of `above` whose corner is p.
+/// @pre p is such a corner. Then no division is needed where a tile has two voxels along an axis.
+template <class TileType> int slotOfCorner(TileType const& above, int3 const& p) {
+  if constexpr (TileType::kTileWidth == 2)
+    return int(p.x > above.ti()) | int(p.y > above.tj()) << 1 | int(p.z > above.tk()) << 2;
+  else {
+    int3 const at = above.childIJK(p);
+    return TileType::slotOf(at.x, at.y, at.z);
+  }
 }
 
 /// Throws when the host has cancelled the job. Called between the passes, never while tiles lack their links.
@@ -44,8 +64,7 @@ Container<TraitsT>::findMissing(std::int64_t count, int depth,
     }
     return all;
   }
-  std::vector<std::vector<std::int64_t>> parts(static_cast<std::size_t>(
-      count >= Internal::kParallelTiles ? chunkCount(0, count, Internal::kRefineGrain) : 1));
+  std::vector<std::vector<std::int64_t>> parts(static_cast<std::size_t>(Internal::refineChunks(count)));
   Internal::refinePass(count, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
     auto accessor = tileAccessor();
     for (std::int64_t n = begin; n < end; ++n) {
@@ -61,47 +80,38 @@ Container<TraitsT>::findMissing(std::int64_t count, int depth,
   return missing;
 }
 
+template <class TraitsT> void Container<TraitsT>::allocateForMaking(int depth, std::int64_t n) {
+  // At the deepest depth nothing is allocated for a tile, so that no record can stay unmade.
+  if (depth < kMaxDepth) return allocateTiles(depth, n);
+  m_data->detachTiles();
+  auto& tiles = m_data->editTiles(depth);
+  tiles.growRaw(tiles.size() + n);
+  m_data->m_tileCounts[static_cast<std::size_t>(depth)] += n;
+  m_data->m_tileCountTotal += n;
+}
+
 template <class TraitsT>
-void Container<TraitsT>::createTiles(std::vector<int3> const& corners, int depth, TileLists* newTiles,
-                                     std::vector<std::int64_t> const* parents) {
-  auto const count = static_cast<std::int64_t>(corners.size());
-  if (count == 0) return;
-  Counts const before = m_data->m_tileCounts;
-  std::int64_t const first = tileCount(depth);
-  allocateTiles(depth, count);
-  // A tile without a parent is a root (no tile above it), or hangs below a coarser tile with tiles between.
-  struct Unlinked {
-    std::int64_t index;
-    TreeIndex above;
-  };
-  std::vector<std::vector<Unlinked>> parts(static_cast<std::size_t>(
-      count >= Internal::kParallelTiles ? chunkCount(0, count, Internal::kRefineGrain) : 1));
-  Internal::refinePass(count, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-    Container const& tree = *this;
-    auto accessor = tree.tileAccessor();
-    for (std::int64_t n = begin; n < end; ++n) {
-      int3 const& p = corners[static_cast<std::size_t>(n)];
-      std::int64_t const index = first + n;
-      std::int64_t parent = -1;
-      TreeIndex nearest;
-      if (parents && (*parents)[static_cast<std::size_t>(n)] >= 0) {
-        // Each slot belongs to exactly one tile: no two workers write the same.
-        parent = (*parents)[static_cast<std::size_t>(n)];
-        TileType& above = editTile({parent, depth - 1});
-        above.childIndex(above.childIJK(p)) = index;
-      } else if (depth > 0) {
-        TileType const& above = accessor.tile(p, depth - 1, false);
-        if (above.valid() && above.depth() == depth - 1) {
-          parent = above.index();
-          editTile(above.treeIndex()).childIndex(above.childIJK(p)) = index;
-        } else if (above.valid()) {
-          nearest = above.treeIndex();
-        }
-      }
-      editTile({index, depth}).init(parent, p.x, p.y, p.z, depth, index);
-      if (parent < 0) parts[static_cast<std::size_t>(chunk)].push_back({index, nearest});
-    }
-  });
+bool Container<TraitsT>::makeAt(std::int64_t index, int depth, int3 const& p, std::int64_t parent,
+                                ConstTileAccessor const& accessor, Unlinked& unlinked) {
+  TreeIndex nearest;
+  if (parent < 0 && depth > 0) {
+    nearest = accessor.treeIndex(p.x, p.y, p.z, depth - 1, false);
+    if (nearest.depth == depth - 1) parent = nearest.index;
+  }
+  if (parent >= 0) {
+    TileType& above = editTile({parent, depth - 1});
+    above.childIndex(Internal::slotOfCorner(above, p)) = index;
+  }
+  auto* const tile = &m_data->editTiles(depth)[index];
+  if (depth == kMaxDepth) new (static_cast<void*>(tile)) TileType;
+  tile->init(parent, p.x, p.y, p.z, depth, index);
+  unlinked = {index, nearest};
+  return parent >= 0;
+}
+
+template <class TraitsT>
+void Container<TraitsT>::finishMaking(int depth, std::vector<std::vector<Unlinked>> const& parts,
+                                      Counts const& before, TileLists* newTiles) {
   bool anyRoot = false;
   for (auto const& part : parts) {
     for (Unlinked const& made : part) {
@@ -117,6 +127,25 @@ void Container<TraitsT>::createTiles(std::vector<int3> const& corners, int depth
     for (std::int64_t n = before[static_cast<std::size_t>(d)]; n < tileCount(d); ++n)
       (*newTiles)[static_cast<std::size_t>(d)].append(tile(n, d).tijk());
   }
+}
+
+template <class TraitsT>
+void Container<TraitsT>::createTiles(std::vector<int3> const& corners, int depth, TileLists* newTiles) {
+  auto const count = static_cast<std::int64_t>(corners.size());
+  if (count == 0) return;
+  Counts const before = m_data->m_tileCounts;
+  std::int64_t const first = tileCount(depth);
+  allocateForMaking(depth, count);
+  std::vector<std::vector<Unlinked>> parts(static_cast<std::size_t>(Internal::refineChunks(count)));
+  Internal::refinePass(count, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+    auto const accessor = std::as_const(*this).tileAccessor();
+    Unlinked unlinked;
+    for (std::int64_t n = begin; n < end; ++n) {
+      if (!makeAt(first + n, depth, corners[static_cast<std::size_t>(n)], -1, accessor, unlinked))
+        parts[static_cast<std::size_t>(chunk)].push_back(unlinked);
+    }
+  });
+  finishMaking(depth, parts, before, newTiles);
 }
 
 template <class TraitsT> void Container<TraitsT>::adoptDeeperRoots(int depth) {
@@ -141,52 +170,63 @@ template <class TraitsT>
 void Container<TraitsT>::refineInternal(Container const& source, bool last, TileLists* newTiles) {
   if (&source != this) {
     tilesAdded();
+    constexpr std::int64_t kDead = -1, kMissing = -2;
     // For each source tile of the depth above, and of this one, the index of its counterpart here. A tile
     // with a parent in the source is found through the parent's counterpart, without a search.
     std::vector<std::int64_t> above, here;
     for (int d = 0; d <= kMaxDepth; ++d) {
       auto const& tiles = source.m_data->tiles(d);
-      here.assign(static_cast<std::size_t>(tiles.size()), -1);
-      struct Missing {
-        std::int64_t index, parent;
+      std::int64_t const count = tiles.size();
+      here.resize(static_cast<std::size_t>(count));
+      auto const parentHere = [&](TileType const& wanted) {
+        return wanted.isRoot() ? -1 : above[static_cast<std::size_t>(wanted.parentIndex())];
       };
-      std::vector<std::vector<Missing>> parts(static_cast<std::size_t>(
-          tiles.size() >= Internal::kParallelTiles ? chunkCount(0, tiles.size(), Internal::kRefineGrain)
-                                                   : 1));
-      Internal::refinePass(tiles.size(), [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+      // For each chunk, how many are missing; then, where its first one goes.
+      std::vector<std::int64_t> starts(static_cast<std::size_t>(Internal::refineChunks(count)));
+      Internal::refinePass(count, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
         Container const& tree = *this;
         auto const accessor = tree.tileAccessor();
+        std::int64_t missing = 0;
         for (std::int64_t n = begin; n < end; ++n) {
           TileType const& wanted = tiles[n];
-          if (!wanted.valid()) continue;
-          std::int64_t parent = -1, found = -1;
-          if (wanted.isRoot()) {
-            TreeIndex const at = accessor.treeIndex(wanted.ti(), wanted.tj(), wanted.tk(), d, false);
-            if (at.depth == d) found = at.index;
-          } else {
-            parent = above[static_cast<std::size_t>(wanted.parentIndex())];
-            TileType const& over = tree.tile(parent, d - 1);
-            found = over.childIndex(over.childIJK(wanted));
+          std::int64_t found = kDead;
+          if (wanted.valid()) {
+            if (wanted.isRoot()) {
+              TreeIndex const at = accessor.treeIndex(wanted.ti(), wanted.tj(), wanted.tk(), d, false);
+              if (at.depth == d) found = at.index;
+            } else {
+              TileType const& over = tree.tile(parentHere(wanted), d - 1);
+              found = over.childIndex(Internal::slotOfCorner(over, wanted.tijk()));
+            }
+            if (found < 0) found = kMissing, ++missing;
           }
-          if (found >= 0)
-            here[static_cast<std::size_t>(n)] = found;
-          else
-            parts[static_cast<std::size_t>(chunk)].push_back({n, parent});
+          here[static_cast<std::size_t>(n)] = found;
         }
+        starts[static_cast<std::size_t>(chunk)] = missing;
       });
       Internal::refineCheckpoint();
       // Chunks are consecutive: new tiles lie in the order of the source.
-      std::vector<int3> corners;
-      std::vector<std::int64_t> parents;
-      std::int64_t const first = tileCount(d);
-      for (auto const& part : parts) {
-        for (Missing const& missing : part) {
-          here[static_cast<std::size_t>(missing.index)] = first + static_cast<std::int64_t>(corners.size());
-          corners.push_back(tiles[missing.index].tijk());
-          parents.push_back(missing.parent);
-        }
+      std::int64_t next = tileCount(d);
+      for (std::int64_t& start : starts) next += std::exchange(start, next);
+      if (next > tileCount(d)) {
+        Counts const before = m_data->m_tileCounts;
+        allocateForMaking(d, next - tileCount(d));
+        std::vector<std::vector<Unlinked>> parts(starts.size());
+        auto const make = [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+          auto const accessor = std::as_const(*this).tileAccessor();
+          std::int64_t index = starts[static_cast<std::size_t>(chunk)];
+          Unlinked unlinked;
+          for (std::int64_t n = begin; n < end; ++n) {
+            if (here[static_cast<std::size_t>(n)] != kMissing) continue;
+            TileType const& wanted = tiles[n];
+            if (!makeAt(index, d, wanted.tijk(), parentHere(wanted), accessor, unlinked))
+              parts[static_cast<std::size_t>(chunk)].push_back(unlinked);
+            here[static_cast<std::size_t>(n)] = index++;
+          }
+        };
+        Internal::refinePass(count, make, next - before[static_cast<std::size_t>(d)]);
+        finishMaking(d, parts, before, newTiles);
       }
-      createTiles(corners, d, newTiles, &parents);
       Internal::refineCheckpoint();
       above.swap(here);
     }

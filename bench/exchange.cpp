@@ -1,0 +1,357 @@
+// Trees and values beside OpenVDB and NanoVDB in the same run: building the topology of a grid, reading its
+// values, summing them, and importing it.
+#include "BenchGrids.h"
+#include "GeometryVolume/channels/ChannelReader.h"
+#include "GeometryVolume/core/Parallel.h"
+#include "GeometryVolume/topology/VoxelTopology.h"
+
+#include <openvdb/tools/Count.h>
+
+#include <benchmark/benchmark.h>
+#include <nanovdb/util/OpenToNanoVDB.h>
+
+#include <algorithm>
+#include <bit>
+#include <functional>
+#include <map>
+#include <memory>
+#include <random>
+
+namespace {
+
+using namespace VLN;
+using namespace VLN::TileTree3D;
+using openvdb::Coord;
+using openvdb::FloatGrid;
+using Shape = PowerOfTwoTraits;
+using Tree = Container<Shape>;
+using Values = Channel<Shape, float, 4, 0>;
+using Topology = VoxelTopology<Shape>;
+
+constexpr std::size_t kPositions = 1 << 20;
+
+/// A grid in all three forms, and the places where it is read.
+struct Subject {
+  std::string name;
+  FloatGrid::Ptr grid;
+  nanovdb::GridHandle<nanovdb::HostBuffer> nano;
+  Interop::VdbImport content;
+  Ostil::Ptr<Tree> tree;
+  Ostil::Ptr<Values> values;
+  std::unique_ptr<Tree> accelerated; ///< the tree with an acceleration grid
+  std::unique_ptr<ChannelReader<Values>> reader;
+  std::vector<Coord> leaves; ///< corners, in the order of the grid's tree
+  std::vector<Coord> ordered, shuffled;
+  double activeVoxels = 0;
+
+  Subject(std::string const& gridName, FloatGrid::Ptr const& source)
+      : name(gridName)
+      , grid(source)
+      , nano(nanovdb::openToNanoVDB(*source))
+      , content(Bench::importGrid(source)) {
+    auto const& volume = content.volumes.at(0);
+    tree = volume.object->component<Tree>(Interop::kVdbContainerName);
+    values = volume.object->component<Values>(volume.channels.at(0).name);
+    accelerated = std::make_unique<Tree>(*tree);
+    accelerated->buildAccessorAccelerationStructure(Shape::kMaxDepth);
+    reader = std::make_unique<ChannelReader<Values>>(*tree, *values);
+    activeVoxels = static_cast<double>(grid->activeVoxelCount());
+    for (auto leaf = grid->tree().cbeginLeaf(); leaf; ++leaf) leaves.push_back(leaf->origin());
+    // Active voxels: leaf by leaf in the file's order, and at random over all.
+    std::vector<Coord> all;
+    for (auto leaf = grid->tree().cbeginLeaf(); leaf; ++leaf)
+      for (auto it = leaf->cbeginValueOn(); it; ++it) all.push_back(it.getCoord());
+    std::mt19937 generator(11);
+    for (std::size_t n = 0; n < kPositions; ++n) {
+      ordered.push_back(all[n % all.size()]);
+      shuffled.push_back(all[generator() % all.size()]);
+    }
+  }
+};
+
+void countItems(benchmark::State& state, double items) {
+  state.counters["items"] = benchmark::Counter(items);
+  state.SetItemsProcessed(static_cast<std::int64_t>(static_cast<double>(state.iterations()) * items));
+}
+
+// --- Topology: items are leaves of 8 x 8 x 8 voxels ---
+
+using Order = std::vector<Coord>;
+
+Order shuffledCopy(Order order) {
+  std::shuffle(order.begin(), order.end(), std::mt19937(5));
+  return order;
+}
+
+void touchLeaves(benchmark::State& state, Order const& leaves) {
+  for (auto _ : state) {
+    auto tree = std::make_unique<openvdb::FloatTree>(0.0f);
+    {
+      openvdb::tree::ValueAccessor<openvdb::FloatTree> accessor(*tree);
+      for (Coord const& c : leaves) benchmark::DoNotOptimize(accessor.touchLeaf(c));
+    }
+    state.PauseTiming();
+    tree.reset();
+    state.ResumeTiming();
+  }
+  countItems(state, static_cast<double>(leaves.size()));
+}
+
+// The eight tiles of each leaf below roots 4096 voxels wide.
+constexpr int kRootDepth = 18;
+
+template <class F> void forQuarters(Coord const& leaf, F const& f) {
+  for (int n = 0; n < 8; ++n)
+    f(int3{leaf.x() + 4 * (n & 1), leaf.y() + 4 * (n >> 1 & 1), leaf.z() + 4 * (n >> 2)});
+}
+
+void addTiles(benchmark::State& state, Order const& leaves) {
+  for (auto _ : state) {
+    auto tree = std::make_unique<Tree>("", 1.0f);
+    auto accessor = tree->tileAccessor();
+    for (Coord const& c : leaves) {
+      accessor.addTile(c.x(), c.y(), c.z(), kRootDepth);
+      forQuarters(c,
+                  [&](int3 const& p) { benchmark::DoNotOptimize(&accessor.addTile(p, Shape::kMaxDepth)); });
+    }
+    state.PauseTiming();
+    tree.reset();
+    state.ResumeTiming();
+  }
+  countItems(state, static_cast<double>(leaves.size()));
+}
+
+void addTilesInBulk(benchmark::State& state, Order const& leaves, bool withValues) {
+  Tree::TileLists corners;
+  std::map<std::array<int, 3>, int3> roots;
+  for (Coord const& c : leaves) {
+    int3 const root{Shape::align(c.x(), kRootDepth), Shape::align(c.y(), kRootDepth),
+                    Shape::align(c.z(), kRootDepth)};
+    roots[{root.x, root.y, root.z}] = root;
+    forQuarters(c, [&](int3 const& p) { corners[Shape::kMaxDepth].append(p); });
+  }
+  for (auto const& entry : roots) corners[kRootDepth].append(entry.second);
+  for (auto _ : state) {
+    auto tree = std::make_unique<Tree>("", 1.0f);
+    std::unique_ptr<Topology> topology;
+    std::unique_ptr<Values> values;
+    tree->tileAccessor().addTiles(corners);
+    if (withValues) {
+      topology = std::make_unique<Topology>("", kVoxelOffsetCorner);
+      topology->update(*tree);
+      float const background = 0;
+      values = std::make_unique<Values>("", &background, kInitializeDefaultValue, true, true,
+                                        Shape::kMaxDepth, Shape::kMaxDepth);
+      values->update(*topology);
+    }
+    state.PauseTiming();
+    values.reset();
+    topology.reset();
+    tree.reset();
+    state.ResumeTiming();
+  }
+  countItems(state, static_cast<double>(leaves.size()));
+}
+
+// --- Values: items are voxels ---
+
+template <class Read>
+void read(benchmark::State& state, std::vector<Coord> const& places, Read const& value) {
+  for (auto _ : state) {
+    // The bits: adding floats would cost more than reading them.
+    std::uint32_t sum = 0;
+    for (Coord const& c : places) sum += std::bit_cast<std::uint32_t>(value(c));
+    benchmark::DoNotOptimize(sum);
+  }
+  countItems(state, static_cast<double>(places.size()));
+}
+
+void readOurs(benchmark::State& state, Tree const& tree, Values const& values,
+              std::vector<Coord> const& places) {
+  auto const accessor = tree.tileAccessor();
+  read(state, places, [&](Coord const& c) {
+    TreeIndex const at = accessor.treeIndex(c.x(), c.y(), c.z(), Shape::kMaxDepth, false);
+    return values.tileData(at)(c.x() & 3, c.y() & 3, c.z() & 3);
+  });
+}
+
+void readReader(benchmark::State& state, ChannelReader<Values> const& reader,
+                std::vector<Coord> const& places) {
+  ChannelReader<Values> const values = reader;
+  read(state, places, [&](Coord const& c) { return values.value(c.x(), c.y(), c.z()); });
+}
+
+void readOpenVdb(benchmark::State& state, FloatGrid const& grid, std::vector<Coord> const& places) {
+  auto const accessor = grid.getConstAccessor();
+  read(state, places, [&](Coord const& c) { return accessor.getValue(c); });
+}
+
+void readNano(benchmark::State& state, nanovdb::NanoGrid<float> const& grid,
+              std::vector<Coord> const& places) {
+  auto const accessor = grid.getAccessor();
+  read(state, places, [&](Coord const& c) { return accessor.getValue(nanovdb::Coord(c.x(), c.y(), c.z())); });
+}
+
+// --- Sums over all active voxels ---
+
+void sumOpenVdb(benchmark::State& state, FloatGrid const& grid, double voxels) {
+  using Manager = openvdb::tree::LeafManager<openvdb::FloatTree const>;
+  Manager const leaves(grid.tree());
+  for (auto _ : state) {
+    struct Sum {
+      double sum = 0;
+      Sum() = default;
+      Sum(Sum const&, tbb::split) {}
+      void operator()(Manager::LeafRange const& range) {
+        for (auto leaf = range.begin(); leaf; ++leaf)
+          for (auto it = leaf->cbeginValueOn(); it; ++it) sum += static_cast<double>(*it);
+      }
+      void join(Sum const& other) { sum += other.sum; }
+    } sum;
+    tbb::parallel_reduce(leaves.leafRange(), sum);
+    benchmark::DoNotOptimize(sum.sum);
+  }
+  countItems(state, voxels);
+}
+
+/// Sums what the importer's rule for level sets calls active: values within the band.
+class SumVisitor : public Visitor<Tree> {
+public:
+  SumVisitor(Values const& values, float background)
+      : m_values(values)
+      , m_background(background) {
+    setEndTileOverridden(false);
+  }
+  using Visitor::beginTile;
+  void beginTile(TileType const& tile) override {
+    if (!tile.atMaxDepth()) return;
+    double sum = 0;
+    for (float const v : m_values.tileData(tile.treeIndex())) sum += isActive(v) ? static_cast<double>(v) : 0;
+    m_sum += sum;
+  }
+  void join(Visitor const& other) override { m_sum += static_cast<SumVisitor const&>(other).m_sum; }
+  Visitor* clone() const override { return new SumVisitor(m_values, m_background); }
+  double sum() const { return m_sum; }
+
+private:
+  bool isActive(float v) const {
+    return m_background > 0 ? v < m_background && v > -m_background : v != m_background;
+  }
+
+  Values const& m_values;
+  float m_background;
+  double m_sum = 0;
+};
+
+void sumOurs(benchmark::State& state, Subject const& s) {
+  for (auto _ : state) {
+    SumVisitor visitor(*s.values, s.values->defaultValue());
+    TraversalRange range;
+    range.minDepth = Shape::kMaxDepth;
+    range.grain = 1024;
+    range.voxelEnd = 0;
+    static_cast<Tree const&>(*s.tree).reduce(visitor, kParallelFlat, range);
+    benchmark::DoNotOptimize(visitor.sum());
+  }
+  countItems(state, s.activeVoxels);
+}
+
+// --- Import ---
+
+void import(benchmark::State& state, Subject const& s) {
+  for (auto _ : state) benchmark::DoNotOptimize(Bench::importGrid(s.grid).volumes.size());
+  countItems(state, s.activeVoxels);
+}
+void deepCopy(benchmark::State& state, Subject const& s) {
+  for (auto _ : state) benchmark::DoNotOptimize(s.grid->deepCopy().get());
+  countItems(state, s.activeVoxels);
+}
+
+// --- Memory: a figure, not a time ---
+
+void bytes(benchmark::State& state, double amount, double voxels) {
+  for (auto _ : state) benchmark::DoNotOptimize(amount);
+  state.counters["bytes/voxel"] = amount / voxels;
+}
+
+double bytesOf(Interop::VdbImport const& content) {
+  auto const& object = *content.volumes.at(0).object;
+  double sum = 0;
+  for (auto const& name : object.componentRange()) {
+    std::uint64_t used = 0, allocated = 0;
+    object.component(name)->memUse(used, allocated, true);
+    sum += static_cast<double>(allocated);
+  }
+  return sum;
+}
+
+void add(Subject const& s, char const* what, std::function<void(benchmark::State&)> body, int threads = 0) {
+  std::string name = s.name + "/" + what;
+  if (threads > 0) name += "/threads:" + std::to_string(threads);
+  auto const run = [body = std::move(body), threads](benchmark::State& state) {
+    if (threads > 0)
+      withThreads(threads, [&] { body(state); });
+    else
+      body(state);
+  };
+  benchmark::RegisterBenchmark(name.c_str(), run)->Unit(benchmark::kMillisecond)->UseRealTime();
+}
+
+void addAll(Subject const& s) {
+  add(s, "topology/ordered/OpenVDB touchLeaf", [&](auto& st) { touchLeaves(st, s.leaves); });
+  add(s, "topology/ordered/addTile", [&](auto& st) { addTiles(st, s.leaves); });
+  add(s, "topology/shuffled/OpenVDB touchLeaf", [&](auto& st) { touchLeaves(st, shuffledCopy(s.leaves)); });
+  add(s, "topology/shuffled/addTile", [&](auto& st) { addTiles(st, shuffledCopy(s.leaves)); });
+  for (int threads : {1, 2}) {
+    add(
+        s, "topology/ordered/bulk", [&](auto& st) { addTilesInBulk(st, s.leaves, false); }, threads);
+    add(
+        s, "topology/ordered/bulk with values", [&](auto& st) { addTilesInBulk(st, s.leaves, true); },
+        threads);
+    add(
+        s, "topology/shuffled/bulk", [&](auto& st) { addTilesInBulk(st, shuffledCopy(s.leaves), false); },
+        threads);
+  }
+  for (bool const random : {false, true}) {
+    auto const& places = random ? s.shuffled : s.ordered;
+    std::string const order = random ? "read/random/" : "read/coherent/";
+    add(s, (order + "OpenVDB").c_str(), [&](auto& st) { readOpenVdb(st, *s.grid, places); });
+    add(s, (order + "NanoVDB").c_str(), [&](auto& st) { readNano(st, *s.nano.grid<float>(), places); });
+    add(s, (order + "ChannelReader").c_str(), [&](auto& st) { readReader(st, *s.reader, places); });
+    add(s, (order + "accessor").c_str(), [&](auto& st) { readOurs(st, *s.tree, *s.values, places); });
+    add(s, (order + "accessor, acceleration grid").c_str(),
+        [&](auto& st) { readOurs(st, *s.accelerated, *s.values, places); });
+  }
+  for (int threads : {1, 2}) {
+    add(
+        s, "sum/OpenVDB", [&](auto& st) { sumOpenVdb(st, *s.grid, s.activeVoxels); }, threads);
+    add(
+        s, "sum/traversal", [&](auto& st) { sumOurs(st, s); }, threads);
+    add(
+        s, "import/OpenVDB deepCopy", [&](auto& st) { deepCopy(st, s); }, threads);
+    add(
+        s, "import/import", [&](auto& st) { import(st, s); }, threads);
+  }
+  add(s, "import/ChannelReader", [&](auto& st) {
+    for (auto _ : st) benchmark::DoNotOptimize(ChannelReader<Values>(*s.tree, *s.values).memUsage());
+    countItems(st, s.activeVoxels);
+  });
+  add(s, "memory/OpenVDB",
+      [&](auto& st) { bytes(st, static_cast<double>(s.grid->memUsage()), s.activeVoxels); });
+  add(s, "memory/volume", [&](auto& st) { bytes(st, bytesOf(s.content), s.activeVoxels); });
+}
+
+} // namespace
+
+int main(int argc, char** argv) {
+  benchmark::Initialize(&argc, argv);
+  if (benchmark::ReportUnrecognizedArguments(argc, argv)) return 1;
+  // Kept to the end: benchmarks refer to them.
+  static std::vector<std::unique_ptr<Subject>> subjects;
+  for (Bench::BenchGrid const& g : Bench::benchGrids())
+    subjects.push_back(std::make_unique<Subject>(g.name, g.grid));
+  for (auto const& subject : subjects) addAll(*subject);
+  benchmark::RunSpecifiedBenchmarks();
+  benchmark::Shutdown();
+  return 0;
+}

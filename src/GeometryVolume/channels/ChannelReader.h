@@ -1,0 +1,105 @@
+// ChannelReader: the value of a channel at a position of tile space, for many reads of a volume that stays as
+// it is.
+#pragma once
+
+#include "GeometryVolume/channels/Channel.h"
+#include "GeometryVolume/channels/ReadTables.h"
+
+#include <memory>
+
+namespace VLN::TileTree3D {
+
+/// Remembers the last block of tiles, and finds others through tables of its own, which copies share.
+/// @pre Tree and channel outlive the reader. After either has changed, make a new one.
+/// @cost Making the first: linear in the tiles of the deepest depth, about 10 bytes for each of them. A copy:
+/// constant. A read: see value().
+/// @threads One copy for each thread.
+template <class ChannelT> class ChannelReader {
+  using TraitsT = typename ChannelT::Traits;
+  using Tables = Internal::ReadTables<TraitsT>;
+
+public:
+  using value_type = typename ChannelT::value_type;
+
+  ChannelReader(Container<TraitsT> const& tree, ChannelT const& channel)
+      : m_tables(std::make_shared<Tables const>(tree,
+                                                [&](std::int64_t n) -> void const* {
+                                                  return elements(channel, {n, TraitsT::kMaxDepth});
+                                                }))
+      , m_channel(&channel)
+      , m_tiles(tree.tileAccessor())
+      , m_block(&m_tables->noBlock()) {}
+
+  /// The sample that holds the position, of the deepest tile that has data.
+  /// @space Tile space.
+  /// @edges The channel's default value where no tile has data, and out of the domain.
+  /// @cost In the block of the read before: one test, and two loads. In another with a tile of the deepest
+  /// depth: one load more. Elsewhere a lookup in the tree.
+  value_type const& value(int i, int j, int k) const {
+    if (!inBlock(i, j, k)) [[unlikely]]
+      moveTo(i, j, k);
+    std::size_t const x = within(i, m_corner.x), y = within(j, m_corner.y), z = within(k, m_corner.z);
+    constexpr std::size_t w = TraitsT::kTDW, slots = TraitsT::kTW;
+    // Sums of whole tile widths before the division: powers of two need one shift then.
+    void const* const tile = m_block->tiles[((x - x % w) + slots * ((y - y % w) + slots * (z - z % w))) / w];
+    if (!tile) [[unlikely]]
+      return coarse(i, j, k);
+    return static_cast<value_type const*>(
+        tile)[kFirst + x % w + ChannelT::ConstTile::kWidth * (y % w + ChannelT::ConstTile::kWidth * (z % w))];
+  }
+  value_type const& value(int3 const& p) const { return value(p.x, p.y, p.z); }
+
+  /// Bytes of the tables.
+  std::uint64_t memUsage() const { return m_tables->memUsage(); }
+
+private:
+  static constexpr std::size_t kFirst = ChannelT::ConstTile::index(0, 0, 0);
+  static constexpr auto kBlockWidth = std::uint32_t(Tables::kBlockWidth);
+
+  /// Distance from the corner of the point's block.
+  static std::uint32_t within(int c, int corner) {
+    if constexpr (TraitsT::kTW == 2)
+      return static_cast<std::uint32_t>(c) % kBlockWidth; // blocks lie at multiples of their width
+    else
+      return static_cast<std::uint32_t>(c) - static_cast<std::uint32_t>(corner);
+  }
+  bool inBlock(int i, int j, int k) const {
+    if constexpr (TraitsT::kTW == 2)
+      return static_cast<std::uint32_t>((i ^ m_corner.x) | (j ^ m_corner.y) | (k ^ m_corner.z)) < kBlockWidth;
+    else
+      return within(i, m_corner.x) < kBlockWidth && within(j, m_corner.y) < kBlockWidth &&
+             within(k, m_corner.z) < kBlockWidth;
+  }
+  void moveTo(int i, int j, int k) const {
+    m_block = m_tables->block(i, j, k);
+    // Out of the domain, too, the corner is less than a block away, and the block is the empty one.
+    m_corner = {TraitsT::align(i, Tables::kBlockDepth), TraitsT::align(j, Tables::kBlockDepth),
+                TraitsT::align(k, Tables::kBlockDepth)};
+  }
+  /// Null for a tile that the channel lacks, or that has fewer elements than a whole one.
+  static value_type const* elements(ChannelT const& channel, TreeIndex const& at) {
+    if (!channel.tileArrays() || at.depth < channel.minDepth() || at.depth > channel.depth()) return nullptr;
+    auto const& tiles = (*channel.tileArrays())[static_cast<std::size_t>(at.depth)];
+    auto const n = static_cast<std::size_t>(at.index);
+    return n < tiles.size() && tiles[n].size() >= std::size_t(ChannelT::kSize) ? tiles[n].data() : nullptr;
+  }
+  /// From the tile that a search in the tree finds, or from one above it.
+  [[gnu::cold]] value_type const& coarse(int i, int j, int k) const {
+    TreeIndex at = m_tiles.treeIndex(i, j, k, TraitsT::kMaxDepth, false);
+    while (at.valid()) {
+      auto const& tile = m_tiles.tile(at);
+      if (value_type const* const samples = elements(*m_channel, at))
+        return samples[ChannelT::ConstTile::index(tile.childDataIJK(i, j, k))];
+      at = tile.parentTreeIndex();
+    }
+    return m_channel->defaultValue();
+  }
+
+  std::shared_ptr<Tables const> m_tables;
+  ChannelT const* m_channel;
+  ConstTileAccessorOf<TraitsT> m_tiles;
+  mutable typename Tables::Block const* m_block;
+  mutable int3 m_corner{TraitsT::kMinTileCoord, TraitsT::kMinTileCoord, TraitsT::kMinTileCoord};
+};
+
+} // namespace VLN::TileTree3D

@@ -1,0 +1,79 @@
+// ReadTables: where the finest tiles of a channel lie in memory, by position.
+//
+//   cells            nodes                          blocks
+//   dense box of     (only where the box is too     for each slot the elements of a tile of the
+//   block ids   -->  wide for a dense one)     -->  deepest depth, null where there is none
+//
+// A block is the place of a tile one level above the deepest, whether that tile exists or not. A read touches
+// a cell, a block and the element: neither tile records nor the records of element vectors.
+#pragma once
+
+#include "GeometryVolume/core/FunctionRef.h"
+#include "GeometryVolume/tiletree/Container.h"
+
+#include <array>
+#include <cstdint>
+#include <vector>
+
+namespace VLN::TileTree3D::Internal {
+
+template <class TraitsT> class VLN_API ReadTables {
+public:
+  static constexpr int kBlockDepth = TraitsT::kMaxDepth - 1;
+  static constexpr int kBlockWidth = TraitsT::width(kBlockDepth);
+  /// Slots as in a tile.
+  struct alignas(64) Block {
+    std::array<void const*, static_cast<std::size_t>(TraitsT::kTileSize)> tiles{};
+  };
+
+  /// `elements` gives the elements of a tile of the deepest depth, null for one without.
+  /// @cost Linear in the tiles of the deepest depth.
+  ReadTables(Container<TraitsT> const& tree, FunctionRef<void const*(std::int64_t tile)> elements);
+
+  /// The block that holds the point; noBlock() where no tile of the deepest depth is near, and out of the
+  /// domain.
+  Block const* block(int i, int j, int k) const {
+    std::uint32_t const u[3] = {TraitsT::offset(i), TraitsT::offset(j), TraitsT::offset(k)};
+    std::size_t cell = 0;
+    bool inside = true;
+    for (std::size_t a = 3; a-- > 0;) {
+      std::uint32_t const q = TraitsT::quotient(u[a], m_cellDepth) - m_origin[a];
+      inside &= q < m_size[a];
+      cell = cell * m_size[a] + q;
+    }
+    if (!inside) return &noBlock();
+    std::int32_t id = m_cells[cell];
+    for (int d = m_cellDepth + 1; d <= kBlockDepth; ++d)
+      id = m_nodes[static_cast<std::size_t>(id)][slot(u, d)];
+    return &m_blocks[static_cast<std::size_t>(id)];
+  }
+  /// A block without tiles.
+  Block const& noBlock() const { return m_blocks.front(); }
+  std::uint64_t memUsage() const;
+
+private:
+  using Node = std::array<std::int32_t, static_cast<std::size_t>(TraitsT::kTileSize)>;
+
+  /// Slot, in its parent, of the tile of depth `d` at an offset.
+  static std::size_t slot(std::uint32_t const* u, int d) {
+    std::uint32_t n = 0;
+    for (int a = 2; a >= 0; --a) {
+      std::uint32_t const digit =
+          TraitsT::quotient(u[a], d) - TraitsT::quotient(u[a], d - 1) * std::uint32_t(TraitsT::kTW);
+      n = n * std::uint32_t(TraitsT::kTW) + digit;
+    }
+    return n;
+  }
+  void chooseCells(Container<TraitsT> const& tree);
+  /// The block of a tile's corner, made when there is none.
+  Block& makeBlock(int3 const& corner);
+
+  int m_cellDepth = 0;
+  std::array<std::uint32_t, 3> m_origin{0, 0, 0}, m_size{0, 0, 0};
+  // The first node leads to itself and the first block is empty, so that a missing entry is a 0.
+  std::vector<std::int32_t> m_cells;
+  std::vector<Node> m_nodes;
+  std::vector<Block> m_blocks;
+};
+
+} // namespace VLN::TileTree3D::Internal

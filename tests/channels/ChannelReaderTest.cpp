@@ -1,0 +1,106 @@
+#include "GeometryVolume/channels/ChannelReader.h"
+
+#include "channels/HaloModel.h"
+#include "support/RandomForest.h"
+#include "support/Shapes.h"
+
+#include <limits>
+
+namespace VLN::Test {
+namespace {
+
+// The sample of the deepest tile with data that holds the point, by looking at every tile.
+template <class ChannelT, class TreeT>
+typename ChannelT::value_type modelValue(TreeT const& tree, ChannelT const& channel, int3 const& p) {
+  for (int d = TreeT::kMaxDepth; d >= 0; --d)
+    for (std::int64_t n = 0; n < tree.tileCount(d); ++n) {
+      auto const& tile = tree.tile(n, d);
+      if (!tile.valid() || !tile.contains(p) || d < channel.minDepth() || d > channel.depth()) continue;
+      if (channel.tileData(n, d).size() == ChannelT::kSize) return channel(tile, tile.childDataIJK(p));
+    }
+  return channel.defaultValue();
+}
+
+VLN_SHAPE_SUITE(ChannelReaderTest);
+
+template <class TraitsT, int E, int H> void expectModel(std::uint32_t seed) {
+  using ChannelT = Channel<TraitsT, float, TraitsT::kTDW + E, H>;
+  Support::RandomForest<TraitsT> forest(seed);
+  for (int n = 0; n < 30; ++n) forest.grow();
+  auto const& tree = forest.tree();
+  // Every third channel ends above the deepest tiles, every fifth begins below the roots.
+  int const low = seed % 5 == 0 ? forest.minDepth() + 1 : 0;
+  int const high = seed % 3 == 0 ? TraitsT::kMaxDepth - 1 : TraitsT::kMaxDepth;
+  auto channel = channelOn<ChannelT>(tree, -1.0f, low, high);
+  fillRandom(channel, tree, seed);
+  ChannelReader<ChannelT> const reader(tree, channel);
+  ChannelReader<ChannelT> const copy(reader);
+  int3 p{0, 0, 0};
+  for (int n = 0; n < 400; ++n) {
+    // Jumps and steps, so that the last block holds the next point, or does not.
+    p = n % 4 == 0 ? forest.point() : forest.near(p, TraitsT::kMaxDepth);
+    float const expected = modelValue(tree, channel, p);
+    ASSERT_EQ(reader.value(p), expected) << "seed " << seed << " at " << p.x << ' ' << p.y << ' ' << p.z;
+    ASSERT_EQ(ChannelReader<ChannelT>(copy).value(p.x, p.y, p.z), expected);
+  }
+}
+
+// model: random forests of mixed depths, all layouts
+TYPED_TEST(ChannelReaderTest, GivesTheDeepestTilesSample) {
+  for (std::uint32_t seed = 1; seed <= 40; ++seed) {
+    expectModel<TypeParam, 0, 0>(seed);
+    if (seed % 4 == 0) {
+      expectModel<TypeParam, 0, 1>(seed);
+      expectModel<TypeParam, 0, 2>(seed);
+      expectModel<TypeParam, 1, 0>(seed);
+    }
+  }
+}
+
+// edge: every int32 position, empty trees, channels without storage
+TYPED_TEST(ChannelReaderTest, GivesTheDefaultValueWhereNothingIs) {
+  using Traits = TypeParam;
+  using ChannelT = Channel<Traits, float, Traits::kTDW, 0>;
+  Container<Traits> tree("", 1.0f);
+  auto const empty = channelOn<ChannelT>(tree, 3.0f, 0, Traits::kMaxDepth);
+  ChannelReader<ChannelT> const nothing(tree, empty);
+  constexpr int kLow = std::numeric_limits<int>::min(), kTop = std::numeric_limits<int>::max();
+  for (int c : {kLow, Traits::kMinTileCoord - 1, Traits::kMinTileCoord, 0, Traits::kMaxTileCoord,
+                Traits::kMaxTileCoord + 1, kTop})
+    EXPECT_EQ(nothing.value(c, c, c), 3.0f);
+  // The two ends of the domain: a dense box between them would not fit.
+  tree.tileAccessor().addTile(Traits::kMinTileCoord, Traits::kMinTileCoord, Traits::kMinTileCoord,
+                              Traits::kMaxDepth);
+  tree.tileAccessor().addTile(Traits::kMaxTileCoord, Traits::kMaxTileCoord, Traits::kMaxTileCoord,
+                              Traits::kMaxDepth);
+  auto channel = channelOn<ChannelT>(tree, 3.0f, 0, Traits::kMaxDepth);
+  channel.tileData(0, Traits::kMaxDepth).set(1.0f);
+  channel.tileData(1, Traits::kMaxDepth).set(2.0f);
+  ChannelReader<ChannelT> const reader(tree, channel);
+  for (int pass = 0; pass < 2; ++pass)
+    for (int c : {kLow, Traits::kMinTileCoord - 1, Traits::kMinTileCoord, 0, Traits::kMaxTileCoord,
+                  Traits::kMaxTileCoord + 1, kTop})
+      EXPECT_EQ(reader.value(c, c, c), c == Traits::kMinTileCoord   ? 1.0f
+                                       : c == Traits::kMaxTileCoord ? 2.0f
+                                                                    : 3.0f)
+          << c;
+  EXPECT_LT(reader.memUsage(), 1u << 20);
+}
+
+// edge: a tile that lost elements is no whole tile, and its parent answers
+TYPED_TEST(ChannelReaderTest, PassesOverTilesWithFewerElements) {
+  using Traits = TypeParam;
+  using ChannelT = Channel<Traits, float, Traits::kTDW, 0>;
+  Container<Traits> tree("", 1.0f);
+  tree.tileAccessor().addTile(0, 0, 0, Traits::kMaxDepth - 1);
+  tree.tileAccessor().addTile(0, 0, 0, Traits::kMaxDepth);
+  auto channel = channelOn<ChannelT>(tree, 0.0f, 0, Traits::kMaxDepth);
+  channel.tileData(0, Traits::kMaxDepth - 1).set(1.0f);
+  channel.tileData(0, Traits::kMaxDepth).set(2.0f);
+  EXPECT_EQ((ChannelReader<ChannelT>(tree, channel).value(0, 0, 0)), 2.0f);
+  channel.tileDataAccessor().tileData(TreeIndex{0, Traits::kMaxDepth}).pop();
+  EXPECT_EQ((ChannelReader<ChannelT>(tree, channel).value(0, 0, 0)), 1.0f);
+}
+
+} // namespace
+} // namespace VLN::Test
