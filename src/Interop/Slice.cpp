@@ -1,6 +1,7 @@
 #include "Interop/Slice.h"
 
 #include "GeometryVolume/channels/Channel.h"
+#include "GeometryVolume/channels/NonLeafValues.h"
 #include "GeometryVolume/core/ElementTypes.h"
 #include "GeometryVolume/core/Numeric.h"
 #include "GeometryVolume/core/Parallel.h"
@@ -213,6 +214,41 @@ std::vector<Sample> linearSamples(Plane const& plane, Sampler const& cold, int d
   return samples;
 }
 
+bool hasRootsBelow(Container const& tree, int depth) {
+  for (int d = depth + 1; d <= Container::kMaxDepth; ++d)
+    if (tree.rootCount(d) > 0) return true;
+  return false;
+}
+
+// A volume with tiles from some depth on above the roots that it had, which hold their children's values.
+struct Raised {
+  Container tree;
+  Topology topology;
+  FloatChannel channel;
+
+  Raised(Container const& from, Topology const& offsets, FloatChannel const& values, int depth)
+      : tree(from)
+      , topology("", offsets.offsetType())
+      , channel("", &values.defaultValue(), TileTree3D::kInitializeDefaultValue, true, true, depth,
+                values.depth()) {
+    Container::TileLists corners;
+    for (auto it = from.cbeginRoots(); it != from.cendRoots(); ++it) {
+      int3 const p = it->first.ijk();
+      for (int d = depth; d < it->second.depth; ++d)
+        corners[static_cast<std::size_t>(d)].append(
+            {VdbTraits::align(p.x, d), VdbTraits::align(p.y, d), VdbTraits::align(p.z, d)});
+    }
+    tree.tileAccessor().addTiles(corners);
+    topology.update(tree);
+    channel.update(topology);
+    // New tiles of a depth follow those that it had.
+    for (int d = std::max(depth, values.minDepth()); d <= values.depth(); ++d)
+      for (std::int64_t n = 0; n < from.tileCount(d); ++n) channel.tileData(n, d).set(values.tileData(n, d));
+    TileTree3D::setNonLeafValueToChildValue(channel, tree, TileTree3D::kVoxelOffsetCorner, depth,
+                                            Container::kMaxDepth);
+  }
+};
+
 } // namespace
 
 Slice drawSlice(VdbVolume const& volume, std::string const& name, SliceOptions const& options) {
@@ -236,10 +272,19 @@ Slice drawSlice(VdbVolume const& volume, std::string const& name, SliceOptions c
   // Channels of other types than float are drawn by their nearest samples.
   bool const nearest = !floats || (options.nearest && !options.gradient);
   int const depth = std::min(options.depth, Container::kMaxDepth);
-  auto const samples =
-      nearest ? nearestSamples(plane, *container, *channel, depth)
-              : linearSamples(plane, {*container, *topology, *floats}, depth,
-                              options.gradient ? &volume.indexToWorld : nullptr, container->voxelSize());
+  auto const draw = [&](Sampler const& sampler) {
+    return linearSamples(plane, sampler, depth, options.gradient ? &volume.indexToWorld : nullptr,
+                         container->voxelSize());
+  };
+  std::vector<Sample> samples;
+  if (nearest) {
+    samples = nearestSamples(plane, *container, *channel, depth);
+  } else if (hasRootsBelow(*container, depth)) {
+    Raised const raised(*container, *topology, *floats, depth);
+    samples = draw({raised.tree, raised.topology, raised.channel});
+  } else {
+    samples = draw({*container, *topology, *floats});
+  }
 
   Slice slice{Image(1, 1), worldOn(volume, plane, nearest ? plane.at : plane.where), 0, 0, 0, 0};
   std::vector<float> numbers;

@@ -14,8 +14,8 @@ struct SliceOptions {
   std::optional<double> at; ///< world position on the axis; the middle of the channel's active box otherwise
   int size = 512;           ///< pixels along the longer side of the plane, without scale and margin
   bool nearest = false;     ///< the nearest sample in place of a linear blend
-  int depth = 1 << 20;      ///< the deepest depth of the tiles that are drawn
-  bool gradient = false;    ///< the length of the gradient in world space, always of the linear blend
+  int depth = 1 << 20; ///< of the deepest tiles drawn; above roots, tiles are made of their children's values
+  bool gradient = false; ///< the length of the gradient in world space, always of the linear blend
 };
 
 struct Slice {
