@@ -46,6 +46,10 @@ double3 IndexToWorld::toWorld(double3 const& p) const {
 double3 IndexToWorld::toIndex(double3 const& p) const {
   return toDouble3(m_impl->transform->worldToIndex(openvdb::Vec3d(p.x, p.y, p.z)));
 }
+double3 IndexToWorld::gradientToWorld(double3 const& g, double3 const& p) const {
+  return toDouble3(
+      m_impl->transform->baseMap()->applyIJT(openvdb::Vec3d(g.x, g.y, g.z), openvdb::Vec3d(p.x, p.y, p.z)));
+}
 double3 IndexToWorld::voxelSize() const { return toDouble3(m_impl->transform->voxelSize()); }
 std::string IndexToWorld::besidesScale() const { return transformBesidesScale(*m_impl->transform); }
 std::string IndexToWorld::bytes() const { return transformBytes(*m_impl->transform); }

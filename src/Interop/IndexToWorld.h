@@ -22,6 +22,10 @@ public:
 
   Velorn::Math::double3 toWorld(Velorn::Math::double3 const& index) const;
   Velorn::Math::double3 toIndex(Velorn::Math::double3 const& world) const;
+  /// The gradient in world space of a field whose gradient in index space is known at a point.
+  /// @formula The transposed inverse of the transform's derivative at `index`, times `gradient`.
+  Velorn::Math::double3 gradientToWorld(Velorn::Math::double3 const& gradient,
+                                        Velorn::Math::double3 const& index) const;
   /// World lengths of a voxel's edges, for a transform that is not linear those at the origin.
   Velorn::Math::double3 voxelSize() const;
   /// Empty for one uniform scale along the axes; otherwise what the transform is, on one line.

@@ -1,6 +1,7 @@
 #include "Interop/Slice.h"
 
 #include "GeometryVolume/channels/Channel.h"
+#include "GeometryVolume/channels/NonLeafValues.h"
 #include "GeometryVolume/core/ElementTypes.h"
 #include "GeometryVolume/core/Numeric.h"
 #include "GeometryVolume/core/Parallel.h"
@@ -157,7 +158,8 @@ std::size_t pixelCount(Plane const& plane) {
   return static_cast<std::size_t>(plane.width) * static_cast<std::size_t>(plane.height);
 }
 
-std::vector<Sample> nearestSamples(Plane const& plane, Container const& tree, ChannelBase const& channel) {
+std::vector<Sample> nearestSamples(Plane const& plane, Container const& tree, ChannelBase const& channel,
+                                   int depth) {
   std::vector<Sample> samples(pixelCount(plane));
   Reader const read = readerOf(channel);
   parallelFor(0, plane.height,
@@ -166,7 +168,7 @@ std::vector<Sample> nearestSamples(Plane const& plane, Container const& tree, Ch
                 for (std::int64_t y = begin; y < end; ++y)
                   for (int x = 0; x < plane.width; ++x) {
                     int3 const p = plane.indexOf(x, static_cast<int>(y));
-                    auto const& tile = accessor.tile(p, Container::kMaxDepth, false);
+                    auto const& tile = accessor.tile(p, depth, false);
                     if (!tile.valid()) continue;
                     samples[static_cast<std::size_t>(y * plane.width + x)] = {
                         read(tile.treeIndex(), tile.childDataIJK(p)), true};
@@ -176,7 +178,8 @@ std::vector<Sample> nearestSamples(Plane const& plane, Container const& tree, Ch
   return samples;
 }
 
-std::vector<Sample> linearSamples(Plane const& plane, Sampler const& cold, bool gradient) {
+std::vector<Sample> linearSamples(Plane const& plane, Sampler const& cold, int depth,
+                                  IndexToWorld const* gradientIn, float voxelSize) {
   std::vector<Sample> samples(pixelCount(plane));
   // Samplers keep tiles that they have widened: one for each thread, for all of its rows.
   std::vector<std::unique_ptr<Sampler>> samplers(static_cast<std::size_t>(parallelThreads()));
@@ -190,15 +193,18 @@ std::vector<Sample> linearSamples(Plane const& plane, Sampler const& cold, bool 
                     TileTree3D::TreeIndex tile;
                     int3 ijk;
                     float3 weights;
-                    if (!sampler->prepareToSample(p, TileTree3D::kSamplerTileSpace, tile, ijk, weights,
-                                                  Container::kMaxDepth, nullptr))
+                    if (!sampler->prepareToSample(p, TileTree3D::kSamplerTileSpace, tile, ijk, weights, depth,
+                                                  nullptr))
                       continue;
                     Sample& s = samples[static_cast<std::size_t>(y * plane.width + x)];
                     s.found = true;
-                    if (gradient) {
+                    if (gradientIn) {
+                      // The sampler knows one voxel size; the transform may have three, and a shear.
                       float3 g;
-                      sampler->sampleGradient(p, TileTree3D::kSamplerTileSpace, &g);
-                      s.value = std::hypot(g.x, g.y, g.z);
+                      sampler->sampleGradient(p, depth, TileTree3D::kSamplerTileSpace, &g);
+                      g *= voxelSize;
+                      auto const w = gradientIn->gradientToWorld({g.x, g.y, g.z}, {p.x, p.y, p.z});
+                      s.value = static_cast<float>(std::hypot(w.x, w.y, w.z));
                     } else {
                       s.value = sampler->sample(tile, ijk, weights);
                     }
@@ -207,6 +213,41 @@ std::vector<Sample> linearSamples(Plane const& plane, Sampler const& cold, bool 
               {.grain = 8});
   return samples;
 }
+
+bool hasRootsBelow(Container const& tree, int depth) {
+  for (int d = depth + 1; d <= Container::kMaxDepth; ++d)
+    if (tree.rootCount(d) > 0) return true;
+  return false;
+}
+
+// A volume with tiles from some depth on above the roots that it had, which hold their children's values.
+struct Raised {
+  Container tree;
+  Topology topology;
+  FloatChannel channel;
+
+  Raised(Container const& from, Topology const& offsets, FloatChannel const& values, int depth)
+      : tree(from)
+      , topology("", offsets.offsetType())
+      , channel("", &values.defaultValue(), TileTree3D::kInitializeDefaultValue, true, true, depth,
+                values.depth()) {
+    Container::TileLists corners;
+    for (auto it = from.cbeginRoots(); it != from.cendRoots(); ++it) {
+      int3 const p = it->first.ijk();
+      for (int d = depth; d < it->second.depth; ++d)
+        corners[static_cast<std::size_t>(d)].append(
+            {VdbTraits::align(p.x, d), VdbTraits::align(p.y, d), VdbTraits::align(p.z, d)});
+    }
+    tree.tileAccessor().addTiles(corners);
+    topology.update(tree);
+    channel.update(topology);
+    // New tiles of a depth follow those that it had.
+    for (int d = std::max(depth, values.minDepth()); d <= values.depth(); ++d)
+      for (std::int64_t n = 0; n < from.tileCount(d); ++n) channel.tileData(n, d).set(values.tileData(n, d));
+    TileTree3D::setNonLeafValueToChildValue(channel, tree, TileTree3D::kVoxelOffsetCorner, depth,
+                                            Container::kMaxDepth);
+  }
+};
 
 } // namespace
 
@@ -230,8 +271,20 @@ Slice drawSlice(VdbVolume const& volume, std::string const& name, SliceOptions c
                                 "' is no float channel, so that it has no gradient here");
   // Channels of other types than float are drawn by their nearest samples.
   bool const nearest = !floats || (options.nearest && !options.gradient);
-  auto const samples = nearest ? nearestSamples(plane, *container, *channel)
-                               : linearSamples(plane, {*container, *topology, *floats}, options.gradient);
+  int const depth = std::min(options.depth, Container::kMaxDepth);
+  auto const draw = [&](Sampler const& sampler) {
+    return linearSamples(plane, sampler, depth, options.gradient ? &volume.indexToWorld : nullptr,
+                         container->voxelSize());
+  };
+  std::vector<Sample> samples;
+  if (nearest) {
+    samples = nearestSamples(plane, *container, *channel, depth);
+  } else if (hasRootsBelow(*container, depth)) {
+    Raised const raised(*container, *topology, *floats, depth);
+    samples = draw({raised.tree, raised.topology, raised.channel});
+  } else {
+    samples = draw({*container, *topology, *floats});
+  }
 
   Slice slice{Image(1, 1), worldOn(volume, plane, nearest ? plane.at : plane.where), 0, 0, 0, 0};
   std::vector<float> numbers;

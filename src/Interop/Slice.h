@@ -14,7 +14,8 @@ struct SliceOptions {
   std::optional<double> at; ///< world position on the axis; the middle of the channel's active box otherwise
   int size = 512;           ///< pixels along the longer side of the plane, without scale and margin
   bool nearest = false;     ///< the nearest sample in place of a linear blend
-  bool gradient = false;    ///< the length of the gradient in world space, always of the linear blend
+  int depth = 1 << 20; ///< of the deepest tiles drawn; above roots, tiles are made of their children's values
+  bool gradient = false; ///< the length of the gradient in world space, always of the linear blend
 };
 
 struct Slice {
@@ -30,11 +31,11 @@ inline constexpr int kSmallestSlice = 16;
 inline constexpr int kLargestSlice = 16384;
 
 /// Draws the plane over the active box of the channel: each pixel shows the field at its middle, blended
-/// linearly between samples, in the deepest tile. A sample lies in the middle of its pixels, as it does when
-/// the nearest is drawn. Across x the picture's axes are y and z, across y they are x and z, across z they
-/// are x and y; the second one points up. Pixels without a tile are grey. Where values of both signs occur
-/// zero is white; otherwise the colours end at the value that 99.5 % of the pixels stay below, so that a few
-/// bright spots do not leave all else dark.
+/// linearly between samples, in the deepest tile down to a depth. A sample lies in the middle of its pixels,
+/// as it does when the nearest is drawn. Across x the picture's axes are y and z, across y they are x and z,
+/// across z they are x and y; the second one points up. Pixels without a tile are grey. Where values of both
+/// signs occur zero is white; otherwise the colours end at the value that 99.5 % of the pixels stay below, so
+/// that a few bright spots do not leave all else dark.
 /// @error std::invalid_argument for a channel that is unknown or has no active voxel, and for a position that
 /// misses the active box.
 VLN_API Slice drawSlice(VdbVolume const& volume, std::string const& channel,

@@ -130,6 +130,49 @@ TEST(SliceTest, ShowsCoarseTilesAndGaps) {
   EXPECT_TRUE(colors.count({half.r, half.g, half.b}));
 }
 
+// requirement: gradients are those of world space, also where the grid is turned and its voxels are no cubes
+TEST(SliceTest, GradientFollowsTheWholeTransform) {
+  openvdb::initialize();
+  auto turned = openvdb::math::Transform::createLinearTransform(0.5);
+  turned->preScale(openvdb::Vec3d(1, 2, 0.5));
+  turned->postRotate(0.6, openvdb::math::Z_AXIS);
+  turned->postTranslate(openvdb::Vec3d(3, -1, 2));
+  auto grid = openvdb::FloatGrid::create(0.0f);
+  grid->setName("ramp");
+  grid->setTransform(turned);
+  openvdb::CoordBBox const box(Coord(-8, 0, 8), Coord(15, 15, 23));
+  for (auto it = box.begin(); it; ++it) {
+    auto const p = turned->indexToWorld(*it);
+    grid->tree().setValueOn(*it, static_cast<float>(2 * p.x() - p.y() + 0.5 * p.z() + 40));
+  }
+  // Along z the middle line of the box is not turned: index 15.5 lies at 2 + 0.25 * 15.5.
+  Slice const slice =
+      drawSlice(volumeOf(grid), "ramp", {.axis = 2, .at = 5.875, .size = 240, .gradient = true});
+  EXPECT_NEAR(slice.at, 5.875, 1e-9);
+  Rgb const expected = ColorMap::forRange(slice.low, slice.top).color(std::sqrt(5.25));
+  Rgb const middle = slice.image(8 + 120, slice.image.height() / 2);
+  EXPECT_NEAR(middle.r, expected.r, 1);
+  EXPECT_NEAR(middle.g, expected.g, 1);
+  EXPECT_NEAR(middle.b, expected.b, 1);
+}
+
+// requirement: tiles above the roots are made of their children's values
+TEST(SliceTest, DepthsAboveTheRoots) {
+  VdbVolume const volume = volumeOf(ramp(Coord(0), Coord(31), 1));
+  for (int depth : {28, 27, 26, 25}) {
+    SCOPED_TRACE(depth);
+    // Pixels on samples: the field is linear, so that every depth draws the same there but at the far ends.
+    Slice const slice = drawSlice(volume, "ramp", {.axis = 2, .at = 8.0, .size = 32, .depth = depth});
+    EXPECT_EQ(slice.drawn, 32 * 32);
+    Rgb const expected = ColorMap::forRange(slice.low, slice.top).color(1 + 9 + 100 * 10 + 10000 * 8);
+    int const top = (slice.image.height() - 32) / 2;
+    Rgb const pixel = slice.image(8 + 9, top + 31 - 10);
+    EXPECT_NEAR(pixel.r, expected.r, 1);
+    EXPECT_NEAR(pixel.g, expected.g, 1);
+    EXPECT_NEAR(pixel.b, expected.b, 1);
+  }
+}
+
 // requirement: a level set is white at its surface, blue inside, red outside
 TEST(SliceTest, ALevelSetShowsItsZero) {
   openvdb::initialize();

@@ -123,15 +123,49 @@ TYPED_TEST(AccelerationGrid, LookupsAreThoseWithoutTheGrid) {
     forest.tree().buildAccessorAccelerationStructure(forest.pick(d0, T::kMaxDepth));
     ASSERT_GE(Access::data(forest.tree()).m_gridDepth, 0);
     ASSERT_EQ(Access::data(plain).m_gridDepth, -1);
+    auto const withGrid = std::as_const(forest.tree()).tileAccessor(), without = plain.tileAccessor();
+    int3 p{x, x, x};
     for (int n = 0; n < 4000; ++n) {
-      int3 p{};
-      for (int a = 0; a < 3; ++a) p[a] = x + forest.pick(-3 * w, 24 * w);
+      for (int a = 0; a < 3; ++a)
+        p[a] = n % 3 ? p[a] < x + 30 * w && p[a] > x - 30 * w ? p[a] + forest.pick(-w, w) : x
+                     : x + forest.pick(-3 * w, 24 * w);
       if (n % 50 == 0) p[n % 3] = n % 100 ? std::numeric_limits<int>::max() : std::numeric_limits<int>::min();
       int const d = forest.pick(d0 - 2, T::kMaxDepth + 1);
       ASSERT_EQ(Access::tileIndex(forest.tree(), p, d), Access::tileIndex(plain, p, d))
           << p << " depth " << d;
+      // Cursors too, which go by the table of places; with the corner of the tile found, and near steps
+      // between.
+      for (bool const exact : {false, true}) {
+        auto const found = withGrid.treeIndex(p.x, p.y, p.z, d, exact);
+        ASSERT_EQ(found, without.treeIndex(p.x, p.y, p.z, d, exact)) << p << " depth " << d << ' ' << exact;
+        if (!found.valid()) continue;
+        ASSERT_EQ(withGrid.cursorCorner(), plain.tile(found).tijk());
+        ASSERT_EQ(withGrid.current().treeIndex(), found);
+      }
     }
   }
+}
+
+// regression: a cell of the grid without a tile of its depth may still hold a deeper root
+TYPED_TEST(AccelerationGrid, DeeperRootsAreFound) {
+  using T = TypeParam;
+  int const d = T::kMaxDepth - 2, w = T::width(d), x = T::align(1000, d);
+  Container<T> tree;
+  auto accessor = tree.tileAccessor();
+  accessor.addTile(x, x, x, d);
+  accessor.addTile(x + 3 * w, x, x, d);
+  TreeIndex const deep = accessor.addTile(x + w, x, x, T::kMaxDepth).treeIndex();
+  tree.buildAccessorAccelerationStructure(d);
+  ASSERT_EQ(Access::data(tree).m_gridDepth, d);
+  auto const cursor = std::as_const(tree).tileAccessor();
+  EXPECT_EQ(cursor.treeIndex(x + w, x, x, T::kMaxDepth, false), deep);
+  EXPECT_EQ(cursor.treeIndex(x + 2 * w, x, x, T::kMaxDepth, false), TreeIndex{});
+  EXPECT_EQ(cursor.treeIndex(x + 2 * w - 1, x, x, T::kMaxDepth, false), TreeIndex{});
+  EXPECT_EQ(cursor.treeIndex(x + w, x, x, T::kMaxDepth, true), deep);
+  EXPECT_EQ(cursor.treeIndex(x + 3 * w, x, x, T::kMaxDepth, false).depth, d);
+  // Growth drops what the grid knew.
+  TreeIndex const grown = accessor.addTile(x + 2 * w, x, x, T::kMaxDepth).treeIndex();
+  EXPECT_EQ(cursor.treeIndex(x + 2 * w, x, x, T::kMaxDepth, false), grown);
 }
 
 // requirement

@@ -244,6 +244,86 @@ TEST_F(ProgramTest, ProbePrintsValuesAndGradients) {
   EXPECT_EQ(vln({"probe", path, "--channel", "surface", "--points", points}).out, "x,y,z,value,gx,gy,gz\n");
 }
 
+// requirement: positions and gradients go through the whole transform, here a shift, three voxel sizes and a
+// turn
+TEST_F(ProgramTest, ProbeAndSliceFollowTheWholeTransform) {
+  openvdb::initialize();
+  auto turned = openvdb::math::Transform::createLinearTransform(0.5);
+  turned->preScale(openvdb::Vec3d(1, 2, 0.5));
+  turned->postRotate(0.6, openvdb::math::Z_AXIS);
+  turned->postTranslate(openvdb::Vec3d(3, -1, 2));
+  auto grid = openvdb::FloatGrid::create(0.0f);
+  grid->setName("ramp");
+  grid->setTransform(turned);
+  // Linear in world space, so that every sample and gradient is known.
+  auto const field = [](openvdb::Vec3d const& p) { return 2 * p.x() - p.y() + 0.5 * p.z() + 40; };
+  openvdb::CoordBBox const box(openvdb::Coord(-8, 0, 8), openvdb::Coord(15, 15, 23));
+  for (auto it = box.begin(); it; ++it)
+    grid->tree().setValueOn(*it, static_cast<float>(field(turned->indexToWorld(*it))));
+  std::string const path = m_folder / "turned.vdb", points = m_folder / "turned.csv";
+  openvdb::io::File(path).write(openvdb::GridPtrVec{grid});
+
+  std::string text;
+  std::vector<openvdb::Vec3d> places;
+  for (openvdb::Vec3d const index :
+       {openvdb::Vec3d(1, 2, 9), openvdb::Vec3d(-6.25, 3.5, 20.125), openvdb::Vec3d(12.75, 13.1, 14.9)}) {
+    places.push_back(turned->indexToWorld(index));
+    std::ostringstream line;
+    line.precision(17);
+    line << places.back().x() << ',' << places.back().y() << ',' << places.back().z() << '\n';
+    text += line.str();
+  }
+  writeAll(points, text);
+  RunResult const run = vln({"probe", path, "--channel", "ramp", "--points", points});
+  ASSERT_EQ(run.code, 0) << run.err;
+  EXPECT_EQ(run.err, "");
+  std::istringstream lines(run.out);
+  std::string line;
+  std::getline(lines, line);
+  for (auto const& p : places) {
+    double row[7] = {};
+    ASSERT_TRUE(std::getline(lines, line));
+    std::istringstream cells(line);
+    for (double& number : row) {
+      std::string cell;
+      std::getline(cells, cell, ',');
+      number = std::stod(cell);
+    }
+    for (int a = 0; a < 3; ++a) EXPECT_NEAR(row[a], p[a], 1e-7);
+    EXPECT_NEAR(row[3], field(p), 1e-4) << line;
+    EXPECT_NEAR(row[4], 2, 1e-4) << line;
+    EXPECT_NEAR(row[5], -1, 1e-4) << line;
+    EXPECT_NEAR(row[6], 0.5, 1e-4) << line;
+  }
+
+  // The middle of the box lies at index (3.5, 7.5, 15.5): along z the position is 2 + 0.25 * 15.5.
+  std::string const picture = m_folder / "turned.png";
+  RunResult const slice = vln({"slice", path, "--channel", "ramp", "--axis", "z", "--at", "5.875",
+                               "--gradient", "--size", "64", "-o", picture});
+  ASSERT_EQ(slice.code, 0) << slice.err;
+  EXPECT_NE(slice.out.find("z = 5.875"), std::string::npos) << slice.out;
+}
+
+// requirement: --depth draws coarser tiles
+TEST_F(ProgramTest, SliceStopsAtADepth) {
+  std::string const path = torus();
+  std::vector<std::string> pictures;
+  for (char const* depth : {"28", "27", "26"}) {
+    std::string const picture = m_folder / (std::string(depth) + ".png");
+    RunResult const run = vln({"slice", path, "--channel", "surface", "--axis", "z", "--size", "100",
+                               "--depth", depth, "-o", picture});
+    ASSERT_EQ(run.code, 0) << run.err;
+    pictures.push_back(readAll(picture));
+  }
+  EXPECT_NE(pictures[0], pictures[1]);
+  EXPECT_NE(pictures[1], pictures[2]);
+  std::string const whole = m_folder / "whole.png";
+  vln({"slice", path, "--channel", "surface", "--axis", "z", "--size", "100", "-o", whole});
+  EXPECT_EQ(readAll(whole), pictures[0]);
+  EXPECT_NE(vln({"slice", path, "--channel", "surface", "--axis", "z", "--depth", "29", "-o", whole}).code,
+            0);
+}
+
 // negative
 TEST_F(ProgramTest, ProbeNamesBadPoints) {
   std::string const path = torus(), points = m_folder / "points.csv";

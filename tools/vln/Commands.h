@@ -37,8 +37,8 @@ void convert(ConvertOptions const& options);
 struct ProbeOptions {
   std::string file;
   std::string channel;
-  std::vector<float> positions; ///< x, y, z, x, y, z, ...
-  std::string points;           ///< a CSV file; empty for none
+  std::vector<double> positions; ///< x, y, z, x, y, z, ...
+  std::string points;            ///< a CSV file; empty for none
   VLN::Interop::VdbReadLimits limits;
 };
 void probe(ProbeOptions const& options);

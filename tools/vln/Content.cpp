@@ -28,10 +28,4 @@ VdbVolume const& volumeWith(VdbImport const& content, std::string const& channel
   throw FileError(content.file, "has no channel '" + channel + "'; " + names(content));
 }
 
-std::string transformNote(VdbImport const& content, VdbVolume const& volume) {
-  if (volume.transform.empty()) return {};
-  return fmt::format("vln: {}: note: its transform is {}; positions are voxel size times index only\n",
-                     content.file, volume.transform);
-}
-
 } // namespace Vln

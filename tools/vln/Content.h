@@ -11,7 +11,4 @@ namespace Vln {
 /// @error FileError that names the channels there are, or why the grid was skipped.
 VLN::Interop::VdbVolume const& volumeWith(VLN::Interop::VdbImport const& content, std::string const& channel);
 
-/// A line about a transform that positions leave out; empty when there is none.
-std::string transformNote(VLN::Interop::VdbImport const& content, VLN::Interop::VdbVolume const& volume);
-
 } // namespace Vln

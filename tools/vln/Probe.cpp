@@ -30,6 +30,7 @@ using Container = VLN::TileTree3D::Container<VdbTraits>;
 using Topology = VLN::TileTree3D::VoxelTopology<VdbTraits>;
 using FloatChannel = VLN::TileTree3D::Channel<VdbTraits, float, 4, 0>;
 using Sampler = VLN::TileTree3D::FloatVoxelSamplerLinear<VdbTraits>;
+using Velorn::Math::double3;
 using Velorn::Math::float3;
 
 // Points whose lines are formed before they are written.
@@ -43,25 +44,22 @@ std::string_view trimmed(std::string_view text) {
   return text;
 }
 
-// One number of a line; false for anything else. Values beyond float's range become infinite.
-bool parse(std::string_view text, float& number) {
+// One number of a line; false for anything else.
+bool parse(std::string_view text, double& number) {
   text = trimmed(text);
   if (!text.empty() && text.front() == '+') text.remove_prefix(1);
-  double value = 0;
-  auto const [end, error] = std::from_chars(text.data(), text.data() + text.size(), value);
-  if (text.empty() || error != std::errc() || end != text.data() + text.size()) return false;
-  number = static_cast<float>(value);
-  return true;
+  auto const [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
+  return !text.empty() && error == std::errc() && end == text.data() + text.size();
 }
 
-std::vector<float3> readPoints(std::string const& path) {
+std::vector<double3> readPoints(std::string const& path) {
   std::error_code unknown;
   if (std::filesystem::is_directory(path, unknown)) throw FileError(path, "is a directory");
   std::ifstream in(path, std::ios::binary);
   if (!in) throw FileError(path, std::strerror(errno));
   std::string const text((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
   if (in.bad()) throw FileError(path, "cannot be read");
-  std::vector<float3> points;
+  std::vector<double3> points;
   std::size_t line = 0;
   for (std::size_t begin = 0; begin < text.size();) {
     std::size_t const end = std::min(text.find('\n', begin), text.size());
@@ -69,7 +67,7 @@ std::vector<float3> readPoints(std::string const& path) {
     begin = end + 1;
     ++line;
     if (trimmed(rest).empty()) continue;
-    float3 p{};
+    double3 p{};
     bool good = true;
     for (int a = 0; a < 3 && good; ++a) {
       std::size_t const comma = rest.find(',');
@@ -82,7 +80,25 @@ std::vector<float3> readPoints(std::string const& path) {
   return points;
 }
 
-void writeLines(std::vector<float3> const& points, Sampler const& cold) {
+// A point of world space as a line: through the whole transform into the tree's space, and the gradient back.
+struct Line {
+  VdbVolume const& volume;
+  float voxelSize; ///< that the sampler's gradients were divided by
+
+  void append(fmt::memory_buffer& text, Sampler const& sampler, double3 const& p) const {
+    double3 const index = volume.indexToWorld.toIndex(p);
+    float3 g;
+    float const value = sampler.sampleGradient(
+        {static_cast<float>(index.x), static_cast<float>(index.y), static_cast<float>(index.z)},
+        VLN::TileTree3D::kSamplerTileSpace, &g);
+    g *= voxelSize;
+    double3 const w = volume.indexToWorld.gradientToWorld({g.x, g.y, g.z}, index);
+    fmt::format_to(std::back_inserter(text), "{:.9g},{:.9g},{:.9g},{:.9g},{:.9g},{:.9g},{:.9g}\n", p.x, p.y,
+                   p.z, value, w.x, w.y, w.z);
+  }
+};
+
+void writeLines(std::vector<double3> const& points, Sampler const& cold, Line const& line) {
   std::vector<std::unique_ptr<Sampler>> samplers(static_cast<std::size_t>(VLN::parallelThreads()));
   auto const count = static_cast<std::int64_t>(points.size());
   std::cout << "x,y,z,value,gx,gy,gz\n";
@@ -93,13 +109,8 @@ void writeLines(std::vector<float3> const& points, Sampler const& cold) {
       auto& sampler = samplers[static_cast<std::size_t>(VLN::parallelThreadIndex())];
       if (!sampler) sampler = std::make_unique<Sampler>(cold);
       fmt::memory_buffer text;
-      for (std::int64_t n = begin; n < end; ++n) {
-        float3 const& p = points[static_cast<std::size_t>(n)];
-        float3 g;
-        float const value = sampler->sampleGradient(p, &g);
-        fmt::format_to(std::back_inserter(text), "{:.9g},{:.9g},{:.9g},{:.9g},{:.9g},{:.9g},{:.9g}\n", p.x,
-                       p.y, p.z, value, g.x, g.y, g.z);
-      }
+      for (std::int64_t n = begin; n < end; ++n)
+        line.append(text, *sampler, points[static_cast<std::size_t>(n)]);
       lines[static_cast<std::size_t>(chunk)].assign(text.data(), text.size());
     });
     for (auto const& text : lines) std::cout << text;
@@ -109,7 +120,7 @@ void writeLines(std::vector<float3> const& points, Sampler const& cold) {
 } // namespace
 
 void probe(ProbeOptions const& options) {
-  std::vector<float3> points;
+  std::vector<double3> points;
   if (options.positions.size() % 3 != 0)
     throw std::invalid_argument("positions are three numbers each, but there are " +
                                 std::to_string(options.positions.size()));
@@ -130,9 +141,8 @@ void probe(ProbeOptions const& options) {
   auto const container = volume.object->component<Container>(kVdbContainerName);
   auto const topology = volume.object->component<Topology>(kVdbTopologyName);
   auto const channel = volume.object->component<FloatChannel>(options.channel);
-  writeLines(points, {*container, *topology, *channel});
+  writeLines(points, {*container, *topology, *channel}, {volume, container->voxelSize()});
   std::cout.flush();
-  std::cerr << transformNote(content, volume);
 }
 
 } // namespace Vln

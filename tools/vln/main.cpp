@@ -90,6 +90,9 @@ void addSlice(CLI::App& app, Vln::SliceOptions& o) {
       ->check(CLI::Range(VLN::Interop::kSmallestSlice, VLN::Interop::kLargestSlice))
       ->capture_default_str()
       ->type_name("N");
+  command->add_option("--depth", o.plane.depth, "Draw no tile deeper than this (default: the deepest)")
+      ->check(CLI::Range(0, 28))
+      ->type_name("D");
   command->add_flag("--nearest", o.plane.nearest, "Draw the nearest sample instead of blending linearly");
   command->add_flag("--gradient", o.plane.gradient, "Draw the length of the gradient")->excludes("--nearest");
   command->add_option("-o,--output", o.output, "The PNG file to write")->required()->type_name("OUT.png");

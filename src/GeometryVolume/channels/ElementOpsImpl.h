@@ -4,6 +4,7 @@
 #include "GeometryVolume/channels/ChannelData.h"
 #include "GeometryVolume/channels/ElementOps.h"
 #include "GeometryVolume/channels/ElementTraits.h"
+#include "GeometryVolume/core/FourLanes.h"
 
 #include <algorithm>
 
@@ -57,6 +58,16 @@ template <class T> struct TypedElementOps {
       for (int j = 0; j < b.count[1]; ++j)
         for (int i = 0; i < b.count[0]; ++i) {
           T const* const low = parent + b.i[i].at + (b.j[j].at + b.k[k].at * w) * w;
+          if constexpr (std::is_same_v<T, float>) {
+            // The four blends along i at once; each in the same order as any other type's.
+            auto const v = lerpLanes(FloatLanes{low[0], low[w], low[w * w], low[w * w + w]},
+                                     FloatLanes{low[1], low[w + 1], low[w * w + 1], low[w * w + w + 1]},
+                                     lanesOf(b.i[i].fraction));
+            auto const lerp = [](float x, float y, float t) { return (y - x) * t + x; };
+            float const fj = b.j[j].fraction;
+            target[i + (j + k * w) * w] = lerp(lerp(v[0], v[1], fj), lerp(v[2], v[3], fj), b.k[k].fraction);
+            continue;
+          }
           target[i + (j + k * w) * w] =
               blendEight<T>([&](int n) -> T const& { return low[offsets[n]]; }, Blend(b.i[i].fraction),
                             Blend(b.j[j].fraction), Blend(b.k[k].fraction));

@@ -5,8 +5,7 @@
 namespace VLN::TileTree3D::Internal {
 
 template <class TraitsT>
-TreeIndex HaloDriver<TraitsT>::searchNeighbor(TileType const& tile, NeighborDirection d) const {
-  int3 const step = neighborOffset(d);
+TreeIndex HaloDriver<TraitsT>::searchBeside(TileType const& tile, int3 const& step) const {
   std::int64_t const w = TraitsT::width(tile.depth());
   std::int64_t const i = tile.ti() + step.x * w, j = tile.tj() + step.y * w, k = tile.tk() + step.z * w;
   auto const outside = [](std::int64_t c) {
@@ -17,31 +16,41 @@ TreeIndex HaloDriver<TraitsT>::searchNeighbor(TileType const& tile, NeighborDire
                               false);
 }
 
-template <class TraitsT> TreeIndex HaloDriver<TraitsT>::neighbor(TileType const& tile, NeighborDirection d) {
-  auto const& tree = *m_accessor.container();
-  if (auto const* table = tree.neighborData())
-    return (*table)[static_cast<std::size_t>(tile.depth())][static_cast<std::size_t>(tile.index())]
-                   [static_cast<std::size_t>(d)];
-  if (tile.isRoot()) return searchNeighbor(tile, d);
-  // The neighbour is a child of the parent, or of a neighbour of the parent.
-  auto const& parent = tree.tile(tile.parentTreeIndex());
-  if (m_parent != parent.treeIndex()) m_parent = parent.treeIndex(), m_known = 0;
-  int3 slot = parent.childIJK(tile), beside{};
-  int3 const step = neighborOffset(d);
-  for (int a = 0; a < 3; ++a) {
-    slot[a] += step[a];
-    beside[a] = slot[a] < 0 ? -1 : slot[a] >= TraitsT::kTW ? 1 : 0;
-    slot[a] -= beside[a] * TraitsT::kTW;
+template <class TraitsT> void HaloDriver<TraitsT>::moveTo(TileType const& tile) {
+  // Without a parent every tile has a table of its own.
+  TreeIndex const parent = tile.isRoot() ? TreeIndex{} : tile.parentTreeIndex();
+  if (!parent.valid() || m_parent != parent) m_parent = parent, m_known = {}, m_aroundKnown = 0;
+  int const d = tile.depth();
+  for (int a = 0; a < 3 && d > 0; ++a) {
+    std::uint32_t const u = TraitsT::offset(tile.tijk()[a]);
+    m_slot[a] = static_cast<int>(TraitsT::quotient(u, d) - TraitsT::kTW * TraitsT::quotient(u, d - 1));
   }
-  NeighborDirection const side = neighborDirection(beside.x, beside.y, beside.z);
+  m_place = (m_slot.x + 1) + kAcross * ((m_slot.y + 1) + kAcross * (m_slot.z + 1));
+}
+
+// The neighbour is a child of the parent, or of a neighbour of the parent.
+template <class TraitsT> TreeIndex HaloDriver<TraitsT>::findBeside(TileType const& tile, int3 const& step) {
+  if (!m_parent.valid()) return searchBeside(tile, step);
+  auto const& tree = *m_accessor.container();
+  int3 slot{}, side{};
+  for (int a = 0; a < 3; ++a) {
+    slot[a] = m_slot[a] + step[a];
+    side[a] = slot[a] < 0 ? -1 : slot[a] >= TraitsT::kTW ? 1 : 0;
+    slot[a] -= side[a] * TraitsT::kTW;
+  }
+  NeighborDirection const direction = neighborDirection(side.x, side.y, side.z);
   TreeIndex holder = m_parent;
-  if (side != kNeighborSelf) {
-    auto& known = m_around[static_cast<std::size_t>(side)];
-    if (!(m_known >> side & 1)) known = searchNeighbor(parent, side), m_known |= 1u << side;
-    holder = known;
+  if (direction != kNeighborSelf) {
+    auto& known = m_around[static_cast<std::size_t>(direction)];
+    if (!(m_aroundKnown >> direction & 1)) {
+      TreeIndex const at = searchBeside(tree.tile(m_parent), side);
+      known = {at.index, nullptr, at.depth};
+      m_aroundKnown |= 1u << direction;
+    }
+    holder = known.at();
   }
   // A root of the tile's own depth may lie where there is no tile above it.
-  if (!holder.valid()) return tree.rootCount(tile.depth()) > 0 ? searchNeighbor(tile, d) : TreeIndex{};
+  if (!holder.valid()) return tree.rootCount(tile.depth()) > 0 ? searchBeside(tile, step) : TreeIndex{};
   if (holder.depth != m_parent.depth) return holder;
   TreeIndex const child = tree.tile(holder).childTreeIndex(slot);
   return child.index >= 0 ? child : holder;
@@ -81,14 +90,13 @@ template <class TraitsT> void HaloDriver<TraitsT>::replicate(HaloBox const& box,
 
 template <class TraitsT>
 void HaloDriver<TraitsT>::blend(HaloBox const& box, HaloTarget<TraitsT> const& target,
-                                int3 const& child) const {
-  auto const axis = [&](std::size_t a, int c) {
-    return &m_table
-                .parentAxis[static_cast<std::size_t>(c)][static_cast<std::size_t>(box.low[a] + m_table.halo)];
+                                void const* parent) const {
+  auto const axis = [&](std::size_t a) {
+    auto const child = static_cast<std::size_t>(m_slot[static_cast<int>(a)]);
+    return &m_table.parentAxis[child][static_cast<std::size_t>(box.low[a] + m_table.halo)];
   };
-  m_source.ops->blendParent({at(target.elements, box.target), at(target.parentElements, m_table.targetOrigin),
-                             m_table.targetWidth, axis(0, child.x), axis(1, child.y), axis(2, child.z),
-                             box.count});
+  m_source.ops->blendParent({at(target.elements, box.target), at(parent, m_table.targetOrigin),
+                             m_table.targetWidth, axis(0), axis(1), axis(2), box.count});
 }
 
 template <class TraitsT>
@@ -127,44 +135,46 @@ template <class TraitsT> void HaloDriver<TraitsT>::fill(HaloTarget<TraitsT> cons
     copy(m_table.core, target.elements, own);
   else
     set(m_table.core, target.elements, m_source.defaultValue);
+  if (m_table.regionCount == 0) return;
 
-  int3 child{-1, 0, 0};
+  moveTo(tile);
+  bool parentKnown = false;
+  void const* parent = nullptr;
   for (int n = 0; n < m_table.regionCount; ++n) {
     HaloRegion const& region = m_table.regions[static_cast<std::size_t>(n)];
-    TreeIndex const beside = neighbor(tile, region.direction);
-    void const* const source = beside.depth == tile.depth() ? m_source.elements(beside) : nullptr;
-    if (source) {
+    if (void const* const source = beside(tile, region).elements) {
       copy(region, target.elements, source);
-    } else if (target.parent && target.parentElements) {
-      if (child.x < 0) child = target.parent->childIJK(tile);
-      blend(region, target, child);
-    } else if (mode == kHaloModeReplicate) {
-      replicate(region, target.elements);
-    } else {
-      set(region, target.elements, m_source.defaultValue);
+      continue;
     }
+    if (!parentKnown) parent = target.parentData(), parentKnown = true;
+    if (parent)
+      blend(region, target, parent);
+    else if (mode == kHaloModeReplicate)
+      replicate(region, target.elements);
+    else
+      set(region, target.elements, m_source.defaultValue);
   }
 }
 
 template <class TraitsT>
 void HaloDriver<TraitsT>::fillRegion(HaloRegion const& region, TileType const& tile, void* target,
                                      HaloFill const& fill, HaloSampler<TraitsT>& sampler) {
-  TreeIndex const beside = neighbor(tile, region.direction);
-  if (beside.depth == tile.depth()) {
-    if (void const* const source = m_source.elements(beside)) return copy(region, target, source);
-  }
-  if (!beside.valid() || beside.depth < m_source.minDepth || fill.mode == kHaloModeDefault)
+  Beside const& known = beside(tile, region);
+  TreeIndex const there = known.at();
+  void const* const source = known.elements;
+  if (source) return copy(region, target, source);
+  if (!there.valid() || there.depth < m_source.minDepth || fill.mode == kHaloModeDefault)
     return set(region, target, m_source.defaultValue);
   switch (fill.mode) {
   case kHaloModeDeepOnly:
-    if (beside.depth > m_source.maxDepth) sample(region, tile, target, fill.scale, sampler);
+    if (there.depth > m_source.maxDepth) sample(region, tile, target, fill.scale, sampler);
     return;
   case kHaloModeReplicate:
     return replicate(region, target);
   case kHaloModeNearestCoarse: {
-    void const* source = nullptr;
-    TileType const* const coarse = withData(&m_accessor.tile(beside), source);
-    if (coarse) return nearest(region, tile, target, *coarse, source);
+    void const* elements = nullptr;
+    TileType const* const coarse = withData(&m_accessor.tile(there), elements);
+    if (coarse) return nearest(region, tile, target, *coarse, elements);
     return set(region, target, m_source.defaultValue);
   }
   case kHaloModeLinearCoarse:
@@ -191,6 +201,7 @@ void HaloDriver<TraitsT>::fill(TileType const& tile, void* target, HaloFill cons
     else
       set(m_table.core, target, m_source.defaultValue);
   }
+  moveTo(tile);
   for (int n = 0; n < m_table.regionCount; ++n) {
     HaloRegion const& region = m_table.regions[static_cast<std::size_t>(n)];
     if (!(fill.type & (region.face ? kHaloFaces : kHaloEdges)) || fill.type & haloSkip(region.direction))
@@ -227,7 +238,7 @@ public:
     HaloTarget<TraitsT> plain{tile, target};
     if (!tile.isRoot() && tile.depth() > m_pass.firstDepth) {
       plain.parent = &m_tree.tile(tile.parentTreeIndex());
-      plain.parentElements = m_pass.target.elements(tile.parentTreeIndex());
+      plain.tiles = &m_pass.target;
     }
     m_driver.fill(plain, kHaloModeReplicate);
   }

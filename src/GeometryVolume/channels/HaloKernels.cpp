@@ -13,8 +13,9 @@ template <std::size_t Size> void copyElement(std::byte* to, std::byte const* fro
   std::memcpy(to, from, Size);
 }
 
-// Runs of a row: whole rows of both shapes and single elements, the common ones, have constant counts.
-template <class Row> void forRows(int count, Row const& row) {
+// Elements of a row, rows of a plane: whole ones of both shapes and single ones, which are common, have
+// constant counts.
+template <class Row> void forCount(int count, Row const& row) {
   switch (count) {
   case 1:
     row(std::integral_constant<int, 1>());
@@ -38,13 +39,13 @@ template <std::size_t Size> void copyBox(BoxMove const& m) {
   };
   std::ptrdiff_t const tj = bytes(m.targetWidth), sj = bytes(m.sourceWidth);
   std::ptrdiff_t const tk = tj * m.targetWidth, sk = sj * m.sourceWidth;
-  forRows(m.count[0], [&](auto n) {
-    for (int k = 0; k < m.count[2]; ++k)
-      for (int j = 0; j < m.count[1]; ++j) {
-        std::byte* const to = target + k * tk + j * tj;
-        std::byte const* const from = source + k * sk + j * sj;
-        std::memcpy(to, from, static_cast<std::size_t>(bytes(n)));
-      }
+  forCount(m.count[0], [&](auto n) {
+    forCount(m.count[1], [&](auto rows) {
+      std::byte* to = target;
+      std::byte const* from = source;
+      for (int k = 0; k < m.count[2]; ++k, to += tk, from += sk)
+        for (int j = 0; j < rows; ++j) std::memcpy(to + j * tj, from + j * sj, std::size_t(bytes(n)));
+    });
   });
 }
 

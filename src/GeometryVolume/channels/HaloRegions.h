@@ -28,6 +28,7 @@ struct HaloBox {
 struct HaloRegion : HaloBox {
   NeighborDirection direction = kNeighborSelf;
   bool face = false;
+  int place = 0; ///< steps in a block of children with one layer round them, i fastest
 };
 
 /// One axis of a read from the parent: the low one of two samples, and the fraction of the high one.
@@ -86,6 +87,7 @@ constexpr HaloTable makeHaloTable(ChannelLayout const& source, ChannelLayout con
     r.direction = neighborDirection(step.x, step.y, step.z);
     int const moved = (step.x != 0) + (step.y != 0) + (step.z != 0);
     r.face = moved == 1;
+    r.place = step.x + (tileWidth + 2) * (step.y + (tileWidth + 2) * step.z);
     int const steps[3] = {step.x, step.y, step.z};
     int targetStride = 1, sourceStride = 1;
     r.target = t.targetOrigin, r.source = t.sourceOrigin;

@@ -10,7 +10,7 @@
 // Beyond the last sample the weight reaches and passes 1; before the first, with an offset, i is -1.
 #pragma once
 
-#include "GeometryVolume/core/Numeric.h"
+#include "GeometryVolume/core/FourLanes.h"
 #include "GeometryVolume/tiletree/Container.h"
 #include "GeometryVolume/topology/VoxelTopology.h"
 
@@ -56,33 +56,48 @@ public:
   /// @numeric A place up to 1e-5 of a sample below the tile's first sample counts as on it.
   bool prepareToSample(Position position, SamplerSpace space, TreeIndex& out, int3& ijk, Position& weights,
                        int depth, Real* invVoxelWidth) const {
-    if (space == kSamplerWorldSpace) position = position * m_worldToTile;
-    int const ci = toIntFloor(position.x), cj = toIntFloor(position.y), ck = toIntFloor(position.z);
-    if (depth < 0) {
-      out = {};
-      return false;
-    }
-    out = m_accessor.treeIndex(ci, cj, ck, depth, false);
-    if (out.depth < 0) return false;
-    Scale const& scale = kScales[static_cast<std::size_t>(out.depth)];
-    if (invVoxelWidth) *invVoxelWidth = scale.invVoxelWidth;
-    int3 const corner = m_accessor.cursorCorner();
-    place(position.x, corner.x, scale.samples, m_offset.x, ijk.x, weights.x);
-    place(position.y, corner.y, scale.samples, m_offset.y, ijk.y, weights.y);
-    place(position.z, corner.z, scale.samples, m_offset.z, ijk.z, weights.z);
+    Place place;
+    bool const found = locate(position, space, depth, place);
+    out = place.tile;
+    if (!found) return false;
+    if (invVoxelWidth) *invVoxelWidth = place.invVoxelWidth;
+    ijk = Internal::toInt3(place.ijk);
+    weights = Internal::toFloat3(place.weights);
     return true;
   }
 
 protected:
   static constexpr int D = TraitsT::kTDW;
 
-  static void place(float p, int corner, float samples, float offset, int& i, float& weight) {
-    float l = (p - static_cast<float>(corner)) * samples - offset;
-    if (l > -1e-5f) l = std::max(0.0f, l);
+  /// What prepareToSample() gives, in lanes.
+  struct Place {
+    TreeIndex tile;
+    float invVoxelWidth;
+    Internal::IntLanes ijk;
+    Internal::FloatLanes weights;
+  };
+  /// @return false without a tile: of `place` the tile alone is then set, and invalid.
+  bool locate(Position const& position, SamplerSpace space, int depth, Place& place) const {
+    using namespace Internal;
+    FloatLanes p = lanesOf(position);
+    if (space == kSamplerWorldSpace) p *= m_worldToTile;
+    IntLanes const c = floorLanesAnywhere(p);
+    place.tile = {};
+    if (depth < 0) return false;
+    place.tile = m_accessor.treeIndex(c[0], c[1], c[2], depth, false);
+    if (place.tile.depth < 0) return false;
+    Scale const& scale = kScales[static_cast<std::size_t>(place.tile.depth)];
+    place.invVoxelWidth = scale.invVoxelWidth;
+    auto const corner = __builtin_convertvector(lanesOf(m_accessor.cursorCorner()), FloatLanes);
+    FloatLanes l = (p - corner) * scale.samples - lanesOf(m_offset);
+    FloatLanes const zero = {};
+    // Up to 1e-5 below the first sample counts as on it.
+    l = (l > zero) | (l <= lanesOf(-1e-5f)) ? l : zero;
     // In reach of int: the tile holds p.
-    auto const cut = static_cast<int>(l);
-    i = std::min(cut - (static_cast<float>(cut) > l ? 1 : 0), D - 1);
-    weight = l - static_cast<float>(i);
+    IntLanes const i = floorLanes(l), last = IntLanes{} + (D - 1);
+    place.ijk = i < last ? i : last;
+    place.weights = l - __builtin_convertvector(place.ijk, FloatLanes);
+    return true;
   }
 
   Accessor m_accessor;

@@ -102,11 +102,11 @@ VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::cachedCell(TreeIndex const& tile, int3 co
   if (this->m_offsetType == kVoxelOffsetCorner) {
     constexpr int w = D + 1;
     float const* const data = entry(m_cacheOneSided).data.data()->data();
-    return {data + ijk.x + w * (ijk.y + w * ijk.z), w, weights};
+    return {data + ijk.x + w * (ijk.y + w * ijk.z), w, Internal::lanesOf(weights)};
   }
   constexpr int w = D + 2;
   float const* const data = entry(m_cacheTwoSided).data.data()->data();
-  return {data + (ijk.x + 1) + w * ((ijk.y + 1) + w * (ijk.z + 1)), w, weights};
+  return {data + (ijk.x + 1) + w * ((ijk.y + 1) + w * (ijk.z + 1)), w, Internal::lanesOf(weights)};
 }
 
 // The entry that holds the tile, or null.
@@ -235,7 +235,7 @@ VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::fillTwoSided(typename ContainerT::TileTyp
                      &y = axes[1][static_cast<std::size_t>(j + 1)],
                      &z = axes[2][static_cast<std::size_t>(k + 1)];
           float const* const low = parent.data()->data() + flat(x.low, y.low, z.low);
-          value = Cell{low, D + 2, {x.fraction, y.fraction, z.fraction}}.value();
+          value = Cell{low, D + 2, {x.fraction, y.fraction, z.fraction, 0.0f}}.value();
         }
       }
 }

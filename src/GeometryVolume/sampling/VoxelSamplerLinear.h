@@ -30,6 +30,7 @@ template <class TraitsT, class Value, int Components, class Real, class Position
 class VLN_API VoxelSamplerLinear : public VoxelSampler<TraitsT, Real, Position> {
   static_assert(std::is_same_v<Value, float> && Components == 1, "instantiated for float");
   using Base = VoxelSampler<TraitsT, Real, Position>;
+  using typename Base::Place;
 
 public:
   using Base::D;
@@ -83,17 +84,14 @@ public:
     return sample(position, TraitsT::kMaxDepth, space);
   }
   float sample(Position const& position, int depth, SamplerSpace space) const {
-    TreeIndex tile;
-    int3 ijk;
-    Position weights;
-    this->prepareToSample(position, space, tile, ijk, weights, std::min(depth, m_maxDepth), nullptr);
-    return sample(tile, ijk, weights);
+    Place place;
+    this->locate(position, space, std::min(depth, m_maxDepth), place);
+    return covers(place.tile) ? cellOf(place).value() : m_defaultValue;
   }
   /// The interpolation proper, of a cell as prepareToSample() gives it.
   float sample(TreeIndex const& tile, int3 const& ijk, Position const& weights) const {
     if (!covers(tile)) return m_defaultValue;
-    Cell const cell = cellOf(tile, ijk, weights);
-    return cell.value();
+    return cellOf({tile, 0.0f, Internal::lanesOf(ijk), Internal::lanesOf(weights)}).value();
   }
 
   // Values with gradients
@@ -110,18 +108,14 @@ public:
     return sampleGradient(position, TraitsT::kMaxDepth, space, gradient);
   }
   float sampleGradient(Position const& position, int depth, SamplerSpace space, Position* gradient) const {
-    TreeIndex tile;
-    int3 ijk;
-    Position weights;
-    float invVoxelWidth = 0.0f;
-    bool const found = this->prepareToSample(position, space, tile, ijk, weights, std::min(depth, m_maxDepth),
-                                             &invVoxelWidth);
-    if (!found || !covers(tile)) {
+    Place place;
+    bool const found = this->locate(position, space, std::min(depth, m_maxDepth), place);
+    if (!found || !covers(place.tile)) {
       *gradient = {0.0f, 0.0f, 0.0f};
       return m_defaultValue;
     }
-    Cell const cell = cellOf(tile, ijk, weights);
-    float const g = invVoxelWidth * 2.0f * m_invVoxelSize;
+    Cell const cell = cellOf(place);
+    float const g = place.invVoxelWidth * 2.0f * m_invVoxelSize;
     *gradient = cell.slope() * g;
     return cell.value();
   }
@@ -148,24 +142,28 @@ protected:
   struct Cell {
     float const* low;
     int width;
-    Position weights;
+    Internal::FloatLanes weights;
 
     static float lerp(float a, float b, float t) { return (b - a) * t + a; }
-    float value() const {
-      float const *const p = low, *const q = low + width * width;
+    // The four samples of an edge of the cell along x, in the order (0,0) (1,0) (0,1) (1,1) of y and z.
+    Internal::FloatLanes samples(int x) const {
+      float const* const p = low + x;
       int const w = width;
-      float const a = lerp(lerp(p[0], p[1], weights.x), lerp(p[w], p[w + 1], weights.x), weights.y);
-      float const b = lerp(lerp(q[0], q[1], weights.x), lerp(q[w], q[w + 1], weights.x), weights.y);
-      return lerp(a, b, weights.z);
+      return Internal::FloatLanes{p[0], p[w], p[w * w], p[w * w + w]};
+    }
+    float value() const { return value(samples(0), samples(1)); }
+    float value(Internal::FloatLanes low4, Internal::FloatLanes high4) const {
+      auto const v = Internal::lerpLanes(low4, high4, Internal::lanesOf(weights[0]));
+      float const y = weights[1];
+      return lerp(lerp(v[0], v[1], y), lerp(v[2], v[3], y), weights[2]);
     }
     /// Derivatives by the weights.
     Position slope() const {
-      float const *const p = low, *const q = low + width * width;
-      int const w = width;
-      auto const [x, y, z] = weights;
-      return {lerp(lerp(p[1] - p[0], p[w + 1] - p[w], y), lerp(q[1] - q[0], q[w + 1] - q[w], y), z),
-              lerp(lerp(p[w] - p[0], p[w + 1] - p[1], x), lerp(q[w] - q[0], q[w + 1] - q[1], x), z),
-              lerp(lerp(q[0] - p[0], q[1] - p[1], x), lerp(q[w] - p[w], q[w + 1] - p[w + 1], x), y)};
+      auto const a = samples(0), b = samples(1), d = b - a;
+      float const x = weights[0], y = weights[1], z = weights[2];
+      return {lerp(lerp(d[0], d[1], y), lerp(d[2], d[3], y), z),
+              lerp(lerp(a[1] - a[0], b[1] - b[0], x), lerp(a[3] - a[2], b[3] - b[2], x), z),
+              lerp(lerp(a[2] - a[0], b[2] - b[0], x), lerp(a[3] - a[1], b[3] - b[1], x), y)};
     }
   };
 
@@ -177,32 +175,27 @@ private:
   bool covers(TreeIndex const& tile) const {
     return tile.index >= 0 && tile.depth >= std::max(m_minDepth, 0);
   }
-  Cell cellOf(TreeIndex const& tile, int3 const& ijk, Position const& weights) const {
-    if (m_channelWide) return wideCell(tile, ijk, weights);
+  Cell cellOf(Place const& place) const {
+    if (m_channelWide) return wideCell(place);
     ++m_accessCount;
     int const low = this->m_offsetType == kVoxelOffsetCorner ? 0 : 1;
     auto const inside = [low](int i) { return i >= low && i + 1 < D; };
-    if (inside(ijk.x) && inside(ijk.y) && inside(ijk.z))
-      return {m_channelCore->tileArrays()
-                      ->
-                      operator[](static_cast<std::size_t>(tile.depth))[static_cast<std::size_t>(tile.index)]
-                      .data() +
-                  ijk.x + D * (ijk.y + D * ijk.z),
-              D, weights};
-    return cachedCell(tile, ijk, weights);
+    int const i = place.ijk[0], j = place.ijk[1], k = place.ijk[2];
+    if (inside(i) && inside(j) && inside(k))
+      return {dataOf(*m_channelCore, place.tile) + i + D * (j + D * k), D, place.weights};
+    return cachedCell(place.tile, Internal::toInt3(place.ijk), Internal::toFloat3(place.weights));
   }
-  Cell wideCell(TreeIndex const& tile, int3 const& ijk, Position weights) const {
+  Cell wideCell(Place const& place) const {
     constexpr int w = D + 1;
-    int3 at = ijk;
     // Below the first sample: extrapolate from the first cell, as the last one does at the top.
-    if ((at.x | at.y | at.z) < 0) {
-      if (at.x < 0) at.x = 0, weights.x -= 1.0f;
-      if (at.y < 0) at.y = 0, weights.y -= 1.0f;
-      if (at.z < 0) at.z = 0, weights.z -= 1.0f;
-    }
-    auto const& data = (*m_channelWide->tileArrays())[static_cast<std::size_t>(tile.depth)]
-                                                     [static_cast<std::size_t>(tile.index)];
-    return {data.data() + at.x + w * (at.y + w * at.z), w, weights};
+    auto const below = place.ijk < 0;
+    auto const at = place.ijk & ~below;
+    auto const weights = place.weights + __builtin_convertvector(below, Internal::FloatLanes);
+    return {dataOf(*m_channelWide, place.tile) + at[0] + w * (at[1] + w * at[2]), w, weights};
+  }
+  template <class ChannelT> static float const* dataOf(ChannelT const& channel, TreeIndex const& tile) {
+    auto const& tiles = (*channel.tileArrays())[static_cast<std::size_t>(tile.depth)];
+    return tiles[static_cast<std::size_t>(tile.index)].data();
   }
   Cell cachedCell(TreeIndex const& tile, int3 const& ijk, Position const& weights) const;
 

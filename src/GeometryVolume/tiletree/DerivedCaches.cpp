@@ -114,6 +114,7 @@ std::shared_ptr<PlaceTable<TraitsT> const> computePlaces(Container<TraitsT> cons
   }
   auto table = std::make_shared<Table>();
   table->gridDepth = g, table->lastDepth = last;
+  table->levels = static_cast<std::uint32_t>(last - g);
   int const width = TraitsT::width(g) / TraitsT::width(last), size = width * width * width;
   table->placeWidth = static_cast<std::uint32_t>(width), table->blockSize = static_cast<std::uint32_t>(size);
   for (int a = 0; a < 3; ++a) {
@@ -121,7 +122,20 @@ std::shared_ptr<PlaceTable<TraitsT> const> computePlaces(Container<TraitsT> cons
     table->first[axis] = TraitsT::quotient(TraitsT::offset(data.m_gridOrigin[a]), g);
     table->size[axis] = static_cast<std::uint32_t>(data.m_gridSize[axis]);
   }
-  table->cells.assign(data.m_gridTable.size(), Table::kNothing);
+  table->cells.assign(data.m_gridTable.size(), Table::kNoTile);
+  // Below the grid's depth lie tiles of the grid's, and deeper roots.
+  for (auto it = tree.cbeginRoots(); it != tree.cendRoots(); ++it) {
+    if (it->second.depth <= g) continue;
+    std::size_t cell = 0;
+    bool inside = true;
+    for (int a = 2; a >= 0; --a) {
+      std::uint32_t const c = TraitsT::quotient(TraitsT::offset(it->first.ijk()[a]), g) -
+                              table->first[static_cast<std::size_t>(a)];
+      inside = inside && c < table->size[static_cast<std::size_t>(a)];
+      cell = cell * table->size[static_cast<std::size_t>(a)] + c;
+    }
+    if (inside) table->cells[cell] = Table::kUnknown;
+  }
   std::int64_t const rows = std::int64_t(data.m_gridSize[1]) * data.m_gridSize[2];
   parallelFor(0, rows, [&](std::int64_t begin, std::int64_t end) {
     auto accessor = tree.tileAccessor();
@@ -153,7 +167,7 @@ std::shared_ptr<PlaceTable<TraitsT> const> computePlaces(Container<TraitsT> cons
           if (child.index < 0) break;
           at = child;
         }
-        block[place] = static_cast<std::int32_t>(at.index * Table::kLevelUnit + (at.depth - g));
+        block[place] = static_cast<std::int32_t>(at.index * std::int64_t(Table::kLevelUnit) + (at.depth - g));
       }
     }
   });

@@ -4,7 +4,7 @@
 //   +----+----+----+----+                    +--+--+--+--+    a number for each place of lastDepth:
 //   | t3 | -- | t7 | c  |   t of depth g --> |  |  |  |  |    the deepest tile there, and its depth
 //   +----+----+----+----+                    +--+--+--+--+
-//                   c: coarser, the same tile in the whole cell; --: not known here, ask the tree
+//                   c: coarser, the same tile in the whole cell; --: no tile of any depth
 //
 // Two loads in place of two for each level: at random places each of those is a miss of the processor's
 // caches.
@@ -23,45 +23,50 @@ namespace VLN::TileTree3D {
 template <class TraitsT> struct PlaceTable {
   /// Levels below the grid's depth that a block resolves.
   static constexpr int kLevels = TraitsT::kTW == 2 ? 2 : 1;
-  static constexpr int kNothing = -1;
+  /// Cells, and depths of answers: no tile at all there; and tiles of deeper roots alone, to be asked of the
+  /// tree.
+  static constexpr int kNoTile = -2, kUnknown = -1;
 
   int gridDepth = -1;
   /// The deepest depth that is resolved. Deeper tiles lie below the answer when that has this depth.
   int lastDepth = -1;
+  std::uint32_t levels = 0;     ///< lastDepth - gridDepth
   std::uint32_t placeWidth = 1; ///< places along a block
   std::uint32_t blockSize = 1;
   /// Cells of the grid's low corner and along its axes.
   std::array<std::uint32_t, 3> first{}, size{};
-  /// index * kDepthUnit + depth of the deepest tile at or above the grid's depth; kNothing where there is
-  /// none.
+  /// index * kDepthUnit + depth of the deepest tile at or above the grid's depth; kNoTile and
+  /// kUnknown else.
   std::vector<std::int64_t> cells;
   /// For each tile of the grid's depth a block of index * kLevelUnit + levels below the grid.
   std::vector<std::int32_t> places;
 
   static constexpr std::int64_t kDepthUnit = 32;
-  static constexpr std::int32_t kLevelUnit = 4;
-  static constexpr std::int64_t kMostTiles = INT32_MAX / kLevelUnit;
+  static constexpr std::uint32_t kLevelUnit = 4;
+  static constexpr std::int64_t kMostTiles = INT32_MAX / 4;
 
-  /// The deepest tile that holds the point, down to lastDepth; invalid where the table does not know.
+  /// The deepest tile that holds the point, down to lastDepth; else with depth kNoTile or kUnknown.
   TreeIndex find(int i, int j, int k) const {
     std::uint32_t const ui = TraitsT::offset(i), uj = TraitsT::offset(j), uk = TraitsT::offset(k);
     std::uint32_t const ci = TraitsT::quotient(ui, gridDepth) - first[0],
                         cj = TraitsT::quotient(uj, gridDepth) - first[1],
                         ck = TraitsT::quotient(uk, gridDepth) - first[2];
-    if (ci >= size[0] || cj >= size[1] || ck >= size[2]) return {};
+    if (ci >= size[0] || cj >= size[1] || ck >= size[2]) return {-1, kUnknown};
     std::int64_t const cell = cells[ci + std::size_t(size[0]) * (cj + std::size_t(size[1]) * ck)];
-    if (cell < 0) return {};
+    if (cell < 0) return {-1, static_cast<std::int32_t>(cell)};
     auto const depth = static_cast<std::int32_t>(cell & (kDepthUnit - 1));
-    auto const index = static_cast<std::int64_t>(static_cast<std::uint64_t>(cell) / kDepthUnit);
-    if (depth != gridDepth) return {index, depth};
+    std::uint64_t const tile = static_cast<std::uint64_t>(cell) / kDepthUnit;
+    if (depth != gridDepth) return {static_cast<std::int64_t>(tile), depth};
     auto const at = [this](std::uint32_t u, std::uint32_t c) {
       return TraitsT::quotient(u, lastDepth) - placeWidth * c;
     };
     std::uint32_t const place =
         at(ui, ci + first[0]) + placeWidth * (at(uj, cj + first[1]) + placeWidth * at(uk, ck + first[2]));
-    auto const found =
-        static_cast<std::uint32_t>(places[static_cast<std::size_t>(index) * blockSize + place]);
-    return {found / std::uint32_t(kLevelUnit), gridDepth + static_cast<std::int32_t>(found % kLevelUnit)};
+    auto const found = static_cast<std::uint32_t>(places[static_cast<std::size_t>(tile) * blockSize + place]);
+    std::uint32_t const index = found / kLevelUnit, level = found % kLevelUnit;
+    // A branch, so that what follows the depth need not wait for the load.
+    if (level == levels) return {index, lastDepth};
+    return {index, gridDepth + static_cast<std::int32_t>(level)};
   }
 };
 

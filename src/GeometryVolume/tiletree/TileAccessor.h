@@ -47,6 +47,7 @@ public:
     if (auto const* places = m_container ? m_container->places() : nullptr) {
       // Complete answers alone: a tile of the last depth may have deeper ones below it.
       TreeIndex const at = depth >= places->lastDepth ? places->find(i, j, k) : TreeIndex{};
+      if (at.depth == places->kNoTile) return {};
       if (at.depth >= 0 && (at.depth < places->lastDepth || at.depth == depth)) {
         moveTo(at, i, j, k);
         return exact && at.depth != depth ? TreeIndex{} : at;
