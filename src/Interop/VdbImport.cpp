@@ -44,9 +44,7 @@ std::string whyNotKept(openvdb::math::Transform const& transform) {
     kept.besidesScale();
     kept.toIndex(kept.toWorld({1, 1, 1}));
     return {};
-  } catch (std::exception const& error) {
-    return "its transform cannot be used: " + oneLine(error.what());
-  }
+  } catch (std::exception const& error) { return "its transform cannot be used: " + oneLine(error.what()); }
 }
 
 std::vector<Group> groupByTransform(VdbFile const& file, std::vector<SkippedGrid>& skipped) {

@@ -5,6 +5,7 @@
 #include "GeometryVolume/core/LoggerHooks.h"
 #include "GeometryVolume/core/Streaming.h"
 #include "GeometryVolume/tiletree/Consistency.h"
+#include "GeometryVolume/tiletree/ContainerBulkImpl.h"
 #include "GeometryVolume/tiletree/ContainerRefineImpl.h"
 #include "GeometryVolume/tiletree/ContainerRemoveImpl.h"
 #include "GeometryVolume/tiletree/ContainerScratchImpl.h"

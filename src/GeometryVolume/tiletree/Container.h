@@ -273,7 +273,7 @@ protected:
   void removeTile(TreeIndex const& at, bool withBranch, TileMoves* moves = nullptr);
   /// Removes many; `lists` becomes what went, sorted.
   void removeTiles(TileIndexLists& lists, bool withBranch, TileMoves* moves = nullptr);
-  /// Adds the tiles of many corners, in Morton order of each depth, and sets all branch sizes.
+  /// Adds the tiles of many corners and those between, and sets all branch sizes.
   void addTilesInBulk(TileLists const& corners, TileLists* newTiles);
 
   AffinityPartitioner& affinityPartitioner(int d) const {
@@ -283,9 +283,6 @@ protected:
   int decrementAffinityPartitionerUseCount() const { return m_data->m_affinityUseCount.fetch_sub(1); }
 
 private:
-  /// Indices n whose corner has no tile at `depth`; a null corner is left out.
-  std::vector<std::int64_t> findMissing(std::int64_t count, int depth,
-                                        FunctionRef<int3 const*(std::int64_t)> cornerAt) const;
   /// A new tile without parent: a root, or one that hangs below a coarser tile with tiles between.
   struct Unlinked {
     std::int64_t index;
@@ -301,8 +298,8 @@ private:
   /// Links what makeAt() could not, and lists what is new since the counts were `before`.
   void finishMaking(int depth, std::vector<std::vector<Unlinked>> const& parts, Counts const& before,
                     TileLists* newTiles);
-  /// Makes the tiles of distinct aligned corners that do not exist yet.
-  void createTiles(std::vector<int3> const& corners, int depth, TileLists* newTiles);
+  /// Appends the corners of all tiles made since the counts were `before`.
+  void listNewTiles(Counts const& before, TileLists* newTiles) const;
   /// Hangs roots deeper than `depth` below roots of `depth` that hold them.
   void adoptDeeperRoots(int depth);
   /// Takes a tile or its branch out of the tree; returns how many tiles died.

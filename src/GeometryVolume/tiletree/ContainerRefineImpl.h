@@ -1,9 +1,8 @@
-// Bulk creation of tiles, and refinement of one tree by others. Included by Container.cpp alone.
+// Refinement of one tree by others. Included by Container.cpp alone.
 #pragma once
 
 #include "GeometryVolume/core/Canceller.h"
 #include "GeometryVolume/tiletree/Container.h"
-#include "GeometryVolume/tiletree/Morton.h"
 #include "Ostil/Job.h"
 #include "Velorn/ExceptionMessage.h"
 
@@ -53,33 +52,6 @@ inline void refineCheckpoint() {
 
 } // namespace Internal
 
-template <class TraitsT>
-std::vector<std::int64_t>
-Container<TraitsT>::findMissing(std::int64_t count, int depth,
-                                FunctionRef<int3 const*(std::int64_t)> cornerAt) const {
-  if (tileCount(depth) == 0) {
-    std::vector<std::int64_t> all;
-    for (std::int64_t n = 0; n < count; ++n) {
-      if (cornerAt(n)) all.push_back(n);
-    }
-    return all;
-  }
-  std::vector<std::vector<std::int64_t>> parts(static_cast<std::size_t>(Internal::refineChunks(count)));
-  Internal::refinePass(count, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-    auto accessor = tileAccessor();
-    for (std::int64_t n = begin; n < end; ++n) {
-      int3 const* corner = cornerAt(n);
-      if (!corner) continue;
-      if (accessor.treeIndex(corner->x, corner->y, corner->z, depth, false).depth != depth)
-        parts[static_cast<std::size_t>(chunk)].push_back(n);
-    }
-  });
-  // Chunks are consecutive, so that the joined list is in the order of the serial pass.
-  std::vector<std::int64_t> missing;
-  for (auto const& part : parts) missing.insert(missing.end(), part.begin(), part.end());
-  return missing;
-}
-
 template <class TraitsT> void Container<TraitsT>::allocateForMaking(int depth, std::int64_t n) {
   // At the deepest depth nothing is allocated for a tile, so that no record can stay unmade.
   if (depth < kMaxDepth) return allocateTiles(depth, n);
@@ -122,30 +94,15 @@ void Container<TraitsT>::finishMaking(int depth, std::vector<std::vector<Unlinke
     }
   }
   if (anyRoot) adoptDeeperRoots(depth);
-  // The asked tiles lie first among the new ones of their depth; tiles between were made at other depths.
+  listNewTiles(before, newTiles);
+}
+
+template <class TraitsT>
+void Container<TraitsT>::listNewTiles(Counts const& before, TileLists* newTiles) const {
   for (int d = 0; newTiles && d <= kMaxDepth; ++d) {
     for (std::int64_t n = before[static_cast<std::size_t>(d)]; n < tileCount(d); ++n)
       (*newTiles)[static_cast<std::size_t>(d)].append(tile(n, d).tijk());
   }
-}
-
-template <class TraitsT>
-void Container<TraitsT>::createTiles(std::vector<int3> const& corners, int depth, TileLists* newTiles) {
-  auto const count = static_cast<std::int64_t>(corners.size());
-  if (count == 0) return;
-  Counts const before = m_data->m_tileCounts;
-  std::int64_t const first = tileCount(depth);
-  allocateForMaking(depth, count);
-  std::vector<std::vector<Unlinked>> parts(static_cast<std::size_t>(Internal::refineChunks(count)));
-  Internal::refinePass(count, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-    auto const accessor = std::as_const(*this).tileAccessor();
-    Unlinked unlinked;
-    for (std::int64_t n = begin; n < end; ++n) {
-      if (!makeAt(first + n, depth, corners[static_cast<std::size_t>(n)], -1, accessor, unlinked))
-        parts[static_cast<std::size_t>(chunk)].push_back(unlinked);
-    }
-  });
-  finishMaking(depth, parts, before, newTiles);
 }
 
 template <class TraitsT> void Container<TraitsT>::adoptDeeperRoots(int depth) {
@@ -239,48 +196,6 @@ void Container<TraitsT>::refine(std::vector<Container const*> const& sources, Ti
                                 bool setBranchSizesAtEnd) {
   for (std::size_t n = 0; n < sources.size(); ++n)
     refineInternal(*sources[n], setBranchSizesAtEnd && n + 1 == sources.size(), newTiles);
-}
-
-template <class TraitsT>
-void Container<TraitsT>::addTilesInBulk(TileLists const& corners, TileLists* newTiles) {
-  tilesAdded();
-  for (int d = 0; d <= kMaxDepth; ++d) {
-    auto const& list = corners[static_cast<std::size_t>(d)];
-    auto const count = static_cast<std::int64_t>(list.size());
-    std::vector<int3> aligned(static_cast<std::size_t>(count));
-    parallelFor(0, count,
-                [&](std::int64_t begin, std::int64_t end) {
-                  for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
-                    int3 const& p = list[n];
-                    aligned[n] = p;
-                    if (TraitsT::inDomain(p.x, p.y, p.z))
-                      aligned[n] = {TraitsT::align(p.x, d), TraitsT::align(p.y, d), TraitsT::align(p.z, d)};
-                  }
-                },
-                {.grain = 4096});
-    auto const missing = findMissing(count, d, [&](std::int64_t n) {
-      int3 const& p = aligned[static_cast<std::size_t>(n)];
-      return TraitsT::inDomain(p.x, p.y, p.z) ? &p : nullptr;
-    });
-    // Morton order makes neighbours in space neighbours in memory, and puts duplicates side by side.
-    std::vector<SortRecord> order(missing.size());
-    parallelFor(0, static_cast<std::int64_t>(missing.size()),
-                [&](std::int64_t begin, std::int64_t end) {
-                  for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n)
-                    order[n] =
-                        mortonRecord<TraitsT>(aligned[static_cast<std::size_t>(missing[n])], missing[n]);
-                },
-                {.grain = 4096});
-    parallelSort(order.data(), static_cast<std::int64_t>(order.size()));
-    std::vector<int3> unique;
-    unique.reserve(order.size());
-    for (SortRecord const& record : order) {
-      int3 const& p = aligned[static_cast<std::size_t>(record.value)];
-      if (unique.empty() || unique.back() != p) unique.push_back(p);
-    }
-    createTiles(unique, d, newTiles);
-  }
-  setBranchSizes();
 }
 
 } // namespace VLN::TileTree3D

@@ -165,10 +165,12 @@ public:
   TileType const& addTile(int3 const& min, int3 const& max);
   /// Adds the tiles of a depth over a box, its max exclusive. Positions out of the domain are left out.
   void addTiles(int3 const& min, int3 const& max, int depth);
-  /// Adds the tiles that hold the listed points, by depth, all at once: existing ones are left, new ones lie
-  /// in Morton order, branch sizes are right afterwards. Parents are found, not made: list them too.
+  /// Adds the tiles that hold the listed points, by depth, all at once: existing ones are left, those between
+  /// a listed tile and the next coarser one above it, listed or there, are made as well, and branch sizes are
+  /// right afterwards. New ones lie parent by parent in the parents' Morton order.
+  /// @edges Points out of the domain are left out; a point may be listed more than once.
   /// @param newTiles If given, the corner of every tile made is appended to the list of its depth.
-  /// @cost One array growth and one lookup pass a depth; runs in parallel.
+  /// @cost Linear, but for one sort of the parents where they do not come in Morton order; runs in parallel.
   void addTiles(typename ContainerT::TileLists const& points,
                 typename ContainerT::TileLists* newTiles = nullptr) {
     m_mutableContainer->addTilesInBulk(points, newTiles);

@@ -1,0 +1,232 @@
+// Addition of many tiles at once. Included by Container.cpp alone.
+//
+// Everything goes by groups of siblings: what is wanted below one tile of the depth above is one corner and a
+// bit for each slot. Groups are sorted, so that neighbours in space are neighbours in memory; then the tiles
+// between are added from the bottom up, and all are made from the top down.
+#pragma once
+
+#include "GeometryVolume/tiletree/Container.h"
+#include "GeometryVolume/tiletree/Morton.h"
+
+#include <algorithm>
+#include <bitset>
+#include <new>
+#include <utility>
+
+namespace VLN::TileTree3D {
+
+namespace Internal {
+
+/// Tiles of one depth with a common parent, which need not exist.
+template <class TraitsT> struct Siblings {
+  SortRecord key; ///< of the parent's corner
+  int3 parent;
+  std::bitset<static_cast<std::size_t>(TraitsT::kTileSize)> slots;
+};
+
+template <class TraitsT> class WantedTiles {
+  using Group = Siblings<TraitsT>;
+  using Groups = std::vector<Group>;
+
+public:
+  static constexpr int kMaxDepth = TraitsT::kMaxDepth;
+
+  explicit WantedTiles(typename Container<TraitsT>::TileLists const& points) {
+    auto const inDomain = [](int3 const& p) { return TraitsT::inDomain(p.x, p.y, p.z); };
+    for (int3 const& p : points[0]) m_domain = m_domain || inDomain(p);
+    for (int d = 1; d <= kMaxDepth; ++d) {
+      for (int3 const& p : points[static_cast<std::size_t>(d)]) {
+        if (inDomain(p)) add(p, d);
+      }
+      join(groups(d));
+    }
+  }
+
+  /// Whether the tile of depth 0 is wanted.
+  bool domain() const { return m_domain; }
+  /// By the Morton order of the parents.
+  Groups& groups(int depth) { return m_groups[static_cast<std::size_t>(depth)]; }
+  Groups const& groups(int depth) const { return m_groups[static_cast<std::size_t>(depth)]; }
+
+  /// Adds the tiles between a wanted one and the next coarser one above, wanted or there.
+  void addBetween(Container<TraitsT> const& tree) {
+    auto const accessor = tree.tileAccessor();
+    for (int d = kMaxDepth; d > 1; --d) {
+      Groups& here = groups(d);
+      if (here.empty()) continue;
+      bool added = false;
+      std::vector<Cover> covers = coversAbove(d - 1);
+      for (Group const& group : here) {
+        int3 const& p = group.parent;
+        TreeIndex const above = accessor.treeIndex(p.x, p.y, p.z, d - 1, false);
+        if (above.depth == d - 1) continue;
+        if (above.valid() || m_domain ||
+            std::any_of(covers.begin(), covers.end(), [&](Cover& c) { return c.holds(p); }))
+          add(p, d - 1), added = true;
+      }
+      if (added) join(groups(d - 1));
+    }
+  }
+
+private:
+  static bool less(Group const& a, Group const& b) {
+    return a.key.high != b.key.high ? a.key.high < b.key.high : a.key.low < b.key.low;
+  }
+  static int3 align(int3 const& p, int d) {
+    return {TraitsT::align(p.x, d), TraitsT::align(p.y, d), TraitsT::align(p.z, d)};
+  }
+  static std::size_t slotOf(int3 const& p, int3 const& parent, int d) {
+    std::int64_t const w = TraitsT::width(d);
+    auto const digit = [&](int a) { return (std::int64_t(p[a]) - parent[a]) / w; };
+    return static_cast<std::size_t>(digit(0) + TraitsT::kTW * (digit(1) + TraitsT::kTW * digit(2)));
+  }
+
+  void add(int3 const& p, int depth) {
+    Groups& list = groups(depth);
+    int3 const parent = align(p, depth - 1);
+    if (list.empty() || list.back().parent != parent) list.push_back({{}, parent, {}});
+    list.back().slots.set(slotOf(p, parent, depth));
+  }
+  /// Sorts a list, and makes one group of those with the same parent.
+  static void join(Groups& list) {
+    std::vector<SortRecord> order(list.size());
+    for (std::size_t n = 0; n < list.size(); ++n)
+      list[n].key = order[n] = mortonRecord<TraitsT>(list[n].parent, static_cast<std::int64_t>(n));
+    parallelSort(order.data(), static_cast<std::int64_t>(order.size()));
+    Groups sorted;
+    sorted.reserve(list.size());
+    for (SortRecord const& record : order) {
+      Group const& group = list[static_cast<std::size_t>(record.value)];
+      if (!sorted.empty() && sorted.back().parent == group.parent)
+        sorted.back().slots |= group.slots;
+      else
+        sorted.push_back(group);
+    }
+    list.swap(sorted);
+  }
+
+  /// Whether a depth's wanted tiles hold a point. Remembers the last answer.
+  class Cover {
+  public:
+    Cover(Groups const& list, int depth)
+        : m_list(&list)
+        , m_depth(depth) {}
+    bool holds(int3 const& p) {
+      int3 const corner = align(p, m_depth);
+      if (m_asked && corner == m_corner) return m_answer;
+      m_asked = true, m_corner = corner;
+      int3 const parent = align(p, m_depth - 1);
+      Group const wanted{mortonRecord<TraitsT>(parent, 0), parent, {}};
+      auto const at = std::lower_bound(m_list->begin(), m_list->end(), wanted, less);
+      m_answer = at != m_list->end() && at->parent == parent && at->slots[slotOf(corner, parent, m_depth)];
+      return m_answer;
+    }
+
+  private:
+    Groups const* m_list;
+    int m_depth;
+    bool m_asked = false, m_answer = false;
+    int3 m_corner{0, 0, 0};
+  };
+  std::vector<Cover> coversAbove(int depth) const {
+    std::vector<Cover> covers;
+    for (int d = 1; d < depth; ++d) {
+      if (!groups(d).empty()) covers.emplace_back(groups(d), d);
+    }
+    return covers;
+  }
+
+  bool m_domain = false;
+  std::array<Groups, static_cast<std::size_t>(TraitsT::kDepths)> m_groups;
+};
+
+} // namespace Internal
+
+template <class TraitsT>
+void Container<TraitsT>::addTilesInBulk(TileLists const& corners, TileLists* newTiles) {
+  using Group = Internal::Siblings<TraitsT>;
+  tilesAdded();
+  Internal::WantedTiles<TraitsT> wanted(corners);
+  wanted.addBetween(*this);
+  if (wanted.domain()) {
+    Counts const before = m_data->m_tileCounts;
+    addTile(kMinTileCoord, kMinTileCoord, kMinTileCoord, 0);
+    listNewTiles(before, newTiles);
+  }
+  constexpr std::int64_t kGrain = 128;
+  for (int d = 1; d <= kMaxDepth; ++d) {
+    auto& groups = wanted.groups(d);
+    auto const count = static_cast<std::int64_t>(groups.size());
+    if (count == 0) continue;
+    std::int64_t const w = TraitsT::width(d);
+    auto const cornerOf = [w](Group const& group, std::size_t slot) {
+      int3 const at = TileType::childIJK(static_cast<int>(slot));
+      return int3{static_cast<int>(group.parent.x + w * at.x), static_cast<int>(group.parent.y + w * at.y),
+                  static_cast<int>(group.parent.z + w * at.z)};
+    };
+    // The parents, and what is missing below them. Then, where each chunk's first tile goes.
+    std::vector<std::int64_t> parents(groups.size());
+    std::vector<std::int64_t> starts(static_cast<std::size_t>(chunkCount(0, count, kGrain)));
+    parallelChunks(0, count, kGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+      Container const& tree = *this;
+      auto const accessor = tree.tileAccessor();
+      std::size_t missing = 0;
+      for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+        Group& group = groups[n];
+        int3 const& p = group.parent;
+        TreeIndex const above = accessor.treeIndex(p.x, p.y, p.z, d - 1, false);
+        bool const hasParent = above.depth == d - 1;
+        parents[n] = hasParent ? above.index : -1;
+        for (std::size_t slot = 0; slot < group.slots.size(); ++slot) {
+          if (!group.slots[slot]) continue;
+          bool there;
+          if (hasParent) {
+            there = !tree.tile(above).isLeaf(static_cast<int>(slot));
+          } else {
+            int3 const corner = cornerOf(group, slot);
+            there = accessor.treeIndex(corner.x, corner.y, corner.z, d, false).depth == d;
+          }
+          if (there) group.slots.reset(slot);
+        }
+        missing += group.slots.count();
+      }
+      starts[static_cast<std::size_t>(chunk)] = static_cast<std::int64_t>(missing);
+    });
+    Counts const before = m_data->m_tileCounts;
+    std::int64_t next = tileCount(d);
+    for (std::int64_t& start : starts) next += std::exchange(start, next);
+    if (next == tileCount(d)) continue;
+    allocateForMaking(d, next - tileCount(d));
+    auto& tiles = m_data->editTiles(d);
+    auto* const above = &m_data->editTiles(d - 1);
+    std::vector<std::vector<std::int64_t>> roots(starts.size());
+    parallelChunks(0, count, kGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+      std::int64_t index = starts[static_cast<std::size_t>(chunk)];
+      for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+        Group const& group = groups[n];
+        for (std::size_t slot = 0; slot < group.slots.size(); ++slot) {
+          if (!group.slots[slot]) continue;
+          int3 const corner = cornerOf(group, slot);
+          auto* const tile = &tiles[index];
+          if (d == kMaxDepth) new (static_cast<void*>(tile)) TileType;
+          tile->init(parents[n], corner.x, corner.y, corner.z, d, index);
+          // Each group has its parent to itself.
+          if (parents[n] >= 0)
+            (*above)[parents[n]].childIndex(static_cast<int>(slot)) = index;
+          else
+            roots[static_cast<std::size_t>(chunk)].push_back(index);
+          ++index;
+        }
+      }
+    });
+    bool anyRoot = false;
+    for (auto const& part : roots) {
+      for (std::int64_t const index : part) addRoot(tile(index, d)), anyRoot = true;
+    }
+    if (anyRoot) adoptDeeperRoots(d);
+    listNewTiles(before, newTiles);
+  }
+  setBranchSizes();
+}
+
+} // namespace VLN::TileTree3D
