@@ -84,11 +84,11 @@ std::string freeName(std::string const& wanted, std::set<std::string>& taken) {
   return name;
 }
 
-// The tree grows from the top down, so that no tile has to be made in passing.
 void addTiles(Container& container, TileCorners const& corners) {
-  auto accessor = container.tileAccessor();
-  for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth)
-    for (int3 const& corner : corners[static_cast<std::size_t>(depth)]) accessor.addTile(corner, depth);
+  Container::TileLists lists;
+  for (std::size_t depth = 0; depth < corners.size(); ++depth)
+    for (int3 const& corner : corners[depth]) lists[depth].append(corner);
+  container.tileAccessor().addTiles(lists);
 }
 
 std::size_t countOf(TileCorners const& corners) {
