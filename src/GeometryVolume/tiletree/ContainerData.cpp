@@ -78,6 +78,10 @@ void ContainerData<TraitsT>::memUse(std::uint64_t& used, std::uint64_t& allocate
   }
   used += m_gridTable.size() * sizeof(std::int64_t);
   allocated += m_gridTable.capacity() * sizeof(std::int64_t);
+  // Used counts the grid alone; what goes with it is an aid, but it takes memory.
+  if (m_places)
+    allocated += m_places->cells.capacity() * sizeof(std::int64_t) +
+                 m_places->places.capacity() * sizeof(std::int32_t);
   used += m_allThreadLocal.size() * sizeof(m_allThreadLocal[0]);
   allocated += m_allThreadLocal.capacity() * sizeof(m_allThreadLocal[0]);
   for (auto const& scratch : m_allThreadLocal) {
