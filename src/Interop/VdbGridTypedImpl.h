@@ -289,13 +289,16 @@ private:
   // Whether a quarter block of a leaf can go: see the rule in VdbImport.h. A coarser tile at the place holds
   // the block's own values; without one a reader finds the background.
   bool isSpare(Leaf const& leaf, Coord const& corner, bool underTile) const {
-    Value const first = underTile ? Value(leaf.getValue(corner)) : Value(m_grid->background());
-    for (int i = 0; i < 4; ++i)
-      for (int j = 0; j < 4; ++j)
-        for (int k = 0; k < 4; ++k) {
-          openvdb::Index const n = Leaf::coordToOffset(corner.offsetBy(i, j, k));
-          if (leaf.isValueOn(n) || !sameBits(Value(leaf.getValue(n)), first)) return false;
-        }
+    // The mask has a word for each i, a byte of it for each j, a bit of that for each k.
+    openvdb::Index const low = Leaf::coordToOffset(corner);
+    std::uint64_t const block = std::uint64_t(0x0f0f0f0f) << low % 64;
+    for (openvdb::Index i = 0; i < 4; ++i)
+      if (leaf.getValueMask().template getWord<std::uint64_t>(low / 64 + i) & block) return false;
+    Value const first = underTile ? Value(leaf.getValue(low)) : Value(m_grid->background());
+    for (openvdb::Index i = 0; i < 4; ++i)
+      for (openvdb::Index j = 0; j < 4; ++j)
+        for (openvdb::Index k = 0; k < 4; ++k)
+          if (!sameBits(Value(leaf.getValue(low + 64 * i + 8 * j + k)), first)) return false;
     return true;
   }
 
@@ -322,10 +325,16 @@ private:
         return;
       }
       openvdb::Index const first = Leaf::coordToOffset(origin);
-      for (openvdb::Index k = 0; k < 4; ++k)
-        for (openvdb::Index j = 0; j < 4; ++j)
-          for (openvdb::Index i = 0; i < 4; ++i)
-            *samples++ = toElement(Value(leaf->getValue(first + 64 * i + 8 * j + k)));
+      auto const copy = [&](auto const& valueAt) {
+        for (openvdb::Index k = 0; k < 4; ++k)
+          for (openvdb::Index j = 0; j < 4; ++j)
+            for (openvdb::Index i = 0; i < 4; ++i)
+              *samples++ = toElement(Value(valueAt(first + 64 * i + 8 * j + k)));
+      };
+      if constexpr (std::is_same_v<Value, bool>) // kept as bits
+        copy([&](openvdb::Index n) { return leaf->getValue(n); });
+      else
+        copy([values = leaf->buffer().data()](openvdb::Index n) { return values[n]; });
       return;
     }
     for (int k = 0; k < 4; ++k)

@@ -104,6 +104,7 @@ void addUnreadTiles(TileCorners& corners, Group const& group, int rootDepth) {
     added = false;
     Container tree("unread", 1.0f);
     addTiles(tree, corners);
+    tree.buildAccessorAccelerationStructure(VdbTraits::kMaxDepth);
     for (auto const& grid : group.grids) {
       TileCorners const missing = grid->unreadTiles(tree);
       for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth) {
