@@ -29,6 +29,7 @@ namespace VLN::Interop {
 namespace {
 
 constexpr std::uint64_t kMB = 1000000;
+constexpr std::uint64_t kStackRoom = 32 * kMB;
 
 // Regular file that starts as a .vdb file does. Returns its size.
 std::uint64_t checkHeader(std::string const& path) {
@@ -177,8 +178,11 @@ void onNoMemory() {
   prctl(PR_SET_PDEATHSIG, SIGKILL); // nobody waits for the verdict of an orphan
   // A sanitizer reserves address space by the terabyte; there the parent's watch over resident memory is the
   // only bound.
-  if (start.space < (std::uint64_t(1) << 40))
-    setLimit(RLIMIT_AS, start.space + limits.memoryBytes, start.space + limits.memoryBytes);
+  if (start.space < (std::uint64_t(1) << 40)) {
+    // Without room for a stack even the verdict that there is no memory would fail.
+    std::uint64_t const space = start.space + std::max(limits.memoryBytes, kStackRoom);
+    setLimit(RLIMIT_AS, space, space);
+  }
   setLimit(RLIMIT_CPU, limits.seconds, limits.seconds + 1);
   setLimit(RLIMIT_CORE, 0, 0);
   for (int n : {SIGSEGV, SIGBUS, SIGFPE, SIGILL, SIGABRT, SIGXCPU, SIGTERM, SIGINT}) signal(n, SIG_DFL);

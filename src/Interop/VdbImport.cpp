@@ -25,7 +25,7 @@ using Topology = VdbTopology;
 
 // Grids that share a transform, and so an object.
 struct Group {
-  openvdb::math::Transform::ConstPtr transform;
+  std::string transform; ///< as transformBytes() writes it
   std::vector<std::unique_ptr<GridSource>> grids;
   std::vector<GridSummary> summaries;
 };
@@ -65,10 +65,12 @@ std::vector<Group> groupByTransform(VdbFile const& file, std::vector<SkippedGrid
       skipped.push_back({base->getName(), reason});
       continue;
     }
-    auto group = std::find_if(groups.begin(), groups.end(),
-                              [&](Group const& g) { return *g.transform == base->transform(); });
+    // OpenVDB's comparison lets transforms pass that differ a little; what comes back is to be the same.
+    std::string const bytes = transformBytes(base->transform());
+    auto group =
+        std::find_if(groups.begin(), groups.end(), [&](Group const& g) { return g.transform == bytes; });
     if (group == groups.end()) {
-      groups.push_back({base->constTransformPtr(), {}, {}});
+      groups.push_back({bytes, {}, {}});
       group = groups.end() - 1;
     }
     group->grids.push_back(std::move(source));
@@ -155,7 +157,7 @@ VdbVolume buildVolume(VdbFile const& file, Group const& group, std::uint64_t& me
   checkMemory(file, bytes, memoryLeft);
   memoryLeft -= bytes;
   VdbVolume volume;
-  volume.indexToWorld = IndexToWorld(transformBytes(*group.transform));
+  volume.indexToWorld = IndexToWorld(group.transform);
   volume.transform = volume.indexToWorld.besidesScale();
   double const size = volume.indexToWorld.voxelSize().x;
   auto const sizeInFloat = static_cast<float>(size);

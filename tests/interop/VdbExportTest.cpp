@@ -155,10 +155,16 @@ TEST(VdbExport, RequirementTransformsClassesMetadataAndHalf) {
   c->setTransform(openvdb::math::Transform::createFrustumTransform(openvdb::BBoxd({0, 0, 0}, {100, 100, 100}),
                                                                    0.5, 10.0, 1.0));
   c->setVectorType(openvdb::VEC_CONTRAVARIANT_RELATIVE);
+  // Scales that OpenVDB's comparison takes for the same.
+  auto d = randomGrid<openvdb::FloatGrid>(24), e = randomGrid<openvdb::FloatGrid>(25);
+  d->setName("fine"), e->setName("finer");
+  d->setTransform(openvdb::math::Transform::createLinearTransform(0.1));
+  e->setTransform(openvdb::math::Transform::createLinearTransform(0.10000005));
+  ASSERT_TRUE(d->transform() == e->transform());
   auto metadata = std::make_shared<openvdb::MetaMap>();
   metadata->insertMeta("author", openvdb::StringMetadata("somebody"));
   metadata->insertMeta("frame", openvdb::Int32Metadata(12));
-  expectSame({a, b, c}, metadata, "transforms");
+  expectSame({a, b, c, d, e}, metadata, "transforms");
 }
 
 TEST(VdbExport, NegativeFailedWriteLeavesWhatWasThere) {

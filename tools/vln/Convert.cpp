@@ -37,6 +37,9 @@ void convert(ConvertOptions const& options) {
   for (auto const& s : content.skipped)
     std::cerr << fmt::format("vln: {}: note: '{}' is left out: {}\n", options.file, oneLine(s.grid, 60),
                              oneLine(s.reason));
+  for (auto const& points : content.points)
+    std::cerr << fmt::format("vln: {}: note: '{}' is left out: it holds points, which vln points writes\n",
+                             options.file, oneLine(points.name, 60));
 }
 
 } // namespace Vln
