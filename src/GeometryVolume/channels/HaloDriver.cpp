@@ -149,15 +149,15 @@ template <class TraitsT> void HaloDriver<TraitsT>::fill(HaloTarget<TraitsT> cons
   m_source.elements(tile.depth(), indices.data(), m_table.regionCount, found.data());
   std::uint32_t missing = 0;
   for (std::size_t n = 0; n < count; ++n) {
-    HaloRegion const& region = m_table.regions[n];
-    void const* const source = found[n];
-    missing |= std::uint32_t(!source) << n;
-    move.sources[region.direction] = source ? source : own;
-    if (!whole && source) copy(region, target.elements, source);
+    missing |= std::uint32_t(!found[n]) << n;
+    move.sources[m_table.regions[n].direction] = found[n] ? found[n] : own;
   }
   if (whole) {
     auto const& kernels = *m_source.ops->kernels;
     (TraitsT::kTDW == 4 ? kernels.tile4 : kernels.tile5)[m_table.kind](move);
+  } else {
+    for (std::size_t n = 0; n < count; ++n)
+      if (found[n]) copy(m_table.regions[n], target.elements, found[n]);
   }
   if (!missing) return;
 
