@@ -33,6 +33,10 @@ struct ElementOps {
   HaloKernels const* kernels;
   /// Elements of a tile; null for one that the arrays lack, or that holds fewer than `count`.
   void const* (*elements)(void const* tileArrays, TreeIndex const& at, int count);
+  /// The same for several tiles of a depth; an index of -1 stands for no tile.
+  /// @cost Without branches that depend on which there are.
+  void (*elementsOf)(void const* tileArrays, int depth, std::int64_t const* indices, int n, int count,
+                     void const** found);
   void (*blendParent)(ParentBlend const&);
   void (*blendCorners)(CornerBlend const&, void* out);
   /// Every component of an element times a factor, in place.
@@ -54,6 +58,12 @@ struct ErasedTiles {
   /// Null outside the range of depths and for tiles without data.
   void const* elements(TreeIndex const& at) const {
     return inRange(at.depth) ? ops->elements(arrays, at, tileSize) : nullptr;
+  }
+  void elements(int depth, std::int64_t const* indices, int n, void const** found) const {
+    if (inRange(depth))
+      ops->elementsOf(arrays, depth, indices, n, tileSize, found);
+    else
+      for (int i = 0; i < n; ++i) found[i] = nullptr;
   }
 };
 

@@ -7,6 +7,7 @@
 #include "GeometryVolume/core/FourLanes.h"
 
 #include <algorithm>
+#include <cstring>
 
 namespace VLN::TileTree3D::Internal {
 
@@ -38,6 +39,58 @@ inline T blendEight(Corner const& corner, typename ElementTraits<T>::Blend fi,
   return result;
 }
 
+/// Columns of a box, V a number or lanes of them: `row` blends a parent's row along i, once for each row.
+/// Each blend is that of blendEight.
+template <class V, class Row, class Store>
+inline void blendColumns(ParentBlend const& b, Row const& row, Store const& store) {
+  constexpr std::size_t n = HaloTable::kLargestTileWidth;
+  auto const lerp = [](V x, V y, float t) { return (y - x) * t + x; };
+  int const firstJ = b.j[0].at, rows = b.j[b.count[1] - 1].at + 2 - firstJ;
+  int const firstK = b.k[0].at, planes = b.k[b.count[2] - 1].at + 2 - firstK;
+  auto const* low = static_cast<float const*>(b.parent) + (firstJ + firstK * b.width) * b.width;
+  V blended[n + 1][n];
+  for (int k = 0; k < planes; ++k, low += b.width * b.width) {
+    V line[n + 1];
+    for (int j = 0; j < rows; ++j) line[j] = row(low + j * b.width);
+    for (int j = 0; j < b.count[1]; ++j) {
+      V const* const at = line + (b.j[j].at - firstJ);
+      blended[k][j] = lerp(at[0], at[1], b.j[j].fraction);
+    }
+  }
+  for (int k = 0; k < b.count[2]; ++k) {
+    auto const* const at = blended + (b.k[k].at - firstK);
+    auto* target = static_cast<float*>(b.target) + k * b.width * b.width;
+    for (int j = 0; j < b.count[1]; ++j, target += b.width)
+      store(target, lerp(at[0][j], at[1][j], b.k[k].fraction));
+  }
+}
+
+inline void blendFloats(ParentBlend b) {
+  auto* const target = static_cast<float*>(b.target);
+  for (int i = 0; i < b.count[0];) {
+    HaloAxis const* const axis = b.i + i;
+    b.target = target + i;
+    if (b.count[0] - i < 4) {
+      blendColumns<float>(
+          b, [x = *axis](float const* row) { return (row[x.at + 1] - row[x.at]) * x.fraction + row[x.at]; },
+          [](float* to, float v) { *to = v; });
+      ++i;
+    } else {
+      int const at[4] = {axis[0].at, axis[1].at, axis[2].at, axis[3].at};
+      FloatLanes const t{axis[0].fraction, axis[1].fraction, axis[2].fraction, axis[3].fraction};
+      blendColumns<FloatLanes>(
+          b,
+          [&at, t](float const* row) {
+            FloatLanes const low{row[at[0]], row[at[1]], row[at[2]], row[at[3]]};
+            FloatLanes const high{row[at[0] + 1], row[at[1] + 1], row[at[2] + 1], row[at[3] + 1]};
+            return lerpLanes(low, high, t);
+          },
+          [](float* to, FloatLanes const& v) { std::memcpy(to, &v, sizeof(v)); });
+      i += 4;
+    }
+  }
+}
+
 template <class T> struct TypedElementOps {
   using Traits = ElementTraits<T>;
   using Blend = typename Traits::Blend;
@@ -49,7 +102,24 @@ template <class T> struct TypedElementOps {
     return tile.size() >= static_cast<std::size_t>(count) ? tile.data() : nullptr;
   }
 
+  static void elementsOf(void const* tileArrays, int depth, std::int64_t const* indices, int n, int count,
+                         void const** found) {
+    auto const& tiles = (*static_cast<TileArrays<T> const*>(tileArrays))[static_cast<std::size_t>(depth)];
+    std::size_t const size = tiles.size();
+    for (int i = 0; i < n; ++i) {
+      // The first tile in place of one that is not there.
+      auto const index = static_cast<std::size_t>(indices[i]);
+      std::size_t const exists = index < size;
+      found[i] = nullptr;
+      if (size == 0) continue;
+      auto const& tile = tiles[index & (0 - exists)];
+      std::size_t const holds = exists & std::size_t(tile.size() >= static_cast<std::size_t>(count));
+      found[i] = reinterpret_cast<void const*>(reinterpret_cast<std::uintptr_t>(tile.data()) & (0 - holds));
+    }
+  }
+
   static void blendParent(ParentBlend const& b) {
+    if constexpr (std::is_same_v<T, float>) return blendFloats(b);
     auto* const target = static_cast<T*>(b.target);
     auto const* const parent = static_cast<T const*>(b.parent);
     int const w = b.width;
@@ -58,16 +128,6 @@ template <class T> struct TypedElementOps {
       for (int j = 0; j < b.count[1]; ++j)
         for (int i = 0; i < b.count[0]; ++i) {
           T const* const low = parent + b.i[i].at + (b.j[j].at + b.k[k].at * w) * w;
-          if constexpr (std::is_same_v<T, float>) {
-            // The four blends along i at once; each in the same order as any other type's.
-            auto const v = lerpLanes(FloatLanes{low[0], low[w], low[w * w], low[w * w + w]},
-                                     FloatLanes{low[1], low[w + 1], low[w * w + 1], low[w * w + w + 1]},
-                                     lanesOf(b.i[i].fraction));
-            auto const lerp = [](float x, float y, float t) { return (y - x) * t + x; };
-            float const fj = b.j[j].fraction;
-            target[i + (j + k * w) * w] = lerp(lerp(v[0], v[1], fj), lerp(v[2], v[3], fj), b.k[k].fraction);
-            continue;
-          }
           target[i + (j + k * w) * w] =
               blendEight<T>([&](int n) -> T const& { return low[offsets[n]]; }, Blend(b.i[i].fraction),
                             Blend(b.j[j].fraction), Blend(b.k[k].fraction));
@@ -97,7 +157,8 @@ template <class T> struct TypedElementOps {
 
   static ElementOps const& get() {
     static ElementOps const ops{
-        sizeof(T), &haloKernels(sizeof(T)), elements, blendParent, blendCorners, scale, broadcast, distance};
+        sizeof(T), &haloKernels(sizeof(T)), elements, elementsOf, blendParent, blendCorners, scale, broadcast,
+        distance};
     return ops;
   }
 };

@@ -1,11 +1,13 @@
 #include "GeometryVolume/channels/HaloDriver.h"
 
 #include <algorithm>
+#include <bit>
 
 namespace VLN::TileTree3D::Internal {
 
 template <class TraitsT>
-TreeIndex HaloDriver<TraitsT>::searchBeside(TileType const& tile, int3 const& step) const {
+TreeIndex HaloDriver<TraitsT>::searchBeside(TileType const& tile, NeighborDirection direction) const {
+  int3 const step = neighborOffset(direction);
   std::int64_t const w = TraitsT::width(tile.depth());
   std::int64_t const i = tile.ti() + step.x * w, j = tile.tj() + step.y * w, k = tile.tk() + step.z * w;
   auto const outside = [](std::int64_t c) {
@@ -16,44 +18,35 @@ TreeIndex HaloDriver<TraitsT>::searchBeside(TileType const& tile, int3 const& st
                               false);
 }
 
-template <class TraitsT> void HaloDriver<TraitsT>::moveTo(TileType const& tile) {
-  // Without a parent every tile has a table of its own.
-  TreeIndex const parent = tile.isRoot() ? TreeIndex{} : tile.parentTreeIndex();
-  if (!parent.valid() || m_parent != parent) m_parent = parent, m_known = {}, m_aroundKnown = 0;
+// One number: three that return as one record are stored and loaded in different pieces, which waits for all
+// earlier stores.
+template <class TraitsT> int HaloDriver<TraitsT>::placeInParent(TileType const& tile) {
   int const d = tile.depth();
-  for (int a = 0; a < 3 && d > 0; ++a) {
-    std::uint32_t const u = TraitsT::offset(tile.tijk()[a]);
-    m_slot[a] = static_cast<int>(TraitsT::quotient(u, d) - TraitsT::kTW * TraitsT::quotient(u, d - 1));
-  }
-  m_place = (m_slot.x + 1) + kAcross * ((m_slot.y + 1) + kAcross * (m_slot.z + 1));
+  if (d == 0) return place({0, 0, 0});
+  auto const slot = [d](int c) {
+    std::uint32_t const u = TraitsT::offset(c);
+    return static_cast<int>(TraitsT::quotient(u, d) - TraitsT::kTW * TraitsT::quotient(u, d - 1));
+  };
+  return place({slot(tile.ti()), slot(tile.tj()), slot(tile.tk())});
 }
 
-// The neighbour is a child of the parent, or of a neighbour of the parent.
-template <class TraitsT> TreeIndex HaloDriver<TraitsT>::findBeside(TileType const& tile, int3 const& step) {
-  if (!m_parent.valid()) return searchBeside(tile, step);
-  auto const& tree = *m_accessor.container();
-  int3 slot{}, side{};
-  for (int a = 0; a < 3; ++a) {
-    slot[a] = m_slot[a] + step[a];
-    side[a] = slot[a] < 0 ? -1 : slot[a] >= TraitsT::kTW ? 1 : 0;
-    slot[a] -= side[a] * TraitsT::kTW;
+template <class TraitsT> void HaloDriver<TraitsT>::moveTo(TileType const& tile) {
+  m_level = tile.isRoot() ? nullptr : &levelOf(tile.parentTreeIndex());
+  m_place = placeInParent(tile);
+}
+
+template <class TraitsT> void HaloDriver<TraitsT>::learn(Level& level, NeighborDirection step) {
+  auto const& tile = m_accessor.tile(level.tile);
+  TreeIndex found = level.tile;
+  if (step != kNeighborSelf) {
+    int const n = placeInParent(tile) + place(neighborOffset(step)) - place({0, 0, 0});
+    found =
+        tile.isRoot() ? searchBeside(tile, step) : childAt(levelOf(tile.parentTreeIndex()), n, tile, step);
   }
-  NeighborDirection const direction = neighborDirection(side.x, side.y, side.z);
-  TreeIndex holder = m_parent;
-  if (direction != kNeighborSelf) {
-    auto& known = m_around[static_cast<std::size_t>(direction)];
-    if (!(m_aroundKnown >> direction & 1)) {
-      TreeIndex const at = searchBeside(tree.tile(m_parent), side);
-      known = {at.index, nullptr, at.depth};
-      m_aroundKnown |= 1u << direction;
-    }
-    holder = known.at();
-  }
-  // A root of the tile's own depth may lie where there is no tile above it.
-  if (!holder.valid()) return tree.rootCount(tile.depth()) > 0 ? searchBeside(tile, step) : TreeIndex{};
-  if (holder.depth != m_parent.depth) return holder;
-  TreeIndex const child = tree.tile(holder).childTreeIndex(slot);
-  return child.index >= 0 ? child : holder;
+  auto const* children = found.depth == tile.depth() ? m_accessor.tile(found).children() : nullptr;
+  level.around[static_cast<std::size_t>(step)] = {
+      found.index, children ? children : kNoChildren<TraitsT::kTileSize>.data(), found.depth};
+  level.known |= 1u << step;
 }
 
 template <class TraitsT>
@@ -91,8 +84,10 @@ template <class TraitsT> void HaloDriver<TraitsT>::replicate(HaloBox const& box,
 template <class TraitsT>
 void HaloDriver<TraitsT>::blend(HaloBox const& box, HaloTarget<TraitsT> const& target,
                                 void const* parent) const {
+  int const slot[3] = {m_place % kAcross - 1, m_place / kAcross % kAcross - 1,
+                       m_place / (kAcross * kAcross) - 1};
   auto const axis = [&](std::size_t a) {
-    auto const child = static_cast<std::size_t>(m_slot[static_cast<int>(a)]);
+    auto const child = static_cast<std::size_t>(slot[a]);
     return &m_table.parentAxis[child][static_cast<std::size_t>(box.low[a] + m_table.halo)];
   };
   m_source.ops->blendParent({at(target.elements, box.target), at(parent, m_table.targetOrigin),
@@ -131,22 +126,44 @@ void HaloDriver<TraitsT>::sample(HaloBox const& box, TileType const& tile, void*
 
 template <class TraitsT> void HaloDriver<TraitsT>::fill(HaloTarget<TraitsT> const& target, HaloMode mode) {
   TileType const& tile = target.tile;
-  if (void const* const own = m_source.elements(tile.treeIndex()))
-    copy(m_table.core, target.elements, own);
-  else
-    set(m_table.core, target.elements, m_source.defaultValue);
+  void const* const own = m_source.elements(tile.treeIndex());
+  bool const whole = own && m_table.kind != kHaloTileOther;
+  if (!whole) {
+    if (own)
+      copy(m_table.core, target.elements, own);
+    else
+      set(m_table.core, target.elements, m_source.defaultValue);
+  }
   if (m_table.regionCount == 0) return;
 
+  // All that is there in one go. What is missing takes any bytes of the tile first.
   moveTo(tile);
-  bool parentKnown = false;
-  void const* parent = nullptr;
-  for (int n = 0; n < m_table.regionCount; ++n) {
-    HaloRegion const& region = m_table.regions[static_cast<std::size_t>(n)];
-    if (void const* const source = beside(tile, region).elements) {
-      copy(region, target.elements, source);
-      continue;
-    }
-    if (!parentKnown) parent = target.parentData(), parentKnown = true;
+  TileMove move;
+  move.target = target.elements;
+  move.sourceWidth = m_table.sourceWidth, move.offsets = m_table.offsets.data();
+  move.sources[kNeighborSelf] = own;
+  auto const count = static_cast<std::size_t>(m_table.regionCount);
+  std::array<std::int64_t, 26> indices;
+  std::array<void const*, 26> found;
+  for (std::size_t n = 0; n < count; ++n) indices[n] = indexBeside(tile, m_table.regions[n]);
+  m_source.elements(tile.depth(), indices.data(), m_table.regionCount, found.data());
+  std::uint32_t missing = 0;
+  for (std::size_t n = 0; n < count; ++n) {
+    missing |= std::uint32_t(!found[n]) << n;
+    move.sources[m_table.regions[n].direction] = found[n] ? found[n] : own;
+  }
+  if (whole) {
+    auto const& kernels = *m_source.ops->kernels;
+    (TraitsT::kTDW == 4 ? kernels.tile4 : kernels.tile5)[m_table.kind](move);
+  } else {
+    for (std::size_t n = 0; n < count; ++n)
+      if (found[n]) copy(m_table.regions[n], target.elements, found[n]);
+  }
+  if (!missing) return;
+
+  void const* const parent = target.parentData();
+  for (; missing; missing &= missing - 1) {
+    HaloRegion const& region = m_table.regions[static_cast<std::size_t>(std::countr_zero(missing))];
     if (parent)
       blend(region, target, parent);
     else if (mode == kHaloModeReplicate)
@@ -159,10 +176,8 @@ template <class TraitsT> void HaloDriver<TraitsT>::fill(HaloTarget<TraitsT> cons
 template <class TraitsT>
 void HaloDriver<TraitsT>::fillRegion(HaloRegion const& region, TileType const& tile, void* target,
                                      HaloFill const& fill, HaloSampler<TraitsT>& sampler) {
-  Beside const& known = beside(tile, region);
-  TreeIndex const there = known.at();
-  void const* const source = known.elements;
-  if (source) return copy(region, target, source);
+  TreeIndex const there = beside(tile, region);
+  if (void const* const source = elementsBeside(tile, there)) return copy(region, target, source);
   if (!there.valid() || there.depth < m_source.minDepth || fill.mode == kHaloModeDefault)
     return set(region, target, m_source.defaultValue);
   switch (fill.mode) {

@@ -49,34 +49,72 @@ public:
   void fill(TileType const& tile, void* target, HaloFill const& fill, HaloSampler<TraitsT>& sampler);
 
 private:
-  /// A tile beside another, at its depth or the deepest one above; the source's elements of one at its depth.
-  /// Without initial values, so that a driver for one tile need not write a table of them.
-  struct Beside {
+  /// A tile or none, as TreeIndex, and its child table; one without children where it has none. Without
+  /// initial values, so that a driver for one tile need not write a table of them.
+  struct Holder {
     std::int64_t index;
-    void const* elements;
+    std::int64_t const* children;
     std::int32_t depth;
 
     TreeIndex at() const { return {index, depth}; }
   };
-  /// @pre moveTo(tile).
-  /// @cost Tiles of one parent after the other share the searches round the parent.
-  Beside const& beside(TileType const& tile, HaloRegion const& region) {
-    int const n = m_place + region.place;
-    auto const word = static_cast<std::size_t>(n) / 64;
-    std::uint64_t const bit = std::uint64_t(1) << n % 64;
-    Beside& entry = m_beside[static_cast<std::size_t>(n)];
-    if (!(m_known[word] & bit)) {
-      m_known[word] |= bit;
-      TreeIndex const at = findBeside(tile, neighborOffset(region.direction));
-      entry = {at.index, at.depth == tile.depth() ? m_source.elements(at) : nullptr, at.depth};
-    }
-    return entry;
-  }
   /// Makes `tile` the one whose neighbours are asked for.
   void moveTo(TileType const& tile);
-  TreeIndex findBeside(TileType const& tile, int3 const& step);
+  /// The tile beside, at its depth or the deepest one above.
+  /// @pre moveTo(tile).
+  TreeIndex beside(TileType const& tile, HaloRegion const& region) {
+    return m_level ? childAt(*m_level, m_place + region.place, tile, region.direction)
+                   : searchBeside(tile, region.direction);
+  }
+  /// The source's elements of a tile at the depth of `tile`.
+  void const* elementsBeside(TileType const& tile, TreeIndex const& at) const {
+    return m_source.elements({at.depth == tile.depth() ? at.index : -1, tile.depth()});
+  }
+  /// What lies round one tile, as far as it was asked for.
+  struct Level {
+    TreeIndex tile;
+    std::uint32_t known = 0;
+    std::array<Holder, kNeighborCount> around;
+  };
+  Level& levelOf(TreeIndex const& at) {
+    Level& level = m_levels[static_cast<std::size_t>(at.depth)];
+    if (level.tile != at) level.tile = at, level.known = 0;
+    return level;
+  }
+  /// Finds the tile beside that of the level through its parent, and so through all its ancestors if need be.
+  void learn(Level& level, NeighborDirection step);
+  /// The tile that holds a place of the block of a tile's children and those round them, and the place's
+  /// slot.
+  Holder const& holderOf(Level& level, PlaceHolder const& in) {
+    if (!(level.known >> in.direction & 1)) learn(level, in.direction);
+    return level.around[static_cast<std::size_t>(in.direction)];
+  }
+  static PlaceHolder const& placeHolder(int place) {
+    return kPlaceHolders<TraitsT::kTW>[static_cast<std::size_t>(place)];
+  }
+  /// What lies at a place of that block, one step from the child `tile`.
+  TreeIndex childAt(Level& level, int place, TileType const& tile, NeighborDirection step) {
+    PlaceHolder const& in = placeHolder(place);
+    Holder const& holder = holderOf(level, in);
+    if (holder.depth < 0) return beyond(tile, step);
+    std::int64_t const child = holder.children[in.slot];
+    return child >= 0 ? TreeIndex{child, tile.depth()} : holder.at();
+  }
+  /// What lies beside a tile where no tile lies beside its parent: maybe a root of the tile's own depth.
+  TreeIndex beyond(TileType const& tile, NeighborDirection step) const {
+    return m_accessor.container()->rootCount(tile.depth()) > 0 ? searchBeside(tile, step) : TreeIndex{};
+  }
+  /// Index of the tile of the same depth beside, -1 without one.
+  /// @pre moveTo(tile).
+  std::int64_t indexBeside(TileType const& tile, HaloRegion const& region) {
+    PlaceHolder const& in = placeHolder(m_place + region.place);
+    Holder const* const holder = m_level ? &holderOf(*m_level, in) : nullptr;
+    if (holder && holder->depth >= 0) return holder->children[in.slot];
+    TreeIndex const at = holder ? beyond(tile, region.direction) : searchBeside(tile, region.direction);
+    return at.depth == tile.depth() ? at.index : -1;
+  }
   /// The same by a search from the accessor's last tile.
-  TreeIndex searchBeside(TileType const& tile, int3 const& step) const;
+  TreeIndex searchBeside(TileType const& tile, NeighborDirection step) const;
   /// The tile itself, or its deepest ancestor whose data the source holds.
   TileType const* withData(TileType const* tile, void const*& elements) const;
 
@@ -101,17 +139,16 @@ private:
   HaloTable const& m_table;
   Accessor const& m_accessor;
 
-  // Children of the last tile's parent with one layer round them, as far as they were asked for; and the
-  // tiles round the parent.
   static constexpr int kAcross = TraitsT::kTW + 2;
-  static constexpr std::size_t kPlaces = std::size_t(kAcross) * kAcross * kAcross;
-  TreeIndex m_parent;
-  int3 m_slot{0, 0, 0};                      ///< of the tile in its parent
-  int m_place = 1 + kAcross * (1 + kAcross); ///< of the tile among them
-  std::array<Beside, kPlaces> m_beside;
-  std::array<std::uint64_t, (kPlaces + 63) / 64> m_known{};
-  std::array<Beside, kNeighborCount> m_around;
-  std::uint32_t m_aroundKnown = 0;
+  static int place(int3 const& slot) {
+    return (slot.x + 1) + kAcross * ((slot.y + 1) + kAcross * (slot.z + 1));
+  }
+  static int placeInParent(TileType const& tile);
+
+  Level* m_level = nullptr;       ///< of the tile's parent; null for a root
+  int m_place = place({0, 0, 0}); ///< of the tile among the parent's children and those round them
+  // One for each depth. The coarser, the more seldom it changes.
+  std::array<Level, static_cast<std::size_t>(TraitsT::kDepths)> m_levels;
 };
 
 /// A pass over the tiles of a range of depths, coarse to fine.

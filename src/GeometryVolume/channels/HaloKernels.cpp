@@ -73,7 +73,47 @@ template <std::size_t Size> void gatherBox(BoxGather const& m) {
     }
 }
 
-template <std::size_t Size> constexpr HaloKernels kKernels{copyBox<Size>, fillBox<Size>, gatherBox<Size>};
+// The rows of one plane and one step along j. Every count is a constant, and all that changes is a local.
+template <std::size_t Size, int W, int Low, int High, int Rows>
+std::byte* copyRows(TileMove const& m, int jk, std::ptrdiff_t plane, std::byte* to) {
+  auto const first = [&](int direction) {
+    auto const d = static_cast<std::size_t>(direction);
+    return static_cast<std::byte const*>(m.sources[d]) + m.offsets[d] * std::ptrdiff_t(Size) + plane;
+  };
+  std::byte const* low = Low ? first(jk) : nullptr;
+  std::byte const* core = first(9 + jk);
+  std::byte const* high = first(18 + jk);
+  std::ptrdiff_t const stride = m.sourceWidth * std::ptrdiff_t(Size);
+  for (int j = 0; j < Rows; ++j, core += stride, high += stride, to += (Low + W + High) * Size) {
+    if constexpr (Low > 0) {
+      std::memcpy(to, low, Low * Size);
+      low += stride;
+    }
+    std::memcpy(to + Low * Size, core, W * Size);
+    std::memcpy(to + (Low + W) * Size, high, High * Size);
+  }
+  return to;
+}
+
+// The target is written from its first byte to its last.
+template <std::size_t Size, int W, int Low, int High> void copyTile(TileMove const& m) {
+  auto* to = static_cast<std::byte*>(m.target);
+  std::ptrdiff_t const plane = m.sourceWidth * m.sourceWidth * std::ptrdiff_t(Size);
+  constexpr int kCounts[3] = {Low, W, High};
+  for (int step = Low ? 0 : 1; step < 3; ++step)
+    for (int k = 0; k < kCounts[step]; ++k) {
+      if constexpr (Low > 0) to = copyRows<Size, W, Low, High, Low>(m, step, k * plane, to);
+      to = copyRows<Size, W, Low, High, W>(m, 3 + step, k * plane, to);
+      to = copyRows<Size, W, Low, High, High>(m, 6 + step, k * plane, to);
+    }
+}
+
+template <std::size_t Size>
+constexpr HaloKernels kKernels{copyBox<Size>,
+                               fillBox<Size>,
+                               gatherBox<Size>,
+                               {copyTile<Size, 4, 0, 1>, copyTile<Size, 4, 1, 1>},
+                               {copyTile<Size, 5, 0, 1>, copyTile<Size, 5, 1, 1>}};
 
 } // namespace
 

@@ -27,10 +27,24 @@ struct BoxGather {
   std::array<int, 3> count;
 };
 
+/// A whole target tile from the 27 source tiles round it and its own. Directions that the layout lacks are
+/// not read.
+struct TileMove {
+  void* target;
+  int sourceWidth;
+  int const* offsets;                  ///< by direction: flat index of the first element that is read there
+  std::array<void const*, 27> sources; ///< by direction: elements of the tile
+};
+
+/// Layouts of a target that TileMove has kernels for.
+enum HaloTileKind { kHaloTileExtended, kHaloTileHalo1, kHaloTileKinds, kHaloTileOther = kHaloTileKinds };
+
 struct HaloKernels {
   void (*copy)(BoxMove const&);
   void (*fill)(BoxMove const&); ///< every element takes the one at `source`
   void (*gather)(BoxGather const&);
+  void (*tile4[kHaloTileKinds])(TileMove const&); ///< for W = 4
+  void (*tile5[kHaloTileKinds])(TileMove const&); ///< for W = 5
 };
 
 /// @pre One of the sizes of the element types.

@@ -9,6 +9,7 @@
 #pragma once
 
 #include "GeometryVolume/channels/ChannelTypes.h"
+#include "GeometryVolume/channels/HaloKernels.h"
 #include "GeometryVolume/tiletree/TreeIndex.h"
 
 #include <array>
@@ -43,12 +44,15 @@ struct HaloTable {
 
   int tileDataWidth = 0; ///< W
   int halo = 0;          ///< of the target
+  HaloTileKind kind = kHaloTileOther;
   int targetWidth = 0, sourceWidth = 0;
   int targetSize = 0, sourceSize = 0;
   int targetOrigin = 0, sourceOrigin = 0; ///< flat index of coordinate (0,0,0)
   HaloBox core;
   std::array<HaloRegion, 26> regions{}; ///< those without a negative step first, beginning with +i, +j, +k
   int regionCount = 0;
+  std::array<int, kNeighborCount>
+      offsets{}; ///< by direction: where the core's and the regions' source begins
   /// For a tile that is child c of its parent along an axis: where each coordinate lies in the parent, whose
   /// tile has the target's layout. [c][coordinate + halo]
   std::array<std::array<HaloAxis, kLargestWidth>, kLargestTileWidth> parentAxis{};
@@ -77,10 +81,12 @@ constexpr HaloTable makeHaloTable(ChannelLayout const& source, ChannelLayout con
   };
   t.tileDataWidth = w;
   t.halo = target.halo;
+  if (target.extended + target.halo == 1) t.kind = target.extended ? kHaloTileExtended : kHaloTileHalo1;
   t.targetWidth = widthOf(target), t.sourceWidth = widthOf(source);
   t.targetSize = target.size, t.sourceSize = source.size;
   t.targetOrigin = originOf(target), t.sourceOrigin = originOf(source);
   t.core = {{0, 0, 0}, {w, w, w}, t.targetOrigin, t.sourceOrigin};
+  t.offsets[kNeighborSelf] = t.sourceOrigin;
 
   auto const add = [&](int3 const& step) {
     HaloRegion r;
@@ -99,6 +105,7 @@ constexpr HaloTable makeHaloTable(ChannelLayout const& source, ChannelLayout con
       r.source += (r.low[a] - steps[a] * w) * sourceStride;
       targetStride *= t.targetWidth, sourceStride *= t.sourceWidth;
     }
+    t.offsets[static_cast<std::size_t>(r.direction)] = r.source;
     t.regions[static_cast<std::size_t>(t.regionCount++)] = r;
   };
   for (int3 const step : {int3{1, 0, 0}, int3{0, 1, 0}, int3{0, 0, 1}, int3{1, 1, 0}, int3{1, 0, 1},
@@ -128,5 +135,34 @@ template <class TraitsT, int SourceExtended, int SourceHalo, int TargetExtended,
 inline constexpr HaloTable kHaloTable = makeHaloTable(haloLayout(TraitsT::kTDW, SourceExtended, SourceHalo),
                                                       haloLayout(TraitsT::kTDW, TargetExtended, TargetHalo),
                                                       TraitsT::kTW);
+
+// Where a place of the block lies: the parent, or the tile beside it in a direction, and the child's slot
+// there.
+struct PlaceHolder {
+  NeighborDirection direction = kNeighborSelf;
+  std::uint8_t slot = 0;
+};
+template <int Width> constexpr auto makePlaceHolders() {
+  constexpr int across = Width + 2;
+  std::array<PlaceHolder, std::size_t(across) * across * across> table{};
+  auto const side = [](int s) { return s < 0 ? -1 : s >= Width ? 1 : 0; };
+  std::size_t n = 0;
+  for (int k = -1; k <= Width; ++k)
+    for (int j = -1; j <= Width; ++j)
+      for (int i = -1; i <= Width; ++i) {
+        int const slot =
+            (i - side(i) * Width) + Width * ((j - side(j) * Width) + Width * (k - side(k) * Width));
+        table[n++] = {neighborDirection(side(i), side(j), side(k)), static_cast<std::uint8_t>(slot)};
+      }
+  return table;
+}
+template <int Width> inline constexpr auto kPlaceHolders = makePlaceHolders<Width>();
+
+template <int N>
+constexpr auto kNoChildren = [] {
+  std::array<std::int64_t, N> table{};
+  for (auto& child : table) child = -1;
+  return table;
+}();
 
 } // namespace VLN::TileTree3D::Internal
