@@ -1,11 +1,16 @@
-// Trees and values beside OpenVDB and NanoVDB in the same run: building the topology of a grid, reading its
-// values, summing them, and importing it.
+// Trees and values beside OpenVDB and NanoVDB in the same run, for each grid:
+//
+//   topology  makes the tiles of all leaves, in the file's order or shuffled; an item is a leaf of 8 x 8 x 8
+//             voxels. touchLeaf makes room for values as well, and so does "bulk with values"
+//   read      a million active voxels, leaf by leaf or at random; an item is a voxel
+//   sum       all active voxels; an item is an active voxel
+//   import    an item is an active voxel. A deep copy is less work: an import arranges the values anew, fills
+//             the coarser tiles, and finds out which state is implied by the values
+//   memory    bytes that the whole grid or volume holds for each active voxel
 #include "BenchGrids.h"
 #include "GeometryVolume/channels/ChannelReader.h"
 #include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/topology/VoxelTopology.h"
-
-#include <openvdb/tools/Count.h>
 
 #include <benchmark/benchmark.h>
 #include <nanovdb/util/OpenToNanoVDB.h>

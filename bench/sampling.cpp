@@ -5,20 +5,16 @@
 //   rays          across the grid's box in steps of half a voxel, in the band and beside it
 //   rays in band  of such rays the positions in the band alone: short runs, far from each other
 //
-// The grid is the first float grid of the file that VLN_BENCH_GRID names, else the level set of a sphere
-// about 500 voxels wide.
+// The grid is the bunny's level set, or that of a sphere where there are no real volumes.
+#include "BenchGrids.h"
 #include "GeometryVolume/channels/Halo.h"
 #include "GeometryVolume/sampling/VoxelSamplerLinear.h"
-#include "Interop/VdbFileImpl.h"
-#include "Interop/VdbImportImpl.h"
 
 #include <benchmark/benchmark.h>
 #include <openvdb/tools/Interpolation.h>
-#include <openvdb/tools/LevelSetSphere.h>
 
 #include <algorithm>
 #include <array>
-#include <cstdlib>
 #include <random>
 
 #include <nanovdb/util/OpenToNanoVDB.h>
@@ -48,19 +44,8 @@ struct Data {
   std::array<std::vector<float3>, 3> positions; ///< by pattern
 
   Data() {
-    openvdb::initialize();
-    Interop::VdbFile file;
-    if (char const* const path = std::getenv("VLN_BENCH_GRID")) {
-      file = Interop::readVdbFile(path);
-      for (auto const& candidate : file.grids)
-        if (candidate->isType<openvdb::FloatGrid>() && !grid)
-          grid = openvdb::gridPtrCast<openvdb::FloatGrid>(candidate);
-    } else {
-      grid = openvdb::tools::createLevelSetSphere<openvdb::FloatGrid>(250.0f, openvdb::Vec3f(0), 1.0f, 3.0f);
-      grid->setName("sphere");
-    }
-    file.grids = {grid};
-    content = Interop::importGrids(file);
+    grid = Bench::benchGrids().front().grid;
+    content = Bench::importGrid(grid);
     nano = nanovdb::openToNanoVDB(*grid);
     auto const& volume = content.volumes.at(0);
     tree = volume.object->component<Tree>(Interop::kVdbContainerName);

@@ -56,6 +56,20 @@ def cell(text):
     return str(text).replace("|", "\\|").replace("\n", " ")
 
 
+def description(binary):
+    """The comment that a benchmark's source begins with, as a paragraph."""
+    lines = []
+    try:
+        with open(os.path.join("bench", binary + ".cpp"), encoding="utf-8") as file:
+            for line in file:
+                if not line.startswith("//"):
+                    break
+                lines.append(line[2:].strip())
+    except OSError:
+        pass
+    return "\n".join(lines)
+
+
 def main():
     build, paths = sys.argv[1], sys.argv[2:]
     rows = []
@@ -103,10 +117,17 @@ def main():
     print(f"- compiler: {compiler}, {build_type}: `{flags}`")
     print(f"- versions: {versions}")
     print(f"- allocator: {cache(build, 'VLN_ALLOCATOR')}, load at the start: {context.get('load_avg', '?')}\n")
-    print("| binary | benchmark | time | cpu | ns per item | GB/s | counters |")
-    print("|---|---|---:|---:|---:|---:|---|")
+    print("Where a benchmark says what its items are, the fourth column is the time for one of them.\n")
+    binary = None
     for row in rows:
-        print("| " + " | ".join(cell(c) for c in row) + " |")
+        if row[0] != binary:
+            binary = row[0]
+            print(f"\n## {binary}\n")
+            if text := description(binary):
+                print(text + "\n")
+            print("| benchmark | time | cpu | ns per item | GB/s | counters |")
+            print("|---|---:|---:|---:|---:|---|")
+        print("| " + " | ".join(cell(c) for c in row[1:]) + " |")
     return 0
 
 
