@@ -57,14 +57,14 @@ def cell(text):
 
 
 def description(binary):
-    """The comment that a benchmark's source begins with, as a paragraph."""
+    """The comment that a benchmark's source begins with, as it is laid out there."""
     lines = []
     try:
         with open(os.path.join("bench", binary + ".cpp"), encoding="utf-8") as file:
             for line in file:
                 if not line.startswith("//"):
                     break
-                lines.append(line[2:].strip())
+                lines.append(line[3:].rstrip())
     except OSError:
         pass
     return "\n".join(lines)
@@ -124,7 +124,7 @@ def main():
             binary = row[0]
             print(f"\n## {binary}\n")
             if text := description(binary):
-                print(text + "\n")
+                print(f"```text\n{text}\n```\n")
             print("| benchmark | time | cpu | ns per item | GB/s | counters |")
             print("|---|---:|---:|---:|---:|---|")
         print("| " + " | ".join(cell(c) for c in row[1:]) + " |")
