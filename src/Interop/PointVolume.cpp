@@ -74,13 +74,13 @@ Placement placePoints(std::vector<float3> const& positions) {
   }
   result.starts.push_back(result.order.size());
   if (box.empty()) return result;
-  for (int d = kDeepest, top = rootDepthOf(box); d > top; --d) {
-    auto& above = result.corners[static_cast<std::size_t>(d - 1)];
-    for (int3 const& p : result.corners[static_cast<std::size_t>(d)]) {
-      int3 const corner{PointTraits::align(p.x, d - 1), PointTraits::align(p.y, d - 1),
-                        PointTraits::align(p.z, d - 1)};
-      if (above.empty() || above.back() != corner) above.append(corner);
-    }
+  // The roots; what lies between comes with the bulk addition.
+  int const top = rootDepthOf(box);
+  auto& roots = result.corners[static_cast<std::size_t>(top)];
+  for (std::size_t n = 0; top < kDeepest && n < deepest.size(); ++n) {
+    int3 const& p = deepest[n];
+    int3 const root{PointTraits::align(p.x, top), PointTraits::align(p.y, top), PointTraits::align(p.z, top)};
+    if (roots.empty() || roots.back() != root) roots.append(root);
   }
   return result;
 }

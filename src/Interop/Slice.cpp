@@ -234,9 +234,9 @@ struct Raised {
     Container::TileLists corners;
     for (auto it = from.cbeginRoots(); it != from.cendRoots(); ++it) {
       int3 const p = it->first.ijk();
-      for (int d = depth; d < it->second.depth; ++d)
-        corners[static_cast<std::size_t>(d)].append(
-            {VdbTraits::align(p.x, d), VdbTraits::align(p.y, d), VdbTraits::align(p.z, d)});
+      if (it->second.depth > depth)
+        corners[static_cast<std::size_t>(depth)].append(
+            {VdbTraits::align(p.x, depth), VdbTraits::align(p.y, depth), VdbTraits::align(p.z, depth)});
     }
     tree.tileAccessor().addTiles(corners);
     topology.update(tree);

@@ -2,6 +2,7 @@
 #include "GeometryVolume/channels/Halo.h"
 #include "GeometryVolume/sampling/VoxelSamplerLinear.h"
 #include "ImportCheck.h"
+#include "support/RealVolumes.h"
 #include "support/TempFolder.h"
 
 #include <openvdb/tools/Interpolation.h>
@@ -140,14 +141,7 @@ TEST_P(SamplerDifference, AgreesWithBoxSampler) {
   }
 }
 
-INSTANTIATE_TEST_SUITE_P(Shared, SamplerDifference,
-                         testing::Values("bunny_ls_128.vdb", "bunny_ls_512_half.vdb",
-                                         "mantaflow_smoke_0010.vdb", "smoke.vdb", "sphere.vdb",
-                                         "sphereCd.vdb", "sphere_points.vdb", "spot_ls_128.vdb"),
-                         [](auto const& param) {
-                           std::string name = param.param;
-                           return name.substr(0, name.find('.'));
-                         });
+INSTANTIATE_TEST_SUITE_P(Shared, SamplerDifference, realVolumes(), volumeName);
 
 } // namespace
 } // namespace VLN::Test

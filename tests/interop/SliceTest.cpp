@@ -1,6 +1,7 @@
 #include "Interop/Slice.h"
 #include "ImportCheck.h"
 #include "Interop/ColorMap.h"
+#include "support/TurnedRamp.h"
 
 #include <openvdb/tools/LevelSetSphere.h>
 
@@ -132,22 +133,9 @@ TEST(SliceTest, ShowsCoarseTilesAndGaps) {
 
 // requirement: gradients are those of world space, also where the grid is turned and its voxels are no cubes
 TEST(SliceTest, GradientFollowsTheWholeTransform) {
-  openvdb::initialize();
-  auto turned = openvdb::math::Transform::createLinearTransform(0.5);
-  turned->preScale(openvdb::Vec3d(1, 2, 0.5));
-  turned->postRotate(0.6, openvdb::math::Z_AXIS);
-  turned->postTranslate(openvdb::Vec3d(3, -1, 2));
-  auto grid = openvdb::FloatGrid::create(0.0f);
-  grid->setName("ramp");
-  grid->setTransform(turned);
-  openvdb::CoordBBox const box(Coord(-8, 0, 8), Coord(15, 15, 23));
-  for (auto it = box.begin(); it; ++it) {
-    auto const p = turned->indexToWorld(*it);
-    grid->tree().setValueOn(*it, static_cast<float>(2 * p.x() - p.y() + 0.5 * p.z() + 40));
-  }
   // Along z the middle line of the box is not turned: index 15.5 lies at 2 + 0.25 * 15.5.
   Slice const slice =
-      drawSlice(volumeOf(grid), "ramp", {.axis = 2, .at = 5.875, .size = 240, .gradient = true});
+      drawSlice(volumeOf(turnedRamp()), "ramp", {.axis = 2, .at = 5.875, .size = 240, .gradient = true});
   EXPECT_NEAR(slice.at, 5.875, 1e-9);
   Rgb const expected = ColorMap::forRange(slice.low, slice.top).color(std::sqrt(5.25));
   Rgb const middle = slice.image(8 + 120, slice.image.height() / 2);

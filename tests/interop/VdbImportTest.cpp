@@ -3,6 +3,7 @@
 #include "ImportCheck.h"
 #include "Interop/FileError.h"
 #include "Interop/VdbMake.h"
+#include "support/RealVolumes.h"
 #include "support/TempFolder.h"
 
 #include <openvdb/tools/LevelSetSphere.h>
@@ -375,13 +376,6 @@ TEST_P(RealFile, EqualsWhatOpenVdbReads) {
   EXPECT_EQ(read + result.skipped.size() + result.points.size(), grids->size());
 }
 
-INSTANTIATE_TEST_SUITE_P(Shared, RealFile,
-                         testing::Values("bunny_ls_128.vdb", "bunny_ls_512_half.vdb",
-                                         "mantaflow_smoke_0010.vdb", "smoke.vdb", "sphere.vdb",
-                                         "sphereCd.vdb", "sphere_points.vdb", "spot_ls_128.vdb"),
-                         [](auto const& param) {
-                           std::string name = param.param;
-                           return name.substr(0, name.find('.'));
-                         });
+INSTANTIATE_TEST_SUITE_P(Shared, RealFile, VLN::Test::realVolumes(), VLN::Test::volumeName);
 
 } // namespace

@@ -1,8 +1,5 @@
 // What vln tells about memory.
-#include "support/RunProgram.h"
-
-#include <gtest/gtest.h>
-#include <nlohmann/json.hpp>
+#include "support/VlnProgram.h"
 
 #include <algorithm>
 
@@ -10,17 +7,6 @@ namespace {
 
 using namespace VLN::Test;
 using Json = nlohmann::ordered_json;
-
-RunResult vln(std::vector<std::string> arguments) {
-  arguments.insert(arguments.begin(), VLN_PROGRAM);
-  return runProgram(arguments);
-}
-
-std::vector<std::string> keysOf(Json const& object) {
-  std::vector<std::string> keys;
-  for (auto const& item : object.items()) keys.push_back(item.key());
-  return keys;
-}
 
 class ChurnTest : public testing::Test {
 protected:

@@ -1,9 +1,6 @@
 // The commands on points, run as processes.
 #include "Interop/Ply.h"
-#include "support/RunProgram.h"
-
-#include <gtest/gtest.h>
-#include <nlohmann/json.hpp>
+#include "support/VlnProgram.h"
 
 #include <algorithm>
 #include <cmath>
@@ -13,16 +10,6 @@ namespace {
 
 using namespace VLN::Test;
 using Json = nlohmann::ordered_json;
-
-RunResult vln(std::vector<std::string> arguments) {
-  arguments.insert(arguments.begin(), VLN_PROGRAM);
-  return runProgram(arguments);
-}
-void expectFailure(RunResult const& run, std::string const& line) {
-  EXPECT_EQ(run.code, 1);
-  EXPECT_EQ(run.out, "");
-  EXPECT_EQ(run.err, "vln: " + line + "\n");
-}
 
 class PointsProgramTest : public testing::Test {
 protected:

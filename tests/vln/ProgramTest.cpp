@@ -1,10 +1,8 @@
 // The program as its users meet it: run as a process, judged by what it says, writes and returns.
 #include "support/PngReader.h"
-#include "support/RunProgram.h"
-
-#include <gtest/gtest.h>
-#include <nlohmann/json.hpp>
-#include <openvdb/openvdb.h>
+#include "support/RealVolumes.h"
+#include "support/TurnedRamp.h"
+#include "support/VlnProgram.h"
 
 #include <algorithm>
 #include <array>
@@ -15,25 +13,6 @@ namespace {
 
 using namespace VLN::Test;
 using Json = nlohmann::ordered_json;
-
-RunResult vln(std::vector<std::string> arguments) {
-  arguments.insert(arguments.begin(), VLN_PROGRAM);
-  return runProgram(arguments);
-}
-
-// Every failure: exit code 1, nothing on standard output, one line on standard error.
-void expectFailure(RunResult const& run, std::string const& line) {
-  EXPECT_EQ(run.code, 1);
-  EXPECT_EQ(run.out, "");
-  EXPECT_EQ(std::count(run.err.begin(), run.err.end(), '\n'), 1) << run.err;
-  EXPECT_EQ(run.err, "vln: " + line + "\n");
-}
-
-std::vector<std::string> keysOf(Json const& object) {
-  std::vector<std::string> keys;
-  for (auto const& item : object.items()) keys.push_back(item.key());
-  return keys;
-}
 
 int distinctColors(VLN::Interop::Image const& image) {
   std::set<std::array<int, 3>> colors;
@@ -247,19 +226,8 @@ TEST_F(ProgramTest, ProbePrintsValuesAndGradients) {
 // requirement: positions and gradients go through the whole transform, here a shift, three voxel sizes and a
 // turn
 TEST_F(ProgramTest, ProbeAndSliceFollowTheWholeTransform) {
-  openvdb::initialize();
-  auto turned = openvdb::math::Transform::createLinearTransform(0.5);
-  turned->preScale(openvdb::Vec3d(1, 2, 0.5));
-  turned->postRotate(0.6, openvdb::math::Z_AXIS);
-  turned->postTranslate(openvdb::Vec3d(3, -1, 2));
-  auto grid = openvdb::FloatGrid::create(0.0f);
-  grid->setName("ramp");
-  grid->setTransform(turned);
-  // Linear in world space, so that every sample and gradient is known.
-  auto const field = [](openvdb::Vec3d const& p) { return 2 * p.x() - p.y() + 0.5 * p.z() + 40; };
-  openvdb::CoordBBox const box(openvdb::Coord(-8, 0, 8), openvdb::Coord(15, 15, 23));
-  for (auto it = box.begin(); it; ++it)
-    grid->tree().setValueOn(*it, static_cast<float>(field(turned->indexToWorld(*it))));
+  auto const grid = turnedRamp();
+  auto const turned = grid->transformPtr();
   std::string const path = m_folder / "turned.vdb", points = m_folder / "turned.csv";
   openvdb::io::File(path).write(openvdb::GridPtrVec{grid});
 
@@ -290,7 +258,7 @@ TEST_F(ProgramTest, ProbeAndSliceFollowTheWholeTransform) {
       number = std::stod(cell);
     }
     for (int a = 0; a < 3; ++a) EXPECT_NEAR(row[a], p[a], 1e-7);
-    EXPECT_NEAR(row[3], field(p), 1e-4) << line;
+    EXPECT_NEAR(row[3], rampAt(p), 1e-4) << line;
     EXPECT_NEAR(row[4], 2, 1e-4) << line;
     EXPECT_NEAR(row[5], -1, 1e-4) << line;
     EXPECT_NEAR(row[6], 0.5, 1e-4) << line;
@@ -465,13 +433,6 @@ TEST_P(RealFile, IsReportedAndDrawn) {
     EXPECT_NE(skipped["reason"].get<std::string>().find("are not read"), std::string::npos);
 }
 
-INSTANTIATE_TEST_SUITE_P(Shared, RealFile,
-                         testing::Values("bunny_ls_128.vdb", "bunny_ls_512_half.vdb",
-                                         "mantaflow_smoke_0010.vdb", "smoke.vdb", "sphere.vdb",
-                                         "sphereCd.vdb", "sphere_points.vdb", "spot_ls_128.vdb"),
-                         [](auto const& param) {
-                           std::string name = param.param;
-                           return name.substr(0, name.find('.'));
-                         });
+INSTANTIATE_TEST_SUITE_P(Shared, RealFile, realVolumes(), volumeName);
 
 } // namespace

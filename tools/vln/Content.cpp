@@ -28,4 +28,14 @@ VdbVolume const& volumeWith(VdbImport const& content, std::string const& channel
   throw FileError(content.file, "has no channel '" + channel + "'; " + names(content));
 }
 
+Memory memoryOf(VLN::Object const& object) {
+  Memory memory;
+  for (auto const& name : object.componentRange()) {
+    Memory one;
+    object.component(name)->memUse(one.used, one.allocated, true);
+    memory.used += one.used, memory.allocated += one.allocated;
+  }
+  return memory;
+}
+
 } // namespace Vln

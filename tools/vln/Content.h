@@ -3,6 +3,7 @@
 
 #include "Interop/VdbImport.h"
 
+#include <cstdint>
 #include <string>
 
 namespace Vln {
@@ -10,5 +11,11 @@ namespace Vln {
 /// The volume that holds a channel.
 /// @error FileError that names the channels there are, or why the grid was skipped.
 VLN::Interop::VdbVolume const& volumeWith(VLN::Interop::VdbImport const& content, std::string const& channel);
+
+/// Bytes of all components, shared ones in full.
+struct Memory {
+  std::uint64_t used = 0, allocated = 0;
+};
+Memory memoryOf(VLN::Object const& object);
 
 } // namespace Vln

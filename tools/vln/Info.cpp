@@ -1,4 +1,5 @@
 #include "Commands.h"
+#include "Content.h"
 #include "GeometryVolume/channels/Channel.h"
 #include "GeometryVolume/channels/NonLeafValues.h"
 #include "GeometryVolume/core/ElementTypes.h"
@@ -33,20 +34,6 @@ namespace ChannelMemoryPool = VLN::TileTree3D::ChannelMemoryPool;
 using VdbTraits = VLN::TileTree3D::Traits<2, 4, 0, 1>;
 using Container = VLN::TileTree3D::Container<VdbTraits>;
 using Json = nlohmann::ordered_json;
-
-struct Memory {
-  std::uint64_t used = 0, allocated = 0;
-};
-
-Memory memoryOf(VLN::Object const& object) {
-  Memory memory;
-  for (auto const& name : object.componentRange()) {
-    Memory one;
-    object.component(name)->memUse(one.used, one.allocated, true);
-    memory.used += one.used, memory.allocated += one.allocated;
-  }
-  return memory;
-}
 
 std::int64_t elementsOf(VdbVolume const& volume, std::string const& channel) {
   return static_cast<std::int64_t>(volume.object->component(channel)->size());

@@ -1,5 +1,6 @@
 #include "InfoPoints.h"
 
+#include "Content.h"
 #include "Interop/FileError.h"
 
 #include <algorithm>
@@ -71,19 +72,6 @@ bool worldBounds(PointVolume const& volume, Bounds& bounds) {
     any = true;
   }
   return any;
-}
-
-struct Memory {
-  std::uint64_t used = 0, allocated = 0;
-};
-Memory memoryOf(VLN::Object const& object) {
-  Memory memory;
-  for (auto const& name : object.componentRange()) {
-    Memory one;
-    object.component(name)->memUse(one.used, one.allocated, true);
-    memory.used += one.used, memory.allocated += one.allocated;
-  }
-  return memory;
 }
 
 } // namespace
