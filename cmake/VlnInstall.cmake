@@ -12,7 +12,7 @@ install(TARGETS GeometryVolume EXPORT GeometryVolumeTargets
   ARCHIVE DESTINATION "${CMAKE_INSTALL_LIBDIR}")
 install(EXPORT GeometryVolumeTargets NAMESPACE GeometryVolume:: DESTINATION "${package_dir}")
 
-set(rooms Ostil Velorn vljemalloc GeometryVolume)
+set(rooms Ostil Velorn vljemalloc Reader GeometryVolume)
 if(TARGET GeometryVolumeInterop)
   list(APPEND rooms Interop)
   install(TARGETS GeometryVolumeInterop EXPORT GeometryVolumeInteropTargets

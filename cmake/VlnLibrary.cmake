@@ -5,7 +5,8 @@ vln_glob(sources
   src/Ostil/*.cpp src/Velorn/*.cpp src/vljemalloc/*.cpp src/GeometryVolume/*/*.cpp)
 vln_glob(templates src/GeometryVolume/*/*.cpp.in)
 vln_expand_templates(generated ${templates})
-vln_glob(headers src/Ostil/*.h src/Velorn/*.h src/vljemalloc/*.h src/GeometryVolume/*/*.h)
+vln_glob(headers src/Ostil/*.h src/Velorn/*.h src/vljemalloc/*.h src/Reader/*.h
+  src/GeometryVolume/*/*.h)
 
 add_library(GeometryVolume ${sources} ${generated} ${headers})
 add_library(GeometryVolume::GeometryVolume ALIAS GeometryVolume)
@@ -25,6 +26,19 @@ add_custom_target(GeometryVolumeVersion
   VERBATIM)
 target_sources(GeometryVolume PRIVATE "${version_source}")
 add_dependencies(GeometryVolume GeometryVolumeVersion)
+
+# The device half is a target of its own: the options of the library's C++ are not nvcc's. The CUDA
+# runtime is linked in statically, so it is no dependency of who uses the library.
+if(vln_cuda)
+  vln_glob(cuda_sources src/GeometryVolume/*/*.cu)
+  add_library(GeometryVolumeCuda OBJECT ${cuda_sources})
+  target_include_directories(GeometryVolumeCuda PRIVATE "${PROJECT_SOURCE_DIR}/src")
+  set_target_properties(GeometryVolumeCuda PROPERTIES CUDA_STANDARD 17 CUDA_STANDARD_REQUIRED ON)
+  target_sources(GeometryVolume PRIVATE $<TARGET_OBJECTS:GeometryVolumeCuda>)
+  target_link_libraries(GeometryVolume PRIVATE $<BUILD_INTERFACE:CUDA::cudart_static>)
+endif()
+set_source_files_properties(src/GeometryVolume/nanovtt/CudaRuntime.cpp PROPERTIES
+  COMPILE_DEFINITIONS "VLN_WITH_CUDA=$<BOOL:${vln_cuda}>")
 
 target_compile_features(GeometryVolume PUBLIC cxx_std_20)
 target_include_directories(GeometryVolume PUBLIC
