@@ -124,6 +124,30 @@ void HaloDriver<TraitsT>::sample(HaloBox const& box, TileType const& tile, void*
       }
 }
 
+template <class TraitsT>
+std::uint32_t HaloDriver<TraitsT>::findBeside(TileType const& tile, std::array<void const*, 26>& found) {
+  std::array<std::int64_t, 26> indices;
+  auto const count = static_cast<std::size_t>(m_table.regionCount);
+  for (std::size_t n = 0; n < count; ++n) indices[n] = indexBeside(tile, m_table.regions[n]);
+  m_source.elements(tile.depth(), indices.data(), m_table.regionCount, found.data());
+  std::uint32_t missing = 0;
+  for (std::size_t n = 0; n < count; ++n) missing |= std::uint32_t(!found[n]) << n;
+  return missing;
+}
+
+template <class TraitsT>
+void HaloDriver<TraitsT>::moveWhole(void* target, void const* own,
+                                    std::array<void const*, 26> const& found) const {
+  TileMove move;
+  move.target = target;
+  move.sourceWidth = m_table.sourceWidth, move.offsets = m_table.offsets.data();
+  move.sources[kNeighborSelf] = own;
+  for (std::size_t n = 0; n < static_cast<std::size_t>(m_table.regionCount); ++n)
+    move.sources[m_table.regions[n].direction] = found[n] ? found[n] : own;
+  auto const& kernels = *m_source.ops->kernels;
+  (TraitsT::kTDW == 4 ? kernels.tile4 : kernels.tile5)[m_table.kind](move);
+}
+
 template <class TraitsT> void HaloDriver<TraitsT>::fill(HaloTarget<TraitsT> const& target, HaloMode mode) {
   TileType const& tile = target.tile;
   void const* const own = m_source.elements(tile.treeIndex());
@@ -136,27 +160,13 @@ template <class TraitsT> void HaloDriver<TraitsT>::fill(HaloTarget<TraitsT> cons
   }
   if (m_table.regionCount == 0) return;
 
-  // All that is there in one go. What is missing takes any bytes of the tile first.
   moveTo(tile);
-  TileMove move;
-  move.target = target.elements;
-  move.sourceWidth = m_table.sourceWidth, move.offsets = m_table.offsets.data();
-  move.sources[kNeighborSelf] = own;
-  auto const count = static_cast<std::size_t>(m_table.regionCount);
-  std::array<std::int64_t, 26> indices;
   std::array<void const*, 26> found;
-  for (std::size_t n = 0; n < count; ++n) indices[n] = indexBeside(tile, m_table.regions[n]);
-  m_source.elements(tile.depth(), indices.data(), m_table.regionCount, found.data());
-  std::uint32_t missing = 0;
-  for (std::size_t n = 0; n < count; ++n) {
-    missing |= std::uint32_t(!found[n]) << n;
-    move.sources[m_table.regions[n].direction] = found[n] ? found[n] : own;
-  }
+  std::uint32_t missing = findBeside(tile, found);
   if (whole) {
-    auto const& kernels = *m_source.ops->kernels;
-    (TraitsT::kTDW == 4 ? kernels.tile4 : kernels.tile5)[m_table.kind](move);
+    moveWhole(target.elements, own, found);
   } else {
-    for (std::size_t n = 0; n < count; ++n)
+    for (std::size_t n = 0; n < static_cast<std::size_t>(m_table.regionCount); ++n)
       if (found[n]) copy(m_table.regions[n], target.elements, found[n]);
   }
   if (!missing) return;
@@ -208,6 +218,19 @@ template <class TraitsT>
 void HaloDriver<TraitsT>::fill(TileType const& tile, void* target, HaloFill const& fill,
                                HaloSampler<TraitsT>& sampler) {
   if (fill.mode < kHaloModeDeepOnly || fill.mode > kHaloModeConstant) return;
+  if (fill.type == kHaloAll && fill.mode != kHaloModeDeepOnly && m_table.kind != kHaloTileOther) {
+    // Every region is written, so what has no tile beside may hold other bytes for a moment.
+    if (void const* const own = m_source.elements(tile.treeIndex())) {
+      moveTo(tile);
+      std::array<void const*, 26> found;
+      std::uint32_t missing = findBeside(tile, found);
+      moveWhole(target, own, found);
+      for (; missing; missing &= missing - 1)
+        fillRegion(m_table.regions[static_cast<std::size_t>(std::countr_zero(missing))], tile, target, fill,
+                   sampler);
+      return;
+    }
+  }
   if (fill.type & kHaloCore) {
     if (tile.depth() > m_source.maxDepth)
       sample(m_table.core, tile, target, fill.scale, sampler);

@@ -113,8 +113,14 @@ private:
     TreeIndex const at = holder ? beyond(tile, region.direction) : searchBeside(tile, region.direction);
     return at.depth == tile.depth() ? at.index : -1;
   }
-  /// The same by a search from the accessor's last tile.
+  /// indexBeside() or beside() by a search from the accessor's last tile.
   TreeIndex searchBeside(TileType const& tile, NeighborDirection step) const;
+  /// The source's elements of the tiles of the same depth beside, by region; null where there are none.
+  /// @pre moveTo(tile).
+  /// @return Bits of the regions without.
+  std::uint32_t findBeside(TileType const& tile, std::array<void const*, 26>& found);
+  /// Core and regions in one go. A region without a tile beside takes any bytes of the tile's own.
+  void moveWhole(void* target, void const* own, std::array<void const*, 26> const& found) const;
   /// The tile itself, or its deepest ancestor whose data the source holds.
   TileType const* withData(TileType const* tile, void const*& elements) const;
 

@@ -1,0 +1,250 @@
+#include "GeometryVolume/nanovtt/GridElements.h"
+
+#include "GeometryVolume/channels/Channel.h"
+#include "GeometryVolume/channels/ElementTraits.h"
+#include "GeometryVolume/channels/EraseTilesImpl.h"
+#include "GeometryVolume/channels/NonLeafValues.h"
+#include "GeometryVolume/core/ElementTypes.h"
+#include "GeometryVolume/nanovtt/GridVisitor.h"
+#include "GeometryVolume/pools/ChannelPool.h"
+
+#include <algorithm>
+#include <cmath>
+#include <cstring>
+
+namespace nanovdb {
+template <class T> class Vec3;
+template <class T> class Vec4;
+} // namespace nanovdb
+
+namespace nanovtt {
+
+using Velorn::Math::double3;
+using Velorn::Math::float3;
+using Velorn::Math::float4;
+using VLN::TileTree3D::ElementTraits;
+
+// --- What a visitor needs its element type for ---
+
+#define NANOVTT_VISITOR                                                                                      \
+  template <class BuildT, class ValueT, class ElementT, class ConstTile, class WorkTile, int kElementBytes>
+#define NANOVTT_VISITOR_OF Visitor<BuildT, ValueT, ElementT, ConstTile, WorkTile, kElementBytes>
+
+NANOVTT_VISITOR std::uint64_t NANOVTT_VISITOR_OF::active(Internal::StoredTile const& tile,
+                                                         float threshold) const {
+  auto const* const samples = static_cast<ElementT const*>(tile.samples);
+  auto const defaultValue = *static_cast<ElementT const*>(task().source.defaultValue);
+  bool const levelSet = task().isLevelSet();
+  std::uint64_t mask = 0;
+  for (int k = 0, bit = 0; k < kTileWidth; ++k)
+    for (int j = 0; j < kTileWidth; ++j)
+      for (int i = 0; i < kTileWidth; ++i, ++bit) {
+        ElementT const& v = samples[(k * tile.width + j) * tile.width + i];
+        bool on;
+        if constexpr (std::is_same_v<ElementT, float>)
+          on = levelSet && threshold == 0 ? v < 0 : std::abs(defaultValue - v) > threshold;
+        else
+          on = ElementTraits<ElementT>::distance(defaultValue, v) > double(threshold);
+        mask |= std::uint64_t(on) << bit;
+      }
+  return mask;
+}
+
+NANOVTT_VISITOR void NANOVTT_VISITOR_OF::quantise(Internal::StoredTile const& tile,
+                                                  std::uint32_t number) const {
+  if constexpr (std::is_same_v<ElementT, float> && !std::is_void_v<BuildT>) {
+    auto const* const samples = static_cast<float const*>(tile.samples);
+    int const count = tile.width * tile.width * tile.width;
+    std::uint8_t* const out = task().table() + task().offset(number);
+    if constexpr (std::is_same_v<BuildT, nanovdb::FpN>)
+      Internal::writeFpN(task().records[number], samples, count, task().dither, out);
+    else
+      Internal::writeQuantised(task().settings.build, samples, count, task().dither, out);
+  }
+}
+
+namespace Internal {
+
+namespace {
+
+template <class T> using ChannelOf = VLN::TileTree3D::Channel<Traits, T, 4, 0>;
+
+/// What NanoVDB calls the values of a type.
+template <class T> struct GridValue { using type = T; };
+template <> struct GridValue<float3> { using type = nanovdb::Vec3<float>; };
+template <> struct GridValue<double3> { using type = nanovdb::Vec3<double>; };
+template <> struct GridValue<float4> { using type = nanovdb::Vec4<float>; };
+
+template <class T> Ostil::Ptr<ChannelBase> find(VLN::Object const& object, Ostil::String const& name) {
+  return object.component<ChannelOf<T>>(name);
+}
+
+template <class T> ChannelOf<T> const& typed(ChannelBase const& channel) {
+  return static_cast<ChannelOf<T> const&>(channel);
+}
+
+template <class T> VLN::TileTree3D::Internal::ErasedTiles tiles(ChannelBase const& channel) {
+  return VLN::TileTree3D::Internal::eraseTiles<T>(typed<T>(channel));
+}
+
+template <class T>
+bool coarserDiffer(ChannelBase const& channel, Tree const& tree, VLN::TileTree3D::VoxelOffsetType offset,
+                   float tolerance, int firstDepth) {
+  return VLN::TileTree3D::checkIfNonLeafValueIsSetToChildValue(typed<T>(channel), tree, offset, tolerance,
+                                                               firstDepth, kMaxDepth);
+}
+
+template <class T>
+Ostil::Ptr<ChannelBase> withCoarser(ChannelBase const& channel, Tree const& tree,
+                                    VLN::TileTree3D::VoxelOffsetType offset, int firstDepth) {
+  using namespace VLN::TileTree3D;
+  ChannelOf<T> const& source = typed<T>(channel);
+  T const defaultValue = source.defaultValue();
+  Ostil::Ptr<ChannelOf<T>> copy;
+  if (ChannelPool::enabled())
+    copy =
+        ChannelPool::allocate<Traits, T, 4, 0>(defaultValue, false, true, source.minDepth(), source.depth(),
+                                               static_cast<std::uint64_t>(tree.tileCount(-1)), nullptr);
+  if (!copy)
+    copy = Ostil::makePtr<ChannelOf<T>>(source.name(), &defaultValue, kInitializeDefaultValue, false, true,
+                                        source.minDepth(), source.depth());
+  std::array<std::int64_t, kChannelDepths> counts;
+  for (int d = 0; d < kChannelDepths; ++d) counts[static_cast<std::size_t>(d)] = tree.tileCount(d);
+  copy->resize(counts.data(), kTileSamples);
+
+  auto const from = VLN::TileTree3D::Internal::eraseTiles<T>(source);
+  auto const storage = copy->cloneData();
+  for (int d = std::max(source.minDepth(), 0); d <= std::min(source.depth(), kMaxDepth); ++d) {
+    auto& to = (*storage)[static_cast<std::size_t>(d)];
+    VLN::parallelFor(0, static_cast<std::int64_t>(to.size()),
+                     [&](std::int64_t begin, std::int64_t end) {
+                       for (std::int64_t n = begin; n < end; ++n) {
+                         auto& tile = to[static_cast<std::size_t>(n)];
+                         auto const* const samples = static_cast<T const*>(from.elements({n, d}));
+                         if (tile.size() != std::size_t(kTileSamples))
+                           tile.resize(kTileSamples, defaultValue);
+                         if (samples) std::copy_n(samples, kTileSamples, tile.data());
+                       }
+                     },
+                     {.grain = 64});
+  }
+  setNonLeafValueToChildValue(*copy, tree, offset, firstDepth, copy->depth());
+  return copy;
+}
+
+template <class T> void fixFog(void const* samples, float threshold, void* out) {
+  constexpr int w = kHaloTileWidth;
+  constexpr int stride[3] = {1, w, w * w};
+  auto const* const from = static_cast<T const*>(samples);
+  for (int n = 0; n < kHaloTileSamples; ++n) {
+    bool raised = false;
+    for (int a = 0; from[n] <= threshold && a < 3 && !raised; ++a) {
+      int const at = n / stride[a] % w;
+      raised = (at > 0 && from[n - stride[a]] > threshold) || (at + 1 < w && from[n + stride[a]] > threshold);
+    }
+    static_cast<T*>(out)[n] = raised ? T(threshold + 1.1920929e-7f) : from[n];
+  }
+}
+
+template <class BuildT, class T, class ValueT> ActiveBoxes fillAs(GridTask const& task) {
+  using VLN::TileTree3D::ConstTileData;
+  using VLN::TileTree3D::TileData;
+  nanovtt::Visitor<BuildT, ValueT, T, ConstTileData<T, 4, 0>, TileData<T, 5, 0>, int(sizeof(T))> visitor(
+      task);
+  VLN::TileTree3D::TraversalRange range;
+  range.minDepth = task.layout.rootDepth(), range.maxDepth = task.layout.maxDepth();
+  range.grain = 50;
+  range.voxelEnd = 0; // tiles alone
+  task.layout.tree().reduce(visitor, VLN::TileTree3D::kParallelTopDown, range);
+  return visitor.boxes();
+}
+
+template <class T> ActiveBoxes fill(GridTask const& task) {
+  constexpr bool quantised = std::is_same_v<T, float>;
+  using Value = typename GridValue<T>::type;
+  switch (task.settings.build) {
+  case Build::kFp4:
+    return fillAs<nanovdb::Fp4, T, std::conditional_t<quantised, nanovdb::Fp4, Value>>(task);
+  case Build::kFp8:
+    return fillAs<nanovdb::Fp8, T, std::conditional_t<quantised, nanovdb::Fp8, Value>>(task);
+  case Build::kFp16:
+    return fillAs<nanovdb::Fp16, T, std::conditional_t<quantised, nanovdb::Fp16, Value>>(task);
+  case Build::kFpN:
+    return fillAs<nanovdb::FpN, T, std::conditional_t<quantised, nanovdb::FpN, Value>>(task);
+  case Build::kPlain:
+    break;
+  }
+  return fillAs<void, T, Value>(task);
+}
+
+template <class T> constexpr GridElement elementOf(char const* name, GridType type) {
+  FogFix fog = nullptr;
+  if constexpr (std::is_floating_point_v<T>) fog = &fixFog<T>;
+  return {name, type, &find<T>, &tiles<T>, &coarserDiffer<T>, &withCoarser<T>, fog, &fill<T>};
+}
+
+} // namespace
+
+std::span<GridElement const> gridElements() {
+  // The order is that of the grids in a buffer.
+  static constexpr GridElement kElements[] = {
+#if VLN_HAS_ELEMENT_FLOAT
+    elementOf<float>("float", GridType::kFloat),
+#endif
+#if VLN_HAS_ELEMENT_DOUBLE
+    elementOf<double>("double", GridType::kDouble),
+#endif
+#if VLN_HAS_ELEMENT_INT16
+    elementOf<short>("int16", GridType::kInt16),
+#endif
+#if VLN_HAS_ELEMENT_INT32
+    elementOf<int>("int32", GridType::kInt32),
+#endif
+#if VLN_HAS_ELEMENT_INT64
+    elementOf<std::int64_t>("int64", GridType::kInt64),
+#endif
+#if VLN_HAS_ELEMENT_FLOAT3
+    elementOf<float3>("float3", GridType::kFloat3),
+#endif
+#if VLN_HAS_ELEMENT_DOUBLE3
+    elementOf<double3>("double3", GridType::kDouble3),
+#endif
+#if VLN_HAS_ELEMENT_UINT32
+    elementOf<unsigned int>("uint32", GridType::kUInt32),
+#endif
+#if VLN_HAS_ELEMENT_FLOAT4
+    elementOf<float4>("float4", GridType::kFloat4),
+#endif
+  };
+  return kElements;
+}
+
+void planFpNTiles(GridTask& task) {
+  ContainerLayout const& layout = task.layout;
+  task.records.assign(layout.tileCount(), {});
+  for (int d = layout.rootDepth(); d <= layout.maxDepth(); ++d) {
+    VLN::parallelFor(0, layout.tree().tileCount(d),
+                     [&](std::int64_t begin, std::int64_t end) {
+                       auto const accessor = layout.tree().tileAccessor();
+                       TileSamples samples(task, accessor);
+                       for (std::int64_t n = begin; n < end; ++n) {
+                         TileType const& tile = layout.tree().tile(n, d);
+                         if (!tile.valid()) continue;
+                         std::uint32_t const number = layout.number(d, n);
+                         StoredTile const stored = samples.get(tile, layout.hasHalo(number));
+                         task.records[number] =
+                             planFpN(static_cast<float const*>(stored.samples),
+                                     stored.width * stored.width * stored.width, task.tolerance, task.dither);
+                       }
+                     },
+                     {.grain = 64});
+  }
+  task.offsets.resize(task.records.size() + 1);
+  task.offsets[0] = task.tableBytes();
+  for (std::size_t n = 0; n < task.records.size(); ++n)
+    task.offsets[n + 1] = task.offsets[n] + kFpNRecordBytes + task.records[n].payload;
+}
+
+} // namespace Internal
+
+} // namespace nanovtt
