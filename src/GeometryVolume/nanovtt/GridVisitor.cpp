@@ -74,7 +74,10 @@ void GridVisitor::beginTile(TileType const& tile) {
     int const bottom = head.depth() + layout.blockLevels(head);
     if (tile.depth() < bottom) return; // all its voxels are refined, and others hold its data
     bool halo = layout.hasHalo(layout.number(head.depth(), head.index()));
-    if (halo) {
+    // Away from the block's high edge the core is all that is stored, and the halo computation leaves a core
+    // as it is: but not below the channel's last depth, where it blends, nor under the fog fix, which looks
+    // beyond it.
+    if (halo && !m_task.fixFog && tile.depth() <= m_task.source.maxDepth) {
       bool touches = false;
       for (int a = 0; a < 3; ++a)
         touches |= tile.tijk()[a] + tile.tileVoxelWidth() == head.tijk()[a] + head.tileVoxelWidth();
