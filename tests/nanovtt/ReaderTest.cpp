@@ -1,0 +1,224 @@
+// The library's reader against the slow one, on random volumes.
+#include "FlatChecks.h"
+#include "Reader/NanoVTTReader.h"
+#include "Reader/NanoVTTValidate.h"
+
+#include <gtest/gtest.h>
+
+#include <type_traits>
+
+namespace {
+
+using namespace Support;
+
+static_assert(std::is_trivially_copyable_v<nanovtt::BufferReader> &&
+              std::is_trivially_copyable_v<nanovtt::GridReader>);
+
+void expectSameTree(nanovtt::ContainerReader const& reader, FlatModel const& model,
+                    std::string const& label) {
+  ASSERT_EQ(reader.tileCount(), model.tiles.size()) << label;
+  EXPECT_EQ(reader.rootDepth(), model.rootDepth) << label;
+  std::size_t met = 0;
+  reader.forEachTile([&](nanovtt::TileRef const& tile) {
+    ++met;
+    auto const& wanted = model.tiles[tile.number];
+    ASSERT_EQ(tile.depth, wanted.depth) << label;
+    ASSERT_EQ(reader.depthOf(tile.number), wanted.depth) << label;
+    ASSERT_EQ(reader.parent(tile.number), wanted.parent) << label;
+    ASSERT_EQ(tile.width(), FlatModel::width(wanted.depth)) << label;
+    ASSERT_TRUE(tile.corner.x == wanted.corner.x && tile.corner.y == wanted.corner.y &&
+                tile.corner.z == wanted.corner.z)
+        << label;
+  });
+  EXPECT_EQ(met, model.tiles.size()) << label;
+
+  std::mt19937 random(5);
+  auto const expectAt = [&](int3 const& p, int depth) {
+    auto const tile = reader.find(p.x, p.y, p.z, depth);
+    auto const number = model.find(p, depth);
+    ASSERT_EQ(tile.number, number) << label << ", at " << p.x << ' ' << p.y << ' ' << p.z << ", depth "
+                                   << depth;
+    ASSERT_EQ(tile.valid(), number != FlatModel::kNone);
+    if (!tile.valid()) return;
+    ASSERT_EQ(tile.depth, model.tiles[number].depth) << label;
+    int3 const c = model.tiles[number].corner;
+    ASSERT_TRUE(tile.corner.x == c.x && tile.corner.y == c.y && tile.corner.z == c.z) << label;
+  };
+  for (auto const& tile : model.tiles)
+    for (int n = 0; n < 4; ++n) {
+      std::int64_t const w = FlatModel::width(tile.depth);
+      int3 p;
+      for (int a = 0; a < 3; ++a)
+        p[a] = static_cast<int>(std::clamp<std::int64_t>(
+            tile.corner[a] - w / 2 + static_cast<std::int64_t>(random() % static_cast<std::uint64_t>(2 * w)),
+            INT32_MIN, INT32_MAX));
+      expectAt(p, static_cast<int>(random() % 31) - 1);
+    }
+  for (int const x : {INT32_MIN, -536870913, -536870912, -1, 0, 536870911, 536870912, INT32_MAX})
+    for (int const z : {INT32_MIN, -536870912, 0, INT32_MAX}) expectAt({x, 0, z}, 28);
+}
+
+template <class T>
+void expectSameBlocks(nanovtt::GridReader const& reader, FlatModel const& model, FlatModel::Grid const& grid,
+                      std::string const& label) {
+  using Traits = VLN::TileTree3D::ElementTraits<T>;
+  for (std::uint32_t n = 0; n < model.tiles.size(); ++n) {
+    auto const block = reader.block(n);
+    auto const core = 4 << (FlatModel::isQuantised(grid.type) ? 0 : grid.levels(n));
+    ASSERT_EQ(block.core, core) << label;
+    std::vector<T> wanted;
+    if constexpr (std::is_same_v<T, float>) {
+      if (FlatModel::isQuantised(grid.type)) {
+        auto const q = model.quantised(grid, n);
+        ASSERT_EQ(block.bits, q.bits) << label;
+        ASSERT_EQ(block.hasHalo(), q.codes.size() == 125) << label;
+        for (std::size_t k = 0; k < q.codes.size(); ++k) {
+          ASSERT_EQ(block.code(k), q.codes[k]) << label << ", tile " << n;
+          wanted.push_back(q.minimum + static_cast<float>(q.codes[k]) * q.quantum);
+        }
+      }
+    }
+    if (reader.isTexture()) {
+      auto const q = static_cast<int>(reader.textureWidth() / 5), c = static_cast<int>(n) + 1;
+      wanted = model.template brick<T>(grid, 5 * q, c % q, c / q % q, c / (q * q));
+    } else if (wanted.empty()) {
+      wanted = model.template block<T>(grid, n);
+    }
+    auto const w = static_cast<std::size_t>(block.width);
+    ASSERT_EQ(wanted.size(), w * w * w) << label;
+    for (std::size_t k = 0; k < wanted.size(); ++k) {
+      auto const at =
+          block.index(static_cast<int>(k % w), static_cast<int>(k / w % w), static_cast<int>(k / w / w));
+      for (int c = 0; c < Traits::kComponents; ++c)
+        ASSERT_EQ(block.getComponent(at, c), static_cast<double>(Traits::component(wanted[k], c)))
+            << label << ", tile " << n << ", sample " << k;
+      if (block.bits) continue;
+      T const value = block.get<T>(at);
+      ASSERT_EQ(std::memcmp(&value, &wanted[k], sizeof(T)), 0) << label << ", tile " << n << ", sample " << k;
+    }
+  }
+}
+
+template <class HandleT> void expectSame(HandleT const& handle, std::string const& label) {
+  if (handle.empty()) return;
+  // Of the exact length, so that a sanitizer sees what lies beyond.
+  std::vector<std::uint8_t> const bytes(handle.data(), handle.data() + handle.size());
+  auto const validation = nanovtt::validate(bytes.data(), bytes.size());
+  ASSERT_TRUE(validation.ok()) << label << ": " << validation.message << " at " << validation.position;
+  FlatModel const model(bytes.data(), bytes.size());
+  nanovtt::BufferReader const reader(bytes.data());
+  EXPECT_EQ(reader.container().bufferSize(), bytes.size());
+  expectSameTree(reader.container(), model, label);
+  ASSERT_EQ(reader.gridCount(), model.grids.size()) << label;
+  for (std::uint32_t n = 0; n < reader.gridCount(); ++n) {
+    auto const& wanted = model.grids[n];
+    auto const grid = reader.grid(n);
+    EXPECT_EQ(reader.gridOffset(n), wanted.start);
+    EXPECT_EQ(reader.find(wanted.name.c_str()), n);
+    EXPECT_EQ(grid.name(), wanted.name);
+    EXPECT_EQ(static_cast<std::uint32_t>(grid.type()), wanted.type);
+    EXPECT_EQ(static_cast<std::uint32_t>(grid.gridClass()), wanted.gridClass);
+    EXPECT_EQ(grid.gridSize(), wanted.size);
+    EXPECT_EQ(grid.checksum(), wanted.checksum);
+    EXPECT_EQ(grid.voxelSize(), wanted.voxelSize);
+    for (int k = 0; k < 6; ++k) {
+      EXPECT_EQ(grid.tileBox(k), wanted.box[static_cast<std::size_t>(k)]);
+      EXPECT_EQ(grid.worldBox(k), wanted.worldBox[static_cast<std::size_t>(k)]);
+    }
+    EXPECT_EQ(
+        std::memcmp(grid.defaultValue().samples, wanted.defaultValue.data(), wanted.defaultValue.size()), 0);
+    switch (wanted.type) {
+    case 2:
+      expectSameBlocks<double>(grid, model, wanted, label);
+      break;
+    case 3:
+      expectSameBlocks<std::int16_t>(grid, model, wanted, label);
+      break;
+    case 4:
+      expectSameBlocks<std::int32_t>(grid, model, wanted, label);
+      break;
+    case 5:
+      expectSameBlocks<std::int64_t>(grid, model, wanted, label);
+      break;
+    case 6:
+      expectSameBlocks<Velorn::Math::float3>(grid, model, wanted, label);
+      break;
+    case 7:
+      expectSameBlocks<Velorn::Math::double3>(grid, model, wanted, label);
+      break;
+    case 10:
+      expectSameBlocks<std::uint32_t>(grid, model, wanted, label);
+      break;
+    case 17:
+      expectSameBlocks<Velorn::Math::float4>(grid, model, wanted, label);
+      break;
+    default:
+      expectSameBlocks<float>(grid, model, wanted, label);
+    }
+    // A point in each tile, through the whole way down.
+    for (std::uint32_t t = 0; t < model.tiles.size(); ++t) {
+      auto const corner = model.tiles[t].corner;
+      auto const last = static_cast<int>(FlatModel::width(model.tiles[t].depth) - 1);
+      nanovtt::TileRef const ref{t, model.tiles[t].depth, {corner.x, corner.y, corner.z}};
+      auto const block = grid.block(t);
+      int const end = block.core - 1;
+      ASSERT_EQ(grid.sampleAt(block, ref, corner.x, corner.y, corner.z), 0u) << label;
+      ASSERT_EQ(grid.sampleAt(block, ref, corner.x + last, corner.y + last, corner.z + last),
+                block.index(end, end, end))
+          << label;
+      ASSERT_EQ(grid.valueAt(corner.x, corner.y, corner.z, 0, ref.depth), block.getComponent(0, 0)) << label;
+    }
+    ASSERT_EQ(grid.valueAt(INT32_MAX, 0, 0), grid.defaultValue().getComponent(0, 0)) << label;
+  }
+  EXPECT_EQ(reader.find("no such name"), reader.gridCount());
+}
+
+TEST(Reader, RequirementReadsWhatTheSlowReaderReads) {
+  for (std::uint32_t seed = 300; seed < 312; ++seed) {
+    FlatVolume volume;
+    fillRandom(volume, seed, 150);
+    std::string const label = "seed " + std::to_string(seed);
+    FlatOptions options;
+    options.rootLevelLimit = 28 - volume.top;
+    for (float const fraction : {0.0f, 0.4f, 1.0f}) {
+      options.haloFraction = fraction;
+      expectSame(flatten(*volume.object, options), label);
+      expectSame(flatten<nanovdb::Fp4>(*volume.object, options), label + " Fp4");
+      expectSame(flatten<nanovdb::Fp8>(*volume.object, options), label + " Fp8");
+      expectSame(flatten<nanovdb::Fp16>(*volume.object, options), label + " Fp16");
+      options.tolerance = 0.3f;
+      expectSame(flatten<nanovdb::FpN>(*volume.object, options), label + " FpN");
+      options.coalesce = true;
+      expectSame(flatten(*volume.object, options), label + " coalesced");
+      options.coalesce = false;
+      options.morton = !options.morton;
+    }
+    options.textures = true;
+    expectSame(flatten(*volume.object, options), label + " textures");
+  }
+}
+
+TEST(Reader, BoundaryVolumesWithoutTilesOrGrids) {
+  FlatVolume volume;
+  volume.finish();
+  expectSame(flatten(*volume.object, {}), "no tile, no channel");
+  volume.channel<float>("f", 1.5f, [](auto const&, int) { return 0.0f; });
+  FlatOptions options;
+  for (float const fraction : {0.0f, 1.0f}) {
+    options.haloFraction = fraction;
+    expectSame(flatten(*volume.object, options), "no tile");
+    expectSame(flatten<nanovdb::Fp4>(*volume.object, options), "no tile, Fp4");
+    expectSame(flatten<nanovdb::FpN>(*volume.object, options), "no tile, FpN");
+    options.textures = fraction == 1;
+    expectSame(flatten(*volume.object, options), "no tile, textures");
+  }
+  FlatVolume other;
+  fillRandom(other, 1, 50);
+  options = {};
+  options.filter = "nothing";
+  expectSame(flatten(*other.object, options), "no grid");
+  options.elementBytes = 1, options.cubic = true;
+  expectSame(flatten(*other.object, options), "no grid, nothing behind the container");
+}
+
+} // namespace
