@@ -1,13 +1,13 @@
 #include "Commands.h"
 #include "GeometryVolume/tiletree/Container.h"
 #include "Interop/FileError.h"
+#include "Interop/Obj.h"
 #include "Interop/OutputFile.h"
 #include "Interop/VdbImport.h"
 #include "PointsFile.h"
 #include "ProgressBar.h"
 
 #include <chrono>
-#include <filesystem>
 #include <iostream>
 
 #include <fmt/format.h>
@@ -25,6 +25,35 @@ std::int64_t pointCount(PointVolume const& volume) {
 }
 std::int64_t tileCount(PointVolume const& volume) {
   return volume.object->component<PointContainer>(kPointContainerName)->tileCount(-1);
+}
+
+// What --grid names is a grid, and the tree is that of all grids of its object.
+std::vector<PlacedTree> treesOf(PointsInput const& input, Progress const& progress) {
+  std::vector<PlacedTree> trees;
+  auto const addPoints = [&](PointVolume const& volume) {
+    trees.push_back({volume.name.empty() ? "points" : volume.name,
+                     volume.object->component<PointContainer>(kPointContainerName),
+                     IndexToWorld(volume.voxelSize, volume.origin)});
+  };
+  auto const wanted = [&](std::string const& name) { return input.grid.empty() || name == input.grid; };
+  if (isPointsFile(input.file)) {
+    addPoints(readPointVolume(input, progress));
+    return trees;
+  }
+  auto const content = importVdb(input.file, input.limits, progress);
+  for (auto const& volume : content.volumes)
+    for (auto const& channel : volume.channels)
+      if (wanted(channel.gridName)) {
+        trees.push_back(
+            {channel.name, volume.object->component<PointContainer>(kVdbContainerName), volume.indexToWorld});
+        break;
+      }
+  for (auto const& volume : content.points)
+    if (wanted(volume.name)) addPoints(volume);
+  if (trees.empty())
+    throw FileError(input.file, input.grid.empty() ? "has no grid that could be drawn"
+                                                   : "has no grid '" + input.grid + "'");
+  return trees;
 }
 
 } // namespace
@@ -45,33 +74,14 @@ void points(PointsOptions const& options) {
 
 void tiles(TilesOptions const& options) {
   checkOutput(options.output);
-  Ostil::Ptr<PointContainer> tree;
+  std::int64_t count = 0;
   {
     ProgressBar bar;
-    if (isPointsFile(options.input.file)) {
-      PointVolume const volume = readPointVolume(options.input, bar.progress());
-      tree = Ostil::makePtr<PointContainer>(*volume.object->component<PointContainer>(kPointContainerName));
-      tree->setVoxelSize(static_cast<float>(volume.voxelSize));
-    } else {
-      auto const content = importVdb(options.input.file, options.input.limits, bar.progress());
-      if (!content.volumes.empty()) {
-        tree = content.volumes.front().object->component<PointContainer>(kVdbContainerName);
-      } else {
-        PointVolume const volume = readPointVolume(options.input, bar.progress());
-        tree = Ostil::makePtr<PointContainer>(*volume.object->component<PointContainer>(kPointContainerName));
-        tree->setVoxelSize(static_cast<float>(volume.voxelSize));
-      }
-    }
-    OutputFile file(options.output);
-    // The materials go to the current folder: they belong beside the file that names them.
-    auto const output = std::filesystem::absolute(file.temporaryPath());
-    auto const here = std::filesystem::current_path();
-    std::filesystem::current_path(output.parent_path());
-    tree->dumpObj(output.string(), options.depth);
-    std::filesystem::current_path(here);
-    file.commit();
+    auto const trees = treesOf(options.input, bar.progress());
+    bar.show("writing", 0.9);
+    count = writeTilesObj(options.output, trees, options.depth);
   }
-  std::cout << fmt::format("{} tiles of depth {}\n", tree->tileCount(options.depth), options.depth);
+  std::cout << fmt::format("{} tiles of depth {}\n", count, options.depth);
 }
 
 void advect(AdvectOptions const& options) {

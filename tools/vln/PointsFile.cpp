@@ -1,7 +1,7 @@
 #include "PointsFile.h"
 
-#include "GeometryVolume/debug/DumpObj.h"
 #include "Interop/FileError.h"
+#include "Interop/Obj.h"
 #include "Interop/OutputFile.h"
 #include "Interop/Ply.h"
 #include "Interop/VdbPoints.h"
@@ -74,10 +74,7 @@ void writePoints(std::string const& path, PointVolume const& volume, double size
   } else if (extension == ".vdb") {
     writeVdbPoints(path, pointSetOf(volume), volume.name.empty() ? "points" : volume.name);
   } else {
-    OutputFile file(path);
-    double const half = size > 0 ? size : 0.25 * volume.voxelSize;
-    ::Test::dumpObj(*scaledPositions(volume), static_cast<float>(half), file.temporaryPath());
-    file.commit();
+    writePointsObj(path, volume, size > 0 ? size : 0.25 * volume.voxelSize);
   }
 }
 
