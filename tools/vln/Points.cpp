@@ -1,11 +1,12 @@
 #include "Commands.h"
 #include "GeometryVolume/tiletree/Container.h"
 #include "Interop/FileError.h"
+#include "Interop/FileFormat.h"
 #include "Interop/Obj.h"
-#include "Interop/OutputFile.h"
 #include "Interop/VdbImport.h"
 #include "PointsFile.h"
 #include "ProgressBar.h"
+#include "StandardOutput.h"
 
 #include <chrono>
 #include <iostream>
@@ -63,25 +64,25 @@ void points(PointsOptions const& options) {
   PointVolume volume;
   {
     ProgressBar bar;
-    volume = readPointVolume(options.input, bar.progress());
+    volume = readPointVolume(options.input, bar.progress(0, 0.7));
     bar.show("writing", 0.7);
     writePoints(options.output, volume, options.size);
   }
   noteLosses(options.input.file, volume);
-  std::cout << fmt::format("{} points in {} tiles, voxel size {:.6g}\n", pointCount(volume),
-                           tileCount(volume), volume.voxelSize);
+  remarks(options.output) << fmt::format("{} points in {} tiles, voxel size {:.6g}\n", pointCount(volume),
+                                         tileCount(volume), volume.voxelSize);
 }
 
 void tiles(TilesOptions const& options) {
-  checkOutput(options.output);
+  checkOutputAs(options.output, "boxes", {FileFormat::kObj});
   std::int64_t count = 0;
   {
     ProgressBar bar;
-    auto const trees = treesOf(options.input, bar.progress());
+    auto const trees = treesOf(options.input, bar.progress(0, 0.9));
     bar.show("writing", 0.9);
     count = writeTilesObj(options.output, trees, options.depth);
   }
-  std::cout << fmt::format("{} tiles of depth {}\n", count, options.depth);
+  remarks(options.output) << fmt::format("{} tiles of depth {}\n", count, options.depth);
 }
 
 void advect(AdvectOptions const& options) {
@@ -91,41 +92,42 @@ void advect(AdvectOptions const& options) {
   double seconds = 0;
   {
     ProgressBar bar;
-    volume = readPointVolume(options.input, bar.progress());
+    volume = readPointVolume(options.input, bar.progress(0, 0.3));
     before = pointCount(volume), tilesBefore = tileCount(volume);
     Velorn::Math::double3 const velocity{options.velocity[0], options.velocity[1], options.velocity[2]};
     for (int n = 0; n < options.steps; ++n) {
-      bar.show("moving the points", double(n) / options.steps);
+      bar.show("moving the points", 0.3 + 0.6 * n / options.steps);
       auto const start = std::chrono::steady_clock::now();
       auto const statistics = VLN::Interop::advect(volume, velocity);
       seconds += std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
       gained += statistics.tilesGained, lost += statistics.tilesLost;
     }
     if (!options.output.empty()) {
-      bar.show("writing", 1);
+      bar.show("writing", 0.9);
       writePoints(options.output, volume, 0);
     }
   }
   noteLosses(options.input.file, volume);
   std::int64_t const after = pointCount(volume);
+  auto& out = remarks(options.output);
   if (options.json) {
-    std::cout << Json({{"points_before", before},
-                       {"points_after", after},
-                       {"dropped", before - after},
-                       {"steps", options.steps},
-                       {"seconds", seconds},
-                       {"tiles_before", tilesBefore},
-                       {"tiles_after", tileCount(volume)}})
-                     .dump(2)
-              << "\n";
+    out << Json({{"points_before", before},
+                 {"points_after", after},
+                 {"dropped", before - after},
+                 {"steps", options.steps},
+                 {"seconds", seconds},
+                 {"tiles_before", tilesBefore},
+                 {"tiles_after", tileCount(volume)}})
+               .dump(2)
+        << "\n";
     return;
   }
   double const rate = seconds > 0 ? double(before) * options.steps / seconds : 0;
-  std::cout << fmt::format("{} points, {} steps in {:.3f} s: {:.1f} million points a second\n"
-                           "{} points after, {} dropped\n"
-                           "{} tiles before, {} gained, {} lost, {} after\n",
-                           before, options.steps, seconds, rate / 1e6, after, before - after, tilesBefore,
-                           gained, lost, tileCount(volume));
+  out << fmt::format("{} points, {} steps in {:.3f} s: {:.1f} million points a second\n"
+                     "{} points after, {} dropped\n"
+                     "{} tiles before, {} gained, {} lost, {} after\n",
+                     before, options.steps, seconds, rate / 1e6, after, before - after, tilesBefore, gained,
+                     lost, tileCount(volume));
 }
 
 } // namespace Vln
