@@ -39,6 +39,11 @@ IndexToWorld::IndexToWorld()
     : m_impl(std::make_shared<Impl>(Impl{openvdb::math::Transform::createLinearTransform()})) {}
 IndexToWorld::IndexToWorld(std::string const& bytes)
     : m_impl(std::make_shared<Impl>(Impl{read(bytes)})) {}
+IndexToWorld::IndexToWorld(double scale, double3 const& origin) {
+  auto transform = openvdb::math::Transform::createLinearTransform(scale);
+  transform->postTranslate({origin.x, origin.y, origin.z});
+  m_impl = std::make_shared<Impl>(Impl{std::move(transform)});
+}
 
 double3 IndexToWorld::toWorld(double3 const& p) const {
   return toDouble3(m_impl->transform->indexToWorld(openvdb::Vec3d(p.x, p.y, p.z)));

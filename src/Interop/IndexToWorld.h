@@ -19,6 +19,8 @@ public:
   /// From OpenVDB's own bytes.
   /// @error std::runtime_error when they are none.
   explicit IndexToWorld(std::string const& bytes);
+  /// World = origin + scale * index.
+  IndexToWorld(double scale, Velorn::Math::double3 const& origin);
 
   Velorn::Math::double3 toWorld(Velorn::Math::double3 const& index) const;
   Velorn::Math::double3 toIndex(Velorn::Math::double3 const& world) const;

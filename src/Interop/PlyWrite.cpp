@@ -90,7 +90,9 @@ void writePly(std::string const& path, PointSet const& points) {
   std::vector<Column> columns;
   for (PointAttribute const& attribute : points.attributes) addColumns(attribute, text, columns);
   text += "end_header\n";
+  file.write(text);
   for (std::size_t n = 0; n < points.size(); ++n) {
+    text.clear();
     auto const p = points.world(n);
     for (int a = 0; a < 3; ++a) {
       if (points.doublePositions)
@@ -109,8 +111,8 @@ void writePly(std::string const& path, PointSet const& points) {
       std::memcpy(&v, at, sizeof v);
       put(text, c.isSigned ? double(v) : double(static_cast<std::uint64_t>(v)));
     }
+    file.write(text);
   }
-  file.write(text.data(), text.size());
   file.commit();
 }
 

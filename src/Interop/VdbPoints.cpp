@@ -4,13 +4,12 @@
 #include "Interop/OutputFile.h"
 #include "Interop/VdbFileImpl.h"
 #include "Interop/VdbImportImpl.h"
+#include "Interop/VdbWriteImpl.h"
 
-#include <openvdb/io/Stream.h>
 #include <openvdb/points/PointAttribute.h>
 #include <openvdb/points/PointConversion.h>
 #include <openvdb/points/PointCount.h>
 
-#include <fstream>
 #include <limits>
 
 namespace VLN::Interop {
@@ -194,13 +193,7 @@ void writeVdbPoints(std::string const& path, PointSet const& points, std::string
       }
     });
   }
-  {
-    std::ofstream out(file.temporaryPath(), std::ios::binary | std::ios::trunc);
-    openvdb::io::Stream(out).write(openvdb::GridCPtrVec{grid});
-    out.flush();
-    if (!out) throw FileError(path, "cannot be written");
-  }
-  file.commit();
+  writeVdbFile(file, {grid});
 }
 
 } // namespace VLN::Interop

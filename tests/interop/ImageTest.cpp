@@ -1,6 +1,4 @@
 #include "Interop/ColorMap.h"
-#include "Interop/FileError.h"
-#include "Interop/OutputFile.h"
 #include "support/PngReader.h"
 #include "support/TempFolder.h"
 
@@ -109,51 +107,6 @@ TEST(ColorMapTest, TakesAnyNumber) {
   EXPECT_EQ(map.color(infinity), map.color(1));
   EXPECT_EQ(map.color(std::nan("")), ColorMap::notANumber());
   EXPECT_GE(map.scale(1).height(), 1);
-}
-
-// requirement
-TEST(OutputFileTest, NothingIsLeftWithoutACommit) {
-  TempFolder folder;
-  std::string const path = folder / "out";
-  writeAll(path, "old");
-  {
-    OutputFile file(path);
-    file.write("new content", 11);
-  }
-  EXPECT_EQ(readAll(path), "old");
-  {
-    OutputFile file(path);
-    file.write("new content", 11);
-    file.commit();
-  }
-  EXPECT_EQ(readAll(path), "new content");
-  EXPECT_EQ(folder.names(), std::vector<std::string>{"out"});
-}
-
-// negative
-TEST(OutputFileTest, NamesWhatCannotBeWritten) {
-  TempFolder folder;
-  auto reason = [](std::string const& path) {
-    try {
-      checkOutput(path);
-      return std::string();
-    } catch (FileError const& error) { return error.reason(); }
-  };
-  EXPECT_EQ(reason(folder.path()), "is a directory");
-  EXPECT_EQ(reason("/dev/null"), "is not a regular file");
-  EXPECT_EQ(reason(folder / "none/out"), "cannot be written: No such file or directory");
-  EXPECT_EQ(reason(""), "is no name for a file");
-  EXPECT_EQ(reason(folder / "out"), "");
-  EXPECT_TRUE(folder.names().empty());
-}
-
-// requirement: what an interrupted program leaves is cleaned by its signal handler
-TEST(OutputFileTest, AnInterruptRemovesTheTemporaryFile) {
-  TempFolder folder;
-  OutputFile file(folder / "out");
-  EXPECT_EQ(folder.names().size(), 1u);
-  removeUnfinishedOutput();
-  EXPECT_TRUE(folder.names().empty());
 }
 
 } // namespace

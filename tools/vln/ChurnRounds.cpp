@@ -158,7 +158,7 @@ ChurnFigures runChurn(ChurnOptions const& options, bool pools) {
   ChurnFigures figures;
   std::vector<Volume> volumes;
   {
-    VdbImport const content = importVdb(options.file, options.limits, bar.progress());
+    VdbImport const content = importVdb(options.file, options.limits, bar.progress(0, 0.2));
     volumes = volumesOf(content);
     for (auto const& v : content.volumes)
       for (auto const& c : v.channels) figures.voxels += c.activeVoxels;
@@ -169,7 +169,7 @@ ChurnFigures runChurn(ChurnOptions const& options, bool pools) {
   using Clock = std::chrono::steady_clock;
   auto const begin = Clock::now();
   for (int r = 0; r < options.rounds; ++r) {
-    bar.show(pools ? "rounds with pools" : "rounds without pools", double(r) / options.rounds);
+    bar.show(pools ? "rounds with pools" : "rounds without pools", 0.2 + 0.8 * r / options.rounds);
     QuietErrors const quiet;
     for (auto const& volume : volumes)
       for (auto const& channel : volume.channels) {

@@ -1,8 +1,9 @@
 #include "Commands.h"
 #include "Interop/FileError.h"
-#include "Interop/OutputFile.h"
+#include "Interop/FileFormat.h"
 #include "Interop/VdbExport.h"
 #include "ProgressBar.h"
+#include "StandardOutput.h"
 
 #include <iostream>
 
@@ -23,17 +24,18 @@ std::string whyNot(VdbImport const& content) {
 } // namespace
 
 void convert(ConvertOptions const& options) {
-  checkOutput(options.output);
+  checkOutputAs(options.output, "grids", {FileFormat::kVdb});
   VdbImport content;
   std::size_t written = 0;
   {
     ProgressBar bar;
-    content = importVdb(options.file, options.limits, bar.progress());
+    content = importVdb(options.file, options.limits, bar.progress(0, 0.7));
     for (auto const& volume : content.volumes) written += volume.channels.size();
     if (written == 0) throw FileError(options.file, "has no grid that could be written" + whyNot(content));
-    exportVdb(content.volumes, options.output, bar.progress());
+    exportVdb(content.volumes, options.output, bar.progress(0.7, 1));
   }
-  std::cout << fmt::format("{}: {} {} written\n", options.output, written, written == 1 ? "grid" : "grids");
+  remarks(options.output) << fmt::format("{}: {} {} written\n", options.output, written,
+                                         written == 1 ? "grid" : "grids");
   for (auto const& s : content.skipped)
     std::cerr << fmt::format("vln: {}: note: '{}' is left out: {}\n", options.file, oneLine(s.grid, 60),
                              oneLine(s.reason));

@@ -1,13 +1,14 @@
 #include "Commands.h"
 #include "GeometryVolume/tiletree/Container.h"
 #include "Interop/FileError.h"
-#include "Interop/OutputFile.h"
+#include "Interop/FileFormat.h"
+#include "Interop/Obj.h"
 #include "Interop/VdbImport.h"
 #include "PointsFile.h"
 #include "ProgressBar.h"
+#include "StandardOutput.h"
 
 #include <chrono>
-#include <filesystem>
 #include <iostream>
 
 #include <fmt/format.h>
@@ -27,6 +28,35 @@ std::int64_t tileCount(PointVolume const& volume) {
   return volume.object->component<PointContainer>(kPointContainerName)->tileCount(-1);
 }
 
+// What --grid names is a grid, and the tree is that of all grids of its object.
+std::vector<PlacedTree> treesOf(PointsInput const& input, Progress const& progress) {
+  std::vector<PlacedTree> trees;
+  auto const addPoints = [&](PointVolume const& volume) {
+    trees.push_back({volume.name.empty() ? "points" : volume.name,
+                     volume.object->component<PointContainer>(kPointContainerName),
+                     IndexToWorld(volume.voxelSize, volume.origin)});
+  };
+  auto const wanted = [&](std::string const& name) { return input.grid.empty() || name == input.grid; };
+  if (isPointsFile(input.file)) {
+    addPoints(readPointVolume(input, progress));
+    return trees;
+  }
+  auto const content = importVdb(input.file, input.limits, progress);
+  for (auto const& volume : content.volumes)
+    for (auto const& channel : volume.channels)
+      if (wanted(channel.gridName)) {
+        trees.push_back(
+            {channel.name, volume.object->component<PointContainer>(kVdbContainerName), volume.indexToWorld});
+        break;
+      }
+  for (auto const& volume : content.points)
+    if (wanted(volume.name)) addPoints(volume);
+  if (trees.empty())
+    throw FileError(input.file, input.grid.empty() ? "has no grid that could be drawn"
+                                                   : "has no grid '" + input.grid + "'");
+  return trees;
+}
+
 } // namespace
 
 void points(PointsOptions const& options) {
@@ -34,44 +64,25 @@ void points(PointsOptions const& options) {
   PointVolume volume;
   {
     ProgressBar bar;
-    volume = readPointVolume(options.input, bar.progress());
+    volume = readPointVolume(options.input, bar.progress(0, 0.7));
     bar.show("writing", 0.7);
     writePoints(options.output, volume, options.size);
   }
   noteLosses(options.input.file, volume);
-  std::cout << fmt::format("{} points in {} tiles, voxel size {:.6g}\n", pointCount(volume),
-                           tileCount(volume), volume.voxelSize);
+  remarks(options.output) << fmt::format("{} points in {} tiles, voxel size {:.6g}\n", pointCount(volume),
+                                         tileCount(volume), volume.voxelSize);
 }
 
 void tiles(TilesOptions const& options) {
-  checkOutput(options.output);
-  Ostil::Ptr<PointContainer> tree;
+  checkOutputAs(options.output, "boxes", {FileFormat::kObj});
+  std::int64_t count = 0;
   {
     ProgressBar bar;
-    if (isPointsFile(options.input.file)) {
-      PointVolume const volume = readPointVolume(options.input, bar.progress());
-      tree = Ostil::makePtr<PointContainer>(*volume.object->component<PointContainer>(kPointContainerName));
-      tree->setVoxelSize(static_cast<float>(volume.voxelSize));
-    } else {
-      auto const content = importVdb(options.input.file, options.input.limits, bar.progress());
-      if (!content.volumes.empty()) {
-        tree = content.volumes.front().object->component<PointContainer>(kVdbContainerName);
-      } else {
-        PointVolume const volume = readPointVolume(options.input, bar.progress());
-        tree = Ostil::makePtr<PointContainer>(*volume.object->component<PointContainer>(kPointContainerName));
-        tree->setVoxelSize(static_cast<float>(volume.voxelSize));
-      }
-    }
-    OutputFile file(options.output);
-    // The materials go to the current folder: they belong beside the file that names them.
-    auto const output = std::filesystem::absolute(file.temporaryPath());
-    auto const here = std::filesystem::current_path();
-    std::filesystem::current_path(output.parent_path());
-    tree->dumpObj(output.string(), options.depth);
-    std::filesystem::current_path(here);
-    file.commit();
+    auto const trees = treesOf(options.input, bar.progress(0, 0.9));
+    bar.show("writing", 0.9);
+    count = writeTilesObj(options.output, trees, options.depth);
   }
-  std::cout << fmt::format("{} tiles of depth {}\n", tree->tileCount(options.depth), options.depth);
+  remarks(options.output) << fmt::format("{} tiles of depth {}\n", count, options.depth);
 }
 
 void advect(AdvectOptions const& options) {
@@ -81,41 +92,42 @@ void advect(AdvectOptions const& options) {
   double seconds = 0;
   {
     ProgressBar bar;
-    volume = readPointVolume(options.input, bar.progress());
+    volume = readPointVolume(options.input, bar.progress(0, 0.3));
     before = pointCount(volume), tilesBefore = tileCount(volume);
     Velorn::Math::double3 const velocity{options.velocity[0], options.velocity[1], options.velocity[2]};
     for (int n = 0; n < options.steps; ++n) {
-      bar.show("moving the points", double(n) / options.steps);
+      bar.show("moving the points", 0.3 + 0.6 * n / options.steps);
       auto const start = std::chrono::steady_clock::now();
       auto const statistics = VLN::Interop::advect(volume, velocity);
       seconds += std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
       gained += statistics.tilesGained, lost += statistics.tilesLost;
     }
     if (!options.output.empty()) {
-      bar.show("writing", 1);
+      bar.show("writing", 0.9);
       writePoints(options.output, volume, 0);
     }
   }
   noteLosses(options.input.file, volume);
   std::int64_t const after = pointCount(volume);
+  auto& out = remarks(options.output);
   if (options.json) {
-    std::cout << Json({{"points_before", before},
-                       {"points_after", after},
-                       {"dropped", before - after},
-                       {"steps", options.steps},
-                       {"seconds", seconds},
-                       {"tiles_before", tilesBefore},
-                       {"tiles_after", tileCount(volume)}})
-                     .dump(2)
-              << "\n";
+    out << Json({{"points_before", before},
+                 {"points_after", after},
+                 {"dropped", before - after},
+                 {"steps", options.steps},
+                 {"seconds", seconds},
+                 {"tiles_before", tilesBefore},
+                 {"tiles_after", tileCount(volume)}})
+               .dump(2)
+        << "\n";
     return;
   }
   double const rate = seconds > 0 ? double(before) * options.steps / seconds : 0;
-  std::cout << fmt::format("{} points, {} steps in {:.3f} s: {:.1f} million points a second\n"
-                           "{} points after, {} dropped\n"
-                           "{} tiles before, {} gained, {} lost, {} after\n",
-                           before, options.steps, seconds, rate / 1e6, after, before - after, tilesBefore,
-                           gained, lost, tileCount(volume));
+  out << fmt::format("{} points, {} steps in {:.3f} s: {:.1f} million points a second\n"
+                     "{} points after, {} dropped\n"
+                     "{} tiles before, {} gained, {} lost, {} after\n",
+                     before, options.steps, seconds, rate / 1e6, after, before - after, tilesBefore, gained,
+                     lost, tileCount(volume));
 }
 
 } // namespace Vln

@@ -1,14 +1,11 @@
 #include "PointsFile.h"
 
-#include "GeometryVolume/debug/DumpObj.h"
 #include "Interop/FileError.h"
-#include "Interop/OutputFile.h"
+#include "Interop/FileFormat.h"
+#include "Interop/Obj.h"
 #include "Interop/Ply.h"
 #include "Interop/VdbPoints.h"
 
-#include <algorithm>
-#include <cctype>
-#include <filesystem>
 #include <iostream>
 
 #include <fmt/format.h>
@@ -17,14 +14,7 @@ namespace Vln {
 
 using namespace VLN::Interop;
 
-std::string extensionOf(std::string const& path) {
-  std::string extension = std::filesystem::path(path).extension().string();
-  std::transform(extension.begin(), extension.end(), extension.begin(),
-                 [](unsigned char c) { return static_cast<char>(std::tolower(c)); });
-  return extension;
-}
-
-bool isPointsFile(std::string const& path) { return extensionOf(path) == ".ply"; }
+bool isPointsFile(std::string const& path) { return formatOf(path) == FileFormat::kPly; }
 
 std::vector<PointVolume> readPointVolumes(PointsInput const& input, Progress const& progress) {
   if (!isPointsFile(input.file)) return importVdbPoints(input.file, input.limits, progress);
@@ -61,23 +51,19 @@ void noteLosses(std::string const& file, PointVolume const& volume) {
 }
 
 void checkPointsOutput(std::string const& path) {
-  std::string const extension = extensionOf(path);
-  if (extension != ".obj" && extension != ".ply" && extension != ".vdb")
-    throw FileError(path, "points are written as .obj, .ply or .vdb");
-  checkOutput(path);
+  checkOutputAs(path, "points", {FileFormat::kObj, FileFormat::kPly, FileFormat::kVdb});
 }
 
 void writePoints(std::string const& path, PointVolume const& volume, double size) {
-  std::string const extension = extensionOf(path);
-  if (extension == ".ply") {
+  switch (formatOf(path)) {
+  case FileFormat::kPly:
     writePly(path, pointSetOf(volume));
-  } else if (extension == ".vdb") {
+    break;
+  case FileFormat::kVdb:
     writeVdbPoints(path, pointSetOf(volume), volume.name.empty() ? "points" : volume.name);
-  } else {
-    OutputFile file(path);
-    double const half = size > 0 ? size : 0.25 * volume.voxelSize;
-    ::Test::dumpObj(*scaledPositions(volume), static_cast<float>(half), file.temporaryPath());
-    file.commit();
+    break;
+  default:
+    writePointsObj(path, volume, size > 0 ? size : 0.25 * volume.voxelSize);
   }
 }
 

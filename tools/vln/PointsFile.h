@@ -8,9 +8,6 @@
 
 namespace Vln {
 
-/// Lower-case letters behind the last dot of the name.
-std::string extensionOf(std::string const& path);
-
 /// The points of a .ply file, or all points grids of a .vdb file.
 std::vector<VLN::Interop::PointVolume> readPointVolumes(PointsInput const& input,
                                                         VLN::Interop::Progress const& progress);

@@ -1,11 +1,12 @@
 #include "Commands.h"
 #include "Content.h"
 #include "Interop/FileError.h"
-#include "Interop/OutputFile.h"
+#include "Interop/FileFormat.h"
 #include "Interop/VdbImport.h"
 #include "ProgressBar.h"
+#include "StandardOutput.h"
 
-#include <iostream>
+#include <ostream>
 #include <stdexcept>
 
 #include <fmt/format.h>
@@ -15,7 +16,7 @@ namespace Vln {
 using namespace VLN::Interop;
 
 void slice(SliceOptions const& options) {
-  checkOutput(options.output);
+  checkOutputAs(options.output, "pictures", {FileFormat::kPng});
   std::string summary;
   {
     ProgressBar bar;
@@ -30,7 +31,7 @@ void slice(SliceOptions const& options) {
                             result.image.width(), result.image.height());
     } catch (std::invalid_argument const& error) { throw FileError(options.file, error.what()); }
   }
-  std::cout << summary;
+  remarks(options.output) << summary;
 }
 
 } // namespace Vln

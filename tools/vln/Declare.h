@@ -1,0 +1,27 @@
+// The options of the commands, and what their declarations share.
+#pragma once
+
+#include "Interop/VdbFile.h"
+
+namespace CLI {
+class App;
+class Option;
+} // namespace CLI
+
+namespace Vln {
+
+void declareInfo(CLI::App& self);
+void declareSlice(CLI::App& self);
+void declareConvert(CLI::App& self);
+void declareProbe(CLI::App& self);
+void declareMake(CLI::App& self);
+void declareChurn(CLI::App& self);
+void declarePoints(CLI::App& self);
+void declareTiles(CLI::App& self);
+void declareAdvect(CLI::App& self);
+
+/// Refuses what is no finite number, for options that take doubles.
+CLI::Option* finite(CLI::Option* option);
+void addMemoryLimit(CLI::App& self, VLN::Interop::VdbReadLimits& limits);
+
+} // namespace Vln

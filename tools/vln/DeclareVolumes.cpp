@@ -1,0 +1,130 @@
+#include "Commands.h"
+#include "Declare.h"
+#include "Interop/VdbMake.h"
+
+#include <CLI/CLI.hpp>
+
+#include <cmath>
+#include <memory>
+
+namespace Vln {
+
+CLI::Option* finite(CLI::Option* option) {
+  return option->check(CLI::Validator(
+      [](std::string& text) {
+        double value = 0;
+        bool const number = CLI::detail::lexical_cast(text, value);
+        return number && !std::isfinite(value) ? text + " is not a finite number" : std::string();
+      },
+      ""));
+}
+
+void addMemoryLimit(CLI::App& self, VLN::Interop::VdbReadLimits& limits) {
+  self.add_option_function<std::uint64_t>(
+          "--max-memory", [&limits](std::uint64_t const& mb) { limits.memoryBytes = mb * 1000000; },
+          "Most memory in MB that reading the file may take (default: three quarters of what is available)")
+      ->check(CLI::Range(std::uint64_t(1), std::uint64_t(1) << 40))
+      ->type_name("MB");
+}
+
+void declareInfo(CLI::App& self) {
+  auto const options = std::make_shared<InfoOptions>();
+  auto& o = *options;
+  self.add_option("FILE", o.file, "A .vdb or .ply file")->required();
+  auto* json = self.add_flag("--json", o.json, "One JSON object instead of tables");
+  self.add_flag("--memory", o.memory, "Also what accounts for memory: objects, their data, and the pools")
+      ->excludes(json);
+  addMemoryLimit(self, o.limits);
+  self.callback([options] { info(*options); });
+}
+
+void declareSlice(CLI::App& self) {
+  auto const options = std::make_shared<SliceOptions>();
+  auto& o = *options;
+  self.add_option("FILE", o.file, "A .vdb file")->required();
+  self.add_option("--channel", o.channel, "Name of the channel, as info tells it")
+      ->required()
+      ->type_name("NAME");
+  self.add_option_function<std::string>(
+          "--axis", [&o](std::string const& axis) { o.plane.axis = axis[0] - 'x'; },
+          "Axis that the plane stands across: x, y or z")
+      ->required()
+      ->check(CLI::IsMember({"x", "y", "z"}))
+      ->type_name("AXIS");
+  finite(self.add_option("--at", o.plane.at,
+                         "World position on the axis (default: middle of the active voxels)"))
+      ->type_name("W");
+  self.add_option("--size", o.plane.size, "Pixels along the longer side")
+      ->check(CLI::Range(VLN::Interop::kSmallestSlice, VLN::Interop::kLargestSlice))
+      ->capture_default_str()
+      ->type_name("N");
+  self.add_option("--depth", o.plane.depth, "Draw no tile deeper than this (default: the deepest)")
+      ->check(CLI::Range(0, 28))
+      ->type_name("D");
+  self.add_flag("--nearest", o.plane.nearest, "Draw the nearest sample instead of blending linearly");
+  self.add_flag("--gradient", o.plane.gradient, "Draw the length of the gradient")->excludes("--nearest");
+  self.add_option("-o,--output", o.output, "The PNG file to write")->required()->type_name("OUT.png");
+  addMemoryLimit(self, o.limits);
+  self.callback([options] { slice(*options); });
+}
+
+void declareConvert(CLI::App& self) {
+  auto const options = std::make_shared<ConvertOptions>();
+  auto& o = *options;
+  self.add_option("IN", o.file, "A .vdb file")->required()->type_name("IN.vdb");
+  self.add_option("OUT", o.output, "The .vdb file to write")->required()->type_name("OUT.vdb");
+  addMemoryLimit(self, o.limits);
+  self.callback([options] { convert(*options); });
+}
+
+void declareProbe(CLI::App& self) {
+  auto const options = std::make_shared<ProbeOptions>();
+  auto& o = *options;
+  self.add_option("FILE", o.file, "A .vdb file")->required();
+  finite(self.add_option("X Y Z", o.positions, "World positions, three numbers each"))->type_name("...");
+  self.add_option("--channel", o.channel, "Name of the channel, as info tells it")
+      ->required()
+      ->type_name("NAME");
+  self.add_option("--points", o.points, "A file with a line x,y,z for each position, without header")
+      ->type_name("FILE.csv");
+  addMemoryLimit(self, o.limits);
+  self.callback([options] { probe(*options); });
+}
+
+void declareMake(CLI::App& self) {
+  auto const options = std::make_shared<MakeOptions>();
+  auto& o = *options;
+  self.add_option("SHAPE", o.shape, "cloud (fog volume \"density\") or torus (level set \"surface\")")
+      ->required()
+      ->check(CLI::IsMember({"cloud", "torus"}))
+      ->type_name("cloud|torus");
+  self.add_option("OUT", o.output, "The .vdb file to write")->required()->type_name("OUT.vdb");
+  self.add_option("--voxels", o.voxels, "About how many active voxels")
+      ->check(CLI::Range(VLN::Interop::kFewestMadeVoxels, VLN::Interop::kMostMadeVoxels))
+      ->capture_default_str()
+      ->type_name("N");
+  self.callback([options] { make(*options); });
+}
+
+void declareChurn(CLI::App& self) {
+  auto const options = std::make_shared<ChurnOptions>();
+  auto& o = *options;
+  self.add_option("FILE", o.file, "A .vdb file")->required();
+  self.add_option("--limit", o.limitBytes,
+                  "Resident memory that the pools hold the process to, such as 512MB (1 KB is 1024 bytes)")
+      ->required()
+      ->transform(CLI::AsSizeValue(false))
+      ->check(CLI::Range(std::uint64_t(1) << 20, std::uint64_t(1) << 50))
+      ->type_name("SIZE");
+  self.add_option("--rounds", o.rounds, "How often the volume is loaded, copied, edited and dropped")
+      ->check(CLI::Range(1, 1000000))
+      ->capture_default_str()
+      ->type_name("N");
+  self.add_flag("--json", o.json, "One JSON object instead of a table");
+  self.add_option("--only", o.only)->check(CLI::IsMember({"with", "without"}))->group("");
+  addMemoryLimit(self, o.limits);
+  self.footer("The file is read once in each run; each round builds its channels anew from what was read.");
+  self.callback([options] { churn(*options); });
+}
+
+} // namespace Vln
