@@ -7,6 +7,13 @@ if(NOT vln_test_data)
   message(STATUS "No ../shared/data: tests on real input files will be skipped")
 endif()
 
+# What helpers of more than one room are too long for a header.
+vln_glob(sources tests/support/*.cpp)
+add_library(test_support STATIC ${sources})
+vln_target(test_support)
+target_include_directories(test_support PRIVATE "${PROJECT_SOURCE_DIR}/tests")
+target_link_libraries(test_support PRIVATE GeometryVolume GTest::gtest)
+
 vln_folders(rooms tests)
 list(REMOVE_ITEM rooms support package)
 foreach(room IN LISTS rooms)
@@ -28,7 +35,7 @@ foreach(room IN LISTS rooms)
   target_compile_definitions(${target} PRIVATE
     "VLN_TEST_DATA_DIR=\"${vln_test_data}\"" "VLN_TEST_ALLOCATOR=\"${VLN_ALLOCATOR}\"")
   target_link_libraries(${target} PRIVATE
-    GeometryVolume TBB::tbb Threads::Threads GTest::gmock GTest::gtest GTest::gtest_main)
+    test_support GeometryVolume TBB::tbb Threads::Threads GTest::gmock GTest::gtest GTest::gtest_main)
   if(room STREQUAL "interop" OR room STREQUAL "vln")
     target_link_libraries(${target} PRIVATE GeometryVolumeInterop)
     vln_uses_openvdb(${target})

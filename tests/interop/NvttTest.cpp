@@ -2,7 +2,7 @@
 #include "Interop/FileError.h"
 #include "Interop/NvttRead.h"
 #include "Interop/NvttWrite.h"
-#include "nanovtt/FlatVolume.h"
+#include "support/FlatVolume.h"
 #include "support/TempFolder.h"
 
 #include <gtest/gtest.h>

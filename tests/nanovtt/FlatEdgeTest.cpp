@@ -1,7 +1,7 @@
 // Small volumes made for one rule each.
-#include "FlatChecks.h"
 #include "GeometryVolume/pools/ChannelPool.h"
 #include "support/CaptureStream.h"
+#include "support/FlatChecks.h"
 
 #include <gtest/gtest.h>
 

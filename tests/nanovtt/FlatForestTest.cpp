@@ -1,5 +1,5 @@
 // Random forests through every option, read again by the slow reader.
-#include "FlatChecks.h"
+#include "support/FlatChecks.h"
 #include "support/Threads.h"
 
 #include <gtest/gtest.h>

@@ -1,7 +1,7 @@
 // Replays the fuzzer's cases without the fuzzer: seeds made from volumes, and mutations of them. With
 // FLAT_SEEDS naming a folder, the seeds are also written there for scripts/fuzz.sh.
-#include "FlatVolume.h"
 #include "support/FlatCase.h"
+#include "support/FlatVolume.h"
 
 #include <gtest/gtest.h>
 

@@ -1,6 +1,6 @@
 // What options exclude each other, what is said on standard error, and what is logged.
-#include "FlatChecks.h"
 #include "support/CaptureStream.h"
+#include "support/FlatChecks.h"
 
 #include <gtest/gtest.h>
 #include <tbb/task_arena.h>

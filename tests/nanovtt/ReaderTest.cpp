@@ -1,7 +1,7 @@
 // The library's reader against the slow one, on random volumes.
-#include "FlatChecks.h"
 #include "Reader/NanoVTTReader.h"
 #include "Reader/NanoVTTValidate.h"
+#include "support/FlatChecks.h"
 
 #include <gtest/gtest.h>
 

@@ -1,8 +1,8 @@
 // Damaged buffers: every field in turn.
-#include "FlatVolume.h"
-#include "ReadAll.h"
 #include "Reader/NanoVTTReader.h"
 #include "Reader/NanoVTTValidate.h"
+#include "support/FlatVolume.h"
+#include "support/ReadAll.h"
 
 #include <gtest/gtest.h>
 

@@ -11,7 +11,7 @@
 #include "Reader/NanoVTTReader.h"
 #include "Reader/NanoVTTValidate.h"
 #include "Reader/NvttFile.h"
-#include "nanovtt/ReadAll.h"
+#include "support/ReadAll.h"
 
 #include <algorithm>
 #include <cstdint>

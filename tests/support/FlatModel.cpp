@@ -1,4 +1,4 @@
-#include "FlatModel.h"
+#include "support/FlatModel.h"
 
 #include <algorithm>
 #include <cmath>

@@ -1,4 +1,4 @@
-#include "FlatExpectation.h"
+#include "support/FlatExpectation.h"
 
 #include <algorithm>
 

@@ -1,4 +1,4 @@
-#include "FlatChecks.h"
+#include "support/FlatChecks.h"
 
 #include "support/Print.h"
 

@@ -1,9 +1,9 @@
 // Compares a flat buffer with the volume that it was made from, by the slow reader and the slow model.
 #pragma once
 
-#include "FlatExpectation.h"
-#include "FlatModel.h"
-#include "FlatVolume.h"
+#include "support/FlatExpectation.h"
+#include "support/FlatModel.h"
+#include "support/FlatVolume.h"
 
 #include "GeometryVolume/channels/Halo.h"
 #include "GeometryVolume/channels/NonLeafValues.h"

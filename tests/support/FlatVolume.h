@@ -117,6 +117,10 @@ class FlatVolume {
 public:
   explicit FlatVolume(float voxelSize = 0.25f)
       : tree("voxel_tile_tree", voxelSize) {}
+  /// One that is there.
+  explicit FlatVolume(Ostil::Ptr<VLN::Object> made)
+      : tree(*made->component<FlatTree>("voxel_tile_tree"))
+      , object(Ostil::MutablePtr<VLN::Object>::shareWith(std::move(made))) {}
 
   void add(int3 const& p, int depth) { tree.tileAccessor().addTile(p, depth); }
   /// The tile and its ancestors down from a depth.

@@ -2,7 +2,7 @@
 // from the description; the tree is asked for nothing but its records and for tiles at positions.
 #pragma once
 
-#include "FlatVolume.h"
+#include "support/FlatVolume.h"
 
 #include <cstdint>
 #include <map>
