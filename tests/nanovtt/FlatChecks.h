@@ -128,6 +128,9 @@ private:
           {e.index, e.depth}, channel, VLN::TileTree3D::HaloMode(4), VLN::TileTree3D::HaloType(15), accessor,
           data, 0.0f, 1.0f, VLN::TileTree3D::kVoxelOffsetCorner);
       std::copy_n(std::as_const(data).begin(), 125, result.begin());
+      if constexpr (std::is_same_v<T, float>) {
+        if (m_options.fogFix && m_grid.name == "voxel_fog_density") fixFog(result);
+      }
       return result;
     }
     int const depth = std::min(e.depth, channel.depth());
@@ -137,6 +140,25 @@ private:
     auto const data = channel.tileData(at);
     std::copy_n(data.begin(), 64, result.begin());
     return result;
+  }
+
+  /// Raises what borders on fog to just above the threshold.
+  void fixFog(Samples& block) const {
+    Samples const before = block;
+    float const threshold = m_options.coarserTolerance;
+    auto const at = [](int i, int j, int k) {
+      return static_cast<std::size_t>(std::clamp(i, 0, 4) +
+                                      5 * (std::clamp(j, 0, 4) + 5 * std::clamp(k, 0, 4)));
+    };
+    for (int k = 0; k < 5; ++k)
+      for (int j = 0; j < 5; ++j)
+        for (int i = 0; i < 5; ++i) {
+          bool borders = false;
+          for (int step : {-1, 1})
+            borders |= before[at(i + step, j, k)] > threshold || before[at(i, j + step, k)] > threshold ||
+                       before[at(i, j, k + step)] > threshold;
+          if (before[at(i, j, k)] <= threshold && borders) block[at(i, j, k)] = threshold + 1.1920929e-7f;
+        }
   }
 
   void checkBytes(std::size_t n, Samples const& wanted, Samples const& found) const {
@@ -283,8 +305,8 @@ std::uint64_t flatBufferSize(FlatModel const& model, FlatOptions const& options)
 /// The whole buffer. The grids are those of all channels, in the order of types and names.
 template <class BuildT = void, class HandleT>
 void expectFlat(FlatVolume const& volume, FlatOptions const& options, HandleT const& handle,
-                std::string const& label) {
-  FlatExpectation const expected(volume.tree, options);
+                std::string const& label, std::optional<int> contentDepth = {}) {
+  FlatExpectation const expected(volume.tree, options, contentDepth);
   if (expected.refused) {
     EXPECT_TRUE(handle.empty()) << label;
     return;
