@@ -11,6 +11,17 @@ namespace VLN::TileTree3D {
 
 ChannelBase::~ChannelBase() = default;
 
+ChannelBase::Change::Change(ChannelBase const& channel)
+    : m_channel(&channel) {
+  channel.m_gate.beginChange();
+  objectIncomplete(m_channel);
+}
+ChannelBase::Change::~Change() {
+  if (!m_channel) return;
+  objectComplete(m_channel);
+  m_channel->m_gate.endChange();
+}
+
 void ChannelBase::memUse(std::uint64_t& used, std::uint64_t& allocated, bool notShared) const {
   VLN::Component::memUse(used, allocated, notShared);
 }

@@ -1,6 +1,7 @@
 // ChannelBase: a channel without its element type, as objects and the update protocol handle it.
 #pragma once
 
+#include "GeometryVolume/channels/ChangeGate.h"
 #include "GeometryVolume/channels/ChannelTypes.h"
 #include "GeometryVolume/channels/ElementMoves.h"
 #include "GeometryVolume/channels/TileDataElementAccessor.h"
@@ -9,6 +10,7 @@
 
 #include <iosfwd>
 #include <typeindex>
+#include <utility>
 
 namespace VLN::TileTree3D {
 
@@ -74,7 +76,26 @@ public:
   void computePermutation(ElementMoves& moves, ElementOrder& order, DestinationTiles& tiles,
                           ArrivalMap& arrivals, bool sorted) const;
 
+  /// For owners of handles on a channel that they do not own, such as the pool.
+  ChangeGate& changeGate() const { return m_gate; }
+
 protected:
+  /// Every operation that changes tiles, counts or settings holds one.
+  class VLN_API Change {
+  public:
+    explicit Change(ChannelBase const& channel);
+    Change(Change&& other) noexcept
+        : m_channel(std::exchange(other.m_channel, nullptr)) {}
+    Change& operator=(Change&& other) noexcept {
+      std::swap(m_channel, other.m_channel);
+      return *this;
+    }
+    ~Change();
+
+  private:
+    ChannelBase const* m_channel;
+  };
+
   void updateElementsNoDispatch(std::vector<ElementToFrom> const& moves,
                                 std::vector<std::uint64_t> const& order,
                                 std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals,
@@ -98,6 +119,9 @@ protected:
   static void addShared(std::uint64_t& used, std::uint64_t& allocated, std::uint64_t dataUsed,
                         std::uint64_t dataAllocated, std::int64_t sharers, bool notShared,
                         void const* storage);
+
+private:
+  mutable ChangeGate m_gate;
 };
 
 } // namespace VLN::TileTree3D
