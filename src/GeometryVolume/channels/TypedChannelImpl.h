@@ -281,6 +281,14 @@ void TypedChannel<T>::allocateElementStorage(std::vector<std::uint64_t> const& t
   write([&](ChannelData<T>& data) { data.allocateElements(tiles, arrivals, moveCount, depth); });
 }
 template <class T>
+void TypedChannel<T>::reserveElementStorage(std::vector<std::uint64_t> const& tiles,
+                                            TileArrivals const& arrivals, std::size_t moveCount, int depth) {
+  write([&](ChannelData<T>& data) { data.reserveElements(tiles, arrivals, moveCount, depth); });
+}
+template <class T> bool TypedChannel<T>::holdsAll(std::vector<ElementToFrom> const& moves, int depth) const {
+  return m_data->holdsAll(moves, depth);
+}
+template <class T>
 void TypedChannel<T>::copyElements(std::vector<ElementToFrom> const& moves,
                                    std::vector<std::uint64_t> const& order,
                                    std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals,
