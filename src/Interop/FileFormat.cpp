@@ -17,8 +17,9 @@ struct Row {
   char const* suffix;
 };
 constexpr Row kTable[] = {
-    {FileFormat::kVdb, ".vdb"}, {FileFormat::kPly, ".ply"}, {FileFormat::kObj, ".obj"},
-    {FileFormat::kPng, ".png"}, {FileFormat::kCsv, ".csv"}, {FileFormat::kJson, ".json"},
+    {FileFormat::kVdb, ".vdb"},   {FileFormat::kNvtt, ".nvtt"}, {FileFormat::kPly, ".ply"},
+    {FileFormat::kObj, ".obj"},   {FileFormat::kPng, ".png"},   {FileFormat::kCsv, ".csv"},
+    {FileFormat::kJson, ".json"},
 };
 
 std::string lowerSuffix(std::string const& path) {

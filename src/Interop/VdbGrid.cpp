@@ -63,10 +63,15 @@ int rootDepth(std::vector<GridSummary> const& grids) {
     depth = std::min(depth, s.shallowest);
   }
   if (box.empty()) return depth;
+  // What a blend that begins in the voxel before the box meets belongs to it, and so may one root behind it:
+  // see collectBeyondRoots().
   auto tooWide = [&](int d) {
     for (int a = 0; a < 3; ++a) {
-      std::int64_t const first = VdbTraits::align(box.min[a], d), last = VdbTraits::align(box.max[a] - 1, d);
-      if ((last - first) / VdbTraits::width(d) + 1 > kMostRootsAnAxis) return true;
+      std::int64_t const low = std::max(box.min[a] - 1, VdbTraits::kMinTileCoord), high = box.max[a] - 1;
+      std::int64_t const first = VdbTraits::align(static_cast<int>(low), d),
+                         last = VdbTraits::align(static_cast<int>(high), d);
+      std::int64_t const beyond = last + VdbTraits::width(d) <= VdbTraits::kMaxTileCoord;
+      if ((last - first) / VdbTraits::width(d) + 1 + beyond > kMostRootsAnAxis) return true;
     }
     return false;
   };

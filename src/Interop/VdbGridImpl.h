@@ -13,6 +13,7 @@
 #include <array>
 #include <memory>
 #include <optional>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -32,12 +33,14 @@ constexpr int depthOfSamples(int width) {
   for (; width > 1; width /= 2) --depth;
   return depth;
 }
+/// Depth of the tiles that are `width` wide.
+constexpr int depthOfTiles(int width) { return depthOfSamples(width / VdbTraits::kTDW); }
 static_assert(depthOfSamples(8) == 25 && depthOfSamples(128) == 21 && depthOfSamples(4096) == 16);
 
 /// What one grid holds, in the measures of the tree.
 struct GridSummary {
-  IndexBox stored;                       ///< leaves and active tiles, whole
-  int shallowest = VdbTraits::kMaxDepth; ///< depth that the widest active tile asks for
+  IndexBox stored; ///< leaves, active tiles, and tiles with another value than the background, whole
+  int shallowest = VdbTraits::kMaxDepth; ///< depth that the widest such tile asks for
   IndexBox active;
   std::int64_t activeVoxels = 0;
   std::int64_t activeTiles = 0;
@@ -62,12 +65,13 @@ public:
   /// Why the grid cannot be placed in the tree; nothing when it can.
   virtual std::optional<std::string> whyNotPlaced() const = 0;
   virtual GridSummary summarize() const = 0;
-  /// Appends the corners of the tiles that leaves and active tiles need.
-  /// @param leavesHaveTile Whether a tile as wide as a leaf stands above each leaf's quarters.
-  virtual void collectTiles(bool leavesHaveTile, TileCorners& corners) const = 0;
-  /// Corners, by depth, of tiles that inactive tiles of the file need: those whose value a reader of the tree
-  /// would not find.
-  virtual TileCorners unreadTiles(VdbContainer const& container) const = 0;
+  /// Appends the corners of the tiles that the grid needs, without their ancestors: see VdbImport.h.
+  /// @param mostTiles The shells of the widest tiles are left out where they would take more.
+  virtual void collectTiles(int rootDepth, std::uint64_t mostTiles, TileCorners& corners) const = 0;
+  /// Appends the corners of further roots: those on the high sides of the others where a blend would
+  /// otherwise not meet the background.
+  virtual void collectBeyondRoots(std::set<std::array<int, 3>> const& roots, int depth,
+                                  std::vector<Velorn::Math::int3>& out) const = 0;
   /// The rule by which values tell what is active, or kChannel.
   virtual VdbActiveRule activeRule() const = 0;
   /// A channel with the grid's values for every sample of the tree.

@@ -162,56 +162,80 @@ public:
       ++summary.activeTiles;
       growRange(summary, value);
     });
+    Value const background = m_grid->background();
+    forEachTile(m_grid->tree(), [&](Coord const& c, int width, Value const& value, bool active) {
+      if (active || sameBits(value, background) || !fitsTheTree(c, width)) return;
+      growBy(summary.stored, c, width);
+      summary.shallowest = std::min(summary.shallowest, depthOfTiles(width));
+    });
     return summary;
   }
 
-  void collectTiles(bool leavesHaveTile, TileCorners& corners) const override {
+  void collectTiles(int rootDepth, std::uint64_t mostTiles, TileCorners& corners) const override {
     auto at = [&](int depth) -> std::vector<int3>& { return corners[static_cast<std::size_t>(depth)]; };
-    constexpr int kLeafDepth = VdbTraits::kMaxDepth - 1; // its tiles are as wide as a leaf
-    constexpr std::int64_t kGrain = 256;
-    auto const count = std::int64_t(m_leaves.size());
-    std::vector<std::vector<int3>> parts(static_cast<std::size_t>(chunkCount(0, count, kGrain)));
-    parallelChunks(0, count, kGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-      auto& part = parts[static_cast<std::size_t>(chunk)];
-      for (std::int64_t n = begin; n < end; ++n) {
-        Leaf const& leaf = *m_leaves[static_cast<std::size_t>(n)];
-        for (int slot = 0; slot < 8; ++slot) {
-          Coord const c = leaf.origin().offsetBy(4 * (slot & 1), 4 * (slot >> 1 & 1), 4 * (slot >> 2));
-          if (!isSpare(leaf, c, leavesHaveTile)) part.push_back(toInt3(c));
-        }
-      }
-    });
-    for (auto const& part : parts)
-      at(VdbTraits::kMaxDepth).insert(at(VdbTraits::kMaxDepth).end(), part.begin(), part.end());
+    constexpr int kWidestDepth = depthOfSamples(kNodeWidths[2]);
+    Value const background = m_grid->background();
+    bool const leavesHaveTile = rootDepth < VdbTraits::kMaxDepth;
+    std::vector<int3>& narrow = at(VdbTraits::kMaxDepth);
+
+    collectInParallel(
+        std::int64_t(m_leaves.size()), 256, narrow, [&](std::int64_t n, Accessor& grid, auto& part) {
+          Leaf const& leaf = *m_leaves[static_cast<std::size_t>(n)];
+          for (int slot = 0; slot < 8; ++slot) {
+            Coord const c = leaf.origin().offsetBy(4 * (slot & 1), 4 * (slot >> 1 & 1), 4 * (slot >> 2));
+            bool const spare = !hasActive(leaf, c) && isUniform(grid, c) &&
+                               (leavesHaveTile || sameBits(Value(leaf.getValue(c)), background));
+            if (!spare) part.push_back(toInt3(c));
+          }
+          collectBeforeLeaf(grid, leaf.origin(), part);
+        });
     if (leavesHaveTile)
-      for (Leaf const* leaf : m_leaves) at(kLeafDepth).push_back(toInt3(leaf->origin()));
-    forEachActiveTile(m_grid->tree(), [&](Coord const& c, int width, Value const&) {
-      at(depthOfSamples(width)).push_back(alignTo(toInt3(c), depthOfSamples(width)));
+      for (Leaf const* leaf : m_leaves) at(VdbTraits::kMaxDepth - 1).push_back(toInt3(leaf->origin()));
+
+    std::vector<WideTile> tiles;
+    forEachTile(m_grid->tree(), [&](Coord const& c, int width, Value const& value, bool active) {
+      if (!fitsTheTree(c, width)) return;
+      if (active) at(depthOfSamples(width)).push_back(alignTo(toInt3(c), depthOfSamples(width)));
+      if (sameBits(value, background)) return;
+      // A root over the tile: what has no finer tile is read there.
+      at(rootDepth).push_back(alignTo(toInt3(c), rootDepth));
+      // And no sample that is wider than any tile of the file: the way back has no place for it.
+      if (rootDepth < kWidestDepth) at(kWidestDepth).push_back(alignTo(toInt3(c), kWidestDepth));
+      tiles.push_back({c, width, value});
     });
+    collectShells(tiles, mostTiles, narrow);
   }
 
-  TileCorners unreadTiles(VdbContainer const& container) const override {
-    TileCorners corners;
-    auto tiles = container.tileAccessor();
+  void collectBeyondRoots(std::set<std::array<int, 3>> const& roots, int depth,
+                          std::vector<int3>& out) const override {
+    int const width = VdbTraits::width(depth), step = width / VdbTraits::kTDW;
+    Value const background = m_grid->background();
     auto grid = m_grid->getConstAccessor();
-    bbox3 bounds;
-    container.tileSpaceBounds(bounds);
-    forEachTile(m_grid->tree(), [&](Coord const& c, int width, Value const& value, bool active) {
-      if (active || !VdbTraits::inDomain(c.x(), c.y(), c.z())) return;
-      auto const& tile = tiles.tile(c.x(), c.y(), c.z(), VdbTraits::kMaxDepth, false);
-      if (tile.valid()) {
-        int const sample = tile.voxelDataWidth();
-        if (sample <= width) return;
-        int3 const corner = tile.childDataTIJK(tile.childDataIJK(toInt3(c)));
-        if (sameBits(value, Value(grid.getValue(toCoord(corner))))) return;
-      } else if (sameBits(value, Value(m_grid->background()))) {
-        return;
+    for (auto const& root : roots)
+      for (int n = 1; n < 8; ++n) {
+        int const side[3] = {n & 1, n >> 1 & 1, n >> 2};
+        std::array<std::int64_t, 3> beyond;
+        bool inside = true;
+        for (std::size_t a = 0; a < 3; ++a) {
+          beyond[a] = std::int64_t(root[a]) + std::int64_t(side[a]) * width;
+          inside = inside && beyond[a] <= VdbTraits::kMaxTileCoord;
+        }
+        int3 const next{static_cast<int>(beyond[0]), static_cast<int>(beyond[1]),
+                        static_cast<int>(beyond[2])};
+        if (!inside || roots.count({next.x, next.y, next.z})) continue;
+        // Without a root there, the outermost samples would go on for ever.
+        bool ends = false;
+        for (int s = 0; s < VdbTraits::kTileDataSize && !ends; ++s) {
+          int const at[3] = {s % 4, s / 4 % 4, s / 16};
+          bool outermost = true;
+          for (int a = 0; a < 3; ++a) outermost = outermost && (!side[a] || at[a] == 3);
+          ends =
+              outermost && !sameBits(Value(grid.getValue(Coord(root[0] + at[0] * step, root[1] + at[1] * step,
+                                                               root[2] + at[2] * step))),
+                                     background);
+        }
+        if (ends) out.push_back(next);
       }
-      if (!fitsTheTree(c, width)) return;
-      int const depth = depthOfSamples(width);
-      corners[static_cast<std::size_t>(depth)].push_back(alignTo(toInt3(c), depth));
-    });
-    return corners;
   }
 
   VdbActiveRule activeRule() const override {
@@ -286,20 +310,133 @@ private:
     s.hasRange = true;
   }
 
-  // Whether a quarter block of a leaf can go: see the rule in VdbImport.h. A coarser tile at the place holds
-  // the block's own values; without one a reader finds the background.
-  bool isSpare(Leaf const& leaf, Coord const& corner, bool underTile) const {
+  using Accessor = typename GridT::ConstAccessor;
+
+  /// A tile of the file's tree whose value is not the background.
+  struct WideTile {
+    Coord corner;
+    int width;
+    Value value;
+  };
+
+  /// Appends what `collect(n, accessor, part)` finds for each n, in order.
+  template <class Collect>
+  void collectInParallel(std::int64_t count, std::int64_t grain, std::vector<int3>& out,
+                         Collect const& collect) const {
+    std::vector<std::vector<int3>> parts(static_cast<std::size_t>(chunkCount(0, count, grain)));
+    parallelChunks(0, count, grain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+      auto grid = m_grid->getConstAccessor();
+      for (std::int64_t n = begin; n < end; ++n) collect(n, grid, parts[static_cast<std::size_t>(chunk)]);
+    });
+    for (auto const& part : parts) out.insert(out.end(), part.begin(), part.end());
+  }
+
+  static bool hasActive(Leaf const& leaf, Coord const& corner) {
     // The mask has a word for each i, a byte of it for each j, a bit of that for each k.
     openvdb::Index const low = Leaf::coordToOffset(corner);
     std::uint64_t const block = std::uint64_t(0x0f0f0f0f) << low % 64;
     for (openvdb::Index i = 0; i < 4; ++i)
-      if (leaf.getValueMask().template getWord<std::uint64_t>(low / 64 + i) & block) return false;
-    Value const first = underTile ? Value(leaf.getValue(low)) : Value(m_grid->background());
-    for (openvdb::Index i = 0; i < 4; ++i)
-      for (openvdb::Index j = 0; j < 4; ++j)
-        for (openvdb::Index k = 0; k < 4; ++k)
-          if (!sameBits(Value(leaf.getValue(low + 64 * i + 8 * j + k)), first)) return false;
+      if (leaf.getValueMask().template getWord<std::uint64_t>(low / 64 + i) & block) return true;
+    return false;
+  }
+
+  /// Whether all voxels of a block of 4 x 4 x 4, and the layer of voxels beyond its high sides, hold one
+  /// value: then every blend that begins in the block gives that value.
+  static bool isUniform(Accessor& grid, Coord const& corner) {
+    Value const first = grid.getValue(corner);
+    for (int n = 0; n < 8; ++n) {
+      int const step[3] = {n & 1, n >> 1 & 1, n >> 2};
+      Coord const c = corner.offsetBy(4 * step[0], 4 * step[1], 4 * step[2]);
+      Leaf const* const leaf = grid.probeConstLeaf(c);
+      if (!leaf) {
+        if (!sameBits(Value(grid.getValue(c)), first)) return false;
+        continue;
+      }
+      openvdb::Index const low = Leaf::coordToOffset(c);
+      auto const last = [&](int a) { return openvdb::Index(step[a] ? 1 : 4); };
+      for (openvdb::Index i = 0; i < last(0); ++i)
+        for (openvdb::Index j = 0; j < last(1); ++j)
+          for (openvdb::Index k = 0; k < last(2); ++k)
+            if (!sameBits(Value(leaf->getValue(low + 64 * i + 8 * j + k)), first)) return false;
+    }
     return true;
+  }
+  static void collectUnlessUniform(Accessor& grid, Coord const& block, std::vector<int3>& out) {
+    if (VdbTraits::inDomain(block.x(), block.y(), block.z()) && !isUniform(grid, block))
+      out.push_back(toInt3(block));
+  }
+
+  /// The blocks before a leaf's low sides, as far as no leaf holds them.
+  static void collectBeforeLeaf(Accessor& grid, Coord const& origin, std::vector<int3>& out) {
+    for (int n = 1; n < 8; ++n) {
+      int const step[3] = {n & 1, n >> 1 & 1, n >> 2};
+      if (grid.probeConstLeaf(origin.offsetBy(-8 * step[0], -8 * step[1], -8 * step[2]))) continue;
+      // On an axis with a step the one block before, on the others the leaf's two.
+      for (int slot = 0; slot < 8; ++slot) {
+        int const at[3] = {slot & 1, slot >> 1 & 1, slot >> 2};
+        Coord block = origin;
+        bool once = true;
+        for (int a = 0; a < 3; ++a) {
+          once = once && !(step[a] && at[a]);
+          block[a] += step[a] ? -4 : 4 * at[a];
+        }
+        if (once) collectUnlessUniform(grid, block, out);
+      }
+    }
+  }
+
+  /// Whether something else than the tile's value lies beside it: its 26 neighbours of the same width.
+  static bool isExposed(Accessor& grid, WideTile const& tile) {
+    int const level = tile.width == kNodeWidths[0] ? 2 : tile.width == kNodeWidths[1] ? 1 : 0;
+    for (int n = 0; n < 27; ++n) {
+      Coord const c = tile.corner.offsetBy((n % 3 - 1) * tile.width, (n / 3 % 3 - 1) * tile.width,
+                                           (n / 9 - 1) * tile.width);
+      if (grid.getValueDepth(c) > level || !sameBits(Value(grid.getValue(c)), tile.value)) return true;
+    }
+    return false;
+  }
+
+  /// The blocks at the surfaces of wide tiles: those inside at the high sides, and those before the low ones.
+  /// Inside such a block a value goes over to another one within one voxel.
+  void collectShells(std::vector<WideTile> tiles, std::uint64_t mostTiles, std::vector<int3>& out) const {
+    std::vector<char> exposed(tiles.size());
+    parallelFor(0, std::int64_t(tiles.size()),
+                [&](std::int64_t begin, std::int64_t end) {
+                  auto grid = m_grid->getConstAccessor();
+                  for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n)
+                    exposed[n] = isExposed(grid, tiles[n]);
+                },
+                {.grain = 64});
+    std::size_t kept = 0;
+    for (std::size_t n = 0; n < tiles.size(); ++n)
+      if (exposed[n]) tiles[kept++] = tiles[n];
+    tiles.resize(kept);
+
+    std::uint64_t planned = out.size();
+    for (int const width : kNodeWidths) {
+      // A shell grows with the square of the width: where memory ends, the widest tiles stay coarse.
+      int const across = width / 4;
+      std::vector<Coord> corners;
+      for (auto const& tile : tiles)
+        if (tile.width == width) corners.push_back(tile.corner);
+      planned += std::uint64_t(corners.size()) * 6 * std::uint64_t(across) * std::uint64_t(across);
+      if (planned > mostTiles) return;
+      auto const rows = std::int64_t(across) + 1;
+      collectInParallel(std::int64_t(corners.size()) * rows, width == kNodeWidths[0] ? 96 : 1, out,
+                        [&](std::int64_t n, Accessor& grid, auto& part) {
+                          collectRow(grid, corners[static_cast<std::size_t>(n / rows)], across,
+                                     static_cast<int>(n % rows) - 1, part);
+                        });
+    }
+  }
+  /// The shell's blocks with one z, of -1 to across - 1.
+  static void collectRow(Accessor& grid, Coord const& corner, int across, int z, std::vector<int3>& out) {
+    auto const outer = [&](int c) { return c == -1 || c == across - 1; };
+    for (int y = -1; y < across; ++y) {
+      int const step = outer(z) || outer(y) ? 1 : across;
+      for (int x = -1; x < across; x += step)
+        collectUnlessUniform(grid, corner.offsetBy(4 * x, 4 * y, 4 * z), out);
+    }
   }
 
   template <class C, class T>
@@ -311,8 +448,6 @@ private:
     channel->update(topology);
     return channel;
   }
-
-  using Accessor = typename GridT::ConstAccessor;
 
   static void fillTile(Accessor& grid, int3 const& corner, int depth, Element* samples) {
     int const step = VdbTraits::width(depth) / VdbTraits::kTDW;
@@ -446,6 +581,7 @@ private:
 
   // Whether the grid has a leaf of its own at a block.
   bool hasLeaf(Block const& block) const {
+    Value const uniform = block.above.valid() ? valueAt(block.above, {0, 0, 0}) : m_background;
     for (std::int64_t const quarter : block.quarters) {
       if (quarter < 0) continue;
       TreeIndex const at{quarter, kMaxDepth};
@@ -453,8 +589,11 @@ private:
         for (unsigned char const s : m_from.state->tileData(at))
           if (s & kVdbStateLeaf) return true;
       } else {
-        for (Element const& v : m_channel.tileData(at))
-          if (!sameBits(fromElement<Value>(v), m_background)) return true;
+        for (Element const& v : m_channel.tileData(at)) {
+          Value const value = fromElement<Value>(v);
+          // Blocks without an active voxel and of one value are inactive tiles, however finely they are cut.
+          if (isActive(value) || !sameBits(value, uniform)) return true;
+        }
       }
     }
     return false;

@@ -99,27 +99,14 @@ std::size_t countOf(TileCorners const& corners) {
   return count;
 }
 
-// Adds the corners of the tiles that inactive tiles of the file need. Roots stay at one depth, if need be a
-// shallower one. A new tile makes finer what stands above its neighbours, so that these are looked at again.
-void addUnreadTiles(TileCorners& corners, Group const& group, int rootDepth) {
-  for (bool added = true; added;) {
-    added = false;
-    Container tree("unread", 1.0f);
-    addTiles(tree, corners);
-    tree.buildAccessorAccelerationStructure(VdbTraits::kMaxDepth);
-    for (auto const& grid : group.grids) {
-      TileCorners const missing = grid->unreadTiles(tree);
-      for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth) {
-        auto const& list = missing[static_cast<std::size_t>(depth)];
-        auto& all = corners[static_cast<std::size_t>(depth)];
-        all.insert(all.end(), list.begin(), list.end());
-        if (list.empty()) continue;
-        added = true;
-        rootDepth = std::min(rootDepth, depth);
-      }
-    }
-    if (added) completeCorners(corners, rootDepth);
-  }
+void addRootsBeyond(std::vector<int3>& roots, Group const& group, int depth) {
+  std::set<std::array<int, 3>> known;
+  for (int3 const& c : roots) known.insert({c.x, c.y, c.z});
+  for (auto const& grid : group.grids) grid->collectBeyondRoots(known, depth, roots);
+  TileCorners only;
+  only[static_cast<std::size_t>(depth)] = std::move(roots);
+  completeCorners(only, depth);
+  roots = std::move(only[static_cast<std::size_t>(depth)]);
 }
 
 // About what a volume takes: records of tiles and of their vectors, child tables and samples. Many grids that
@@ -149,10 +136,11 @@ VdbVolume buildVolume(VdbFile const& file, Group const& group, std::uint64_t& me
   tell(progress, "building the tree", from);
   int const root = rootDepth(group.summaries);
   TileCorners corners;
-  for (auto const& grid : group.grids) grid->collectTiles(root < VdbTraits::kMaxDepth, corners);
+  // A half for the shells of wide tiles: ancestors take an eighth or more, and lists of corners their part.
+  std::uint64_t const mostTiles = memoryLeft / 2 / bytesFor(1, group);
+  for (auto const& grid : group.grids) grid->collectTiles(root, mostTiles, corners);
   completeCorners(corners, root);
-  checkMemory(file, bytesFor(countOf(corners), group), memoryLeft);
-  addUnreadTiles(corners, group, root);
+  addRootsBeyond(corners[static_cast<std::size_t>(root)], group, root);
   std::uint64_t const bytes = bytesFor(countOf(corners), group);
   checkMemory(file, bytes, memoryLeft);
   memoryLeft -= bytes;

@@ -10,16 +10,15 @@
 //   active tile,  128 wide           a sample of a tile at depth 21
 //   active tile, 4096 wide           a sample of a tile at depth 16
 //
+// Blends are those of the file as well: a block of 4 x 4 x 4 voxels has a tile of its own wherever a blend
+// that begins in it meets two different values, in leaves, at the surfaces of the file's tiles, and around
+// both. What has no finer tile is of one value, which the coarser samples there hold. So reading or blending
+// in the deepest tile at a position, or taking the channel's default value where there is no tile, gives
+// exactly what the grid gives. (Blocks that hold an active voxel have tiles in any case.)
+//
 // Above them stands the chain of ancestors up to one depth of roots, the deepest at which the whole box is at
 // most 64 tiles wide on each axis and no tile that the file needs lies higher. Grids of one object share the
 // union of their trees. Every sample of every tile holds the grid's value at the sample's corner.
-//
-// An inactive tile of the file gets a coarse tile like an active one where a reader of the tree would not
-// find its value without.
-//
-// A quarter block of a leaf (4 voxels wide) is left out where that loses nothing: all its voxels are inactive
-// and equal to what a reader finds there without it. So reading the deepest tile at a voxel, or the channel's
-// default value where there is no tile, gives exactly the grid's value for all voxels of leaves and tiles.
 //
 // What else the file holds is kept as plain properties of the object, see VdbRecord.h. Where values do not
 // tell which samples are active, a channel of bytes beside the grid's own does.

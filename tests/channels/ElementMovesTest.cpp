@@ -91,6 +91,111 @@ TEST_P(ElementMoves, RequirementElementsMoveBetweenDepths) {
   EXPECT_EQ(tile(channel, 1, 5), (Values{60, 52}));
 }
 
+/// Depths 2, 3 and 5 with a tile of three and a tile of two elements each, in a channel that may have fewer.
+Points threeDepths(Flags const& flags = {}, std::vector<int> const& deepest = {3, 2}) {
+  Points channel(flags);
+  FakeTree tree;
+  tree.elements[2] = tree.elements[3] = {3, 2};
+  tree.elements[5] = deepest;
+  channel.update(tree);
+  for (int d : {2, 3, 5})
+    for (std::int64_t i = 0; i < channel.tileCount(d); ++i)
+      for (int n = 0; n < channel.elementCount(TreeIndex{i, d}); ++n)
+        channel[ElementTreeIndex(i, d, n)] = 100 * d + int(10 * i) + n;
+  return channel;
+}
+/// One element from the first tile to the second at each depth, one to depth 3 from each of the others and
+/// back.
+TileTree3D::ElementMoves movesOfAllDepths() {
+  TileTree3D::ElementMoves moves(kChannelDepths);
+  moves[2] = {{1, 0, 0, 2}, {0, 1, 0, 3}};
+  moves[3] = {{1, 0, 1, 2}, {1, 0, 0, 3}, {1, 0, 1, 5}};
+  moves[5] = {{0, 1, 1, 3}, {1, 0, 0, 5}};
+  return moves;
+}
+
+TEST(ElementMovesOutOfRange, RegressionMovesOfDepthsOutsideTheRangeDoNothing) {
+  Points const whole = threeDepths();
+  auto moves = movesOfAllDepths();
+  ElementOrder order;
+  DestinationTiles to;
+  ArrivalMap arrivals;
+  whole.computePermutation(moves, order, to, arrivals, false);
+  Points shallow = threeDepths(Flags{.depth = 3}), deep = threeDepths(Flags{.minDepth = 3});
+  shallow.updateElements(moves, order, to, arrivals);
+  EXPECT_EQ(tile(shallow, 0, 2), (Values{310, 202}));
+  EXPECT_EQ(tile(shallow, 1, 2), (Values{210, 211, 200}));
+  EXPECT_EQ(tile(shallow, 0, 3), (Values{302, 301}));
+  EXPECT_EQ(tile(shallow, 1, 3), (Values{300, 311, 201}))
+      << "311 wanted to leave for a depth that is not there";
+  EXPECT_EQ(shallow.tileCount(5), 0);
+  deep.updateElements(moves, order, to, arrivals);
+  EXPECT_EQ(deep.tileCount(2), 0);
+  EXPECT_EQ(tile(deep, 0, 3), (Values{302, 301}));
+  EXPECT_EQ(tile(deep, 1, 3), (Values{310, 501, 300})) << "310 wanted to leave for a depth that is not there";
+  EXPECT_EQ(tile(deep, 0, 5), (Values{311, 502}));
+  EXPECT_EQ(tile(deep, 1, 5), (Values{510, 511, 500}));
+}
+
+TEST(ElementMovesOutOfRange, RegressionMovesOfTilesThatAreNotThereDoNothing) {
+  Points const whole = threeDepths();
+  auto moves = movesOfAllDepths();
+  ElementOrder order;
+  DestinationTiles to;
+  ArrivalMap arrivals;
+  whole.computePermutation(moves, order, to, arrivals, false);
+  Points behind = threeDepths({}, {3}), empty = threeDepths({}, {});
+  behind.updateElements(moves, order, to, arrivals);
+  EXPECT_EQ(tile(behind, 0, 5), (Values{500, 311, 502}))
+      << "500 wanted to leave for a tile that is not there";
+  EXPECT_EQ(behind.tileCount(5), 1);
+  empty.updateElements(moves, order, to, arrivals);
+  EXPECT_EQ(empty.tileCount(5), 0);
+  EXPECT_EQ(tile(empty, 0, 3), (Values{302, 301}));
+  // A list that names tiles, elements and depths that nobody has.
+  std::vector<ElementToFrom> wild = {{7, 0, 0, 3}, {1, 9, 0, 3}, {1, 0, 8, 3}, {1, 0, 0, 28}, {1, 0, 0, 3}};
+  Points channel = threeDepths();
+  channel.update(wild, 3, false);
+  EXPECT_EQ(tile(channel, 0, 3), (Values{302, 301}));
+  EXPECT_EQ(tile(channel, 1, 3), (Values{310, 311, 300}));
+}
+
+TEST(ElementMovesOutOfRange, RegressionARecordOfMovesThatCannotBeFollowed) {
+  Points channel = threeDepths(Flags{.depth = 3});
+  TileTree3D::TileDataElementAccessor record;
+  record.move(ElementTreeIndex(0, 3, 0), TreeIndex{1, 5});
+  record.move(ElementTreeIndex(0, 3, 1), TreeIndex{1, 3});
+  record.move(ElementTreeIndex(0, 5, 0), TreeIndex{1, 3});
+  record.remove(ElementTreeIndex(0, 3, 2));
+  record.remove(ElementTreeIndex(0, 5, 2));
+  record.remove(ElementTreeIndex(9, 2, 0));
+  channel.update(record);
+  EXPECT_EQ(tile(channel, 0, 3), (Values{300}));
+  EXPECT_EQ(tile(channel, 1, 3), (Values{310, 311, 301}));
+  EXPECT_EQ(tile(channel, 0, 2), (Values{200, 201, 202}));
+}
+
+template <int E, int H> void expectFixedSizeIsPassedOver() {
+  ProbeChannel<PowerOfTwoTraits, int, E, H> channel(Flags{});
+  channel.update(FakeTree().set(3, 2, 1));
+  for (std::int64_t i = 0; i < 2; ++i) channel.tileData(i, 3).set(int(i));
+  std::vector<ElementToFrom> moves = {{1, 0, 0, 3}, {-1, 1, 5, 3}};
+  channel.update(moves, 3, false);
+  TileTree3D::TileDataElementAccessor record;
+  record.move(ElementTreeIndex(0, 3, 0), TreeIndex{1, 3});
+  record.remove(ElementTreeIndex(1, 3, 0));
+  channel.update(record);
+  for (std::int64_t i = 0; i < 2; ++i) {
+    EXPECT_EQ(channel.elementCount(TreeIndex{i, 3}), channel.kSize);
+    for (int const v : std::as_const(channel).tileData(i, 3)) EXPECT_EQ(v, int(i));
+  }
+}
+TEST(ElementMovesOutOfRange, RegressionChannelsOfFixedSizeArePassedOver) {
+  expectFixedSizeIsPassedOver<4, 1>();
+  expectFixedSizeIsPassedOver<4, 2>();
+  expectFixedSizeIsPassedOver<5, 0>();
+}
+
 TEST(ElementMovesPreparation, RequirementOrderTilesAndArrivals) {
   Points const channel = points({5, 2, 3});
   std::vector<ElementToFrom> moves = {{2, 1, 0, 3}, {0, 2, 1, 3}, {-1, 0, 2, 3}, {2, 0, 1, 3}};

@@ -183,6 +183,43 @@ TYPED_TEST(ReTile, RandomMovesFollowTheRules) {
   }
 }
 
+TYPED_TEST(ReTile, RegressionChannelsThatHoldNoPointsStayWhole) {
+  constexpr int kW = TypeParam::kTileDataWidth;
+  PointCloud<TypeParam> cloud(1.0f);
+  using Wide = Channel<TypeParam, float, kW, 1>;
+  using Corners = Channel<TypeParam, float, kW + 1, 0>;
+  using Shallow = Channel<TypeParam, int, kW, 0>;
+  this->fill(cloud, 5, 80);
+  auto const add = [&](auto channel) {
+    channel->setTargetName(cloud.topology.name());
+    channel->update(cloud.topology);
+    cloud.object.addComponent(std::move(channel));
+  };
+  int const last = TypeParam::kMaxDepth;
+  add(Ostil::makePtr<Wide>("wide", nullptr, kInitializeDefaultValue, false, true, 0, last));
+  add(Ostil::makePtr<Corners>("corners", nullptr, kInitializeDefaultValue, false, true, 0, last));
+  add(Ostil::makePtr<Shallow>("shallow", nullptr, kInitializeDefaultValue, false, true, 0, last - 2));
+  std::mt19937 random(5);
+  std::uniform_real_distribution<float> along(-40, 40);
+  for (std::uint32_t round = 0; round < 4; ++round) {
+    float3 const by{along(random), along(random), along(random)};
+    cloud.move([&](float3 const& p) { return float3{p.x + by.x, p.y + by.y, p.z + by.z}; });
+    cloud.reTile(round % 2 == 1);
+    cloud.check();
+    auto const wide = cloud.object.template component<Wide>("wide");
+    auto const corners = cloud.object.template component<Corners>("corners");
+    auto const shallow = cloud.object.template component<Shallow>("shallow");
+    ASSERT_EQ(wide->tileCount(-1), cloud.tree.tileCount(-1));
+    for (std::int64_t i = 0; i < wide->tileCount(-1); ++i) {
+      ASSERT_EQ(wide->tileData(i).size(), Wide::kSize);
+      ASSERT_EQ(corners->tileData(i).size(), Corners::kSize);
+    }
+    ASSERT_EQ(shallow->tileCount(last), 0);
+    for (int d = 0; d <= last - 2; ++d)
+      ASSERT_EQ(shallow->elementCount(d), cloud.positions.elementCount(d)) << d;
+  }
+}
+
 TYPED_TEST(ReTile, BytesAreEqualAtAnyNumberOfThreads) {
   std::vector<std::int64_t> first;
   for (int const threads : {1, 2, 8}) {

@@ -218,4 +218,22 @@ TEST(PoolUtilsLog, RequirementEachReadingPrintsOneLineWhenTheVariableIsSet) {
   unsetenv("VELORN_ENABLE_VLN_POOL_UTILS_LOGGING");
 }
 
+TEST_F(ArrayPoolLog, RegressionAnArrayInUseIsListedAsItWasHandedOut) {
+  auto array = ArrayPool::allocate<float>(0, kMB / 4);
+  auto const entryAndTotal = [&] {
+    lines();
+    ArrayPool::dump();
+    return lines();
+  };
+  std::string const entry = text(array.get()) + ": Array<float>: 1MB, use_count = ";
+  EXPECT_EQ(entryAndTotal(), dumpOf({entry + "2)"}, "1"));
+  // Its holder may do this at any time, also while the pool is being listed.
+  array->resize(kMB);
+  EXPECT_EQ(entryAndTotal(), dumpOf({entry + "2)"}, "1"));
+  EXPECT_EQ(ArrayPool::allocatedMemory(), 4 * kMB);
+  std::string const larger = text(array.get()) + ": Array<float>: 4MB, use_count = ";
+  array.reset();
+  EXPECT_EQ(entryAndTotal(), dumpOf({larger + "1)"}, "4"));
+}
+
 } // namespace

@@ -14,6 +14,7 @@ using test::ArrayPoolTest;
 namespace ArrayPool = test::ArrayPool;
 
 TEST(ArrayPoolOff, RequirementHandsOutNullAndAnswersNothing) {
+  ArrayPool::resetAllocationCount(); // tests before this one leave it where it was
   ASSERT_FALSE(ArrayPool::enabled());
   EXPECT_FALSE(ArrayPool::allocate<float>(1.0f, 10));
   EXPECT_EQ(ArrayPool::allocationCount(), 0u);

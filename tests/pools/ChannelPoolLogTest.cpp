@@ -3,6 +3,7 @@
 #include "PoolScript.h"
 
 #include <algorithm>
+#include <map>
 #include <regex>
 #include <sstream>
 
@@ -175,6 +176,50 @@ TEST_F(ChannelPoolLog, RequirementAnEntryTellsItsElements) {
   ASSERT_EQ(all.size(), 7u);
   // 9 tiles of 216 elements; their number is told in megabytes, too.
   EXPECT_EQ(all[5], "ChannelPool:Channel<float, 4, 1>(0, 28, #1944, 0.00185394MB, use_count = 2)");
+}
+
+/// Looks into the pool whenever it is asked for the elements of a tile, which happens in the midst of an
+/// update.
+class Curious final : public VLN::TileTree3D::Component {
+public:
+  explicit Curious(std::int64_t tiles)
+      : m_tiles(tiles) {}
+  std::uint64_t size() const override { return static_cast<std::uint64_t>(elementCount(-1)); }
+  void update(VLN::Component const&) override {}
+  std::int64_t elementCount(int depth) const override { return tileCount(depth) * 64; }
+  int elementCount(VLN::TileTree3D::TreeIndex const&) const override {
+    ChannelPool::dump();
+    return 64;
+  }
+  std::int64_t tileCount(int depth) const override { return depth == -1 || depth == 28 ? m_tiles : 0; }
+
+private:
+  std::int64_t m_tiles;
+};
+
+TEST_F(ChannelPoolLog, RegressionAChannelThatIsBeingChangedIsListedAsLastSeen) {
+  auto const channel =
+      ChannelPool::allocate<PowerOfTwoTraits, float, 4, 0>(0.0f, false, true, 0, 28, 4, nullptr);
+  channel->update(Tiles(7));
+  lines();
+  ChannelPool::dump();
+  std::string const entry = "ChannelPool:Channel<float, 4, 0>(0, 28, #";
+  auto const listed = [&] {
+    std::map<std::string, int> found;
+    for (auto const& line : lines())
+      if (line.starts_with(entry))
+        ++found[line.substr(entry.size(), line.find(',', entry.size()) - entry.size())];
+    return found;
+  };
+  EXPECT_EQ(listed(), (std::map<std::string, int>{{"448", 1}}));
+  channel->update(Curious(27));
+  EXPECT_EQ(listed(), (std::map<std::string, int>{{"448", 20}}));
+  ChannelPool::dump();
+  EXPECT_EQ(listed(), (std::map<std::string, int>{{"1728", 1}}));
+  auto accessor = channel->tileDataAccessor();
+  accessor.tileData(VLN::TileTree3D::TreeIndex{0, 28}).push(1.0f);
+  ChannelPool::dump();
+  EXPECT_EQ(listed(), (std::map<std::string, int>{{"1728", 1}}));
 }
 
 TEST_F(ChannelPoolLog, RequirementFreeingWithFlush) {

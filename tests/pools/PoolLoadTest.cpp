@@ -29,10 +29,10 @@ namespace Blocks = VLN::TileTree3D::ChannelMemoryPool;
 using VLN::TileTree3D::OddTraits;
 using Clock = std::chrono::steady_clock;
 
-/// How long a load lasts; a longer run is asked for by the environment.
-std::chrono::seconds loadTime() {
+/// How long a load lasts; longer and shorter runs are asked for by the environment.
+std::chrono::milliseconds loadTime(double usual) {
   char const* const seconds = std::getenv("VLN_TEST_LOAD_SECONDS");
-  return std::chrono::seconds(seconds ? std::atoi(seconds) : 4);
+  return std::chrono::milliseconds(static_cast<long>(1000 * (seconds ? std::atof(seconds) : usual)));
 }
 
 class PoolLoad : public ChannelPoolTest {
@@ -132,7 +132,7 @@ protected:
   };
 
   /// Eight threads of work and two that make it hard, for a while.
-  Counts& runLoad(std::chrono::seconds time) {
+  Counts& runLoad(std::chrono::milliseconds time) {
     Watchdog const watchdog("the load", time + 120s);
     ControlGroup group;
     std::atomic<bool> stop{false};
@@ -191,7 +191,7 @@ protected:
 };
 
 TEST_F(PoolLoad, RequirementEightThreadsUnderPressure) {
-  Counts& counts = runLoad(loadTime());
+  Counts& counts = runLoad(loadTime(4));
   EXPECT_EQ(counts.wrong, 0) << "a channel or an array was shared";
   EXPECT_EQ(counts.failures, 0);
   EXPECT_GT(counts.channels, 100);
@@ -206,8 +206,8 @@ TEST_F(PoolLoad, RequirementEightThreadsUnderPressure) {
   RecordProperty("channels", int(counts.channels));
   RecordProperty("arrays", int(counts.arrays));
   RecordProperty("cancelled", int(counts.cancelled));
-  std::printf("channels %ld, arrays %ld, cancelled passes %ld in %ld s\n", counts.channels.load(),
-              counts.arrays.load(), counts.cancelled.load(), long(loadTime().count()));
+  std::printf("channels %ld, arrays %ld, cancelled passes %ld in %ld ms\n", counts.channels.load(),
+              counts.arrays.load(), counts.cancelled.load(), long(loadTime(4).count()));
 }
 
 /// @units Bytes.
@@ -250,7 +250,7 @@ TEST_F(PoolLoad, RequirementTheSameWithLogsAndReports) {
       std::this_thread::sleep_for(5ms);
     }
   });
-  Counts& counts = runLoad(2s);
+  Counts& counts = runLoad(loadTime(2));
   stop = true;
   reporter.join();
   Blocks::disableLog();

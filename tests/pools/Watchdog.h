@@ -12,11 +12,11 @@ namespace test {
 
 class Watchdog {
 public:
-  Watchdog(char const* what, std::chrono::seconds limit)
+  Watchdog(char const* what, std::chrono::milliseconds limit)
       : m_thread([this, what, limit] {
         std::unique_lock lock(m_mutex);
         if (m_condition.wait_for(lock, limit, [&] { return m_done; })) return;
-        std::fprintf(stderr, "watchdog: %s did not end in %ld seconds\n", what, long(limit.count()));
+        std::fprintf(stderr, "watchdog: %s did not end in %ld ms\n", what, long(limit.count()));
         std::abort();
       }) {}
   ~Watchdog() {

@@ -164,6 +164,26 @@ TEST(InitializeTileData, FillsListedTilesOfAllChannelsAndSkipsUnknownOnes) {
   }
 }
 
+TEST(InitializeTileData, RegressionChannelsOfTheOtherShapeStayUntouched) {
+  Volume volume;
+  auto other = Ostil::makePtr<Channel<OddTraits, float, 5, 1>>("other", nullptr, kInitializeDefaultValue,
+                                                               false, true, 0, Shape::kMaxDepth);
+  int const depth = Shape::kMaxDepth;
+  std::int64_t counts[kChannelDepths]{};
+  counts[depth] = 3;
+  other->resize(counts, 343);
+  for (std::int64_t n = 0; n < 3; ++n) other->tileData(TreeIndex{n, depth}).set(-5.0f);
+  auto const* address = other.get();
+  volume.object->addComponent(std::move(other));
+  auto const shared = *volume.object;
+  Container<Shape>::TileLists newTiles;
+  newTiles[static_cast<std::size_t>(depth)].append(volume.tree->tile(0, depth).tijk());
+  Command::initializeTileData(*volume.tree, newTiles, *volume.object);
+  auto const after = volume.object->component<Channel<OddTraits, float, 5, 1>>("other");
+  EXPECT_EQ(after.get(), address) << "nor was it copied";
+  for (float const v : std::as_const(*after).tileData(TreeIndex{0, depth})) EXPECT_EQ(v, -5.0f);
+}
+
 TEST(InitializeTileData, EmptyListsLeaveAllAsItWas) {
   Volume volume;
   createChannel<float, 2, 4, 4, 0, 0>("a", *volume.topology, *volume.object, 1.0f, kInitializeDefaultValue, 0,

@@ -1,6 +1,7 @@
 // The sub-commands of vln. Each throws std::exception with a message for one line when it fails.
 #pragma once
 
+#include "Interop/Flatten.h"
 #include "Interop/Slice.h"
 #include "Interop/VdbFile.h"
 
@@ -33,6 +34,19 @@ struct ConvertOptions {
   VLN::Interop::VdbReadLimits limits;
 };
 void convert(ConvertOptions const& options);
+
+struct FlattenOptions {
+  std::string file;
+  std::string output;
+  VLN::Interop::FlattenOptions flat;
+  VLN::Interop::VdbReadLimits limits;
+};
+void flatten(FlattenOptions const& options);
+
+struct ValidateOptions {
+  std::string file;
+};
+void validate(ValidateOptions const& options);
 
 struct ProbeOptions {
   std::string file;

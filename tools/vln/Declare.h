@@ -13,6 +13,8 @@ namespace Vln {
 void declareInfo(CLI::App& self);
 void declareSlice(CLI::App& self);
 void declareConvert(CLI::App& self);
+void declareFlatten(CLI::App& self);
+void declareValidate(CLI::App& self);
 void declareProbe(CLI::App& self);
 void declareMake(CLI::App& self);
 void declareChurn(CLI::App& self);

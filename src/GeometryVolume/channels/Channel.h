@@ -53,7 +53,8 @@ public:
     ConstTile tileData(std::int64_t flat) const { return tileData(this->indexToTreeIndex(flat)); }
   };
 
-  /// Direct growth of single tiles. Owns nothing; the channel must outlive it.
+  /// Direct growth of single tiles. Owns nothing; the channel must outlive it. While it lives the channel
+  /// counts as being changed: what other threads report of it is what they saw before.
   class TileDataAccessor {
   public:
     using DynamicTile = DynamicTileData<WritableTile>;
@@ -67,11 +68,13 @@ public:
 
   protected:
     explicit TileDataAccessor(Channel& channel)
-        : m_channel(&channel) {}
+        : m_channel(&channel)
+        , m_change(channel) {}
 
   private:
     friend class Channel;
     Channel* m_channel;
+    ChannelBase::Change m_change;
   };
 
   template <class TD, class VecIterator, class Reference, class Pointer, class ChannelPointer>

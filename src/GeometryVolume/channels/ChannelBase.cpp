@@ -6,10 +6,22 @@
 
 #include <algorithm>
 #include <iostream>
+#include <vector>
 
 namespace VLN::TileTree3D {
 
 ChannelBase::~ChannelBase() = default;
+
+ChannelBase::Change::Change(ChannelBase const& channel)
+    : m_channel(&channel) {
+  channel.m_gate.beginChange();
+  objectIncomplete(m_channel);
+}
+ChannelBase::Change::~Change() {
+  if (!m_channel) return;
+  objectComplete(m_channel);
+  m_channel->m_gate.endChange();
+}
 
 void ChannelBase::memUse(std::uint64_t& used, std::uint64_t& allocated, bool notShared) const {
   VLN::Component::memUse(used, allocated, notShared);
@@ -52,7 +64,7 @@ void ChannelBase::computePermutation(std::vector<ElementToFrom>& moves, std::vec
                                      bool sorted) const {
   if (!sorted) Internal::sortMoves(moves);
   Internal::groupByDestination(moves, order, tiles, arrivals, [&](std::int64_t tile) {
-    return elementCount(TreeIndex{tile, depth});
+    return tile < tileCount(depth) ? elementCount(TreeIndex{tile, depth}) : 0;
   });
 }
 
@@ -75,33 +87,86 @@ void ChannelBase::updateElementsNoDispatch(std::vector<ElementToFrom> const& mov
                                               nullptr});
 }
 
+namespace {
+
+/// Calls `body(moves, order, tiles, arrivals, depth)` for each destination depth.
+template <class Body> void forEachList(ElementPermutation const& p, Body const& body) {
+  if (p.kind == ElementPermutation::kOneDepth) {
+    body(*p.moves, *p.order, *p.tiles, *p.arrivals, p.firstDepth);
+    return;
+  }
+  std::size_t const n = std::min({p.allMoves->size(), p.allOrders->size(), p.allTiles->size(),
+                                  p.allArrivals->size(), std::size_t(kChannelDepths)});
+  for (std::size_t d = 0; d < n; ++d)
+    body((*p.allMoves)[d], (*p.allOrders)[d], (*p.allTiles)[d], (*p.allArrivals)[d], static_cast<int>(d));
+}
+
+} // namespace
+
 void ChannelBase::updateElementsNoDispatch(ElementPermutation const& p) {
-  auto const forEachList = [&](auto const& body) {
-    if (p.kind == ElementPermutation::kOneDepth) {
-      body(*p.moves, *p.order, *p.tiles, *p.arrivals, p.firstDepth);
-      return;
-    }
-    std::size_t const n = std::min({p.allMoves->size(), p.allOrders->size(), p.allTiles->size(),
-                                    p.allArrivals->size(), std::size_t(kChannelDepths)});
-    for (std::size_t d = 0; d < n; ++d)
-      body((*p.allMoves)[d], (*p.allOrders)[d], (*p.allTiles)[d], (*p.allArrivals)[d], static_cast<int>(d));
-  };
-  // Sources are read by position, so nothing is removed before everything is copied.
-  forEachList([&](auto const& moves, auto const&, auto const& tiles, auto const& arrivals, int d) {
-    allocateElementStorage(tiles, arrivals, moves.size(), d);
+  if (layout().fixedSize()) return;
+  bool canFollow = true;
+  forEachList(p, [&](auto const& moves, auto const&, auto const&, auto const&, int d) {
+    canFollow = canFollow && holdsAll(moves, d);
   });
-  forEachList([&](auto const& moves, auto const& order, auto const& tiles, auto const& arrivals, int d) {
-    copyElements(moves, order, tiles, arrivals, d);
+  if (canFollow)
+    applyMoves(p);
+  else
+    applyHeldMoves(p);
+}
+
+void ChannelBase::applyHeldMoves(ElementPermutation const& p) {
+  ElementMoves moves(kChannelDepths);
+  ElementRemovals ignored;
+  forEachList(p, [&](auto const& all, auto const&, auto const&, auto const&, int d) {
+    if (d < 0 || d >= kChannelDepths) return;
+    std::vector<ElementToFrom> others;
+    for (ElementToFrom const& move : all)
+      (holdsAll({move}, d) ? moves[static_cast<std::size_t>(d)] : others).push_back(move);
+    Internal::addSources(others, ignored);
   });
+  ElementOrder order;
+  DestinationTiles tiles;
+  ArrivalMap arrivals;
+  computePermutation(moves, order, tiles, arrivals, true);
+  ElementPermutation held{ElementPermutation::kAllDepths};
+  held.allMoves = &moves, held.allOrders = &order, held.allTiles = &tiles, held.allArrivals = &arrivals;
+  ElementRemovals removals;
+  if (p.kind == ElementPermutation::kRecorded) {
+    // The record lists the sources of its moves as well: those of moves that are ignored stay.
+    Internal::finishRemovals(ignored);
+    removals = *p.removals;
+    for (std::size_t d = 0; d < std::min(removals.size(), ignored.size()); ++d)
+      std::erase_if(removals[d], [&](ElementInTile const& e) {
+        return std::binary_search(ignored[d].begin(), ignored[d].end(), e);
+      });
+    held.kind = ElementPermutation::kRecorded;
+    held.removals = &removals;
+  }
+  applyMoves(held);
+}
+
+void ChannelBase::applyMoves(ElementPermutation const& p) {
+  // What may fail comes first.
   ElementRemovals collected;
   ElementRemovals const* removals = p.removals;
   if (p.kind != ElementPermutation::kRecorded) {
-    forEachList([&](auto const& moves, auto const&, auto const&, auto const&, int) {
+    forEachList(p, [&](auto const& moves, auto const&, auto const&, auto const&, int) {
       Internal::addSources(moves, collected);
     });
     Internal::finishRemovals(collected);
     removals = &collected;
   }
+  forEachList(p, [&](auto const& moves, auto const&, auto const& tiles, auto const& arrivals, int d) {
+    reserveElementStorage(tiles, arrivals, moves.size(), d);
+  });
+  // Sources are read by position, so nothing is removed before everything is copied.
+  forEachList(p, [&](auto const& moves, auto const&, auto const& tiles, auto const& arrivals, int d) {
+    allocateElementStorage(tiles, arrivals, moves.size(), d);
+  });
+  forEachList(p, [&](auto const& moves, auto const& order, auto const& tiles, auto const& arrivals, int d) {
+    copyElements(moves, order, tiles, arrivals, d);
+  });
   for (std::size_t d = 0; d < removals->size(); ++d) removeElements((*removals)[d], static_cast<int>(d));
 }
 

@@ -1,6 +1,7 @@
 // ChannelBase: a channel without its element type, as objects and the update protocol handle it.
 #pragma once
 
+#include "GeometryVolume/channels/ChangeGate.h"
 #include "GeometryVolume/channels/ChannelTypes.h"
 #include "GeometryVolume/channels/ElementMoves.h"
 #include "GeometryVolume/channels/TileDataElementAccessor.h"
@@ -9,6 +10,7 @@
 
 #include <iosfwd>
 #include <typeindex>
+#include <utility>
 
 namespace VLN::TileTree3D {
 
@@ -58,6 +60,10 @@ public:
 
   using Component::elementCount;
   using Component::update;
+  // Moves of elements. A move from or to a tile that the channel lacks, such as one of a depth outside its
+  // range, does nothing. Channels of fixed size (ChannelLayout::fixedSize) are passed over: each of their
+  // tiles holds what its place asks for, and no element of it is a point's.
+
   /// Moves elements to tiles of depth `first`. The moves are sorted by source unless they are so already. An
   /// element that leaves a tile is replaced by the tile's last one: the order in a tile is not kept.
   void update(std::vector<ElementToFrom>& moves, int first, int last, bool sorted);
@@ -74,7 +80,26 @@ public:
   void computePermutation(ElementMoves& moves, ElementOrder& order, DestinationTiles& tiles,
                           ArrivalMap& arrivals, bool sorted) const;
 
+  /// For owners of handles on a channel that they do not own, such as the pool.
+  ChangeGate& changeGate() const { return m_gate; }
+
 protected:
+  /// Every operation that changes tiles, counts or settings holds one.
+  class VLN_API Change {
+  public:
+    explicit Change(ChannelBase const& channel);
+    Change(Change&& other) noexcept
+        : m_channel(std::exchange(other.m_channel, nullptr)) {}
+    Change& operator=(Change&& other) noexcept {
+      std::swap(m_channel, other.m_channel);
+      return *this;
+    }
+    ~Change();
+
+  private:
+    ChannelBase const* m_channel;
+  };
+
   void updateElementsNoDispatch(std::vector<ElementToFrom> const& moves,
                                 std::vector<std::uint64_t> const& order,
                                 std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals,
@@ -91,6 +116,12 @@ protected:
   /// @pre Sorted by tile and element.
   virtual void removeElements(std::vector<ElementInTile> const& elements, int depth) = 0;
 
+  /// Whether the channel has the source, and the destination tile if there is one, of every move.
+  virtual bool holdsAll(std::vector<ElementToFrom> const& moves, int depth) const = 0;
+  /// Makes sure that allocateElementStorage() does not fail. Changes capacities only.
+  virtual void reserveElementStorage(std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals,
+                                     std::size_t moveCount, int depth) = 0;
+
   void dumpCounts(std::ostream& os) const;
   /// Tells of a deep copy while the logger is on.
   void announceCopy(ChannelBase const& copy) const;
@@ -98,6 +129,14 @@ protected:
   static void addShared(std::uint64_t& used, std::uint64_t& allocated, std::uint64_t dataUsed,
                         std::uint64_t dataAllocated, std::int64_t sharers, bool notShared,
                         void const* storage);
+
+private:
+  /// @pre The channel holds what the moves name.
+  void applyMoves(ElementPermutation const& permutation);
+  /// The moves that the channel can follow; the others do nothing.
+  void applyHeldMoves(ElementPermutation const& permutation);
+
+  mutable ChangeGate m_gate;
 };
 
 } // namespace VLN::TileTree3D

@@ -130,6 +130,12 @@ public:
   bool resizeDepth(int depth, std::int64_t tileCount, int elementCount);
   /// Grows tiles that hold fewer elements than `source` says.
   void growElements(Internal::TileCounts const& source);
+  /// Whether the tiles and elements that the moves to one depth name exist. A negative destination is no
+  /// tile.
+  bool holdsAll(std::vector<ElementToFrom> const& moves, int depth) const;
+  /// Capacity for what arrives in the tiles of one depth.
+  void reserveElements(std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals,
+                       std::size_t moveCount, int depth);
   /// Grows the destination tiles of one depth by what arrives there.
   void allocateElements(std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals,
                         std::size_t moveCount, int depth);

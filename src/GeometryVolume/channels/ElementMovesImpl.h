@@ -6,7 +6,47 @@
 #include "GeometryVolume/channels/TileVectorOps.h"
 #include "GeometryVolume/core/Parallel.h"
 
+#include <algorithm>
+
 namespace VLN::TileTree3D {
+
+template <class T> bool ChannelData<T>::holdsAll(std::vector<ElementToFrom> const& moves, int depth) const {
+  if (moves.empty() || !m_data) return true;
+  if (depth < 0 || depth >= kChannelDepths) return false;
+  auto const destinations = static_cast<std::int64_t>(depthTiles(depth).size());
+  auto const holds = [&](ElementToFrom const& move) {
+    if (move.to >= destinations || move.fromDepth < 0 || move.fromDepth >= kChannelDepths) return false;
+    auto const& sources = depthTiles(move.fromDepth);
+    return move.from >= 0 && move.from < static_cast<std::int64_t>(sources.size()) && move.fromElement >= 0 &&
+           static_cast<std::size_t>(move.fromElement) < sources[static_cast<std::size_t>(move.from)].size();
+  };
+  return parallelReduce(
+      0, static_cast<std::int64_t>(moves.size()), 4096, true,
+      [&](std::int64_t begin, std::int64_t end) {
+        return std::all_of(moves.begin() + begin, moves.begin() + end, holds);
+      },
+      [](bool a, bool b) { return a && b; });
+}
+
+template <class T>
+void ChannelData<T>::reserveElements(std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals,
+                                     std::size_t moveCount, int depth) {
+  if (tiles.empty() || !m_data) return;
+  cloneData();
+  auto& all = depthTiles(depth);
+  auto const plan = Internal::planArrivals(tiles, arrivals, moveCount);
+  ParallelOptions options;
+  options.grain = 64;
+  parallelFor(
+      0, static_cast<std::int64_t>(tiles.size()),
+      [&](std::int64_t begin, std::int64_t end) {
+        for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+          Vector& tile = all[tiles[n]];
+          Internal::growOutOfBlock(tile, tile.size() + plan.count(n));
+        }
+      },
+      options);
+}
 
 template <class T>
 void ChannelData<T>::allocateElements(std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals,
@@ -49,14 +89,16 @@ void ChannelData<T>::copyElements(std::vector<ElementToFrom> const& moves,
 
 template <class T>
 void ChannelData<T>::removeElements(std::vector<ElementInTile> const& elements, int depth) {
-  if (elements.empty() || !m_data) return;
+  if (elements.empty() || !m_data || depth >= kChannelDepths) return;
   cloneData();
   auto& all = depthTiles(depth);
   Internal::forEachTileRun(elements, [&](std::int64_t low, std::int64_t end) {
     auto const position = [&](std::int64_t at) {
       return static_cast<std::size_t>(elements[static_cast<std::size_t>(at)].element);
     };
-    Vector& tile = all[static_cast<std::size_t>(elements[static_cast<std::size_t>(low)].tile)];
+    std::int64_t const index = elements[static_cast<std::size_t>(low)].tile;
+    if (index < 0 || index >= static_cast<std::int64_t>(all.size())) return;
+    Vector& tile = all[static_cast<std::size_t>(index)];
     std::size_t size = tile.size();
     std::int64_t high = end - 1;
     // What the tile does not hold cannot be removed.

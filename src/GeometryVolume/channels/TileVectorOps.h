@@ -60,13 +60,24 @@ template <class T> void resizeVector(TileVector<T>& v, std::size_t n, T value) {
   v.resize(n, value);
 }
 
-/// As resizeVector(), for a vector that must grow: a static one that has no room moves out of its block.
+/// Room for `n` elements in all: a static vector that has none moves out of its block.
+template <class T> void growOutOfBlock(TileVector<T>& v, std::size_t n) {
+  if (n > v.max_size())
+    rebuffer(v, std::max(n, v.capacity() + v.capacity() / 2));
+  else if (n > v.capacity())
+    growCapacity(v, n);
+}
+/// As resizeVector(), for a vector that must grow.
 template <class T> void resizeOutOfBlock(TileVector<T>& v, std::size_t n, T value) {
-  if (n > v.max_size()) rebuffer(v, std::max(n, v.capacity() + v.capacity() / 2));
-  resizeVector(v, n, value);
+  growOutOfBlock(v, n);
+  v.resize(n, value);
 }
 
-/// Brings the capacity down to the size.
-template <class T> void trimVector(TileVector<T>& v) { rebuffer(v, v.size()); }
+/// Brings the capacity down to the size, where there is memory for that.
+template <class T> void trimVector(TileVector<T>& v) {
+  try {
+    rebuffer(v, v.size());
+  } catch (std::bad_alloc const&) {}
+}
 
 } // namespace VLN::TileTree3D::Internal

@@ -107,6 +107,9 @@ protected:
                     std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals,
                     int depth) override;
   void removeElements(std::vector<ElementInTile> const& elements, int depth) override;
+  bool holdsAll(std::vector<ElementToFrom> const& moves, int depth) const override;
+  void reserveElementStorage(std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals,
+                             std::size_t moveCount, int depth) override;
   void remove(int firstDepth, int lastDepth);
 
   std::int64_t treeIndexToIndex(TreeIndex const& tile) const { return m_data->treeIndexToIndex(tile); }

@@ -36,7 +36,7 @@ TypedChannel<T>::TypedChannel(TypedChannel const& other)
 
 template <class T> TypedChannel<T>& TypedChannel<T>::operator=(TypedChannel const& other) {
   if (this == &other) return *this;
-  ObjectChange const change(this);
+  ChannelBase::Change const change(*this);
   ChannelBase::operator=(other);
   pointerDeAllocated(dataPtr(), this);
   m_data = other.m_data;
@@ -54,7 +54,7 @@ template <class T> void TypedChannel<T>::replaceEmptyName() {
 }
 
 template <class T> void TypedChannel<T>::write(FunctionRef<void(ChannelData<T>&)> change) {
-  ObjectChange const accounted(this);
+  ChannelBase::Change const announced(*this);
   void const* const before = dataPtr();
   if (m_data && !m_data.unique()) m_data = Ostil::MutablePtr<ChannelData<T>>(std::move(m_data));
   change(*m_data);
@@ -221,7 +221,7 @@ template <class T> bool TypedChannel<T>::permute(TilePermutation const* newToOld
   return true;
 }
 template <class T> void TypedChannel<T>::updateTilePermuteNoDispatch(TilePermutation const* newToOld) {
-  ObjectChange const accounted(this);
+  ChannelBase::Change const change(*this);
   void const* const before = dataPtr();
   if (m_data && !m_data.unique()) m_data = Ostil::MutablePtr<ChannelData<T>>(std::move(m_data));
   m_data->permuteTiles(*newToOld);
@@ -279,6 +279,14 @@ template <class T>
 void TypedChannel<T>::allocateElementStorage(std::vector<std::uint64_t> const& tiles,
                                              TileArrivals const& arrivals, std::size_t moveCount, int depth) {
   write([&](ChannelData<T>& data) { data.allocateElements(tiles, arrivals, moveCount, depth); });
+}
+template <class T>
+void TypedChannel<T>::reserveElementStorage(std::vector<std::uint64_t> const& tiles,
+                                            TileArrivals const& arrivals, std::size_t moveCount, int depth) {
+  write([&](ChannelData<T>& data) { data.reserveElements(tiles, arrivals, moveCount, depth); });
+}
+template <class T> bool TypedChannel<T>::holdsAll(std::vector<ElementToFrom> const& moves, int depth) const {
+  return m_data->holdsAll(moves, depth);
 }
 template <class T>
 void TypedChannel<T>::copyElements(std::vector<ElementToFrom> const& moves,

@@ -2,38 +2,13 @@
 
 #include "GeometryVolume/channels/ChannelBase.h"
 #include "GeometryVolume/channels/UpdateDispatch.h"
+#include "GeometryVolume/core/TakenComponentImpl.h"
 #include "GeometryVolume/topology/PointTopology.h"
 #include "GeometryVolume/topology/VoxelTopology.h"
-
-#include <utility>
 
 namespace VLN::TileTree3D {
 
 namespace {
-
-/// A component, out of its object for as long as this lives; its key keeps its place.
-class TakenComponent {
-public:
-  TakenComponent(VLN::Object& object, Ostil::String const& name)
-      : m_object(object)
-      , m_name(name) {
-    auto shared = Ostil::staticCast<Component>(object.component(name));
-    object.setProperty(name, Ostil::Any());
-    m_component = Ostil::MutablePtr<Component>(std::move(shared));
-  }
-  ~TakenComponent() {
-    Ostil::Ptr<VLN::Component> component = std::move(m_component);
-    m_object.setProperty(m_name, Ostil::Any(std::move(component)));
-  }
-  TakenComponent(TakenComponent const&) = delete;
-  TakenComponent& operator=(TakenComponent const&) = delete;
-  Component& operator*() { return *m_component; }
-
-private:
-  VLN::Object& m_object;
-  Ostil::String m_name;
-  Ostil::MutablePtr<Component> m_component;
-};
 
 /// A channel of the topology that may hold a different number of elements in each tile; null without one.
 Ostil::Ptr<ChannelBase> pointChannel(Component const& topology, VLN::Object const& object) {
@@ -56,7 +31,7 @@ void updateTopologies(Container<TraitsT> const& tree, VLN::Object& object, TileR
     if (!points && !object.component<VoxelTopology<TraitsT>>(name)) continue;
     if (object.component(name)->getTargetName() != tree.name() || (except && except->name() == name))
       continue;
-    TakenComponent taken(object, name);
+    VLN::Internal::TakenComponent<Component> const taken(object, name);
     Component& topology = *taken;
     topology.update(tree);
     if (!removed) {

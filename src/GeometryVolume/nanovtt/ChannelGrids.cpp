@@ -1,6 +1,6 @@
-#include "GeometryVolume/nanovtt/ChannelGrids.h"
+#include "GeometryVolume/nanovtt/ChannelGridsImpl.h"
 
-#include "GeometryVolume/nanovtt/Checksum.h"
+#include "GeometryVolume/nanovtt/ChecksumImpl.h"
 
 #include <algorithm>
 #include <cfloat>

@@ -1,4 +1,4 @@
-#include "GeometryVolume/nanovtt/Checksum.h"
+#include "GeometryVolume/nanovtt/ChecksumImpl.h"
 
 #include "GeometryVolume/core/Parallel.h"
 

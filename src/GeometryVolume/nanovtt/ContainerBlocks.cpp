@@ -3,7 +3,7 @@
 //   head        f = 2: all 8 children, and all 64 below those           number, entry, child cube
 //   children    f = 1                                                   nothing
 //   bottom      f = 0: hold the samples, and may have children          samples in the block
-#include "GeometryVolume/nanovtt/ContainerLayout.h"
+#include "GeometryVolume/nanovtt/ContainerLayoutImpl.h"
 
 #include <algorithm>
 

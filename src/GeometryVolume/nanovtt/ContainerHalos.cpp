@@ -1,7 +1,7 @@
 // Which tiles are stored with a halo. One lets a reader blend inside the tile without a look at its
 // neighbours, and costs nearly twice the memory: a tile needs it where a neighbour on the high side is
 // coarser; within the fraction asked for, coarse tiles keep theirs.
-#include "GeometryVolume/nanovtt/ContainerLayout.h"
+#include "GeometryVolume/nanovtt/ContainerLayoutImpl.h"
 
 #include <algorithm>
 

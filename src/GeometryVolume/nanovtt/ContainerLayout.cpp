@@ -1,4 +1,4 @@
-#include "GeometryVolume/nanovtt/ContainerLayout.h"
+#include "GeometryVolume/nanovtt/ContainerLayoutImpl.h"
 
 #include "GeometryVolume/channels/Channel.h"
 

@@ -1,5 +1,5 @@
 // Two buffers beside the main one: where each tile lies, and who its neighbours are.
-#include "GeometryVolume/nanovtt/ContainerLayout.h"
+#include "GeometryVolume/nanovtt/ContainerLayoutImpl.h"
 
 namespace nanovtt::Internal {
 

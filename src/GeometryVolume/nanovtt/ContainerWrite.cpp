@@ -1,5 +1,5 @@
 // Writing the container section that was planned.
-#include "GeometryVolume/nanovtt/ContainerLayout.h"
+#include "GeometryVolume/nanovtt/ContainerLayoutImpl.h"
 
 #include <algorithm>
 #include <cstring>

@@ -1,6 +1,6 @@
-#include "GeometryVolume/nanovtt/Conversion.h"
+#include "GeometryVolume/nanovtt/ConversionImpl.h"
 
-#include "GeometryVolume/nanovtt/ChannelGrids.h"
+#include "GeometryVolume/nanovtt/ChannelGridsImpl.h"
 
 #include <optional>
 

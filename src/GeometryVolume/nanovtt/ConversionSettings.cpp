@@ -1,4 +1,4 @@
-#include "GeometryVolume/nanovtt/ConversionSettings.h"
+#include "GeometryVolume/nanovtt/ConversionSettingsImpl.h"
 
 #include <algorithm>
 #include <cmath>

@@ -1,11 +1,11 @@
-#include "GeometryVolume/nanovtt/GridElements.h"
+#include "GeometryVolume/nanovtt/GridElementsImpl.h"
 
 #include "GeometryVolume/channels/Channel.h"
 #include "GeometryVolume/channels/ElementTraits.h"
 #include "GeometryVolume/channels/EraseTilesImpl.h"
 #include "GeometryVolume/channels/NonLeafValues.h"
 #include "GeometryVolume/core/ElementTypes.h"
-#include "GeometryVolume/nanovtt/GridVisitor.h"
+#include "GeometryVolume/nanovtt/GridVisitorImpl.h"
 #include "GeometryVolume/pools/ChannelPool.h"
 
 #include <algorithm>

@@ -1,4 +1,4 @@
-#include "GeometryVolume/nanovtt/GridVisitor.h"
+#include "GeometryVolume/nanovtt/GridVisitorImpl.h"
 
 #include <algorithm>
 #include <bit>

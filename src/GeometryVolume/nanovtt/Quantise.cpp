@@ -1,4 +1,4 @@
-#include "GeometryVolume/nanovtt/Quantise.h"
+#include "GeometryVolume/nanovtt/QuantiseImpl.h"
 
 #include "Reader/NanoVTTFormat.h"
 

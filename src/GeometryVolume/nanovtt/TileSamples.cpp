@@ -1,4 +1,4 @@
-#include "GeometryVolume/nanovtt/TileSamples.h"
+#include "GeometryVolume/nanovtt/TileSamplesImpl.h"
 
 #include <cstring>
 

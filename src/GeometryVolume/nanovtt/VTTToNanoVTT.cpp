@@ -1,6 +1,6 @@
 #include "GeometryVolume/nanovtt/VTTToNanoVTT.h"
 
-#include "GeometryVolume/nanovtt/Conversion.h"
+#include "GeometryVolume/nanovtt/ConversionImpl.h"
 
 #include <algorithm>
 #include <type_traits>

@@ -76,10 +76,17 @@ private:
   std::uint64_t rank(std::size_t store, Entry const& entry) const override {
     return kKinds[store].capacity(entry.get());
   }
-  std::uint64_t bytes(std::size_t store, Entry const& entry) const override {
-    return rank(store, entry) * kKinds[store].elementSize;
+  /// An array tells nobody that it is being changed: beside a holder it cannot be measured.
+  bool measure(std::size_t store, Entry const& entry, bool inUse, Measure& result) const override {
+    if (inUse) return false;
+    result.bytes = rank(store, entry) * kKinds[store].elementSize;
+    result.elements = kKinds[store].size(entry.get());
+    return true;
   }
-  std::string describe(std::size_t store, Entry const& entry) const override;
+  void glance(std::size_t store, Entry const& entry, Measure& result) const override {
+    measure(store, entry, false, result);
+  }
+  std::string describe(std::size_t store, Held const& held) const override;
   bool enoughAfterTry(Need const& need) const override;
   bool enoughFromPartner(Need const& need) const override;
   char const* availableLabel() const override { return " Available = "; }
@@ -97,8 +104,8 @@ RecyclingPool::Entry Pool::allocate(std::size_t store, std::uint64_t n, void con
   Stats stats{};
   bool const statsRead = m_requiredFreeEnabled && getMemoryStats(stats);
 
-  Entry array = bestFit(store, n, [&](Entry const& entry) {
-    log("Cannot re-use array because use_count = ", entry.useCount());
+  Entry array = bestFit(store, n, [&](Held const& held) {
+    log("Cannot re-use array because use_count = ", held.entry.useCount());
   });
   std::uint64_t const held = array ? kind.capacity(array.get()) : 0;
   std::uint64_t capacity = array && held >= n ? held : capacityFor(n);
@@ -118,7 +125,7 @@ RecyclingPool::Entry Pool::allocate(std::size_t store, std::uint64_t n, void con
                ", in_elementCount = ", n, ", capacity = ", held);
     }
     kind.refill(array.get(), capacity, n, value);
-    if (!intoPool) removeEntry(store, array);
+    settle(store, array, intoPool);
   } else {
     array = makeNew(store, capacity, n, value, intoPool);
   }
@@ -136,7 +143,7 @@ RecyclingPool::Entry Pool::makeNew(std::size_t store, std::uint64_t capacity, st
                                    void const* value, bool intoPool) {
   ElementKind const& kind = kKinds[store];
   Entry array = kind.make(capacity, n, value);
-  if (intoPool) m_stores[store].append(array);
+  settle(store, array, intoPool);
   if (logging()) {
     log(" Creating new array ", array.get(), " of type Ostil::Array<", kind.name, ">, and of size ",
         toMB(n * kind.elementSize), "MB and capacity ", toMB(kind.capacity(array.get()) * kind.elementSize),
@@ -147,11 +154,11 @@ RecyclingPool::Entry Pool::makeNew(std::size_t store, std::uint64_t capacity, st
   return array;
 }
 
-std::string Pool::describe(std::size_t store, Entry const& entry) const {
+std::string Pool::describe(std::size_t store, Held const& held) const {
   ElementKind const& kind = kKinds[store];
   std::ostringstream line;
-  line << entry.get() << ": Array<" << kind.name << ">: " << toMB(kind.size(entry.get()) * kind.elementSize)
-       << "MB, use_count = " << entry.useCount() << ")";
+  line << held.entry.get() << ": Array<" << kind.name << ">: " << toMB(held.seen.elements * kind.elementSize)
+       << "MB, use_count = " << held.entry.useCount() << ")";
   return line.str();
 }
 

@@ -71,7 +71,7 @@ VLN_API std::uint64_t freeStoreSize();
 /// Number of arrays in use; 0 while the pool is off.
 VLN_API std::uint64_t usedStoreSize();
 /// Writes what the pool holds to standard output; nothing while the pool is off.
-/// @pre As allocatedMemory().
+/// @threads Holders may change their arrays meanwhile: one in use is listed as it was handed out.
 VLN_API void dump();
 
 /// Capacity that a new or grown array for `elementCount` elements gets: a power of two.

@@ -36,17 +36,21 @@ private:
   std::uint64_t rank(std::size_t, Entry const& entry) const override {
     return static_cast<std::uint64_t>(channelOf(entry).tileCount(-1));
   }
-  std::uint64_t bytes(std::size_t, Entry const& entry) const override {
-    std::uint64_t used = 0, allocated = 0;
-    channelOf(entry).memUse(used, allocated, false);
-    return allocated;
+  bool measure(std::size_t store, Entry const& entry, bool inUse, Measure& result) const override;
+  void glance(std::size_t, Entry const& entry, Measure& result) const override {
+    readDepths(channelOf(entry), result);
+    if (logging()) result.elements = channelOf(entry).size();
   }
-  std::string describe(std::size_t store, Entry const& entry) const override;
+  std::string describe(std::size_t store, Held const& held) const override;
   bool enoughAfterTry(Need const& need) const override;
   bool enoughFromPartner(Need const& need) const override;
   char const* availableLabel() const override { return " Available physical and pool (minus required) = "; }
   char const* totalLabel() const override { return ":Total allocated memory:"; }
 
+  static void readDepths(ChannelBase const& channel, Measure& result) {
+    result.minDepth = channel.minDepth();
+    result.depth = channel.depth();
+  }
   void logRequest(ChannelKind const& kind, Request const& request) const;
   bool checkMemory(Stats const& stats, ChannelKind const& kind, std::uint64_t n, Entry const& best);
   void reconfigure(ChannelKind const& kind, Request const& request, ChannelBase& channel) const;
@@ -102,10 +106,13 @@ Ostil::Ptr<ChannelBase> Pool::allocate(ChannelKind const& kind, Request const& r
   Stats stats{};
   bool const statsRead = m_requiredFreeEnabled && getMemoryStats(stats);
 
-  Entry entry = bestFit(store, r.tileCount, [&](Entry const& e) {
-    log("Cannot re-use channel because use_count = ", e.useCount(), ", ptr->depth() = ", channelOf(e).depth(),
-        ", in_maxDepth = ", r.depth, ", ptr->minDepth() = ", channelOf(e).minDepth(),
-        ", in_minDepth = ", r.minDepth);
+  Entry entry = bestFit(store, r.tileCount, [&](Held const& held) {
+    if (!logging()) return;
+    if (ChangeGate::Measurement const gate(channelOf(held.entry).changeGate()); gate)
+      readDepths(channelOf(held.entry), held.seen);
+    log("Cannot re-use channel because use_count = ", held.entry.useCount(),
+        ", ptr->depth() = ", held.seen.depth, ", in_maxDepth = ", r.depth,
+        ", ptr->minDepth() = ", held.seen.minDepth, ", in_minDepth = ", r.minDepth);
   });
 
   bool intoPool = true;
@@ -116,12 +123,11 @@ Ostil::Ptr<ChannelBase> Pool::allocate(ChannelKind const& kind, Request const& r
 
   if (entry) {
     reconfigure(kind, r, channelOf(entry));
-    if (!intoPool) removeEntry(store, entry);
   } else {
     entry = kind.make(r.defaultValue, r.useStaticAllocation, r.callElementConstructor, r.minDepth, r.depth);
-    if (intoPool) m_stores[store].append(entry);
     log(" Creating channel ", entry.get());
   }
+  settle(store, entry, intoPool);
   log(" Inserting into pool = ", intoPool);
   countHandOut(entry.get());
   if (logging()) {
@@ -133,13 +139,24 @@ Ostil::Ptr<ChannelBase> Pool::allocate(ChannelKind const& kind, Request const& r
   return Ostil::staticCast<ChannelBase>(entry);
 }
 
-std::string Pool::describe(std::size_t store, Entry const& entry) const {
-  ChannelKind const& kind = *m_kinds[store];
+/// A channel in use is measured as an idle one, unless its holder changes it at this moment.
+bool Pool::measure(std::size_t, Entry const& entry, bool, Measure& result) const {
   ChannelBase const& channel = channelOf(entry);
+  ChangeGate::Measurement const gate(channel.changeGate());
+  if (!gate) return false;
+  std::uint64_t used = 0;
+  channel.memUse(used, result.bytes, false);
+  result.elements = channel.size();
+  readDepths(channel, result);
+  return true;
+}
+
+std::string Pool::describe(std::size_t store, Held const& held) const {
+  ChannelKind const& kind = *m_kinds[store];
   std::ostringstream line;
   line << "ChannelPool:Channel<" << kind.typeName << ", " << kind.E << ", " << kind.H << ">("
-       << channel.minDepth() << ", " << channel.depth() << ", #" << channel.size() << ", "
-       << toMB(channel.size()) << "MB, use_count = " << entry.useCount() << ")";
+       << held.seen.minDepth << ", " << held.seen.depth << ", #" << held.seen.elements << ", "
+       << toMB(held.seen.elements) << "MB, use_count = " << held.entry.useCount() << ")";
   return line.str();
 }
 

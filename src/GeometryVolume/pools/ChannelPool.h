@@ -63,8 +63,8 @@ VLN_API std::uint64_t requiredFreeSize();
 VLN_API void enableRequiredFreeSize();
 VLN_API void disableRequiredFreeSize();
 
-/// What all channels hold, idle or not; 0 while the pool is off.
-/// @pre Holders of channels do not change them meanwhile.
+/// What all channels hold, idle or not; 0 while the pool is off. A channel that is being changed at that
+/// moment counts with what it held when it was last measured.
 VLN_API std::uint64_t allocatedMemory();
 /// Free physical memory and what idle channels hold, less the required size when that is on; 0 while the pool
 /// is off.
@@ -82,7 +82,6 @@ VLN_API std::uint64_t freeStoreSize();
 /// Number of channels in use; 0 while the pool is off.
 VLN_API std::uint64_t usedStoreSize();
 /// Writes what the pool holds to standard output; nothing while the pool is off.
-/// @pre As allocatedMemory().
 VLN_API void dump();
 
 } // namespace VLN::TileTree3D::ChannelPool

@@ -1,5 +1,6 @@
 #include "GeometryVolume/pools/RecyclingPoolImpl.h"
 
+#include <algorithm>
 #include <chrono>
 #include <limits>
 #include <utility>
@@ -145,14 +146,28 @@ void RecyclingPool::freeRequiredMemory() {
 
 template <class Visit> void RecyclingPool::forEachEntry(Visit const& visit) const {
   for (std::size_t s = 0; s < m_stores.size(); ++s)
-    for (Entry const& entry : m_stores[s]) visit(s, entry);
+    for (Held const& held : m_stores[s]) visit(s, held);
+}
+
+RecyclingPool::Measure const& RecyclingPool::look(std::size_t store, Held const& held) const {
+  measure(store, held.entry, !isIdle(held.entry), held.seen);
+  return held.seen;
+}
+std::uint64_t RecyclingPool::knownMemory() const {
+  std::uint64_t sum = 0;
+  forEachEntry([&](std::size_t s, Held const& held) { sum += look(s, held).bytes; });
+  return sum;
 }
 
 std::uint64_t RecyclingPool::allocatedMemory() const {
   if (!m_enabled) return 0;
   std::lock_guard const lock(mutex());
   std::uint64_t sum = 0;
-  forEachEntry([&](std::size_t s, Entry const& entry) { sum += bytes(s, entry); });
+  forEachEntry([&](std::size_t s, Held const& held) {
+    Measure now = held.seen;
+    measure(s, held.entry, false, now);
+    sum += now.bytes;
+  });
   return sum;
 }
 
@@ -161,8 +176,8 @@ std::uint64_t RecyclingPool::availableMemory() const {
   Stats stats{};
   std::uint64_t sum = getMemoryStats(stats) ? stats.availablePhysical : 0;
   std::lock_guard const lock(mutex());
-  forEachEntry([&](std::size_t s, Entry const& entry) {
-    if (isIdle(entry)) sum += bytes(s, entry);
+  forEachEntry([&](std::size_t s, Held const& held) {
+    if (isIdle(held.entry)) sum += look(s, held).bytes;
   });
   return m_requiredFreeEnabled ? sum - std::min(sum, m_requiredFreeSize) : sum;
 }
@@ -190,7 +205,7 @@ std::uint64_t RecyclingPool::countEntries(bool idle) const {
   std::lock_guard const lock(mutex());
   std::uint64_t count = 0;
   if (m_enabled)
-    forEachEntry([&](std::size_t, Entry const& entry) { count += isIdle(entry) == idle ? 1 : 0; });
+    forEachEntry([&](std::size_t, Held const& held) { count += isIdle(held.entry) == idle ? 1 : 0; });
   return count;
 }
 std::uint64_t RecyclingPool::freeStoreSize() const { return countEntries(true); }
@@ -199,12 +214,13 @@ std::uint64_t RecyclingPool::usedStoreSize() const { return countEntries(false);
 // Handing out
 
 RecyclingPool::Entry RecyclingPool::bestFit(std::size_t store, std::uint64_t n,
-                                            FunctionRef<void(Entry const&)> skipped) const {
+                                            FunctionRef<void(Held const&)> skipped) const {
   Entry const* best = nullptr;
   std::uint64_t c = 0;
-  for (Entry const& entry : m_stores[store]) {
+  for (Held const& held : m_stores[store]) {
+    Entry const& entry = held.entry;
     if (!isIdle(entry)) {
-      skipped(entry);
+      skipped(held);
     } else {
       std::uint64_t const e = rank(store, entry);
       bool const better =
@@ -215,14 +231,20 @@ RecyclingPool::Entry RecyclingPool::bestFit(std::size_t store, std::uint64_t n,
   return best ? *best : nullptr;
 }
 
-void RecyclingPool::removeEntry(std::size_t store, Entry const& entry) {
+void RecyclingPool::settle(std::size_t store, Entry const& entry, bool intoPool) {
   Store& entries = m_stores[store];
-  for (Entry& e : entries) {
-    if (!(e == entry)) continue;
-    e.swap(entries.back());
-    entries.removeLast();
-    return;
+  auto at =
+      std::find_if(entries.begin(), entries.end(), [&](Held const& held) { return held.entry == entry; });
+  if (!intoPool) {
+    if (at == entries.end()) return;
+    std::swap(*at, entries.back());
+    return entries.removeLast();
   }
+  if (at == entries.end()) {
+    entries.append({entry});
+    at = entries.end() - 1;
+  }
+  glance(store, entry, at->seen);
 }
 
 bool RecyclingPool::needsRoom(Stats const& stats, std::uint64_t extra) const {
@@ -240,8 +262,8 @@ void RecyclingPool::countHandOut(void const* address) { m_lastHandOut[address] =
 
 template <class Keep> void RecyclingPool::keepEntries(Store& store, Keep const& keep) {
   Store kept;
-  for (Entry& entry : store)
-    if (keep(entry)) kept.append(std::move(entry));
+  for (Held& held : store)
+    if (keep(held.entry)) kept.append(std::move(held));
   store.swap(kept);
 }
 
@@ -279,8 +301,8 @@ void RecyclingPool::freeMemory(std::uint64_t bytes) {
 
 std::multimap<std::uint64_t, void const*> RecyclingPool::idleEntries() const {
   std::multimap<std::uint64_t, void const*> idle;
-  forEachEntry([&](std::size_t s, Entry const& entry) {
-    if (isIdle(entry)) idle.emplace(bytes(s, entry), entry.get());
+  forEachEntry([&](std::size_t s, Held const& held) {
+    if (isIdle(held.entry)) idle.emplace(look(s, held).bytes, held.entry.get());
   });
   return idle;
 }
@@ -350,7 +372,7 @@ void RecyclingPool::logFreeAndRequired(Stats const& stats, Need const& need) con
 }
 
 void RecyclingPool::logAmounts() const {
-  log(" Allocated = ", toMB(allocatedMemory()), "MB");
+  log(" Allocated = ", toMB(knownMemory()), "MB");
   log(availableLabel(), toMB(availableMemory()), "MB");
   log(" Available physical = ", toMB(availablePhysicalMemory()), "MB");
 }
@@ -392,9 +414,9 @@ void RecyclingPool::dump() const {
   auto const rule = [&] { writeLine(m_name, ":========================"); };
   rule();
   writeLine(m_name, ":Content of ", m_kind == Kind::kArrays ? "array" : "channel", " pool:");
-  writeLine(m_name, totalLabel(), toMB(allocatedMemory()), "MB");
+  writeLine(m_name, totalLabel(), toMB(knownMemory()), "MB");
   rule();
-  forEachEntry([&](std::size_t s, Entry const& entry) { writeLine(describe(s, entry)); });
+  forEachEntry([&](std::size_t s, Held const& held) { writeLine(describe(s, held)); });
   rule();
 }
 

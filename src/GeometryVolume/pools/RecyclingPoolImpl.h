@@ -69,7 +69,19 @@ public:
 
 protected:
   using Stats = PoolUtils::MemoryStats;
-  using Store = Ostil::Array<Entry>;
+
+  /// What the pool says of an entry.
+  struct Measure {
+    std::uint64_t bytes = 0; ///< Held, whether used or not.
+    std::uint64_t elements = 0;
+    int minDepth = 0, depth = 0;
+  };
+  struct Held {
+    Entry entry;
+    /// From the last time that it could be measured: beside a holder who changes it nobody else may look.
+    mutable Measure seen{};
+  };
+  using Store = Ostil::Array<Held>;
 
   /// What freeMemory() is after: `requested` bytes more than there were before.
   struct Need {
@@ -87,11 +99,14 @@ protected:
   RecyclingPool(Kind kind, char const* name, char const* noun, std::size_t storeCount);
   ~RecyclingPool() = default;
 
-  /// Bytes that an entry holds, whether it uses them or not.
-  virtual std::uint64_t bytes(std::size_t store, Entry const& entry) const = 0;
+  /// @return false, and nothing written, when the entry cannot be measured beside its holder.
+  virtual bool measure(std::size_t store, Entry const& entry, bool inUse, Measure& result) const = 0;
+  /// What shall be known of an entry that is about to be handed out; cheap.
+  virtual void glance(std::size_t store, Entry const& entry, Measure& result) const = 0;
   /// What best fit compares with the request.
   virtual std::uint64_t rank(std::size_t store, Entry const& entry) const = 0;
-  virtual std::string describe(std::size_t store, Entry const& entry) const = 0;
+  /// From the last measurement.
+  virtual std::string describe(std::size_t store, Held const& held) const = 0;
   /// Whether enough is free, after a try of freeMemory() has dropped entries.
   virtual bool enoughAfterTry(Need const& need) const = 0;
   /// Last resort of freeMemory(): asks the other pool.
@@ -104,9 +119,10 @@ protected:
 
   /// The idle entry that serves a request of `n` best, null for none. Held by the caller it is no longer
   /// idle: making room does not drop it.
-  Entry bestFit(std::size_t store, std::uint64_t n, FunctionRef<void(Entry const&)> skipped) const;
-  /// Moves the last entry of the store into the place of this one.
-  void removeEntry(std::size_t store, Entry const& entry);
+  Entry bestFit(std::size_t store, std::uint64_t n, FunctionRef<void(Held const&)> skipped) const;
+  /// An entry is about to be handed out, new or from the store. Outside the pool it leaves the store, the
+  /// last entry taking its place; else the pool takes a last look that needs no regard for a holder.
+  void settle(std::size_t store, Entry const& entry, bool intoPool);
   /// Makes sure that `extra` more bytes leave the required size free.
   /// @return false when they do not, and could not be made to.
   bool makeRoom(Stats const& stats, std::uint64_t extra);
@@ -143,6 +159,10 @@ private:
   template <class Keep> static void keepEntries(Store& store, Keep const& keep);
   template <class Visit> void forEachEntry(Visit const& visit) const;
   std::uint64_t countEntries(bool idle) const;
+  /// Measures again what can be measured.
+  Measure const& look(std::size_t store, Held const& held) const;
+  /// As allocatedMemory(), beside holders who change what they hold.
+  std::uint64_t knownMemory() const;
   void logAmounts() const;
   void logOutcome(bool success, Need const& need) const;
 

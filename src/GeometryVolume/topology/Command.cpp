@@ -1,5 +1,7 @@
 #include "GeometryVolume/topology/Command.h"
 
+#include "GeometryVolume/core/TakenComponentImpl.h"
+
 namespace VLN::TileTree3D::Command {
 
 template <int kTW, int kTDW, int A>
@@ -37,6 +39,11 @@ Ostil::Ptr<Topology> attach(Ostil::Ptr<Topology> topology, ContainerT const& con
   return topology;
 }
 
+template <class TraitsT> bool isChannelOf(Ostil::Ptr<ChannelBase> const& channel) {
+  return channel && channel->layout().tileDataWidth == TraitsT::kTileDataWidth &&
+         channel->layout().maxDepth == TraitsT::kMaxDepth;
+}
+
 } // namespace
 
 template <int kTW, int kTDW, int A>
@@ -66,12 +73,12 @@ void initializeTileData(Container<TraitsT> const& container,
     }
   }
   for (auto const& name : object.componentRange()) {
-    auto channel = object.extractComponent<ChannelBase>(name);
-    if (!channel) continue;
-    int const last = std::min(channel->depth(), TraitsT::kMaxDepth);
-    for (int d = std::max(channel->minDepth(), 0); d <= last; ++d)
-      channel->fillTiles(d, tiles[static_cast<std::size_t>(d)]);
-    object.putComponent(std::move(channel));
+    if (!isChannelOf<TraitsT>(object.component<ChannelBase>(name))) continue;
+    VLN::Internal::TakenComponent<ChannelBase> const taken(object, name);
+    ChannelBase& channel = *taken;
+    int const last = std::min(channel.depth(), TraitsT::kMaxDepth);
+    for (int d = std::max(channel.minDepth(), 0); d <= last; ++d)
+      channel.fillTiles(d, tiles[static_cast<std::size_t>(d)]);
   }
 }
 

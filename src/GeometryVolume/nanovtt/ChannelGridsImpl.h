@@ -2,7 +2,7 @@
 // then filled in place.
 #pragma once
 
-#include "GeometryVolume/nanovtt/GridElements.h"
+#include "GeometryVolume/nanovtt/GridElementsImpl.h"
 #include "GeometryVolume/topology/VoxelTopology.h"
 #include "GeometryVolume/utils/ChannelParser.h"
 

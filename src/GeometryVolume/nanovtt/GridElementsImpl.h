@@ -3,7 +3,7 @@
 
 #include "GeometryVolume/channels/ChannelBase.h"
 #include "GeometryVolume/core/Object.h"
-#include "GeometryVolume/nanovtt/GridTask.h"
+#include "GeometryVolume/nanovtt/GridTaskImpl.h"
 #include "GeometryVolume/topology/VoxelOffsetType.h"
 
 #include <span>

@@ -6,7 +6,7 @@
 // A sample reads as minimum + code * quantum.
 #pragma once
 
-#include "GeometryVolume/nanovtt/ConversionSettings.h"
+#include "GeometryVolume/nanovtt/ConversionSettingsImpl.h"
 
 #include <array>
 

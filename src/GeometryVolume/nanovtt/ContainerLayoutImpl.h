@@ -8,7 +8,7 @@
 #pragma once
 
 #include "GeometryVolume/core/Object.h"
-#include "GeometryVolume/nanovtt/ConversionSettings.h"
+#include "GeometryVolume/nanovtt/ConversionSettingsImpl.h"
 #include "Reader/NanoVTTFormat.h"
 
 #include <array>

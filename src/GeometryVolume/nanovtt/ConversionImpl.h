@@ -2,7 +2,7 @@
 #pragma once
 
 #include "GeometryVolume/core/Object.h"
-#include "GeometryVolume/nanovtt/ConversionSettings.h"
+#include "GeometryVolume/nanovtt/ConversionSettingsImpl.h"
 
 namespace nanovtt::Internal {
 

@@ -5,7 +5,7 @@
 #pragma once
 
 #include "GeometryVolume/channels/TileData.h"
-#include "GeometryVolume/nanovtt/TileSamples.h"
+#include "GeometryVolume/nanovtt/TileSamplesImpl.h"
 
 namespace nanovdb {
 class Fp4;

@@ -3,8 +3,8 @@
 #pragma once
 
 #include "GeometryVolume/channels/ElementOps.h"
-#include "GeometryVolume/nanovtt/ContainerLayout.h"
-#include "GeometryVolume/nanovtt/Quantise.h"
+#include "GeometryVolume/nanovtt/ContainerLayoutImpl.h"
+#include "GeometryVolume/nanovtt/QuantiseImpl.h"
 
 namespace nanovtt::Internal {
 

@@ -2,7 +2,7 @@
 #pragma once
 
 #include "GeometryVolume/channels/HaloDriver.h"
-#include "GeometryVolume/nanovtt/GridTask.h"
+#include "GeometryVolume/nanovtt/GridTaskImpl.h"
 
 #include <memory>
 

@@ -1,0 +1,152 @@
+// Flat buffers beside NanoVDB's own conversion of the same grids in the same run:
+//
+//   flatten    a volume into one buffer, no halos, no checksum, the box of what is active; GB/s are those of
+//              the output. NanoVDB's "openToNanoVDB" with StatsMode::BBox and no checksum does the same work
+//   memcpy     the same number of bytes, into memory that is mapped anew like that of a new buffer
+//   validate   of the whole buffer before it is trusted
+//   read       a million active voxels through the flat buffer, leaf by leaf or at random; an item is a voxel
+//
+// "bytes a voxel" counts active voxels; "error" is the largest difference of any active voxel.
+#include "BenchGrids.h"
+#include "GeometryVolume/channels/Channel.h"
+#include "GeometryVolume/core/Parallel.h"
+#include "GeometryVolume/nanovtt/VTTToNanoVTT.h"
+
+#include <benchmark/benchmark.h>
+
+#include <cstdlib>
+#include <cstring>
+
+#include <nanovdb/util/OpenToNanoVDB.h>
+
+namespace {
+
+using namespace VLN;
+
+struct Subject {
+  std::string name;
+  openvdb::FloatGrid::Ptr grid;
+  Interop::VdbImport content;
+  std::int64_t voxels = 0;
+  int rootLevel = 0;
+
+  explicit Subject(Bench::BenchGrid const& source)
+      : name(source.name)
+      , grid(source.grid)
+      , content(Bench::importGrid(source.grid)) {
+    using Tree = TileTree3D::Container<TileTree3D::PowerOfTwoTraits>;
+    voxels = static_cast<std::int64_t>(grid->activeVoxelCount());
+    auto const tree = content.volumes.at(0).object->component<Tree>(Interop::kVdbContainerName);
+    rootLevel = Tree::kMaxDepth - tree->cbeginRoots()->second.depth;
+  }
+  Object const& object() const { return *content.volumes.at(0).object; }
+  std::string const& channel() const { return content.volumes.at(0).channels.at(0).name; }
+};
+
+template <class BuildT>
+nanovtt::GridHandle<nanovtt::AlignedHostBuffer> flatten(Subject const& subject, float halo = 0) {
+  nanovtt::AlignedHostBuffer const pool;
+  return nanovtt::vttToNanoVTT<nanovtt::AlignedHostBuffer, BuildT, nanovdb::AbsDiff, true>(
+      subject.object(), subject.channel(), nanovdb::StatsMode::Disable, nanovdb::ChecksumMode::Disable, 0,
+      -1.0f, false, halo, subject.rootLevel, 0, false, false, false, 1, false, false, 0.0f, false, false,
+      nullptr, nullptr, nullptr, pool);
+}
+
+template <class BuildT> nanovdb::GridHandle<nanovdb::HostBuffer> nanoFlatten(Subject const& subject) {
+  using NanoBuild = std::conditional_t<std::is_void_v<BuildT>, float, BuildT>;
+  nanovdb::OpenToNanoVDB<float, NanoBuild> convert;
+  return convert(*subject.grid, nanovdb::StatsMode::BBox, nanovdb::ChecksumMode::Disable, 0);
+}
+
+void report(benchmark::State& state, Subject const& subject, std::uint64_t size) {
+  state.SetBytesProcessed(static_cast<std::int64_t>(size) * static_cast<std::int64_t>(state.iterations()));
+  state.counters["bytes a voxel"] = double(size) / double(subject.voxels);
+  state.counters["MB"] = double(size) / 1e6;
+}
+
+template <class BuildT>
+void oursBench(benchmark::State& state, Subject const* subject, int threads, float halo) {
+  std::uint64_t size = 0;
+  withThreads(threads, [&] {
+    for (auto _ : state) {
+      auto const flat = flatten<BuildT>(*subject, halo);
+      size = flat.size();
+    }
+  });
+  report(state, *subject, size);
+}
+
+template <class BuildT> void nanoBench(benchmark::State& state, Subject const* subject, int threads) {
+  std::uint64_t size = 0;
+  withThreads(threads, [&] {
+    for (auto _ : state) {
+      auto const flat = nanoFlatten<BuildT>(*subject);
+      size = flat.size();
+    }
+  });
+  report(state, *subject, size);
+}
+
+void memcpyBench(benchmark::State& state, Subject const* subject, int threads) {
+  auto const flat = flatten<void>(*subject);
+  std::uint64_t const size = flat.size();
+  constexpr std::int64_t kPiece = 1 << 20;
+  withThreads(threads, [&] {
+    for (auto _ : state) {
+      auto* const copy = static_cast<std::uint8_t*>(std::aligned_alloc(32, size - size % 32 + 32));
+      parallelFor(0, static_cast<std::int64_t>(size),
+                  [&](std::int64_t begin, std::int64_t end) {
+                    std::memcpy(copy + begin, flat.data() + begin, static_cast<std::size_t>(end - begin));
+                  },
+                  {.grain = kPiece});
+      benchmark::DoNotOptimize(copy);
+      std::free(copy);
+    }
+  });
+  report(state, *subject, size);
+}
+
+template <class BuildT> void addBuild(std::string const& build, Subject const* subject) {
+  for (int threads : {1, 2}) {
+    std::string const tail = build + "/threads:" + std::to_string(threads);
+    benchmark::RegisterBenchmark((subject->name + "/flatten/NanoVDB " + tail).c_str(), nanoBench<BuildT>,
+                                 subject, threads)
+        ->Unit(benchmark::kMillisecond)
+        ->UseRealTime();
+    benchmark::RegisterBenchmark((subject->name + "/flatten/ours " + tail).c_str(), oursBench<BuildT>,
+                                 subject, threads, 0.0f)
+        ->Unit(benchmark::kMillisecond)
+        ->UseRealTime();
+  }
+}
+
+void addAll(Subject const* subject) {
+  addBuild<void>("float", subject);
+  for (int threads : {1, 2})
+    for (float halo : {0.3f, 1.0f})
+      benchmark::RegisterBenchmark((subject->name + "/flatten/ours float, halo " +
+                                    std::to_string(halo).substr(0, 3) + "/threads:" + std::to_string(threads))
+                                       .c_str(),
+                                   oursBench<void>, subject, threads, halo)
+          ->Unit(benchmark::kMillisecond)
+          ->UseRealTime();
+  addBuild<nanovdb::Fp4>("Fp4", subject);
+  addBuild<nanovdb::Fp8>("Fp8", subject);
+  addBuild<nanovdb::Fp16>("Fp16", subject);
+  addBuild<nanovdb::FpN>("FpN", subject);
+  for (int threads : {1, 2})
+    benchmark::RegisterBenchmark((subject->name + "/memcpy/threads:" + std::to_string(threads)).c_str(),
+                                 memcpyBench, subject, threads)
+        ->Unit(benchmark::kMillisecond)
+        ->UseRealTime();
+}
+
+} // namespace
+
+int main(int argc, char** argv) {
+  for (auto const& grid : Bench::benchGrids()) addAll(new Subject(grid));
+  benchmark::Initialize(&argc, argv);
+  if (benchmark::ReportUnrecognizedArguments(argc, argv)) return 1;
+  benchmark::RunSpecifiedBenchmarks();
+  return 0;
+}

@@ -1,0 +1,123 @@
+#include "Commands.h"
+#include "Content.h"
+#include "Interop/FileError.h"
+#include "Interop/FileFormat.h"
+#include "Interop/NvttRead.h"
+#include "Interop/NvttWrite.h"
+#include "Interop/VolumeFile.h"
+#include "ProgressBar.h"
+#include "StandardOutput.h"
+
+#include <iostream>
+
+#include <fmt/format.h>
+
+namespace Vln {
+
+using namespace VLN::Interop;
+
+namespace {
+
+// The one volume with channels that pass: a flat buffer has one tree.
+VdbVolume const& volumeFor(VdbImport const& content, std::string const& filter) {
+  VdbVolume const* found = nullptr;
+  std::size_t count = 0;
+  for (auto const& volume : content.volumes) {
+    if (flatChannels(*volume.object, filter).empty()) continue;
+    ++count;
+    if (!found) found = &volume;
+  }
+  if (!found)
+    throw FileError(content.file, "has no channel that passes '" + oneLine(filter, 60) +
+                                      "' and that a flat "
+                                      "buffer can hold");
+  if (count > 1)
+    throw FileError(content.file,
+                    fmt::format("its channels lie in {} objects with different transforms; choose "
+                                "those of one with --channels",
+                                count));
+  return *found;
+}
+
+std::string megabytes(std::uint64_t bytes) { return fmt::format("{:.2f} MB", double(bytes) / 1e6); }
+
+void report(VdbVolume const& volume, FlatVolume const& flat, bool quantised) {
+  nanovtt::BufferReader const reader(flat.buffer.data());
+  auto const& container = reader.container();
+  std::uint64_t halos = 0;
+  if (reader.gridCount() > 0) {
+    auto const grid = reader.grid(0);
+    for (std::uint32_t n = 0; n < container.tileCount(); ++n) halos += grid.block(n).hasHalo();
+  }
+  std::int64_t voxels = 0;
+  std::ostream& out = std::cout;
+  out << fmt::format("  tiles       {}, {} of them with a halo, roots at depth {}\n", container.tileCount(),
+                     halos, container.rootDepth());
+  out << fmt::format("  container   {}\n", megabytes(container.containerSize()));
+  for (std::uint32_t n = 0; n < reader.gridCount(); ++n) {
+    auto const grid = reader.grid(n);
+    VdbChannel const* const channel = volume.channel(grid.name());
+    if (channel) voxels = std::max(voxels, channel->activeVoxels);
+    out << fmt::format("  grid        {}, {}\n", megabytes(grid.gridSize()), oneLine(grid.name(), 60));
+  }
+  if (!flat.traversal.empty()) out << fmt::format("  traversal   {}\n", megabytes(flat.traversal.size()));
+  if (!flat.neighbors.empty()) out << fmt::format("  neighbours  {}\n", megabytes(flat.neighbors.size()));
+  std::string const each =
+      voxels > 0 ? fmt::format(", {:.2f} bytes per active voxel", double(flat.buffer.size()) / double(voxels))
+                 : "";
+  out << fmt::format("  buffer      {}{}; made in {:.1f} ms, {:.2f} GB/s\n", megabytes(flat.buffer.size()),
+                     each, flat.seconds * 1e3,
+                     double(flat.buffer.size()) / 1e9 / std::max(flat.seconds, 1e-9));
+  if (!quantised) return;
+  for (auto const& error : flatErrors(*volume.object, flat))
+    out << fmt::format("  error       largest {:.3g}, mean {:.3g}, {}\n", error.largest, error.mean,
+                       oneLine(error.channel, 60));
+}
+
+} // namespace
+
+void flatten(FlattenOptions const& options) {
+  checkOutputAs(options.output, "flat buffers", {FileFormat::kNvtt});
+  VdbImport content;
+  FlatVolume flat;
+  VdbVolume const* volume = nullptr;
+  {
+    ProgressBar bar;
+    content = importVolumes(options.file, options.limits, bar.progress(0, 0.7));
+    volume = &volumeFor(content, options.flat.channels);
+    auto const progress = bar.progress(0.7, 1);
+    progress("flattening", 0);
+    try {
+      flat = flattenVolume(*volume->object, options.flat);
+    } catch (FileError const&) { throw; } catch (std::runtime_error const& error) {
+      throw FileError(options.file, error.what());
+    }
+    progress("writing", 0.5);
+    writeNvtt(options.output, {flat.buffer.data(), flat.buffer.size(), flat.traversal.data(),
+                               flat.traversal.size(), flat.neighbors.data(), flat.neighbors.size()});
+  }
+  std::ostream& out = remarks(options.output);
+  out << options.output << '\n';
+  if (&out == &std::cout) report(*volume, flat, options.flat.quantisation != Quantisation::kNone);
+  if (!volume->transform.empty())
+    std::cerr << fmt::format("vln: {}: note: a flat buffer holds one voxel size; the transform is {}\n",
+                             options.file, volume->transform);
+  for (auto const& points : content.points)
+    std::cerr << fmt::format("vln: {}: note: '{}' is left out: it holds points\n", options.file,
+                             oneLine(points.name, 60));
+  auto const kept = flatChannels(*volume->object, options.flat.channels);
+  for (auto const& channel : volume->channels)
+    if (std::find(kept.begin(), kept.end(), channel.name) == kept.end() && options.flat.channels == "*")
+      std::cerr << fmt::format("vln: {}: note: '{}' is left out: a flat buffer holds no {}\n", options.file,
+                               oneLine(channel.name, 60), channel.type);
+}
+
+void validate(ValidateOptions const& options) {
+  MappedNvtt const file(options.file, NvttCheck::kPages);
+  auto const& reader = file.reader();
+  std::cout << fmt::format("{}: sound; {} tiles, {} {}, {} bytes\n", options.file,
+                           reader.container().tileCount(), reader.gridCount(),
+                           reader.gridCount() == 1 ? "grid" : "grids", file.bufferLength());
+}
+
+} // namespace Vln
