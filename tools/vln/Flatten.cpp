@@ -85,14 +85,14 @@ void flatten(FlattenOptions const& options) {
     ProgressBar bar;
     content = importVolumes(options.file, options.limits, bar.progress(0, 0.7));
     volume = &volumeFor(content, options.flat.channels);
-    auto const progress = bar.progress(0.7, 1);
-    progress("flattening", 0);
+    auto const progress = bar.progress(0.7, 1); // empty where nobody looks
+    if (progress) progress("flattening", 0);
     try {
       flat = flattenVolume(*volume->object, options.flat);
     } catch (FileError const&) { throw; } catch (std::runtime_error const& error) {
       throw FileError(options.file, error.what());
     }
-    progress("writing", 0.5);
+    if (progress) progress("writing", 0.5);
     writeNvtt(options.output, {flat.buffer.data(), flat.buffer.size(), flat.traversal.data(),
                                flat.traversal.size(), flat.neighbors.data(), flat.neighbors.size()});
   }
