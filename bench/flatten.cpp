@@ -4,20 +4,28 @@
 //              the output. NanoVDB's "openToNanoVDB" with StatsMode::BBox and no checksum does the same work
 //   memcpy     the same number of bytes, into memory that is mapped anew like that of a new buffer
 //   validate   of the whole buffer before it is trusted
-//   read       a million active voxels through the flat buffer, leaf by leaf or at random; an item is a voxel
+//   read       a million active voxels, leaf by leaf or at random, through NanoVDB's accessor and through a
+//   cursor
+//              on the flat buffer; an item is a voxel
+//   trilinear  in the cells of the same voxels, through NanoVDB's sampler and from tiles with halo
 //
 // "bytes a voxel" counts active voxels; "error" is the largest difference of any active voxel.
 #include "BenchGrids.h"
 #include "GeometryVolume/channels/Channel.h"
 #include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/nanovtt/VTTToNanoVTT.h"
+#include "Reader/NanoVTTCursor.h"
+#include "Reader/NanoVTTValidate.h"
 
 #include <benchmark/benchmark.h>
 
+#include <algorithm>
 #include <cstdlib>
 #include <cstring>
+#include <random>
 
 #include <nanovdb/util/OpenToNanoVDB.h>
+#include <nanovdb/util/SampleFromVoxels.h>
 
 namespace {
 
@@ -106,6 +114,75 @@ void memcpyBench(benchmark::State& state, Subject const* subject, int threads) {
   report(state, *subject, size);
 }
 
+void validateBench(benchmark::State& state, Subject const* subject) {
+  auto const flat = flatten<void>(*subject);
+  for (auto _ : state) {
+    bool ok = nanovtt::validate(flat.data(), flat.size()).ok();
+    benchmark::DoNotOptimize(ok);
+  }
+  report(state, *subject, flat.size());
+}
+
+/// A million active voxels of leaves, leaf by leaf, or in any order.
+std::vector<openvdb::Coord> voxelsOf(openvdb::FloatGrid const& grid, bool random) {
+  constexpr std::size_t kMost = 1 << 20;
+  std::vector<openvdb::Coord> voxels;
+  for (auto leaf = grid.tree().cbeginLeaf(); leaf; ++leaf)
+    for (auto it = leaf->cbeginValueOn(); it; ++it) voxels.push_back(it.getCoord());
+  if (random) std::shuffle(voxels.begin(), voxels.end(), std::mt19937(11));
+  if (voxels.size() > kMost) voxels.resize(kMost);
+  return voxels;
+}
+
+template <class Read>
+void readBench(benchmark::State& state, Subject const& subject, bool random, Read read) {
+  auto const voxels = voxelsOf(*subject.grid, random);
+  for (auto _ : state) {
+    float sum = 0;
+    for (auto const& c : voxels) sum += read(c);
+    benchmark::DoNotOptimize(sum);
+  }
+  state.SetItemsProcessed(static_cast<std::int64_t>(voxels.size()) *
+                          static_cast<std::int64_t>(state.iterations()));
+}
+
+void addReads(Subject const* subject) {
+  for (bool random : {false, true}) {
+    std::string const tail = random ? "random/" : "coherent/";
+    auto const add = [&](std::string const& name, auto const& body) {
+      benchmark::RegisterBenchmark((subject->name + "/" + name).c_str(), body)->Unit(benchmark::kMillisecond);
+    };
+    add("read/" + tail + "NanoVDB", [=](benchmark::State& state) {
+      auto const flat = nanoFlatten<void>(*subject);
+      auto const accessor = flat.grid<float>()->getAccessor();
+      readBench(state, *subject, random, [&](openvdb::Coord const& c) {
+        return accessor.getValue(nanovdb::Coord(c.x(), c.y(), c.z()));
+      });
+    });
+    add("read/" + tail + "ours", [=](benchmark::State& state) {
+      auto const flat = flatten<void>(*subject);
+      nanovtt::GridCursor cursor(nanovtt::BufferReader(flat.data()).grid(0));
+      readBench(state, *subject, random,
+                [&](openvdb::Coord const& c) { return cursor.value(c.x(), c.y(), c.z()); });
+    });
+    add("trilinear/" + tail + "NanoVDB", [=](benchmark::State& state) {
+      auto const flat = nanoFlatten<void>(*subject);
+      auto const accessor = flat.grid<float>()->getAccessor();
+      auto const sampler = nanovdb::createSampler<1>(accessor);
+      readBench(state, *subject, random, [&](openvdb::Coord const& c) {
+        return sampler(nanovdb::Vec3f(float(c.x()) + 0.25f, float(c.y()) + 0.5f, float(c.z()) + 0.75f));
+      });
+    });
+    add("trilinear/" + tail + "ours, halo tiles", [=](benchmark::State& state) {
+      auto const flat = flatten<void>(*subject, 1.0f);
+      nanovtt::GridCursor cursor(nanovtt::BufferReader(flat.data()).grid(0));
+      readBench(state, *subject, random, [&](openvdb::Coord const& c) {
+        return cursor.trilinear(float(c.x()) + 0.25f, float(c.y()) + 0.5f, float(c.z()) + 0.75f);
+      });
+    });
+  }
+}
+
 template <class BuildT> void addBuild(std::string const& build, Subject const* subject) {
   for (int threads : {1, 2}) {
     std::string const tail = build + "/threads:" + std::to_string(threads);
@@ -121,6 +198,9 @@ template <class BuildT> void addBuild(std::string const& build, Subject const* s
 }
 
 void addAll(Subject const* subject) {
+  addReads(subject);
+  benchmark::RegisterBenchmark((subject->name + "/validate").c_str(), validateBench, subject)
+      ->Unit(benchmark::kMillisecond);
   addBuild<void>("float", subject);
   for (int threads : {1, 2})
     for (float halo : {0.3f, 1.0f})
@@ -145,6 +225,13 @@ void addAll(Subject const* subject) {
 
 int main(int argc, char** argv) {
   for (auto const& grid : Bench::benchGrids()) addAll(new Subject(grid));
+  // On request, for it takes gigabytes: a level set of 50 million voxels.
+  if (std::getenv("VLN_BENCH_LARGE")) {
+    auto const large =
+        openvdb::tools::createLevelSetSphere<openvdb::FloatGrid>(820.0f, openvdb::Vec3f(0), 1.0f, 3.0f);
+    large->setName("sphere");
+    addAll(new Subject({"sphere_820", large}));
+  }
   benchmark::Initialize(&argc, argv);
   if (benchmark::ReportUnrecognizedArguments(argc, argv)) return 1;
   benchmark::RunSpecifiedBenchmarks();

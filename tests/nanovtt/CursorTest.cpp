@@ -1,0 +1,117 @@
+// The cursor against single lookups, and its blends against the library's sampler.
+#include "GeometryVolume/channels/Halo.h"
+#include "GeometryVolume/nanovtt/VTTToNanoVTT.h"
+#include "GeometryVolume/sampling/VoxelSamplerLinear.h"
+#include "GeometryVolume/topology/Command.h"
+#include "Reader/NanoVTTCursor.h"
+
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <limits>
+#include <random>
+
+namespace {
+
+using namespace VLN::TileTree3D;
+using Shape = PowerOfTwoTraits;
+using Buffer = nanovtt::AlignedHostBuffer;
+
+// A ball of fog in tiles of three depths, with roots 64 wide.
+struct Ball {
+  Ostil::MutablePtr<VLN::Object> object =
+      Command::createVoxelVLN<Shape>("voxel_tile_tree", "voxel_component", 1.0f, kVoxelOffsetCorner);
+  int rootLevel = 0;
+
+  Ball() {
+    auto tree = object->extractComponent<Container<Shape>>("voxel_tile_tree");
+    auto accessor = tree->tileAccessor();
+    accessor.addTiles(int3{-64, -64, -64}, int3{64, 64, 64}, 24);
+    accessor.addTiles(int3{-20, -20, -20}, int3{20, 20, 20}, 27);
+    accessor.addTiles(int3{-20, -9, -20}, int3{3, 20, 11}, 28);
+    rootLevel = Shape::kMaxDepth - 24;
+    auto topology = object->extractComponent<VoxelTopology<Shape>>("voxel_component");
+    topology->update(*tree);
+    auto field = Command::createChannel<float, 2, 4, 4, 0, 0>("density", *topology, 0.0f,
+                                                              kInitializeDefaultValue, 0, Shape::kMaxDepth);
+    for (int d = 0; d <= Shape::kMaxDepth; ++d)
+      for (std::int64_t n = 0; n < tree->tileCount(d); ++n) {
+        auto const& tile = std::as_const(*tree).tile(n, d);
+        auto data = field->tileData(tile.treeIndex());
+        for (int s = 0; s < 64; ++s) {
+          auto const p = tile.childDataTIJK(s % 4, s / 4 % 4, s / 16);
+          data(s) = std::max(0.0f, 1.0f - std::hypot(float(p.x), float(p.y), float(p.z)) / 24.0f);
+        }
+      }
+    object->putComponent(std::move(field));
+    object->putComponent(std::move(topology));
+    object->putComponent(std::move(tree));
+  }
+
+  nanovtt::GridHandle<Buffer> flatten(float halo, bool coalesce) const {
+    Buffer const pool;
+    return nanovtt::vttToNanoVTT<Buffer, void, nanovdb::AbsDiff, true>(
+        *object, "density", nanovdb::StatsMode(0), nanovdb::ChecksumMode(0), 0, -1.0f, false, halo, rootLevel,
+        0, false, coalesce, false, 1, false, false, 0.0f, false, false, nullptr, nullptr, nullptr, pool);
+  }
+};
+
+// requirement
+TEST(Cursor, RequirementReadsWhatLookupsRead) {
+  Ball const ball;
+  for (float halo : {0.0f, 0.5f, 1.0f})
+    for (bool coalesce : {false, true}) {
+      auto const flat = ball.flatten(halo, coalesce);
+      auto const grid = nanovtt::BufferReader(flat.data()).grid(0);
+      nanovtt::GridCursor cursor(grid);
+      std::mt19937 random(3);
+      for (int n = 0; n < 50000; ++n) {
+        int const x = int(random() % 160) - 80, y = int(random() % 160) - 80, z = int(random() % 40) - 20;
+        for (int step = 0; step < 4; ++step) // near each other, so that the tile is found again
+          ASSERT_EQ(double(cursor.value(x + step, y, z)), grid.valueAt(x + step, y, z))
+              << x + step << ' ' << y << ' ' << z << ", halo " << halo << ", coalesce " << coalesce;
+      }
+    }
+}
+
+// requirement: in halo tiles the blend is the library's own
+TEST(Cursor, RequirementBlendsAsTheSampler) {
+  Ball const ball;
+  auto const flat = ball.flatten(1.0f, false);
+  nanovtt::GridCursor cursor(nanovtt::BufferReader(flat.data()).grid(0));
+  auto const tree = ball.object->component<Container<Shape>>("voxel_tile_tree");
+  auto const topology = ball.object->component<VoxelTopology<Shape>>("voxel_component");
+  auto const field = ball.object->component<Channel<Shape, float, 4, 0>>("density");
+  float const zero = 0;
+  Channel<Shape, float, 5, 0> wide("wide", &zero, kInitializeDefaultValue, false, true, 0, Shape::kMaxDepth);
+  wide.update(*topology);
+  computeHalo<Shape, float, 0, 0, 1, 0>(*field, *tree, wide, -1, -1);
+  FloatVoxelSamplerLinear<Shape> const sampler(*tree, *topology, wide);
+  std::mt19937 random(4);
+  std::uniform_real_distribution<float> inside(-18.0f, 1.0f);
+  float worst = 0;
+  for (int n = 0; n < 20000; ++n) {
+    // Where tiles of the deepest depth are surrounded by their like.
+    float3 const p{inside(random), std::abs(inside(random)) - 8.0f, inside(random)};
+    worst = std::max(worst, std::abs(cursor.trilinear(p.x, p.y, p.z) - sampler.sample(p, kSamplerTileSpace)));
+  }
+  EXPECT_LE(worst, 2e-6f);
+}
+
+// negative
+TEST(Cursor, NegativePositionsThatAreNone) {
+  Ball const ball;
+  auto const flat = ball.flatten(1.0f, false);
+  nanovtt::GridCursor cursor(nanovtt::BufferReader(flat.data()).grid(0));
+  float const huge = std::numeric_limits<float>::max(), nan = std::numeric_limits<float>::quiet_NaN();
+  for (float const v :
+       {huge, -huge, nan, std::numeric_limits<float>::infinity(), 2147483648.0f, -2147483648.0f})
+    for (int axis = 0; axis < 3; ++axis) {
+      float p[3] = {0, 0, 0};
+      p[axis] = v;
+      EXPECT_EQ(cursor.trilinear(p[0], p[1], p[2]), 0.0f) << v;
+    }
+  EXPECT_EQ(cursor.value(INT32_MAX, 0, INT32_MIN), 0.0f);
+}
+
+} // namespace
