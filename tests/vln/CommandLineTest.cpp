@@ -106,7 +106,8 @@ TEST_F(CommandLineTest, RegressionNohupIsHonoured) {
   std::string const path = m_folder / "cloud.vdb";
   for (bool const ignored : {false, true}) {
     RunResult const run = shell((ignored ? "trap '' HUP; " : "") + program() + " make cloud '" + path +
-                                (ignored ? "' --voxels 300000" : "' --voxels 30000000") + " & p=$!; sleep 0.1; kill -HUP $p; wait $p");
+                                (ignored ? "' --voxels 300000" : "' --voxels 30000000") +
+                                " & p=$!; sleep 0.1; kill -HUP $p; wait $p");
     if (ignored)
       EXPECT_EQ(run.code, 0) << run.err;
     else
