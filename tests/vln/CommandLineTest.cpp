@@ -128,6 +128,31 @@ TEST_F(CommandLineTest, RequirementAReaderMayGoAway) {
   EXPECT_EQ(run.err, "");
 }
 
+// requirement: the manual page and the completions know every command and its options
+TEST_F(CommandLineTest, RequirementManualAndCompletions) {
+  RunResult const manual = vln({"manual"});
+  EXPECT_EQ(manual.code, 0) << manual.err;
+  EXPECT_EQ(manual.out.rfind(".TH VLN 1", 0), 0u);
+  for (std::string const command :
+       {"info", "slice", "convert", "probe", "make", "churn", "points", "tiles", "advect", "completions"})
+    EXPECT_NE(manual.out.find(".SS vln " + command), std::string::npos) << command;
+  EXPECT_NE(manual.out.find("\\-\\-percentile \\fIP\\fR"), std::string::npos) << manual.out;
+  for (std::string const shell : {"bash", "zsh", "fish"}) {
+    RunResult const script = vln({"completions", shell});
+    EXPECT_EQ(script.code, 0) << script.err;
+    EXPECT_NE(script.out.find("percentile"), std::string::npos);
+    EXPECT_EQ(script.out.find("manual"), std::string::npos) << "a command for the build alone";
+  }
+  std::string const script = m_folder / "completions";
+  writeAll(script, vln({"completions", "bash"}).out);
+  RunResult const completed =
+      runProgram({"/bin/bash", "-c",
+                  ". '" + script + "'; COMP_WORDS=(vln slice --chan); COMP_CWORD=2; _vln; " +
+                      "echo \"${COMPREPLY[@]}\"; COMP_WORDS=(vln sl); COMP_CWORD=1; _vln; " +
+                      "echo \"${COMPREPLY[@]}\""});
+  EXPECT_EQ(completed.out, "--channel\nslice\n") << completed.err;
+}
+
 // regression: after the import the bar of convert began again
 TEST_F(CommandLineTest, RegressionProgressNeverGoesBack) {
   std::string const path = torus("3000000"), copy = m_folder / "copy.vdb";
