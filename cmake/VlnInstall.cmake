@@ -38,6 +38,15 @@ install(FILES "${VLN_GENERATED_DIR}/GeometryVolume/core/ElementTypesConfig.h"
   DESTINATION "${include_dir}/GeometryVolume/core")
 if(TARGET vln)
   install(TARGETS vln RUNTIME DESTINATION "${CMAKE_INSTALL_BINDIR}")
+  if(TARGET vln_manual)
+    set(manual_dir "${PROJECT_BINARY_DIR}/manual")
+    install(FILES "${manual_dir}/vln.1" DESTINATION "${CMAKE_INSTALL_MANDIR}/man1")
+    install(FILES "${manual_dir}/vln"
+      DESTINATION "${CMAKE_INSTALL_DATADIR}/bash-completion/completions")
+    install(FILES "${manual_dir}/_vln" DESTINATION "${CMAKE_INSTALL_DATADIR}/zsh/site-functions")
+    install(FILES "${manual_dir}/vln.fish"
+      DESTINATION "${CMAKE_INSTALL_DATADIR}/fish/vendor_completions.d")
+  endif()
 endif()
 
 configure_package_config_file("${PROJECT_SOURCE_DIR}/cmake/GeometryVolumeConfig.cmake.in"

@@ -47,8 +47,13 @@ foreach(room IN LISTS rooms)
     endif()
   endif()
   if(room STREQUAL "vln")
-    target_compile_definitions(${target} PRIVATE "VLN_PROGRAM=\"$<TARGET_FILE:vln>\"")
-    add_dependencies(${target} vln)
+    # Loaded before the program, lets system calls fail on purpose.
+    add_library(vln_failing_calls MODULE tests/support/FailingCalls.cpp)
+    target_link_libraries(vln_failing_calls PRIVATE ${CMAKE_DL_LIBS})
+    target_compile_features(vln_failing_calls PRIVATE cxx_std_20)
+    target_compile_definitions(${target} PRIVATE "VLN_PROGRAM=\"$<TARGET_FILE:vln>\""
+      "VLN_FAILING_CALLS=\"$<TARGET_FILE:vln_failing_calls>\"")
+    add_dependencies(${target} vln vln_failing_calls)
   endif()
   # PRE_TEST: the list is asked for when ctest starts, not at the end of every link.
   gtest_discover_tests(${target}

@@ -66,9 +66,24 @@ std::array<Rgb, 256> divergingTable() {
   return table;
 }
 
-std::string label(double value, bool open = false) {
+std::array<Rgb, 256> grayTable() {
+  std::array<Rgb, 256> table;
+  for (std::size_t n = 0; n < 256; ++n) {
+    auto const level = static_cast<std::uint8_t>(n);
+    table[n] = {level, level, level};
+  }
+  return table;
+}
+
+// In as many digits as tell the ends of the range apart.
+std::string label(double value, double range) {
+  double const largest = std::max(std::abs(value), range);
+  int const digits = range > 0 && std::isfinite(largest)
+                         ? std::clamp(3 + static_cast<int>(std::ceil(std::log10(largest / range))), 3, 12)
+                         : 3;
   char text[32];
-  std::snprintf(text, sizeof text, open ? ">%.3g" : "%.3g", value == 0 ? 0.0 : value);
+  // What is nothing beside the range is zero.
+  std::snprintf(text, sizeof text, "%.*g", digits, std::abs(value) < 1e-9 * range ? 0.0 : value);
   return text;
 }
 
@@ -77,7 +92,8 @@ std::string label(double value, bool open = false) {
 std::array<Rgb, 256> const& colorTable(ColorMap::Kind kind) {
   static std::array<Rgb, 256> const sequential = sequentialTable();
   static std::array<Rgb, 256> const diverging = divergingTable();
-  return kind == ColorMap::Kind::kSequential ? sequential : diverging;
+  static std::array<Rgb, 256> const gray = grayTable();
+  return kind == ColorMap::Kind::kSequential ? sequential : kind == ColorMap::Kind::kGray ? gray : diverging;
 }
 
 ColorMap::ColorMap(Kind kind, double low, double high)
@@ -105,18 +121,22 @@ Rgb ColorMap::color(double value) const {
   return colorTable(m_kind)[static_cast<std::size_t>(std::lround(255 * t))];
 }
 
-Image ColorMap::scale(int height, int textScale, bool open) const {
+Image ColorMap::scale(int height, int textScale, Marks const& marks) const {
   Rgb const ink{40, 40, 40};
   int const bar = 12 * textScale, tick = 4 * textScale, gap = 3 * textScale;
   int const half = Image::textHeight(textScale) / 2 + 1;
-  height = std::max(height, 2 * half + 2);
+  int const below = marks.notANumber ? bar + 2 * half : 0;
+  height = std::max(height - below, 2 * half + 2);
   // As many ticks as leave some room between their labels.
   int const steps = height >= 16 * 2 * half ? 8 : height >= 8 * 2 * half ? 4 : 2;
 
-  auto labelAt = [&](int n) { return label(m_low + (m_high - m_low) * n / steps, open && n == steps); };
-  int widest = 0;
+  auto labelAt = [&](int n) {
+    char const* const open = n == steps && marks.openHigh ? ">" : n == 0 && marks.openLow ? "<" : "";
+    return open + label(m_low + (m_high - m_low) * n / steps, m_high - m_low);
+  };
+  int widest = marks.notANumber ? Image::textWidth("nan", textScale) : 0;
   for (int n = 0; n <= steps; ++n) widest = std::max(widest, Image::textWidth(labelAt(n), textScale));
-  Image image(bar + tick + gap + widest, height);
+  Image image(bar + tick + gap + widest, height + below);
 
   int const top = half, bottom = height - 1 - half; // rows of the high and the low end
   for (int y = top; y <= bottom; ++y) {
@@ -127,6 +147,11 @@ Image ColorMap::scale(int height, int textScale, bool open) const {
     int const y = bottom - static_cast<int>(std::lround(double(bottom - top) * n / steps));
     image.fill(bar, y, bar + tick, y + 1, ink);
     image.text(bar + tick + gap, y - Image::textHeight(textScale) / 2, labelAt(n), ink, textScale);
+  }
+  if (marks.notANumber) {
+    int const y = height + below - bar;
+    image.fill(0, y, bar, y + bar, notANumber());
+    image.text(bar + tick + gap, y + bar / 2 - Image::textHeight(textScale) / 2, "nan", ink, textScale);
   }
   return image;
 }

@@ -13,9 +13,10 @@ namespace VLN::Interop {
 /// like equal steps of the colour:
 ///   sequential  dark violet - blue - green - yellow, its lightness rising evenly
 ///   diverging   blue - white - red, white in the middle
+///   gray        black - white
 class VLN_API ColorMap {
 public:
-  enum class Kind { kSequential, kDiverging };
+  enum class Kind { kSequential, kDiverging, kGray };
 
   /// A range without extent is widened a little, so that its one value gets the middle colour.
   ColorMap(Kind kind, double low, double high);
@@ -30,9 +31,15 @@ public:
   /// For what is no number.
   static Rgb notANumber() { return {255, 0, 255}; }
 
-  /// A vertical bar of all colours, the high end on top, with ticks and the values at them. `open` marks the
-  /// high end with ">": it also stands for larger values.
-  Image scale(int height, int textScale = 1, bool open = false) const;
+  /// Marks of a scale.
+  struct Marks {
+    bool openHigh = false;   ///< the high end gets a ">": it also stands for larger values
+    bool openLow = false;    ///< the low end a "<"
+    bool notANumber = false; ///< below the bar, the colour of what is no number
+  };
+  /// A vertical bar of all colours, the high end on top, with ticks and the values at them.
+  Image scale(int height, int textScale, Marks const& marks) const;
+  Image scale(int height) const { return scale(height, 1, {}); }
 
 private:
   Kind m_kind;

@@ -177,22 +177,24 @@ void OutputFile::write(void const* bytes, std::size_t count) {
 }
 
 void OutputFile::finish() {
-  if (m_failed || m_fd < 0) fail(EBADF);
+  if (m_failed) fail(EBADF);
+  if (m_fd < 0) return;
   put(m_collected.data(), m_collected.size());
   m_collected.clear();
   // Without this a crash of the machine could leave the new name on an empty file.
   if (m_way != Way::kStraight)
     if (int const error = sync(m_fd)) fail(error);
+  if (m_way == Way::kRefill) return; // it is read again
+  int const fd = m_fd;
+  m_fd = -1;
+  // What a disk in the net could not take is told here at the latest.
+  if (close(fd) != 0) fail(errno);
 }
 
 void OutputFile::commit() {
   finish();
   if (m_way == Way::kRefill)
     if (int const error = refill(m_target, m_fd)) fail(error);
-  int const fd = m_fd;
-  m_fd = -1;
-  // What a disk in the net could not take is told here at the latest.
-  if (close(fd) != 0) fail(errno);
   if (m_way != Way::kReplace) return;
   if (rename(m_temporary.c_str(), m_target.c_str()) != 0) fail(errno);
   forget(m_temporary);

@@ -1,3 +1,4 @@
+#include "Interop/ElementScalarImpl.h"
 #include "Interop/OutputFile.h"
 #include "Interop/Ply.h"
 
@@ -27,13 +28,6 @@ template <class T> char const* plyType() {
   }
   return "double";
 }
-
-template <class T> struct ScalarOf { using type = T; };
-template <class T>
-requires requires { typename T::Scalar; }
-struct ScalarOf<T> {
-  using type = typename T::Scalar;
-};
 
 /// Every element type, whether this build has channels of it or not.
 template <class Body> void withAnyElementType(std::string const& name, Body&& body) {

@@ -174,17 +174,6 @@ PointSet pointSetOf(PointVolume const& volume) {
   return points;
 }
 
-Ostil::Ptr<PositionChannel> scaledPositions(PointVolume const& volume) {
-  auto const positions = volume.object->component<PositionChannel>(kPositionsName);
-  Ostil::Ptr<Component> copy;
-  positions->copyTo(copy);
-  auto scaled = Ostil::dynamicCast<PositionChannel>(copy);
-  for (float3& p : *scaled) {
-    for (int a = 0; a < 3; ++a) p[a] = static_cast<float>(double(p[a]) * volume.voxelSize);
-  }
-  return scaled;
-}
-
 AdvectStatistics advect(PointVolume& volume, Velorn::Math::double3 const& velocity) {
   Object& object = *volume.object;
   auto tree = object.extractComponent<PointContainer>(kPointContainerName);

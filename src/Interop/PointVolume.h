@@ -35,7 +35,6 @@ struct PointVolume {
   std::vector<std::pair<std::string, std::string>> attributes;
   std::vector<std::string> skippedAttributes; ///< of types that this build has no channels for
   std::int64_t dropped = 0;                   ///< points that lie out of the tree's reach, or nowhere
-  std::string transform;                      ///< empty, or what the scale and origin leave out
 };
 
 /// Builds the tree and the channels. Roots lie at the deepest depth at which the whole cloud spans at most 64
@@ -45,9 +44,6 @@ VLN_API PointVolume buildPointVolume(PointSet const& points);
 
 /// The way back: all points, tile by tile.
 VLN_API PointSet pointSetOf(PointVolume const& volume);
-
-/// The positions scaled to world length, without the origin, which a float might not resolve.
-VLN_API Ostil::Ptr<PositionChannel> scaledPositions(PointVolume const& volume);
 
 struct AdvectStatistics {
   std::int64_t tilesGained = 0, tilesLost = 0;

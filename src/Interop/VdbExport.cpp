@@ -2,6 +2,8 @@
 
 #include "Interop/IndexToWorldImpl.h"
 #include "Interop/VdbGridImpl.h"
+#include "Interop/VdbImportImpl.h"
+#include "Interop/VdbMaskImpl.h"
 #include "Interop/VdbRecord.h"
 #include "Interop/VdbWriteImpl.h"
 
@@ -30,20 +32,24 @@ openvdb::GridBase::Ptr toGrid(Object const& object, VdbGridRecord const& record)
   auto const channel = object.component<TileTree3D::ChannelBase>(record.channel);
   auto const state = object.component<StateChannel>(record.stateChannel);
   bool const complete = container && channel && (record.rule != VdbActiveRule::kChannel || state);
-  auto grid = complete ? makeGrid(record.type, {*container, *channel, state.get(), record.rule}) : nullptr;
+  bool const mask = record.type == kMaskType;
+  auto grid = complete ? makeGrid(mask ? Ostil::String("bool") : record.type,
+                                  {*container, *channel, state.get(), record.rule})
+                       : nullptr;
+  if (grid && mask) grid = maskOf(*grid);
   if (!grid)
     throw std::runtime_error("the volume no longer holds the grid '" + record.channel + "' as it came");
   readMetadata(record.metadata, *grid);
   return grid;
 }
 
-} // namespace
-
-void exportVdb(std::vector<VdbVolume> const& volumes, std::string const& path, Progress const& progress) {
+void write(std::vector<VdbVolume> const& volumes, std::vector<PointVolume> const& points,
+           std::string const& fileMetadata, std::string const& path, Progress const& progress) {
   openvdb::initialize();
   OutputFile out(path);
   openvdb::GridPtrVec grids;
   openvdb::MetaMap metadata;
+  if (!fileMetadata.empty()) readMetadata(fileMetadata, metadata);
   std::size_t count = 0, done = 0;
   Ostil::Any holder, bytesHolder;
   for (auto const& volume : volumes) count += volume.channels.size();
@@ -62,9 +68,21 @@ void exportVdb(std::vector<VdbVolume> const& volumes, std::string const& path, P
     if (auto const* bytes = property<Ostil::String>(*volume.object, kVdbMetadataProperty, bytesHolder))
       readMetadata(*bytes, metadata);
   }
+  for (auto const& volume : points)
+    grids.push_back(makePointsGrid(pointSetOf(volume), volume.name.empty() ? "points" : volume.name));
   if (progress) progress("writing", 0.8);
   writeVdbFile(out, grids, metadata);
   if (progress) progress("done", 1);
+}
+
+} // namespace
+
+void exportVdb(std::vector<VdbVolume> const& volumes, std::string const& path, Progress const& progress) {
+  write(volumes, {}, "", path, progress);
+}
+
+void exportVdb(VdbImport const& content, std::string const& path, Progress const& progress) {
+  write(content.volumes, content.points, content.metadata, path, progress);
 }
 
 } // namespace VLN::Interop

@@ -12,5 +12,7 @@ namespace VLN::Interop {
 /// name is told as std::runtime_error.
 VLN_API void exportVdb(std::vector<VdbVolume> const& volumes, std::string const& path,
                        Progress const& progress = {});
+/// The same with the points grids behind them, whose points are those of the volumes tile by tile.
+VLN_API void exportVdb(VdbImport const& content, std::string const& path, Progress const& progress = {});
 
 } // namespace VLN::Interop

@@ -3,7 +3,9 @@
 #include "Interop/FileError.h"
 #include "Interop/VdbFileImpl.h"
 
-#include <openvdb/io/Stream.h>
+#include <openvdb/io/Archive.h>
+#include <openvdb/io/GridDescriptor.h>
+#include <openvdb/io/io.h>
 #include <tbb/global_control.h>
 
 #include <algorithm>
@@ -51,6 +53,55 @@ std::uint64_t checkHeader(std::string const& path) {
   return static_cast<std::uint64_t>(info.st_size);
 }
 
+// OpenVDB's own readers give a file up at the first grid of a type that is not registered. This one goes on
+// behind it.
+class WholeReader : public openvdb::io::Archive {
+public:
+  void read(std::istream& in, VdbFile& file) {
+    readHeader(in);
+    auto streamMetadata = std::make_shared<openvdb::io::StreamMetadata>();
+    openvdb::io::setStreamMetadataPtr(in, streamMetadata, /*transfer=*/false);
+    openvdb::io::setVersion(in, libraryVersion(), fileVersion());
+    setDataCompression(in);
+    file.metadata = std::make_shared<openvdb::MetaMap>();
+    file.metadata->readMeta(in);
+    std::int32_t const count = readGridCount(in);
+    std::vector<openvdb::io::GridDescriptor> descriptors;
+    NamedGridMap byName;
+    for (std::int32_t n = 0; n < count; ++n) {
+      openvdb::io::GridDescriptor descriptor;
+      auto const grid = create(in, descriptor);
+      if (!grid) {
+        skip(in, descriptor, file);
+        continue;
+      }
+      readGrid(grid, descriptor, in);
+      descriptors.push_back(descriptor);
+      file.grids.push_back(grid);
+      byName[descriptor.uniqueName()] = grid;
+    }
+    for (auto const& descriptor : descriptors) connectInstance(descriptor, byName);
+  }
+
+private:
+  // Null for an unknown type: the offsets come next then.
+  static openvdb::GridBase::Ptr create(std::istream& in, openvdb::io::GridDescriptor& descriptor) {
+    try {
+      return descriptor.read(in);
+    } catch (openvdb::LookupError const&) { return nullptr; }
+  }
+
+  void skip(std::istream& in, openvdb::io::GridDescriptor const& descriptor, VdbFile& file) {
+    std::int64_t offsets[3] = {}; // of the grid, of its blocks, of its end
+    in.read(reinterpret_cast<char*>(offsets), sizeof offsets);
+    if (!inputHasGridOffsets() || offsets[2] < in.tellg())
+      throw std::runtime_error("grids of type " + oneLine(descriptor.gridType(), 60) + " are not read");
+    in.seekg(offsets[2]);
+    file.skipped.push_back({openvdb::io::GridDescriptor::nameAsString(descriptor.uniqueName()),
+                            "grids of type " + oneLine(descriptor.gridType()) + " are not read"});
+  }
+};
+
 // Reads from a stream that throws at the first byte that is missing: OpenVDB itself does not ask whether its
 // reads succeed, and would go on with whatever its buffers hold.
 VdbFile readWhole(std::string const& path) {
@@ -60,11 +111,7 @@ VdbFile readWhole(std::string const& path) {
   std::ifstream in(path, std::ios::binary);
   if (!in) throw FileError(path, std::string("cannot be opened: ") + std::strerror(errno));
   in.exceptions(std::ios::failbit | std::ios::badbit | std::ios::eofbit);
-  openvdb::io::Stream stream(in, /*delayLoad=*/false);
-  file.metadata = stream.getMetadata();
-  file.grids = *stream.getGrids();
-  for (auto const& grid : file.grids)
-    if (!grid) throw std::runtime_error("a grid is missing");
+  WholeReader().read(in, file);
   return file;
 }
 

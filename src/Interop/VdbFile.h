@@ -22,6 +22,12 @@ struct VdbReadLimits {
   unsigned seconds = 0;
 };
 
+/// A grid that does not come in.
+struct SkippedGrid {
+  std::string grid;
+  std::string reason;
+};
+
 /// Reads a whole file in a child process and drops what was read.
 /// @error FileError that names the file and what is wrong with it: missing, not a regular file, of another
 /// kind, truncated, damaged, or over a limit.

@@ -5,13 +5,16 @@
 
 #include <openvdb/openvdb.h>
 
+#include <vector>
+
 namespace VLN::Interop {
 
 struct VdbFile {
   std::string path;
   openvdb::GridPtrVec grids; ///< in the order of the file
   openvdb::MetaMap::Ptr metadata;
-  std::uint64_t memoryBytes = 0; ///< most that what is made of it may take; 0 for no bound
+  std::vector<SkippedGrid> skipped; ///< grids of types that OpenVDB does not know
+  std::uint64_t memoryBytes = 0;    ///< most that what is made of it may take; 0 for no bound
 };
 
 /// Probes a file as probeVdbFile() does, then reads all of it, nothing delayed.

@@ -8,6 +8,7 @@
 #include "Interop/FileError.h"
 #include "Interop/IndexToWorldImpl.h"
 #include "Interop/VdbImportImpl.h"
+#include "Interop/VdbMaskImpl.h"
 #include "Interop/VdbRecord.h"
 
 #include <algorithm>
@@ -27,6 +28,7 @@ using Topology = VdbTopology;
 struct Group {
   std::string transform; ///< as transformBytes() writes it
   std::vector<std::unique_ptr<GridSource>> grids;
+  std::vector<std::string> types; ///< of the values in the file
   std::vector<GridSummary> summaries;
 };
 
@@ -51,7 +53,7 @@ std::vector<Group> groupByTransform(VdbFile const& file, std::vector<SkippedGrid
   std::vector<Group> groups;
   for (auto const& base : file.grids) {
     std::string type;
-    auto source = makeGridSource(base, type);
+    auto source = makeGridSource(withoutMask(base), type);
     if (!source) {
       if (isPointGrid(*base)) continue;
       skipped.push_back({base->getName(), "grids of type " + oneLine(type) + " are not read"});
@@ -70,9 +72,10 @@ std::vector<Group> groupByTransform(VdbFile const& file, std::vector<SkippedGrid
     auto group =
         std::find_if(groups.begin(), groups.end(), [&](Group const& g) { return g.transform == bytes; });
     if (group == groups.end()) {
-      groups.push_back({bytes, {}, {}});
+      groups.push_back({bytes, {}, {}, {}});
       group = groups.end() - 1;
     }
+    group->types.push_back(valueTypeOf(*base));
     group->grids.push_back(std::move(source));
   }
   return groups;
@@ -159,7 +162,9 @@ VdbVolume buildVolume(VdbFile const& file, Group const& group, std::uint64_t& me
   auto topology = object->extractComponent<Topology>(kVdbTopologyName);
   topology->update(*container);
 
-  std::set<std::string> taken{kVdbContainerName, kVdbTopologyName};
+  // Components and plain properties share one set of names.
+  std::set<std::string> taken{kVdbContainerName, kVdbTopologyName, kVdbGridsProperty, kVdbTransformProperty,
+                              kVdbMetadataProperty};
   double const tilesToFill = double(container->tileCount(-1)) * double(group.grids.size());
   double filled = 0;
   // Grids come first to their names, channels of states after them.
@@ -175,13 +180,13 @@ VdbVolume buildVolume(VdbFile const& file, Group const& group, std::uint64_t& me
       filled += double(tiles);
       tell(progress, "filling the channels", from + (to - from) * filled / tilesToFill);
     }));
-    VdbGridRecord record{name, grid.valueType(), source.activeRule(), "", metadataBytes(grid)};
+    VdbGridRecord record{name, group.types[n], source.activeRule(), "", metadataBytes(grid)};
     if (record.rule == VdbActiveRule::kChannel) {
       record.stateChannel = freeName(name + "_active", taken);
       object->addComponent(source.makeStateChannel(record.stateChannel, *container, *topology));
     }
     records.append(record);
-    volume.channels.push_back({name, grid.getName(), source.type(), 4, 0, summary.activeVoxels,
+    volume.channels.push_back({name, grid.getName(), group.types[n], 4, 0, summary.activeVoxels,
                                summary.minimum, summary.maximum, summary.hasRange, summary.active});
     if (!summary.active.empty())
       volume.activeBox.grow(summary.active.min), volume.activeBox.grow(summary.active.max);
@@ -228,6 +233,8 @@ std::string transformBesidesScale(openvdb::math::Transform const& transform) {
 VdbImport importGrids(VdbFile const& file, Progress const& progress) {
   VdbImport result;
   result.file = file.path;
+  result.skipped = file.skipped;
+  if (file.metadata) result.metadata = metadataBytes(*file.metadata);
   auto groups = groupByTransform(file, result.skipped);
   for (Group& group : groups)
     for (auto const& grid : group.grids) {

@@ -46,8 +46,8 @@ using IndexBox = Velorn::Math::bbox<Velorn::Math::int3, int>;
 struct VdbChannel {
   std::string name;     ///< of the channel in its object; unlike the grid's only where that is taken
   std::string gridName; ///< as in the file
-  std::string
-      type; ///< of the grid's values: "float", "double", "int32", "int64", "bool", "vec3s", "vec3d", "vec3i"
+  std::string type;     ///< of the grid's values: "float", "double", "int32", "int64", "bool", "mask",
+                        ///< "vec3s", "vec3d", "vec3i"
   int core = 0;
   int halo = 0;
   std::int64_t activeVoxels = 0; ///< of the grid, those of active tiles included
@@ -71,20 +71,16 @@ struct VdbVolume {
   VdbChannel const* channel(std::string const& name) const;
 };
 
-struct SkippedGrid {
-  std::string grid;
-  std::string reason;
-};
-
 struct VdbImport {
   std::string file;
   std::vector<VdbVolume> volumes;  ///< in the order in which their first grids come
   std::vector<PointVolume> points; ///< one for each points grid
   std::vector<SkippedGrid> skipped;
+  std::string metadata; ///< OpenVDB's own bytes of the file's metadata
 };
 
 /// Reads a file and builds its volumes: each grid of a supported type becomes a Channel<Traits<2,4,0,1>, T,
-/// 4, 0> of its type (bool as unsigned char) whose default value is the grid's background.
+/// 4, 0> of its type (bool and masks as unsigned char) whose default value is the grid's background.
 /// @numeric The same trees and values for any number of threads.
 /// @error FileError; see probeVdbFile().
 VLN_API VdbImport importVdb(std::string const& path, VdbReadLimits const& limits = {},

@@ -13,6 +13,7 @@ VLN_API VdbImport importGrids(VdbFile const& file, Progress const& progress = {}
 /// A volume for each points grid of the file. Those that cannot come in are named as skipped.
 std::vector<PointVolume> importPointGrids(VdbFile const& file, std::vector<SkippedGrid>& skipped);
 bool isPointGrid(openvdb::GridBase const& grid);
+openvdb::GridBase::Ptr makePointsGrid(PointSet const& points, std::string const& name);
 
 /// Empty when the transform is one uniform scale along the axes; otherwise what it is, on one line.
 std::string transformBesidesScale(openvdb::math::Transform const& transform);

@@ -66,13 +66,32 @@ bool appendAttribute(PointDataGrid const& grid, std::string const& name, std::si
   return false;
 }
 
+// Beyond this a float's share of a voxel becomes coarse.
+constexpr int kNearIndex = 1 << 14;
+
+// A point of index space that is near all points of the grid: zero where that is.
+openvdb::Vec3d middleOf(PointDataGrid const& grid) {
+  openvdb::CoordBBox box;
+  if (!grid.tree().evalLeafBoundingBox(box)) return openvdb::Vec3d(0);
+  openvdb::Vec3d middle(0);
+  for (int a = 0; a < 3; ++a)
+    if (box.min()[a] < -kNearIndex || box.max()[a] > kNearIndex)
+      middle[a] = std::round((double(box.min()[a]) + box.max()[a]) / 2);
+  return middle;
+}
+
 PointVolume readGrid(PointDataGrid const& grid) {
   PointSet points;
   auto const& transform = grid.transform();
   double const size = transform.voxelSize().x();
   if (size > 0 && std::isfinite(size)) points.voxelSize = size;
-  auto const origin = transform.indexToWorld(openvdb::Vec3d(0));
+  auto const middle = middleOf(grid);
+  auto const origin = transform.indexToWorld(middle);
   points.origin = {origin.x(), origin.y(), origin.z()};
+  // A float would lose what lies between the origin and the points.
+  points.doublePositions = origin != openvdb::Vec3d(0);
+  // What is more than a scale and a shift goes into the positions.
+  bool const scaled = transformBesidesScale(transform).rfind("not ", 0) != 0;
 
   std::vector<std::string> skipped;
   if (auto const first = grid.tree().cbeginLeaf()) {
@@ -87,7 +106,8 @@ PointVolume readGrid(PointDataGrid const& grid) {
       leaf->validateOffsets(); // which handles do not
       AttributeHandle<openvdb::Vec3f> const handle(leaf->constAttributeArray(position));
       for (auto at = leaf->beginIndexOn(); at; ++at) {
-        auto const p = openvdb::Vec3d(handle.get(*at)) + at.getCoord().asVec3d();
+        auto p = openvdb::Vec3d(handle.get(*at)) + at.getCoord().asVec3d();
+        p = scaled ? p - middle : (transform.indexToWorld(p) - origin) / points.voxelSize;
         points.positions.push_back(
             {static_cast<float>(p.x()), static_cast<float>(p.y()), static_cast<float>(p.z())});
       }
@@ -104,8 +124,6 @@ PointVolume readGrid(PointDataGrid const& grid) {
   PointVolume volume = buildPointVolume(points);
   volume.name = grid.getName();
   volume.skippedAttributes.insert(volume.skippedAttributes.end(), skipped.begin(), skipped.end());
-  std::string const besides = transformBesidesScale(transform);
-  if (besides.rfind("not ", 0) == 0) volume.transform = besides; // a translation is the origin
   return volume;
 }
 
@@ -161,9 +179,8 @@ std::vector<PointVolume> importPointGrids(VdbFile const& file, std::vector<Skipp
   return volumes;
 }
 
-void writeVdbPoints(std::string const& path, PointSet const& points, std::string const& name) {
+openvdb::GridBase::Ptr makePointsGrid(PointSet const& points, std::string const& name) {
   openvdb::initialize();
-  OutputFile file(path);
   auto transform = openvdb::math::Transform::createLinearTransform(points.voxelSize);
   transform->postTranslate({points.origin.x, points.origin.y, points.origin.z});
   std::vector<openvdb::Vec3d> world;
@@ -193,7 +210,12 @@ void writeVdbPoints(std::string const& path, PointSet const& points, std::string
       }
     });
   }
-  writeVdbFile(file, {grid});
+  return grid;
+}
+
+void writeVdbPoints(std::string const& path, PointSet const& points, std::string const& name) {
+  OutputFile file(path);
+  writeVdbFile(file, {makePointsGrid(points, name)});
 }
 
 } // namespace VLN::Interop

@@ -149,7 +149,6 @@ TEST(VdbPoints, WhatIsWrittenReadsBack) {
   EXPECT_EQ(volume.voxelSize, 0.5);
   EXPECT_EQ(volume.origin, set.origin);
   EXPECT_TRUE(volume.skippedAttributes.empty());
-  EXPECT_TRUE(volume.transform.empty());
   expectPlaced(volume);
   auto const back = pointSetOf(volume);
   auto const ids = byId(back);

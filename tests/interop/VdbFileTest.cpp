@@ -211,7 +211,11 @@ TEST_F(VdbFileTest, BoundsMemory) {
 
 // negative
 TEST_F(VdbFileTest, ForeignTextStaysOnOneLine) {
-  EXPECT_EQ(oneLine("a\nb\tc\x01\xff"), "a b c??");
+  EXPECT_EQ(oneLine("a\nb\tc\x01\xff"), "a b c\\x01\\xff");
+  EXPECT_EQ(oneLine("D\u00fcse \u96f2 \U0001f32b"), "D\u00fcse \u96f2 \U0001f32b");
+  EXPECT_EQ(oneLine("\x1b[31m \x7f \xc2\x85 \xc0\xaf \xed\xa0\x80 \xe9"),
+            "\\x1b[31m \\x7f \\xc2\\x85 \\xc0\\xaf \\xed\\xa0\\x80 \\xe9");
+  EXPECT_EQ(oneLine("\u00e4\u00f6\u00fc", 2), "\u00e4\u00f6...");
   EXPECT_EQ(oneLine("abcdef", 3), "abc...");
 }
 

@@ -106,7 +106,8 @@ TEST_F(CommandLineTest, RegressionNohupIsHonoured) {
   std::string const path = m_folder / "cloud.vdb";
   for (bool const ignored : {false, true}) {
     RunResult const run = shell((ignored ? "trap '' HUP; " : "") + program() + " make cloud '" + path +
-                                (ignored ? "' --voxels 300000" : "' --voxels 30000000") + " & p=$!; sleep 0.1; kill -HUP $p; wait $p");
+                                (ignored ? "' --voxels 300000" : "' --voxels 30000000") +
+                                " & p=$!; sleep 0.1; kill -HUP $p; wait $p");
     if (ignored)
       EXPECT_EQ(run.code, 0) << run.err;
     else
@@ -125,6 +126,31 @@ TEST_F(CommandLineTest, RequirementAReaderMayGoAway) {
                               (m_folder / "p.csv") + "' | head -n 1");
   EXPECT_EQ(run.out, "x,y,z,value,gx,gy,gz\n");
   EXPECT_EQ(run.err, "");
+}
+
+// requirement: the manual page and the completions know every command and its options
+TEST_F(CommandLineTest, RequirementManualAndCompletions) {
+  RunResult const manual = vln({"manual"});
+  EXPECT_EQ(manual.code, 0) << manual.err;
+  EXPECT_EQ(manual.out.rfind(".TH VLN 1", 0), 0u);
+  for (std::string const command :
+       {"info", "slice", "convert", "probe", "make", "churn", "points", "tiles", "advect", "completions"})
+    EXPECT_NE(manual.out.find(".SS vln " + command), std::string::npos) << command;
+  EXPECT_NE(manual.out.find("\\-\\-percentile \\fIP\\fR"), std::string::npos) << manual.out;
+  for (std::string const shell : {"bash", "zsh", "fish"}) {
+    RunResult const script = vln({"completions", shell});
+    EXPECT_EQ(script.code, 0) << script.err;
+    EXPECT_NE(script.out.find("percentile"), std::string::npos);
+    EXPECT_EQ(script.out.find("manual"), std::string::npos) << "a command for the build alone";
+  }
+  std::string const script = m_folder / "completions";
+  writeAll(script, vln({"completions", "bash"}).out);
+  RunResult const completed =
+      runProgram({"/bin/bash", "-c",
+                  ". '" + script + "'; COMP_WORDS=(vln slice --chan); COMP_CWORD=2; _vln; " +
+                      "echo \"${COMPREPLY[@]}\"; COMP_WORDS=(vln sl); COMP_CWORD=1; _vln; " +
+                      "echo \"${COMPREPLY[@]}\""});
+  EXPECT_EQ(completed.out, "--channel\nslice\n") << completed.err;
 }
 
 // regression: after the import the bar of convert began again

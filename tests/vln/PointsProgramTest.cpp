@@ -2,6 +2,8 @@
 #include "Interop/Ply.h"
 #include "support/VlnProgram.h"
 
+#include <openvdb/openvdb.h>
+
 #include <algorithm>
 #include <cmath>
 #include <fstream>
@@ -106,6 +108,77 @@ TEST_F(PointsProgramTest, TilesBecomeBoxesWithTheirMaterials) {
   ASSERT_EQ(vln({"make", "torus", m_folder / "t.vdb", "--voxels", "20000"}).code, 0);
   EXPECT_EQ(vln({"tiles", m_folder / "t.vdb", "--depth", "28", "-o", obj}).code, 0);
   EXPECT_GT(count(obj, "usemtl"), 100u);
+}
+
+// regression: positions went through floats, which are half a metre apart out there
+TEST_F(PointsProgramTest, RegressionSurveyCoordinatesKeepTheirMillimetres) {
+  VLN::Interop::PointSet set;
+  set.origin = {4500000, 500000, 120};
+  set.doublePositions = true;
+  for (int n = 0; n < 3000; ++n)
+    set.positions.push_back({0.013f * float(n % 101), 0.017f * float(n % 97), 0.001f * float(n)});
+  set.attributes = {VLN::Interop::makeAttribute<float>("id")};
+  for (int n = 0; n < 3000; ++n) set.attributes[0].append(float(n));
+  std::string const ply = m_folder / "survey.ply", vdb = m_folder / "survey.vdb",
+                    back = m_folder / "back.ply", obj = m_folder / "survey.obj";
+  VLN::Interop::writePly(ply, set);
+  for (auto const& [from, to] : {std::pair(ply, vdb), std::pair(vdb, back), std::pair(vdb, obj)}) {
+    RunResult const run = vln({"points", from, "-o", to, "--size", "0.001"});
+    ASSERT_EQ(run.code, 0) << run.err;
+  }
+  auto const read = VLN::Interop::readPly(back);
+  ASSERT_EQ(read.size(), set.size());
+  for (std::size_t n = 0; n < read.size(); ++n) {
+    auto const was = set.world(static_cast<std::size_t>(read.attributes.at(0).value<float>(n)));
+    for (int a = 0; a < 3; ++a) ASSERT_NEAR(read.world(n)[a], was[a], 1e-5);
+  }
+  // The boxes stand where the points are, each two millimetres wide.
+  std::ifstream in(obj);
+  std::string word;
+  double x = 0, y = 0, z = 0, lowest = 1e300, highest = -1e300;
+  while (in >> word)
+    if (word == "v" && in >> x >> y >> z) lowest = std::min(lowest, x), highest = std::max(highest, x);
+  EXPECT_NEAR(lowest, 4500000 - 0.001, 2e-5);
+  EXPECT_NEAR(highest, 4500000 + 0.013 * 100 + 0.001, 2e-5);
+}
+
+// regression: tiles of the first object only were drawn, without its transform, whatever --grid said
+TEST_F(PointsProgramTest, RegressionTilesStandInTheWorld) {
+  openvdb::initialize();
+  auto const box = [](char const* name, double size, openvdb::Vec3d const& at) {
+    auto grid = openvdb::FloatGrid::create();
+    grid->setName(name);
+    grid->setTransform(openvdb::math::Transform::createLinearTransform(size));
+    grid->transform().postRotate(0.5, openvdb::math::Z_AXIS);
+    grid->transform().postTranslate(at);
+    grid->tree().setValueOn({0, 0, 0}, 1.0f);
+    return grid;
+  };
+  openvdb::GridPtrVec const grids{box("near", 0.5, {0, 0, 0}), box("far", 2, {1000, 0, 0})};
+  std::string const vdb = m_folder / "two.vdb", obj = m_folder / "two.obj";
+  openvdb::io::File(vdb).write(grids);
+  auto const corners = [&](std::vector<std::string> const& more) {
+    std::vector<std::string> arguments{"tiles", vdb, "--depth", "28", "-o", obj};
+    arguments.insert(arguments.end(), more.begin(), more.end());
+    RunResult const run = vln(arguments);
+    EXPECT_EQ(run.code, 0) << run.err;
+    std::vector<openvdb::Vec3d> found;
+    std::ifstream in(obj);
+    for (std::string word; in >> word;) {
+      openvdb::Vec3d p;
+      if (word == "v" && in >> p.x() >> p.y() >> p.z()) found.push_back(p);
+    }
+    return found;
+  };
+  EXPECT_EQ(corners({}).size(), 16u);
+  auto const far = corners({"--grid", "far"});
+  ASSERT_EQ(far.size(), 8u);
+  for (int n = 0; n < 8; ++n) {
+    auto const expected = grids[1]->indexToWorld(openvdb::Vec3d(n & 1 ? 4 : 0, n & 2 ? 4 : 0, n & 4 ? 4 : 0));
+    EXPECT_LT((far[std::size_t(n)] - expected).length(), 1e-6);
+  }
+  expectFailure(vln({"tiles", vdb, "--depth", "28", "--grid", "none", "-o", obj}),
+                vdb + ": has no grid 'none'");
 }
 
 TEST_F(PointsProgramTest, FailuresAreOneLineAndLeaveNoFile) {

@@ -8,6 +8,7 @@
 #include "GeometryVolume/pools/PoolUtils.h"
 #include "Interop/FileError.h"
 #include "ProgressBar.h"
+#include "StandardOutput.h"
 
 #include <array>
 #include <cstdio>
@@ -80,7 +81,7 @@ void printOne(ChurnOptions const& o) {
   Json const j = {{"seconds", f.seconds},         {"peak_rss", f.peakResident}, {"voxels", f.voxels},
                   {"channels", f.heldByChannels}, {"arrays", f.heldByArrays},   {"blocks", f.heldByBlocks},
                   {"checksum", f.checksum}};
-  std::cout << j.dump() << "\n";
+  out() << j.dump() << "\n";
 }
 
 std::string mb(Json const& bytes) { return fmt::format("{:.1f} MB", bytes.get<double>() / 1e6); }
@@ -100,26 +101,24 @@ void churn(ChurnOptions const& o) {
                     {"limit", o.limitBytes},
                     {"with_pools", part(with)},
                     {"without_pools", part(without)}};
-    std::cout << j.dump(2) << "\n";
+    out() << j.dump(2) << "\n";
     return;
   }
-  std::cout << fmt::format("{}: {} active voxels, {} rounds, limit {:.1f} MB\n\n",
-                           VLN::Interop::oneLine(o.file), with["voxels"].get<std::int64_t>(), o.rounds,
-                           double(o.limitBytes) / 1e6);
-  std::cout << fmt::format("  {:<14}  {:>12}  {:>14}  {}\n", "", "time a round", "peak resident",
-                           "held by the pools at the end");
+  out() << fmt::format("{}: {} active voxels, {} rounds, limit {:.1f} MB\n\n", VLN::Interop::oneLine(o.file),
+                       with["voxels"].get<std::int64_t>(), o.rounds, double(o.limitBytes) / 1e6);
+  out() << fmt::format("  {:<14}  {:>12}  {:>14}  {}\n", "", "time a round", "peak resident",
+                       "held by the pools at the end");
   auto const row = [](char const* name, Json const& j, std::string const& held) {
-    std::cout << fmt::format("  {:<14}  {:>9.2f} ms  {:>14}  {}\n", name, 1000 * j["seconds"].get<double>(),
-                             mb(j["peak_rss"]), held);
+    out() << fmt::format("  {:<14}  {:>9.2f} ms  {:>14}  {}\n", name, 1000 * j["seconds"].get<double>(),
+                         mb(j["peak_rss"]), held);
   };
   row("with pools", with,
       fmt::format("channels {}, arrays {}, blocks {}", mb(with["channels"]), mb(with["arrays"]),
                   mb(with["blocks"])));
   row("without pools", without, "-");
-  std::cout << fmt::format(
-      "\n  rounds with pools take {:.2f} of the time; their peak is {:.2f} of the limit\n",
-      with["seconds"].get<double>() / without["seconds"].get<double>(),
-      with["peak_rss"].get<double>() / double(o.limitBytes));
+  out() << fmt::format("\n  rounds with pools take {:.2f} of the time; their peak is {:.2f} of the limit\n",
+                       with["seconds"].get<double>() / without["seconds"].get<double>(),
+                       with["peak_rss"].get<double>() / double(o.limitBytes));
 }
 
 } // namespace Vln

@@ -27,6 +27,8 @@ std::vector<Command> const& commandTable() {
        declareTiles},
       {"advect", "Move points, each step into the tiles where they then belong",
        "vln advect scan.ply --velocity 0.1 0 0 --steps 100", declareAdvect},
+      {"completions", "Print the completions of a shell", "vln completions bash", declareCompletions},
+      {"manual", "Print the manual page", "", declareManual},
   };
   return table;
 }

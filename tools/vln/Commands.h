@@ -12,7 +12,8 @@
 namespace Vln {
 
 struct InfoOptions {
-  std::string file;
+  std::vector<std::string> files; ///< and patterns
+  bool brief = false;             ///< a line for each
   bool json = false;
   bool memory = false;
   VLN::Interop::VdbReadLimits limits;
@@ -24,6 +25,7 @@ struct SliceOptions {
   std::string channel;
   std::string output;
   VLN::Interop::SliceOptions plane;
+  bool title = true;
   VLN::Interop::VdbReadLimits limits;
 };
 void slice(SliceOptions const& options);
@@ -31,6 +33,7 @@ void slice(SliceOptions const& options);
 struct ConvertOptions {
   std::string file;
   std::string output;
+  bool strict = false; ///< what would be left out is an error
   VLN::Interop::VdbReadLimits limits;
 };
 void convert(ConvertOptions const& options);
@@ -51,8 +54,9 @@ void validate(ValidateOptions const& options);
 struct ProbeOptions {
   std::string file;
   std::string channel;
-  std::vector<double> positions; ///< x, y, z, x, y, z, ...
-  std::string points;            ///< a CSV file; empty for none
+  std::vector<std::string> positions; ///< x, y, z, x, y, z, ..., or "-"
+  std::string points;                 ///< a CSV file, or "-" for standard input; empty for none
+  std::string output;                 ///< empty for standard output
   VLN::Interop::VdbReadLimits limits;
 };
 void probe(ProbeOptions const& options);

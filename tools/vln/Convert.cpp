@@ -2,6 +2,7 @@
 #include "Interop/FileError.h"
 #include "Interop/FileFormat.h"
 #include "Interop/VdbExport.h"
+#include "PointsFile.h"
 #include "ProgressBar.h"
 #include "StandardOutput.h"
 
@@ -21,6 +22,15 @@ std::string whyNot(VdbImport const& content) {
   return reasons;
 }
 
+// With --strict all that would be left out is an error.
+void checkWhole(VdbImport const& content) {
+  if (!content.skipped.empty()) throw FileError(content.file, "would not be written whole" + whyNot(content));
+  for (auto const& points : content.points)
+    if (std::string const loss = lossesOf(points); !loss.empty())
+      throw FileError(content.file,
+                      "would not be written whole; '" + oneLine(points.name, 60) + "': " + loss);
+}
+
 } // namespace
 
 void convert(ConvertOptions const& options) {
@@ -30,18 +40,18 @@ void convert(ConvertOptions const& options) {
   {
     ProgressBar bar;
     content = importVdb(options.file, options.limits, bar.progress(0, 0.7));
+    written = content.points.size();
     for (auto const& volume : content.volumes) written += volume.channels.size();
     if (written == 0) throw FileError(options.file, "has no grid that could be written" + whyNot(content));
-    exportVdb(content.volumes, options.output, bar.progress(0.7, 1));
+    if (options.strict) checkWhole(content);
+    exportVdb(content, options.output, bar.progress(0.7, 1));
   }
-  remarks(options.output) << fmt::format("{}: {} {} written\n", options.output, written,
-                                         written == 1 ? "grid" : "grids");
   for (auto const& s : content.skipped)
     std::cerr << fmt::format("vln: {}: note: '{}' is left out: {}\n", options.file, oneLine(s.grid, 60),
                              oneLine(s.reason));
-  for (auto const& points : content.points)
-    std::cerr << fmt::format("vln: {}: note: '{}' is left out: it holds points, which vln points writes\n",
-                             options.file, oneLine(points.name, 60));
+  for (auto const& points : content.points) noteLosses(options.file, points);
+  remarks(options.output) << fmt::format("{}: {} {} written\n", options.output, written,
+                                         written == 1 ? "grid" : "grids");
 }
 
 } // namespace Vln

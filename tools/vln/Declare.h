@@ -21,6 +21,8 @@ void declareChurn(CLI::App& self);
 void declarePoints(CLI::App& self);
 void declareTiles(CLI::App& self);
 void declareAdvect(CLI::App& self);
+void declareCompletions(CLI::App& self);
+void declareManual(CLI::App& self);
 
 /// Refuses what is no finite number, for options that take doubles.
 CLI::Option* finite(CLI::Option* option);

@@ -30,10 +30,11 @@ void addMemoryLimit(CLI::App& self, VLN::Interop::VdbReadLimits& limits) {
 void declareInfo(CLI::App& self) {
   auto const options = std::make_shared<InfoOptions>();
   auto& o = *options;
-  self.add_option("FILE", o.file, "A .vdb or .ply file")->required();
+  self.add_option("FILE", o.files, "Files, .vdb or .ply")->required();
   auto* json = self.add_flag("--json", o.json, "One JSON object instead of tables");
   self.add_flag("--memory", o.memory, "Also what accounts for memory: objects, their data, and the pools")
       ->excludes(json);
+  self.add_flag("--brief", o.brief, "One line for each file")->excludes("--memory")->excludes(json);
   addMemoryLimit(self, o.limits);
   self.callback([options] { info(*options); });
 }
@@ -63,6 +64,40 @@ void declareSlice(CLI::App& self) {
       ->type_name("D");
   self.add_flag("--nearest", o.plane.nearest, "Draw the nearest sample instead of blending linearly");
   self.add_flag("--gradient", o.plane.gradient, "Draw the length of the gradient")->excludes("--nearest");
+  self.add_option_function<std::string>(
+          "--component", [&o](std::string const& c) { o.plane.component = c == "length" ? -1 : c[0] - 'x'; },
+          "Of vectors: x, y, z, or their length (the default)")
+      ->check(CLI::IsMember({"x", "y", "z", "length"}))
+      ->type_name("C");
+  finite(self.add_option_function<std::vector<double>>(
+             "--range",
+             [&o](std::vector<double> const& r) {
+               o.plane.range = {r[0], r[1]};
+             },
+             "Values of the first and of the last colour"))
+      ->expected(2)
+      ->type_name("LOW HIGH");
+  finite(self.add_option("--percentile", o.plane.percentile,
+                         "Colours end at the value that so many per cent of the pixels stay below"))
+      ->check(CLI::Range(50.1, 100.0))
+      ->capture_default_str()
+      ->excludes("--range")
+      ->type_name("P");
+  self.add_option_function<std::string>(
+          "--cmap",
+          [&o](std::string const& name) {
+            using VLN::Interop::SliceColors;
+            o.plane.colors = name == "sequential"  ? SliceColors::kSequential
+                             : name == "diverging" ? SliceColors::kDiverging
+                             : name == "gray"      ? SliceColors::kGray
+                                                   : SliceColors::kAuto;
+          },
+          "Colours: auto, sequential, diverging (white in the middle) or gray")
+      ->check(CLI::IsMember({"auto", "sequential", "diverging", "gray"}))
+      ->type_name("NAME");
+  self.add_flag("--index-space", o.plane.indexSpace,
+                "Draw along the grid's own axes, every voxel a square; --at is an index then");
+  self.add_flag("!--no-title", o.title, "Leave the line with file, channel and plane out");
   self.add_option("-o,--output", o.output, "The PNG file to write")->required()->type_name("OUT.png");
   addMemoryLimit(self, o.limits);
   self.callback([options] { slice(*options); });
@@ -73,6 +108,7 @@ void declareConvert(CLI::App& self) {
   auto& o = *options;
   self.add_option("IN", o.file, "A .vdb file")->required()->type_name("IN.vdb");
   self.add_option("OUT", o.output, "The .vdb file to write")->required()->type_name("OUT.vdb");
+  self.add_flag("--strict", o.strict, "Write nothing where anything of the file would be left out");
   addMemoryLimit(self, o.limits);
   self.callback([options] { convert(*options); });
 }
@@ -81,12 +117,16 @@ void declareProbe(CLI::App& self) {
   auto const options = std::make_shared<ProbeOptions>();
   auto& o = *options;
   self.add_option("FILE", o.file, "A .vdb file")->required();
-  finite(self.add_option("X Y Z", o.positions, "World positions, three numbers each"))->type_name("...");
+  self.add_option("X Y Z", o.positions,
+                  "World positions, three numbers each; - reads them from standard input")
+      ->type_name("...");
   self.add_option("--channel", o.channel, "Name of the channel, as info tells it")
       ->required()
       ->type_name("NAME");
-  self.add_option("--points", o.points, "A file with a line x,y,z for each position, without header")
+  self.add_option("--points", o.points, "A file with a line x,y,z for each position, below a header or none")
       ->type_name("FILE.csv");
+  self.add_option("-o,--output", o.output, "The file to write (default: standard output)")
+      ->type_name("OUT.csv");
   addMemoryLimit(self, o.limits);
   self.callback([options] { probe(*options); });
 }

@@ -2,6 +2,7 @@
 
 #include "Content.h"
 #include "Interop/FileError.h"
+#include "StandardOutput.h"
 
 #include <algorithm>
 #include <array>
@@ -99,30 +100,29 @@ Json pointsJson(PointVolume const& volume) {
 
 void printPoints(PointVolume const& volume, std::size_t n) {
   auto const tree = volume.object->component<PointContainer>(kPointContainerName);
-  auto& out = std::cout;
-  out << fmt::format("\nobject {}: points{}{}, voxel size {:.6g} world units\n", n,
-                     volume.name.empty() ? "" : " ", oneLine(volume.name, 60), volume.voxelSize);
+  out() << fmt::format("\nobject {}: points{}{}, voxel size {:.12g} world units\n", n,
+                       volume.name.empty() ? "" : " ", oneLine(volume.name, 60), volume.voxelSize);
   Bounds b;
   if (worldBounds(volume, b))
-    out << fmt::format("  world box: ({:.6g}, {:.6g}, {:.6g}) .. ({:.6g}, {:.6g}, {:.6g})\n", b[0][0],
-                       b[0][1], b[0][2], b[1][0], b[1][1], b[1][2]);
+    out() << fmt::format("  world box: ({:.12g}, {:.12g}, {:.12g}) .. ({:.12g}, {:.12g}, {:.12g})\n", b[0][0],
+                         b[0][1], b[0][2], b[1][0], b[1][1], b[1][2]);
   else
-    out << "  world box: none, there are no points\n";
-  out << fmt::format("\n  {:>5}  {:>12}\n", "depth", "tiles");
+    out() << "  world box: none, there are no points\n";
+  out() << fmt::format("\n  {:>5}  {:>12}\n", "depth", "tiles");
   for (int d = 0; d <= PointTraits::kMaxDepth; ++d)
-    if (auto const count = tree->tileCount(d); count > 0) out << fmt::format("  {:>5}  {:>12}\n", d, count);
+    if (auto const count = tree->tileCount(d); count > 0) out() << fmt::format("  {:>5}  {:>12}\n", d, count);
   auto const rows = rowsOf(volume);
   std::size_t width = 7;
   for (Row const& row : rows) width = std::max(width, oneLine(row.name, 60).size());
-  out << fmt::format("\n  {:<{}}  {:<8}  {:>12}  {:>12}  {:>12}\n", "channel", width, "type", "elements",
-                     "min", "max");
+  out() << fmt::format("\n  {:<{}}  {:<8}  {:>12}  {:>12}  {:>12}\n", "channel", width, "type", "elements",
+                       "min", "max");
   for (Row const& row : rows)
-    out << fmt::format("  {:<{}}  {:<8}  {:>12}  {:>12}  {:>12}\n", oneLine(row.name, 60), width, row.type,
-                       row.elements, row.hasRange ? fmt::format("{:.6g}", row.low) : "-",
-                       row.hasRange ? fmt::format("{:.6g}", row.high) : "-");
+    out() << fmt::format("  {:<{}}  {:<8}  {:>12}  {:>12}  {:>12}\n", oneLine(row.name, 60), width, row.type,
+                         row.elements, row.hasRange ? fmt::format("{:.12g}", row.low) : "-",
+                         row.hasRange ? fmt::format("{:.12g}", row.high) : "-");
   Memory const memory = memoryOf(*volume.object);
-  out << fmt::format("\n  memory: {:.2f} MB used, {:.2f} MB allocated\n", double(memory.used) / 1e6,
-                     double(memory.allocated) / 1e6);
+  out() << fmt::format("\n  memory: {:.2f} MB used, {:.2f} MB allocated\n", double(memory.used) / 1e6,
+                       double(memory.allocated) / 1e6);
 }
 
 } // namespace Vln

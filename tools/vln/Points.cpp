@@ -109,25 +109,25 @@ void advect(AdvectOptions const& options) {
   }
   noteLosses(options.input.file, volume);
   std::int64_t const after = pointCount(volume);
-  auto& out = remarks(options.output);
+  auto& report = remarks(options.output);
   if (options.json) {
-    out << Json({{"points_before", before},
-                 {"points_after", after},
-                 {"dropped", before - after},
-                 {"steps", options.steps},
-                 {"seconds", seconds},
-                 {"tiles_before", tilesBefore},
-                 {"tiles_after", tileCount(volume)}})
-               .dump(2)
-        << "\n";
+    report << Json({{"points_before", before},
+                    {"points_after", after},
+                    {"dropped", before - after},
+                    {"steps", options.steps},
+                    {"seconds", seconds},
+                    {"tiles_before", tilesBefore},
+                    {"tiles_after", tileCount(volume)}})
+                  .dump(2)
+           << "\n";
     return;
   }
   double const rate = seconds > 0 ? double(before) * options.steps / seconds : 0;
-  out << fmt::format("{} points, {} steps in {:.3f} s: {:.1f} million points a second\n"
-                     "{} points after, {} dropped\n"
-                     "{} tiles before, {} gained, {} lost, {} after\n",
-                     before, options.steps, seconds, rate / 1e6, after, before - after, tilesBefore, gained,
-                     lost, tileCount(volume));
+  report << fmt::format("{} points, {} steps in {:.3f} s: {:.1f} million points a second\n"
+                        "{} points after, {} dropped\n"
+                        "{} tiles before, {} gained, {} lost, {} after\n",
+                        before, options.steps, seconds, rate / 1e6, after, before - after, tilesBefore,
+                        gained, lost, tileCount(volume));
 }
 
 } // namespace Vln

@@ -38,16 +38,18 @@ PointVolume readPointVolume(PointsInput const& input, Progress const& progress) 
   return std::move(volumes.front());
 }
 
-void noteLosses(std::string const& file, PointVolume const& volume) {
-  if (volume.dropped > 0)
-    std::cerr << fmt::format("vln: {}: note: {} points lie out of reach and are left out\n", file,
-                             volume.dropped);
+std::string lossesOf(PointVolume const& volume) {
+  std::string losses;
+  auto const add = [&](std::string const& loss) { losses += (losses.empty() ? "" : "; ") + loss; };
+  if (volume.dropped > 0) add(fmt::format("{} points lie out of reach and are left out", volume.dropped));
   for (auto const& name : volume.skippedAttributes)
-    std::cerr << fmt::format("vln: {}: note: the attribute {} is left out\n", file, oneLine(name, 60));
-  if (!volume.transform.empty())
-    std::cerr << fmt::format(
-        "vln: {}: note: the transform is {}; positions leave out all but the voxel size\n", file,
-        volume.transform);
+    add(fmt::format("the attribute {} is left out", oneLine(name, 60)));
+  return losses;
+}
+
+void noteLosses(std::string const& file, PointVolume const& volume) {
+  if (std::string const losses = lossesOf(volume); !losses.empty())
+    std::cerr << fmt::format("vln: {}: note: {}\n", file, losses);
 }
 
 void checkPointsOutput(std::string const& path) {

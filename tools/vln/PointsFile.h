@@ -15,7 +15,9 @@ std::vector<VLN::Interop::PointVolume> readPointVolumes(PointsInput const& input
 /// @error FileError when there is none, or more than one without a name.
 VLN::Interop::PointVolume readPointVolume(PointsInput const& input, VLN::Interop::Progress const& progress);
 
-/// Tells on standard error what of the file did not come in.
+/// What of the points did not come in; empty where all did.
+std::string lossesOf(VLN::Interop::PointVolume const& volume);
+/// Tells it on standard error.
 void noteLosses(std::string const& file, VLN::Interop::PointVolume const& volume);
 
 /// Writes points as the extension of the name asks.

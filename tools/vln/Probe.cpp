@@ -3,20 +3,18 @@
 #include "GeometryVolume/channels/Channel.h"
 #include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/sampling/VoxelSamplerLinear.h"
-#include "Interop/FileError.h"
+#include "Interop/ChannelValues.h"
+#include "Interop/FileFormat.h"
+#include "Interop/OutputFile.h"
 #include "Interop/VdbImport.h"
+#include "Positions.h"
 #include "ProgressBar.h"
+#include "StandardOutput.h"
 
-#include <cerrno>
-#include <charconv>
-#include <cstring>
-#include <filesystem>
-#include <fstream>
-#include <iostream>
 #include <iterator>
 #include <memory>
+#include <optional>
 #include <stdexcept>
-#include <string_view>
 
 #include <fmt/format.h>
 
@@ -33,116 +31,177 @@ using Sampler = VLN::TileTree3D::FloatVoxelSamplerLinear<VdbTraits>;
 using Velorn::Math::double3;
 using Velorn::Math::float3;
 
-// Points whose lines are formed before they are written.
-constexpr std::int64_t kBlock = 1 << 16;
+// Points of a piece of work.
 constexpr std::int64_t kChunk = 1 << 11;
 
-std::string_view trimmed(std::string_view text) {
-  auto const blank = [](char c) { return c == ' ' || c == '\t' || c == '\r'; };
-  while (!text.empty() && blank(text.front())) text.remove_prefix(1);
-  while (!text.empty() && blank(text.back())) text.remove_suffix(1);
-  return text;
-}
-
-// One number of a line; false for anything else.
-bool parse(std::string_view text, double& number) {
-  text = trimmed(text);
-  if (!text.empty() && text.front() == '+') text.remove_prefix(1);
-  auto const [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
-  return !text.empty() && error == std::errc() && end == text.data() + text.size();
-}
-
-std::vector<double3> readPoints(std::string const& path) {
-  std::error_code unknown;
-  if (std::filesystem::is_directory(path, unknown)) throw FileError(path, "is a directory");
-  std::ifstream in(path, std::ios::binary);
-  if (!in) throw FileError(path, std::strerror(errno));
-  std::string const text((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
-  if (in.bad()) throw FileError(path, "cannot be read");
-  std::vector<double3> points;
-  std::size_t line = 0;
-  for (std::size_t begin = 0; begin < text.size();) {
-    std::size_t const end = std::min(text.find('\n', begin), text.size());
-    auto rest = std::string_view(text).substr(begin, end - begin);
-    begin = end + 1;
-    ++line;
-    if (trimmed(rest).empty()) continue;
-    double3 p{};
-    bool good = true;
-    for (int a = 0; a < 3 && good; ++a) {
-      std::size_t const comma = rest.find(',');
-      good = (comma == std::string_view::npos) == (a == 2) && parse(rest.substr(0, comma), p[a]);
-      if (a < 2 && good) rest.remove_prefix(comma + 1);
-    }
-    if (!good) throw FileError(path, fmt::format("line {} is not of the form x,y,z", line));
-    points.push_back(p);
-  }
-  return points;
-}
-
-// A point of world space as a line: through the whole transform into the tree's space, and the gradient back.
-struct Line {
-  VdbVolume const& volume;
-  float voxelSize; ///< that the sampler's gradients were divided by
-
-  void append(fmt::memory_buffer& text, Sampler const& sampler, double3 const& p) const {
-    double3 const index = volume.indexToWorld.toIndex(p);
-    float3 g;
-    float const value = sampler.sampleGradient(
-        {static_cast<float>(index.x), static_cast<float>(index.y), static_cast<float>(index.z)},
-        VLN::TileTree3D::kSamplerTileSpace, &g);
-    g *= voxelSize;
-    double3 const w = volume.indexToWorld.gradientToWorld({g.x, g.y, g.z}, index);
-    fmt::format_to(std::back_inserter(text), "{:.9g},{:.9g},{:.9g},{:.9g},{:.9g},{:.9g},{:.9g}\n", p.x, p.y,
-                   p.z, value, w.x, w.y, w.z);
-  }
+// Prints a position's line from the value on.
+class Prober {
+public:
+  virtual ~Prober() = default;
+  virtual std::unique_ptr<Prober> clone() const = 0;
+  virtual std::string columns() const = 0;
+  /// @param index The position in the tree's space.
+  virtual void append(fmt::memory_buffer& text, double3 const& index) const = 0;
 };
 
-void writeLines(std::vector<double3> const& points, Sampler const& cold, Line const& line) {
-  std::vector<std::unique_ptr<Sampler>> samplers(static_cast<std::size_t>(VLN::parallelThreads()));
-  auto const count = static_cast<std::int64_t>(points.size());
-  std::cout << "x,y,z,value,gx,gy,gz\n";
-  for (std::int64_t first = 0; first < count && std::cout; first += kBlock) {
-    std::int64_t const last = std::min(first + kBlock, count);
-    std::vector<std::string> lines(static_cast<std::size_t>(VLN::chunkCount(first, last, kChunk)));
-    VLN::parallelChunks(first, last, kChunk, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-      auto& sampler = samplers[static_cast<std::size_t>(VLN::parallelThreadIndex())];
-      if (!sampler) sampler = std::make_unique<Sampler>(cold);
-      fmt::memory_buffer text;
-      for (std::int64_t n = begin; n < end; ++n)
-        line.append(text, *sampler, points[static_cast<std::size_t>(n)]);
-      lines[static_cast<std::size_t>(chunk)].assign(text.data(), text.size());
-    });
-    for (auto const& text : lines) std::cout << text;
+// Values with gradients, back through the whole transform.
+class FloatProber final : public Prober {
+public:
+  FloatProber(VdbVolume const& volume, FloatChannel const& channel)
+      : m_volume(volume)
+      , m_tree(volume.object->component<Container>(kVdbContainerName))
+      , m_topology(volume.object->component<Topology>(kVdbTopologyName))
+      , m_sampler(*m_tree, *m_topology, channel) {}
+
+  std::unique_ptr<Prober> clone() const override { return std::make_unique<FloatProber>(*this); }
+  std::string columns() const override { return "value,gx,gy,gz"; }
+  void append(fmt::memory_buffer& text, double3 const& index) const override {
+    float3 g;
+    float const value = m_sampler.sampleGradient(
+        {static_cast<float>(index.x), static_cast<float>(index.y), static_cast<float>(index.z)},
+        VLN::TileTree3D::kSamplerTileSpace, &g);
+    g *= m_tree->voxelSize(); // by which the sampler divided
+    double3 const w = m_volume.indexToWorld.gradientToWorld({g.x, g.y, g.z}, index);
+    fmt::format_to(std::back_inserter(text), ",{:.9g},{:.9g},{:.9g},{:.9g}", value, w.x, w.y, w.z);
   }
+
+private:
+  VdbVolume const& m_volume;
+  Ostil::Ptr<Container> m_tree;
+  Ostil::Ptr<Topology> m_topology;
+  Sampler m_sampler;
+};
+
+// Values of the other types by component.
+class AnyProber final : public Prober {
+public:
+  explicit AnyProber(std::unique_ptr<ChannelValues> values)
+      : m_values(std::move(values)) {}
+
+  std::unique_ptr<Prober> clone() const override { return std::make_unique<AnyProber>(m_values->clone()); }
+  std::string columns() const override {
+    return m_values->components() == 1 ? "value" : "value_x,value_y,value_z";
+  }
+  void append(fmt::memory_buffer& text, double3 const& index) const override {
+    auto const at = std::back_inserter(text);
+    if (m_values->whole()) {
+      fmt::format_to(at, ",{}", m_values->text(ChannelValues::nearest(index)));
+      return;
+    }
+    double values[kMostComponents];
+    m_values->linear(index, values);
+    for (int c = 0; c < m_values->components(); ++c)
+      fmt::format_to(at, ",{:.{}g}", values[c], m_values->wide() ? 17 : 9);
+  }
+
+private:
+  std::unique_ptr<ChannelValues> m_values;
+};
+
+std::unique_ptr<Prober> proberOf(VdbVolume const& volume, std::string const& channel) {
+  if (auto const floats = volume.object->component<FloatChannel>(channel))
+    return std::make_unique<FloatProber>(volume, *floats);
+  auto values = ChannelValues::of(volume, channel);
+  if (!values) throw std::runtime_error("channel '" + channel + "' has a type that cannot be printed");
+  return std::make_unique<AnyProber>(std::move(values));
+}
+
+// Writes lines to a file, or to standard output.
+class Lines {
+public:
+  Lines(IndexToWorld const& indexToWorld, Prober const& prober, OutputFile* file)
+      : m_indexToWorld(indexToWorld)
+      , m_prober(prober)
+      , m_file(file)
+      , m_probers(static_cast<std::size_t>(VLN::parallelThreads())) {
+    put("x,y,z," + prober.columns() + "\n");
+  }
+
+  void write(std::vector<double3> const& points) {
+    auto const count = static_cast<std::int64_t>(points.size());
+    constexpr std::int64_t kBlock = 32 * kChunk; // whose lines are formed before they are written
+    for (std::int64_t first = 0; first < count && out(); first += kBlock) {
+      std::int64_t const last = std::min(first + kBlock, count);
+      std::vector<std::string> lines(static_cast<std::size_t>(VLN::chunkCount(first, last, kChunk)));
+      VLN::parallelChunks(first, last, kChunk, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+        auto& prober = m_probers[static_cast<std::size_t>(VLN::parallelThreadIndex())];
+        if (!prober) prober = m_prober.clone();
+        fmt::memory_buffer text;
+        for (std::int64_t n = begin; n < end; ++n) append(text, *prober, points[static_cast<std::size_t>(n)]);
+        lines[static_cast<std::size_t>(chunk)].assign(text.data(), text.size());
+      });
+      for (auto const& text : lines) put(text);
+    }
+  }
+
+private:
+  void append(fmt::memory_buffer& text, Prober const& prober, double3 const& p) const {
+    fmt::format_to(std::back_inserter(text), "{:.{}g},{:.{}g},{:.{}g}", p.x, kDigits, p.y, kDigits, p.z,
+                   kDigits);
+    prober.append(text, m_indexToWorld.toIndex(p));
+    text.push_back('\n');
+  }
+  void put(std::string const& text) {
+    if (m_file)
+      m_file->write(text);
+    else
+      out() << text;
+  }
+
+  // Enough for a hundredth of a millimetre at any place on the earth.
+  static constexpr int kDigits = 12;
+
+  IndexToWorld const& m_indexToWorld;
+  Prober const& m_prober;
+  OutputFile* m_file;
+  std::vector<std::unique_ptr<Prober>> m_probers;
+};
+
+std::vector<double3> givenPositions(std::vector<std::string> const& numbers) {
+  if (numbers.size() % 3 != 0)
+    throw std::invalid_argument("positions are three numbers each, but there are " +
+                                std::to_string(numbers.size()));
+  std::vector<double3> points(numbers.size() / 3);
+  for (std::size_t n = 0; n < numbers.size(); ++n)
+    if (!parseNumber(numbers[n], points[n / 3][static_cast<int>(n % 3)]))
+      throw std::invalid_argument("'" + numbers[n] + "' is no number that a position could have");
+  return points;
 }
 
 } // namespace
 
 void probe(ProbeOptions const& options) {
+  bool const standardInput = options.points == "-" || options.positions == std::vector<std::string>{"-"};
   std::vector<double3> points;
-  if (options.positions.size() % 3 != 0)
-    throw std::invalid_argument("positions are three numbers each, but there are " +
-                                std::to_string(options.positions.size()));
-  for (std::size_t n = 0; n < options.positions.size(); n += 3)
-    points.push_back({options.positions[n], options.positions[n + 1], options.positions[n + 2]});
-  if (!options.points.empty()) {
-    auto const read = readPoints(options.points);
-    points.insert(points.end(), read.begin(), read.end());
-  } else if (points.empty()) {
-    throw std::invalid_argument("no position given: X Y Z or --points is required");
-  }
+  if (options.positions != std::vector<std::string>{"-"}) points = givenPositions(options.positions);
+  if (points.empty() && options.points.empty() && !standardInput)
+    throw std::invalid_argument("no position given: X Y Z, - or --points is required");
+  std::optional<PositionLines> lines;
+  if (standardInput || !options.points.empty()) lines.emplace(standardInput ? "-" : options.points);
+  // Of a file all lines are looked at before the first value is printed.
+  if (lines && !lines->streams())
+    while (lines->next(points)) {}
+  if (!options.output.empty()) checkOutputAs(options.output, "values", {FileFormat::kCsv});
   VdbImport content;
   {
     ProgressBar bar;
     content = importVdb(options.file, options.limits, bar.progress());
   }
   auto const& volume = volumeWith(content, options.channel);
-  auto const container = volume.object->component<Container>(kVdbContainerName);
-  auto const topology = volume.object->component<Topology>(kVdbTopologyName);
-  auto const channel = volume.object->component<FloatChannel>(options.channel);
-  writeLines(points, {*container, *topology, *channel}, {volume, container->voxelSize()});
-  std::cout.flush();
+  auto const prober = proberOf(volume, options.channel);
+  std::optional<OutputFile> file;
+  if (!options.output.empty()) file.emplace(options.output);
+  Lines text(volume.indexToWorld, *prober, file ? &*file : nullptr);
+  text.write(points);
+  if (lines && lines->streams())
+    for (bool more = true; more && out();) {
+      // Who asks may wait for the answer before the next question.
+      if (!file) out().flush();
+      points.clear();
+      more = lines->next(points);
+      text.write(points);
+    }
+  if (file) file->commit();
 }
 
 } // namespace Vln

@@ -6,6 +6,7 @@
 #include "ProgressBar.h"
 #include "StandardOutput.h"
 
+#include <filesystem>
 #include <ostream>
 #include <stdexcept>
 
@@ -23,12 +24,16 @@ void slice(SliceOptions const& options) {
     auto const content = importVdb(options.file, options.limits, bar.progress());
     auto const& volume = volumeWith(content, options.channel);
     try {
-      auto const result = drawSlice(volume, options.channel, options.plane);
+      auto plane = options.plane;
+      std::string what = oneLine(options.channel, 60);
+      if (plane.component >= 0) what += std::string("_") + "xyz"[plane.component];
+      if (plane.gradient) what = "gradient of " + what;
+      char const axis = (plane.indexSpace ? "ijk" : "xyz")[plane.axis];
+      if (options.title) plane.title = std::filesystem::path(options.file).filename().string() + ": " + what;
+      auto const result = drawSlice(volume, options.channel, plane);
       result.image.writePng(options.output);
-      summary = fmt::format("{}{} at {} = {:.6g}: values {:.6g} .. {:.6g}, {} x {} pixels\n",
-                            options.plane.gradient ? "gradient of " : "", options.channel,
-                            "xyz"[options.plane.axis], result.at, result.low, result.high,
-                            result.image.width(), result.image.height());
+      summary = fmt::format("{} at {} = {:.9g}: values {:.6g} .. {:.6g}, {} x {} pixels\n", what, axis,
+                            result.at, result.low, result.high, result.image.width(), result.image.height());
     } catch (std::invalid_argument const& error) { throw FileError(options.file, error.what()); }
   }
   remarks(options.output) << summary;

@@ -99,9 +99,8 @@ std::string hint(CLI::App const& program, int argc, char** argv) {
 }
 
 // A reader that has what it wanted (vln probe ... | head) ends the program as it ends any other.
-int finish(Vln::StandardOutput& output) {
-  std::cout.flush();
-  int const error = output.close();
+int finish() {
+  int const error = Vln::closeOutput();
   if (error == EPIPE) {
     signal(SIGPIPE, SIG_DFL);
     raise(SIGPIPE);
@@ -113,7 +112,7 @@ int finish(Vln::StandardOutput& output) {
 
 int main(int argc, char** argv) {
   prepareSignals();
-  Vln::StandardOutput output;
+  Vln::ForeignLines const foreign;
 
   CLI::App app("Looks at sparse volumes: what a file holds, and what it looks like.", "vln");
   app.set_version_flag("--version", versionText());
@@ -124,10 +123,10 @@ int main(int argc, char** argv) {
 
   try {
     app.parse(argc, argv);
-    return finish(output);
+    return finish();
   } catch (CLI::Success const& done) { // --help and --version
-    app.exit(done);
-    return finish(output);
+    app.exit(done, Vln::out());
+    return finish();
   } catch (CLI::ParseError const& error) {
     std::string const better = hint(app, argc, argv);
     return fail((better.empty() ? error.what() : better) + " (vln --help tells more)");
