@@ -55,7 +55,14 @@ public:
     if constexpr (std::is_copy_constructible_v<T>) {
       auto* copy = new InplaceBlock(m_object);
       // A class whose copies share parts with their source says here how a clone becomes independent.
-      if constexpr (requires(T & object) { object.separateClone(); }) copy->object()->separateClone();
+      if constexpr (requires(T & object) { object.separateClone(); }) {
+        try {
+          copy->object()->separateClone();
+        } catch (...) {
+          delete copy;
+          throw;
+        }
+      }
       auto const offset = static_cast<char const*>(held) - reinterpret_cast<char const*>(&m_object);
       outObject = reinterpret_cast<char*>(copy->object()) + offset;
       outBlock = copy;

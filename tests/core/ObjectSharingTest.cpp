@@ -7,6 +7,7 @@
 #include <stdexcept>
 #include <string>
 #include <thread>
+#include <utility>
 #include <vector>
 
 using namespace Support;
@@ -40,6 +41,37 @@ TEST(ObjectSharing, HandlesShareOneHostObject) {
   c = VLN::Object();
   EXPECT_EQ(a.componentsUseCount(), 2);
   EXPECT_EQ(a.component("a").get(), b.component("a").get());
+}
+
+// regression: a moved-from handle is as good as before
+TEST(ObjectSharing, MovingShares) {
+  VLN::Object a = sample();
+  VLN::Object b = std::move(a);
+  EXPECT_EQ(a.size(), 3u);
+  EXPECT_EQ(a.componentsUseCount(), 2);
+  VLN::Object c;
+  c = std::move(b);
+  EXPECT_EQ(b.size(), 3u);
+  EXPECT_TRUE(b.component("a"));
+  b.eraseProperty("a");
+  EXPECT_EQ(c.size(), 3u);
+  EXPECT_EQ(b.size(), 2u);
+  EXPECT_EQ(a.component("a").get(), c.component("a").get());
+}
+
+// requirement: what only the object holds is taken out, not copied
+TEST(ObjectSharing, ExtractionCopiesOnlyWhatOthersHold) {
+  VLN::Object a = sample();
+  void const* const address = a.component("a").get();
+  auto taken = a.extractComponent<NumberComponent>("a");
+  EXPECT_EQ(taken.get(), address);
+  EXPECT_FALSE(a.hasProperty("a"));
+  void const* const second = a.component("b").get();
+  VLN::Object const other = a;
+  auto const copied = a.extractComponent("b");
+  EXPECT_NE(copied.get(), second);
+  EXPECT_EQ(other.component("b").get(), second);
+  EXPECT_FALSE(a.hasProperty("b"));
 }
 
 // boundary

@@ -4,6 +4,7 @@
 
 #include <memory>
 #include <sstream>
+#include <thread>
 #include <vector>
 
 namespace {
@@ -239,6 +240,73 @@ TEST_F(LoggerTest, RequirementOnlyTheReportIsADumpInProgress) {
   BaseLogger::disable();
   BaseLogger::dump();
   EXPECT_FALSE(asking.seen) << "never while the logger is off";
+}
+
+/// Makes and drops objects, with blocks and new names, while it is asked for its size.
+class Busy final : public Base {
+public:
+  Busy()
+      : Base("busy") {}
+  void memUse(std::uint64_t& used, std::uint64_t& allocated, bool) const override {
+    for (int n = 0; n < 100; ++n) {
+      Base other("voxel_other" + std::to_string(n));
+      BaseLogger::pointerAllocated(test::block(n + 1), &other);
+      other.setName("renamed");
+      BaseLogger::numberOfActiveCopies();
+      BaseLogger::pointerDeAllocated(test::block(n + 1), &other);
+    }
+    if (!m_kept) m_kept = std::make_unique<Base>("kept");
+    used = allocated = std::uint64_t(32) << 20;
+  }
+
+private:
+  mutable std::unique_ptr<Base> m_kept;
+};
+
+TEST_F(LoggerTest, RegressionObjectsThatMakeOthersToMeasureThemselves) {
+  Busy const busy;
+  BaseLogger::dump();
+  EXPECT_EQ(out.after("Total mem occupied by data: used = ").substr(0, 4), "32MB");
+  EXPECT_EQ(out.count("pointerDeAllocated"), 0);
+  EXPECT_EQ(out.count("Warning"), 0);
+  out.take();
+  EXPECT_EQ(counter("numDeAllocNotOK"), 0);
+  BaseLogger::dump();
+  EXPECT_NE(out.all().find("base = kept, #shallow copies (incl orig) = 1"), std::string::npos) << out.all();
+}
+
+TEST_F(LoggerTest, RegressionObjectsThatDieWhileTheLoggerIsOffAreForgotten) {
+  auto gone = std::make_unique<test::Sized>("gone", 1000, 1000);
+  auto renamed = std::make_unique<Base>("before");
+  BaseLogger::pointerAllocated(test::block(1), gone.get());
+  BaseLogger::disable();
+  EXPECT_FALSE(BaseLogger::enabled());
+  BaseLogger::pointerDeAllocated(test::block(1), gone.get());
+  gone.reset();
+  renamed->setName("after");
+  Base const unseen("unseen");
+  BaseLogger::enable();
+  out.take();
+  BaseLogger::dump();
+  std::string const report = out.all();
+  EXPECT_EQ(report.find("base = gone"), std::string::npos);
+  EXPECT_EQ(report.find("base = unseen"), std::string::npos);
+  EXPECT_NE(report.find("base = after"), std::string::npos);
+  EXPECT_EQ(out.after(" numDeAllocOK = "), "0") << "nothing is counted while it is off";
+  BaseLogger::pointerDeAllocated(test::block(1), renamed.get());
+  EXPECT_EQ(out.count("pointerDeAllocated.1: DeAlloc Error"), 1) << "the block went as well";
+}
+
+TEST_F(LoggerTest, RegressionAnotherThreadsObjectIsMeasuredOnceItIsComplete) {
+  test::Sized const mine("mine", std::uint64_t(16) << 20, std::uint64_t(16) << 20);
+  test::Sized announced("announced", std::uint64_t(8) << 20, std::uint64_t(8) << 20);
+  VLN::objectComplete(&announced);
+  std::thread([] { BaseLogger::dump(); }).join();
+  std::string const elsewhere = out.after("Total mem occupied by data: used = ");
+  EXPECT_TRUE(elsewhere.starts_with("8")) << elsewhere;
+  out.take();
+  BaseLogger::dump();
+  EXPECT_TRUE(out.after("Total mem occupied by data: used = ").starts_with("24"));
 }
 
 TEST_F(LoggerTest, RequirementObjectsBeingMadeOrDestroyedAreNotAskedForTheirSize) {

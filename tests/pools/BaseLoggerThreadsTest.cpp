@@ -4,8 +4,10 @@
 #include "GeometryVolume/channels/Channel.h"
 #include "GeometryVolume/tiletree/Container.h"
 #include "GeometryVolume/tiletree/TileAccessor.h"
+#include "GeometryVolume/topology/PointTopology.h"
 #include "GeometryVolume/topology/VoxelTopology.h"
 
+#include <algorithm>
 #include <atomic>
 #include <chrono>
 #include <iostream>
@@ -81,6 +83,35 @@ TEST_F(LoggerTest, RequirementAReportWhileEightThreadsCreateAndDestroy) {
   EXPECT_EQ(counter("numDeAllocNotOK"), 0);
   EXPECT_EQ(counter("numAllocOK"), counter("numDeAllocOK") + 2) << "tree and topology of the source are left";
   EXPECT_EQ(counter("numVoidDeAllocNotOK"), 0);
+}
+
+TEST_F(LoggerTest, RegressionTopologiesAreMeasuredWhole) {
+  QuietErrors const quiet;
+  Source const source;
+  PointTopology<PowerOfTwoTraits> points("voxel_points");
+  points.update(source.tree);
+  std::atomic<bool> stop{false};
+  std::vector<std::thread> threads;
+  for (int t = 0; t < 4; ++t)
+    threads.emplace_back([&] {
+      while (!stop) {
+        Topology voxels(source.topology);
+        PointTopology<PowerOfTwoTraits> copy(points);
+        voxels = source.topology;
+        copy.update(source.tree);
+        voxels.setName("voxel_renamed");
+      }
+    });
+  double largest = 0;
+  auto const until = std::chrono::steady_clock::now() + std::chrono::seconds(1);
+  while (std::chrono::steady_clock::now() < until) {
+    out.take();
+    BaseLogger::dump();
+    largest = std::max(largest, std::stod(out.after("Total mem occupied by data: used = ")));
+  }
+  stop = true;
+  for (auto& thread : threads) thread.join();
+  EXPECT_LT(largest, 10.0) << "megabytes";
 }
 
 } // namespace

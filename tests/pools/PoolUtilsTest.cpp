@@ -110,6 +110,11 @@ TEST_F(ControlGroup, NegativeUnreadableGroupGivesNoFigures) {
   expectNoFigures();
   put("memory.max", "");
   expectNoFigures();
+  for (auto const* text : {"12x", "12 x", "0x12", "1e9", "67108864 kB", "6710 8864", "-1"}) {
+    SCOPED_TRACE(text);
+    put("memory.max", text);
+    expectNoFigures();
+  }
   setCgroupPath((m_directory / "missing").string());
   expectNoFigures();
 }

@@ -276,6 +276,39 @@ TYPED_TEST(LinearSamplerTest, NamesAndPlaceholders) {
 
 // boundary: on a wide channel with an offset, positions below the first sample extrapolate from the first
 // cell
+// regression: prepareToSample() finds tiles that the channel does not reach
+TYPED_TEST(LinearSamplerTest, TilesDeeperThanTheChannelStandForTheirPlace) {
+  using Traits = TypeParam;
+  constexpr int kDeep = Traits::kMaxDepth;
+  for (VoxelOffsetType const type : {kVoxelOffsetCorner, kVoxelOffsetCenter}) {
+    SamplerVolume<Traits> volume(type, 0.5f);
+    volume.addRandom(7, {0, 0, 0}, 60, kDeep - 4);
+    volume.fill([](double x, double y, double z) { return float(x + 2 * y - z); }, 3.5f, 0, kDeep - 2);
+    Sampler<Traits> const core(volume.tree, volume.topology, *volume.core);
+    Sampler<Traits> const wide(volume.tree, volume.topology, *volume.wide);
+    std::mt19937 random(11);
+    int deeper = 0;
+    for (int d = kDeep - 4; d <= kDeep; ++d)
+      for (std::int64_t n = 0; n < volume.tree.tileCount(d); ++n) {
+        auto const& there = std::as_const(volume.tree).tile(n, d);
+        auto const c = [&](int corner) {
+          return 0.5f * (float(corner) + float(random() % 1000u) * 0.001f * float(Traits::width(d)));
+        };
+        float3 const p{c(there.ti()), c(there.tj()), c(there.tk())};
+        TreeIndex tile;
+        int3 ijk{};
+        float3 weights{};
+        if (!core.prepareToSample(p, kSamplerWorldSpace, tile, ijk, weights, kDeep, nullptr)) continue;
+        deeper += tile.depth > kDeep - 2 ? 1 : 0;
+        EXPECT_NEAR(core.sample(tile, ijk, weights), core.sample(p), 1e-2f) << n;
+        EXPECT_NEAR(wide.sample(tile, ijk, weights), wide.sample(p), 1e-2f) << n;
+      }
+    EXPECT_GT(deeper, 10);
+    EXPECT_EQ(core.sample(TreeIndex{1 << 30, kDeep}, {0, 0, 0}, {0, 0, 0}), 3.5f);
+    EXPECT_EQ(core.sample(TreeIndex{0, kDeep + 1}, {0, 0, 0}, {0, 0, 0}), 3.5f);
+  }
+}
+
 TYPED_TEST(LinearSamplerTest, WideBelowTheFirstSample) {
   using Traits = TypeParam;
   constexpr int deep = Traits::kMaxDepth;

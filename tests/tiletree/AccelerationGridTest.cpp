@@ -87,6 +87,18 @@ TYPED_TEST(AccelerationGrid, SixtyFourCellsAreTheLimit) {
   }
 }
 
+// regression: where no depth qualifies there is no grid, not an older one
+TYPED_TEST(AccelerationGrid, NoDepthThatQualifiesLeavesNone) {
+  using T = TypeParam;
+  Container<T> tree;
+  tree.tileAccessor().addTile({0, 0, 0}, T::kMaxDepth);
+  tree.buildAccessorAccelerationStructure(T::kMaxDepth);
+  ASSERT_EQ(Access::data(tree).m_gridDepth, T::kMaxDepth);
+  tree.buildAccessorAccelerationStructure(0);
+  EXPECT_EQ(Access::data(tree).m_gridDepth, -1);
+  EXPECT_TRUE(Access::data(tree).m_gridTable.empty());
+}
+
 // requirement: the deepest depth that qualifies, not above what was asked
 TYPED_TEST(AccelerationGrid, DeepestQualifyingDepthIsTaken) {
   using T = TypeParam;

@@ -31,15 +31,13 @@ public:
   TileStorage() = default;
   TileStorage(TileStorage const&) = delete;
   TileStorage& operator=(TileStorage const&) = delete;
-  ~TileStorage() { Internal::freeBlocks(m_blocks); }
-
   /// Keeps blocks that static tiles of this storage lie in, for a holder that leaves.
-  void adopt(std::vector<void*>& blocks) { Internal::handOverBlocks(m_blocks, blocks); }
+  void adopt(Internal::BlockList& blocks) { Internal::handOverBlocks(m_blocks, blocks); }
   /// Takes over the blocks of a storage whose tiles move here.
   void adoptAll(TileStorage& from) { adopt(from.m_blocks); }
 
 private:
-  std::vector<void*> m_blocks;
+  Internal::BlockList m_blocks;
 };
 
 /// Nested export: by depth, by tile, the tile's elements. Depths outside the channel's range are null.
@@ -114,17 +112,20 @@ public:
   void compactStorage();
 
   // Blocks
-  std::vector<void*> const& allocations() const { return m_allocations; }
-  void freeAndClearAllocations() { Internal::freeBlocks(m_allocations); }
+  Internal::BlockList const& allocations() const { return m_allocations; }
+  void freeAndClearAllocations() { m_allocations.clear(); }
 
   // Updates; each separates the storage first when it changes anything.
   /// Grows and shrinks every depth of the range to the tile counts of `source`.
-  /// @return false when a static block could not be allocated; nothing has changed then.
+  /// @return false when a static block could not be allocated; nothing has changed then, nor when something
+  /// is thrown.
   bool resizeTiles(Internal::TileCounts const& source);
-  /// Applies a compaction of tiles. Sources that lie at or beyond `kept(depth)` are about to be dropped.
+  /// Applies a compaction of tiles, all of it or, when something is thrown, none. Sources that lie at or
+  /// beyond `kept(depth)` are about to be dropped.
   void moveTiles(TileRemovalList const& removed, FunctionRef<std::int64_t(int depth)> kept);
   /// Puts the tiles in a new order, in new storage.
   /// @return false when there was nothing to do or no memory for a static block.
+  /// What is thrown leaves the tiles as they were.
   bool permuteTiles(TilePermutation const& newToOld);
   void removeDepths(int first, int last);
   bool resizeDepth(int depth, std::int64_t tileCount, int elementCount);
@@ -170,15 +171,19 @@ private:
   std::size_t tileBytes() const { return static_cast<std::size_t>(m_layout.size) * sizeof(T); }
   void sumCounts();
   Spans allTiles() const;
+  /// Gives the added tiles of a plan their elements, in `block` if there is one.
+  void fillAdded(Internal::GrowthPlan const& plan, Internal::TileCounts const& source, void* block,
+                 std::int64_t stride);
 
   /// A vector of `n` unwritten elements, in `slot` when that is not null.
   Vector unwrittenTile(std::int64_t n, T* slot) const;
   /// A new tile as the flags ask for.
   Vector newTile(std::int64_t n, T* slot) const;
-  /// Leaves the storage, and its blocks to whoever still holds it; then holds `fresh` and `block`.
-  void replaceStorage(Ostil::Ptr<TileStorage<T>> fresh, void* block);
+  /// Leaves the storage, and its blocks to whoever still holds it; then holds `fresh` and `blocks`.
+  void replaceStorage(Ostil::Ptr<TileStorage<T>> fresh, Internal::BlockList& blocks) noexcept;
   /// New storage with the tiles of `source`, their values taken from `values`. Leaves out [skipFirst,
-  /// skipLast].
+  /// skipLast]. Without memory for a static block the storage is empty afterwards; whatever is thrown leaves
+  /// all as it was.
   void rebuild(TileArrays<T> const& source, Counts const& counts, TileValues values, int skipFirst,
                int skipLast);
   void separateWithout(int skipFirst, int skipLast);
@@ -188,7 +193,7 @@ private:
   T m_defaultValue{};
   DataElementInitializerType m_initializer = kInitializeDefaultValue;
   Ostil::Ptr<TileStorage<T>> m_data;
-  std::vector<void*> m_allocations;
+  Internal::BlockList m_allocations;
   bool m_useStaticAllocation = false;
   bool m_callElementConstructor = true;
   bool m_rawCopy = false;

@@ -41,7 +41,10 @@ ChannelData<T>::ChannelData(ChannelData const& b)
     , m_tileCountTotal(b.m_tileCountTotal)
     , m_layout(b.m_layout) {}
 
-template <class T> ChannelData<T>::~ChannelData() { replaceStorage(nullptr, nullptr); }
+template <class T> ChannelData<T>::~ChannelData() {
+  Internal::BlockList none;
+  replaceStorage(nullptr, none);
+}
 
 template <class T> std::int64_t ChannelData<T>::tileCount(int depth) const {
   if (depth == -1) return m_tileCountTotal;
@@ -96,13 +99,14 @@ template <class T> TileVector<T> ChannelData<T>::newTile(std::int64_t n, T* slot
   return tile;
 }
 
-template <class T> void ChannelData<T>::replaceStorage(Ostil::Ptr<TileStorage<T>> fresh, void* block) {
-  if (storageIsShared())
-    m_data->adopt(m_allocations);
-  else
-    freeAndClearAllocations();
+template <class T>
+void ChannelData<T>::replaceStorage(Ostil::Ptr<TileStorage<T>> fresh, Internal::BlockList& blocks) noexcept {
+  if (storageIsShared()) m_data->adopt(m_allocations);
+  // The tiles go before the blocks that they lie in.
+  Internal::BlockList left;
+  left.take(m_allocations);
   m_data = std::move(fresh);
-  if (block) m_allocations.push_back(block);
+  m_allocations.take(blocks);
 }
 
 template <class T>
@@ -110,8 +114,12 @@ void ChannelData<T>::rebuild(TileArrays<T> const& source, Counts const& counts, 
                              int skipFirst, int skipLast) {
   auto const skipped = [&](int d) { return d >= skipFirst && d <= skipLast; };
   Counts kept{};
-  for (int d = firstDepth(); d <= lastDepth(); ++d)
-    if (!skipped(d)) kept[static_cast<std::size_t>(d)] = counts[static_cast<std::size_t>(d)];
+  Spans spans;
+  for (int d = firstDepth(); d <= lastDepth(); ++d) {
+    if (skipped(d)) continue;
+    kept[static_cast<std::size_t>(d)] = counts[static_cast<std::size_t>(d)];
+    spans.add(d, 0, kept[static_cast<std::size_t>(d)]);
+  }
   Internal::TileSlots slots;
   if (m_useStaticAllocation)
     slots = Internal::planSlots(
@@ -120,15 +128,15 @@ void ChannelData<T>::rebuild(TileArrays<T> const& source, Counts const& counts, 
           return source[static_cast<std::size_t>(d)][static_cast<std::size_t>(i)].size();
         },
         [&](std::size_t n) { return slotElements(n); });
-  void* const block = slots.total > 0 ? Internal::allocateBlock(slots.total, sizeof(T)) : nullptr;
+  Internal::BlockList blocks;
+  void* const block = slots.total > 0 ? blocks.allocate(slots.total, sizeof(T)) : nullptr;
   auto fresh = Ostil::makePtr<TileStorage<T>>();
-  m_tileCounts.fill(0);
   if (block || slots.total == 0) {
-    m_tileCounts = kept;
     Internal::forEachDepth(firstDepth(), lastDepth(), [&](int d) {
-      (*fresh)[static_cast<std::size_t>(d)].resize(static_cast<std::size_t>(count(d)));
+      auto const depth = static_cast<std::size_t>(d);
+      (*fresh)[depth].resize(static_cast<std::size_t>(kept[depth]));
     });
-    allTiles().forEach(Internal::tileGrain(tileBytes()), [&](int d, std::int64_t begin, std::int64_t end) {
+    spans.forEach(Internal::tileGrain(tileBytes()), [&](int d, std::int64_t begin, std::int64_t end) {
       auto const depth = static_cast<std::size_t>(d);
       for (auto i = static_cast<std::size_t>(begin); i < static_cast<std::size_t>(end); ++i) {
         std::size_t const n = source[depth][i].size();
@@ -139,9 +147,12 @@ void ChannelData<T>::rebuild(TileArrays<T> const& source, Counts const& counts, 
         (*fresh)[depth][i].swap(tile);
       }
     });
+  } else {
+    kept.fill(0);
   }
+  m_tileCounts = kept;
   sumCounts();
-  replaceStorage(std::move(fresh), block);
+  replaceStorage(std::move(fresh), blocks);
 }
 
 template <class T> void ChannelData<T>::separateWithout(int skipFirst, int skipLast) {
@@ -160,7 +171,10 @@ template <class T> void ChannelData<T>::deepCopy(ChannelData const& source) {
   m_minDepth = source.m_minDepth;
   m_depth = source.m_depth;
   auto const old = source.m_data;
-  if (!old) return replaceStorage(nullptr, nullptr);
+  if (!old) {
+    Internal::BlockList none;
+    return replaceStorage(nullptr, none);
+  }
   auto const values = [&](int d, std::int64_t i) -> T const* {
     return (*old)[static_cast<std::size_t>(d)][static_cast<std::size_t>(i)].data();
   };

@@ -17,29 +17,35 @@ std::int64_t tileSlotStride(std::int64_t elements, std::size_t elementSize) {
   return static_cast<std::int64_t>(padded / elementSize + (divides ? 0 : 1));
 }
 
-void* allocateBlock(std::int64_t elements, std::size_t elementSize) {
+void* BlockList::allocate(std::int64_t elements, std::size_t elementSize) {
   auto const count = static_cast<std::uint64_t>(elements);
   if (count > static_cast<std::uint64_t>(INT64_MAX) / elementSize) return nullptr;
-  if (ChannelMemoryPool::enabled()) return ChannelMemoryPool::allocate(count * elementSize);
-  return allocate_jemalloc(count, elementSize);
+  m_blocks.push_back(nullptr); // first: a block without a place would be lost
+  void* const block = ChannelMemoryPool::enabled() ? ChannelMemoryPool::allocate(count * elementSize)
+                                                   : allocate_jemalloc(count, elementSize);
+  if (block)
+    m_blocks.back() = block;
+  else
+    m_blocks.pop_back();
+  return block;
 }
 
-void freeBlocks(std::vector<void*>& blocks) {
-  for (void* block : blocks) {
+void BlockList::clear() {
+  for (void* block : m_blocks) {
+    if (!block) continue;
     if (ChannelMemoryPool::enabled())
       ChannelMemoryPool::deallocate(block);
     else
       deallocate_jemalloc(block);
   }
-  blocks.clear();
+  m_blocks.clear();
 }
 
-void handOverBlocks(std::vector<void*>& into, std::vector<void*>& from) {
+void handOverBlocks(BlockList& into, BlockList& from) noexcept {
   // Rare and short: one lock for all storages.
   static std::mutex mutex;
   std::lock_guard const lock(mutex);
-  into.insert(into.end(), from.begin(), from.end());
-  from.clear();
+  into.take(from);
 }
 
 void TileSpans::add(int depth, std::int64_t begin, std::int64_t end) {

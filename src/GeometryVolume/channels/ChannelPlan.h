@@ -9,6 +9,7 @@
 #include <array>
 #include <cstddef>
 #include <cstdint>
+#include <list>
 #include <vector>
 
 namespace VLN::TileTree3D::Internal {
@@ -19,14 +20,30 @@ using DepthCounts = std::array<std::int64_t, kChannelDepths>;
 /// start on a cache line when the element size divides 64; other slots are only spaced apart.
 VLN_API std::int64_t tileSlotStride(std::int64_t elements, std::size_t elementSize);
 
-/// A 64-byte aligned block from the pool while that is enabled, else from the allocator.
-/// @error Null when there is no memory.
-VLN_API void* allocateBlock(std::int64_t elements, std::size_t elementSize);
-/// Frees the blocks and empties the list.
-VLN_API void freeBlocks(std::vector<void*>& blocks);
+/// Blocks behind static tiles, each from the pool while that is enabled, else from the allocator. Frees them
+/// when it goes.
+class VLN_API BlockList {
+public:
+  BlockList() = default;
+  ~BlockList() { clear(); }
+  BlockList(BlockList const&) = delete;
+  BlockList& operator=(BlockList const&) = delete;
+
+  /// A further block, 64-byte aligned.
+  /// @error Null when there is no memory for it.
+  void* allocate(std::int64_t elements, std::size_t elementSize);
+  /// Takes all blocks of another list. Needs no memory.
+  void take(BlockList& from) noexcept { m_blocks.splice(m_blocks.end(), from.m_blocks); }
+  void clear();
+  bool empty() const { return m_blocks.empty(); }
+  std::size_t size() const { return m_blocks.size(); }
+
+private:
+  std::list<void*> m_blocks;
+};
 /// Appends `from` to `into` and empties it.
 /// @threads Several threads may hand blocks to one list.
-VLN_API void handOverBlocks(std::vector<void*>& into, std::vector<void*>& from);
+VLN_API void handOverBlocks(BlockList& into, BlockList& from) noexcept;
 
 /// Source of the counts that a channel is brought into step with.
 class TileCounts {

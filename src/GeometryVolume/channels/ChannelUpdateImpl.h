@@ -14,23 +14,49 @@ namespace VLN::TileTree3D {
 
 namespace Internal {
 
-/// Shortens or extends the tiles of a depth. New tiles are empty; `trim` drops capacity beyond twice the
-/// size.
-template <class T> void resizeDepthTiles(std::vector<TileVector<T>>& tiles, std::int64_t n, bool trim) {
-  tiles.resize(static_cast<std::size_t>(n));
-  if (!trim || !(static_cast<float>(tiles.capacity()) > 2.0f * static_cast<float>(tiles.size()))) return;
+/// Room for `n` tiles, growing as vectors do.
+template <class T> void reserveDepthTiles(std::vector<TileVector<T>>& tiles, std::int64_t n) {
+  auto const wanted = static_cast<std::size_t>(n);
+  if (wanted > tiles.capacity()) tiles.reserve(std::max(wanted, 2 * tiles.size()));
+}
+
+/// Drops capacity beyond twice the size, where there is memory for the move.
+template <class T> void trimDepthTiles(std::vector<TileVector<T>>& tiles) {
+  if (!(static_cast<float>(tiles.capacity()) > 2.0f * static_cast<float>(tiles.size()))) return;
   std::vector<TileVector<T>> exact;
-  exact.reserve(tiles.size());
+  try {
+    exact.reserve(tiles.size());
+  } catch (std::bad_alloc const&) { return; }
   for (auto& tile : tiles) exact.push_back(std::move(tile));
   tiles.swap(exact);
 }
 
+/// Makes the capacity that assignTile() needs.
+template <class T> void prepareAssign(TileVector<T>& to, TileVector<T> const& from) {
+  if (from.size() > to.capacity()) growOutOfBlock(to, from.size());
+}
 /// Copies the elements of one tile to another. A static target keeps its slot while the elements fit.
 template <class T> void assignTile(TileVector<T>& to, TileVector<T> const& from) {
-  if (from.size() > to.capacity()) to = TileVector<T>(from.size(), TileDataAllocator<T>());
   to.resize(from.size());
   std::copy(from.begin(), from.end(), to.begin());
 }
+
+/// Runs `undo` unless it is told that all went well.
+template <class Undo> class Rollback {
+public:
+  explicit Rollback(Undo undo)
+      : m_undo(std::move(undo)) {}
+  ~Rollback() {
+    if (m_armed) m_undo();
+  }
+  Rollback(Rollback const&) = delete;
+  Rollback& operator=(Rollback const&) = delete;
+  void dismiss() { m_armed = false; }
+
+private:
+  Undo m_undo;
+  bool m_armed = true;
+};
 
 } // namespace Internal
 
@@ -44,38 +70,67 @@ template <class T> bool ChannelData<T>::resizeTiles(Internal::TileCounts const& 
     sumCounts();
     return true;
   }
+  Internal::BlockList blocks;
   void* block = nullptr;
-  if (plan.blockElements > 0 && !(block = Internal::allocateBlock(plan.blockElements, sizeof(T))))
-    return false;
+  if (plan.blockElements > 0 && !(block = blocks.allocate(plan.blockElements, sizeof(T)))) return false;
 
-  cloneData();
-  if (block) m_allocations.push_back(block);
   Counts const before = m_tileCounts;
-  Internal::forEachDepth(firstDepth(), lastDepth(), [&](int d) {
-    auto const n = plan.wanted[static_cast<std::size_t>(d)];
-    if (n == count(d)) return;
-    Internal::resizeDepthTiles(depthTiles(d), n, !m_useStaticAllocation);
-    count(d) = n;
-  });
-  if (fill) {
-    plan.added.forEach(Internal::tileGrain(tileBytes()), [&](int d, std::int64_t begin, std::int64_t end) {
-      auto const depth = static_cast<std::size_t>(d);
+  cloneData();
+  // A copy for which there was no static block is empty: the plan was for another.
+  if (m_tileCounts != before) return false;
+
+  // Tiles are added first and dropped last: dropping cannot fail.
+  auto const wanted = [&](int d) {
+    return static_cast<std::size_t>(plan.wanted[static_cast<std::size_t>(d)]);
+  };
+  Internal::Rollback added([&] {
+    for (int d = firstDepth(); d <= lastDepth(); ++d) {
       auto& tiles = depthTiles(d);
-      for (auto i = begin; i < end; ++i) {
-        std::int64_t const n =
-            fixed ? m_layout.size : std::max<std::int64_t>(0, source.elementCount(TreeIndex{i, d}));
-        if (n == 0) continue;
-        T* slot = nullptr;
-        if (block) {
-          std::int64_t const nth = i - before[depth];
-          slot = static_cast<T*>(block) + (fixed ? plan.base[depth] + nth * stride : plan.slots.at(d, nth));
-        }
-        tiles[static_cast<std::size_t>(i)] = newTile(n, slot);
-      }
-    });
-  }
+      auto const n = static_cast<std::size_t>(before[static_cast<std::size_t>(d)]);
+      if (tiles.size() > n) tiles.erase(tiles.begin() + static_cast<std::ptrdiff_t>(n), tiles.end());
+    }
+  });
+  Internal::forEachDepth(firstDepth(), lastDepth(), [&](int d) {
+    auto& tiles = depthTiles(d);
+    if (wanted(d) <= tiles.size()) return;
+    Internal::reserveDepthTiles(tiles, plan.wanted[static_cast<std::size_t>(d)]);
+    tiles.resize(wanted(d));
+  });
+  if (fill) fillAdded(plan, source, block, stride);
+  added.dismiss();
+
+  m_allocations.take(blocks);
+  Internal::forEachDepth(firstDepth(), lastDepth(), [&](int d) {
+    if (wanted(d) == static_cast<std::size_t>(count(d))) return;
+    auto& tiles = depthTiles(d);
+    if (wanted(d) < tiles.size())
+      tiles.erase(tiles.begin() + static_cast<std::ptrdiff_t>(wanted(d)), tiles.end());
+    if (!m_useStaticAllocation) Internal::trimDepthTiles(tiles);
+    count(d) = plan.wanted[static_cast<std::size_t>(d)];
+  });
   sumCounts();
   return true;
+}
+
+template <class T>
+void ChannelData<T>::fillAdded(Internal::GrowthPlan const& plan, Internal::TileCounts const& source,
+                               void* block, std::int64_t stride) {
+  bool const fixed = m_layout.fixedSize();
+  plan.added.forEach(Internal::tileGrain(tileBytes()), [&](int d, std::int64_t begin, std::int64_t end) {
+    auto const depth = static_cast<std::size_t>(d);
+    auto& tiles = depthTiles(d);
+    for (auto i = begin; i < end; ++i) {
+      std::int64_t const n =
+          fixed ? m_layout.size : std::max<std::int64_t>(0, source.elementCount(TreeIndex{i, d}));
+      if (n == 0) continue;
+      T* slot = nullptr;
+      if (block) {
+        std::int64_t const nth = i - m_tileCounts[depth];
+        slot = static_cast<T*>(block) + (fixed ? plan.base[depth] + nth * stride : plan.slots.at(d, nth));
+      }
+      tiles[static_cast<std::size_t>(i)] = newTile(n, slot);
+    }
+  });
 }
 
 template <class T>
@@ -88,28 +143,38 @@ void ChannelData<T>::moveTiles(TileRemovalList const& removed, FunctionRef<std::
                   [&](auto const& list) { return std::any_of(list.begin(), list.end(), moves); });
   if (!any) return;
   cloneData();
-  Internal::forEachDepth(0, last, [&](int d) {
-    auto const& list = removed[static_cast<std::size_t>(d)];
-    auto& tiles = depthTiles(d);
-    auto const exists = [&](std::int64_t i) { return i >= 0 && i < static_cast<std::int64_t>(tiles.size()); };
-    std::int64_t const remaining = kept(d);
-    ParallelOptions options;
-    options.grain = Internal::tileGrain(tileBytes());
-    parallelFor(
-        0, static_cast<std::int64_t>(list.size()),
-        [&](std::int64_t begin, std::int64_t end) {
-          for (auto n = begin; n < end; ++n) {
-            auto const [to, from] = list[static_cast<std::size_t>(n)];
-            if (to == from || !exists(to) || !exists(from)) continue;
-            Vector& target = tiles[static_cast<std::size_t>(to)];
-            Vector& source = tiles[static_cast<std::size_t>(from)];
-            if (from >= remaining)
-              target.swap(source);
-            else
-              Internal::assignTile(target, source);
-          }
-        },
-        options);
+  // `body(target, source, dropped)` for each pair; the source of a dropped pair is of no further use.
+  auto const forEachPair = [&](auto const& body) {
+    Internal::forEachDepth(0, last, [&](int d) {
+      auto const& list = removed[static_cast<std::size_t>(d)];
+      auto& tiles = depthTiles(d);
+      auto const exists = [&](std::int64_t i) {
+        return i >= 0 && i < static_cast<std::int64_t>(tiles.size());
+      };
+      std::int64_t const remaining = kept(d);
+      ParallelOptions options;
+      options.grain = Internal::tileGrain(tileBytes());
+      parallelFor(
+          0, static_cast<std::int64_t>(list.size()),
+          [&](std::int64_t begin, std::int64_t end) {
+            for (auto n = begin; n < end; ++n) {
+              auto const [to, from] = list[static_cast<std::size_t>(n)];
+              if (to == from || !exists(to) || !exists(from)) continue;
+              body(tiles[static_cast<std::size_t>(to)], tiles[static_cast<std::size_t>(from)],
+                   from >= remaining);
+            }
+          },
+          options);
+    });
+  };
+  forEachPair([](Vector& target, Vector& source, bool dropped) {
+    if (!dropped) Internal::prepareAssign(target, source);
+  });
+  forEachPair([](Vector& target, Vector& source, bool dropped) {
+    if (dropped)
+      target.swap(source);
+    else
+      Internal::assignTile(target, source);
   });
 }
 
@@ -143,7 +208,8 @@ template <class T> bool ChannelData<T>::permuteTiles(TilePermutation const& newT
     slots = Internal::planSlots(
         firstDepth(), lastDepth(), m_tileCounts, [&](int d, std::int64_t i) { return source(d, i).size(); },
         [&](std::size_t n) { return slotElements(n); });
-  void* const block = slots.total > 0 ? Internal::allocateBlock(slots.total, sizeof(T)) : nullptr;
+  Internal::BlockList blocks;
+  void* const block = slots.total > 0 ? blocks.allocate(slots.total, sizeof(T)) : nullptr;
   if (slots.total > 0 && !block) return false;
 
   auto fresh = Ostil::makePtr<TileStorage<T>>();
@@ -171,9 +237,9 @@ template <class T> bool ChannelData<T>::permuteTiles(TilePermutation const& newT
   else if (shared)
     old->adopt(m_allocations);
   else
-    freeAndClearAllocations();
+    m_allocations.clear();
+  m_allocations.take(blocks);
   m_data = std::move(fresh);
-  if (block) m_allocations.push_back(block);
   return true;
 }
 
@@ -210,13 +276,23 @@ template <class T> bool ChannelData<T>::resizeDepth(int depth, std::int64_t tile
   std::int64_t const before = count(depth);
   if (tileCount == before) return false;
   cloneData();
-  m_tileCountTotal += tileCount - before;
-  count(depth) = tileCount;
+  if (count(depth) != before) return false;
   auto& tiles = depthTiles(depth);
-  tiles.resize(static_cast<std::size_t>(tileCount));
+  auto const n = static_cast<std::size_t>(tileCount);
+  Internal::Rollback added([&] {
+    if (static_cast<std::int64_t>(tiles.size()) > before)
+      tiles.erase(tiles.begin() + static_cast<std::ptrdiff_t>(before), tiles.end());
+  });
+  if (n < tiles.size())
+    tiles.erase(tiles.begin() + static_cast<std::ptrdiff_t>(n), tiles.end());
+  else
+    tiles.resize(n);
   for (auto i = before; i < tileCount; ++i)
     Internal::resizeVector(tiles[static_cast<std::size_t>(i)],
                            static_cast<std::size_t>(std::max(0, elementCount)), T{});
+  added.dismiss();
+  m_tileCountTotal += tileCount - before;
+  count(depth) = tileCount;
   return true;
 }
 
@@ -241,6 +317,9 @@ template <class T> void ChannelData<T>::growElements(Internal::TileCounts const&
     if (!any) return;
     cloneData();
   }
+  // Room first, so that all grow or none.
+  forEachShort(
+      [](Vector& tile, std::int64_t n) { Internal::growOutOfBlock(tile, static_cast<std::size_t>(n)); });
   forEachShort([](Vector& tile, std::int64_t n) {
     Internal::resizeOutOfBlock(tile, static_cast<std::size_t>(n), T{});
   });

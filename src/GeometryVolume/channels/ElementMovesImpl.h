@@ -10,6 +10,58 @@
 
 namespace VLN::TileTree3D {
 
+namespace Internal {
+
+/// As ArrivalPlan, yet without lists of its own: what writes after room was made must not fail any more.
+class ArrivalRuns {
+public:
+  ArrivalRuns(std::vector<std::uint64_t> const& tiles, TileArrivals const& arrivals, std::size_t moveCount)
+      : m_tiles(tiles)
+      , m_arrivals(arrivals)
+      , m_end(moveCount) {}
+
+  std::uint64_t start(std::size_t n) const {
+    return n < m_tiles.size() ? m_arrivals.find(m_tiles[n])->second.first : m_end;
+  }
+  /// Calls `body(n, start, end, first, last)` in parallel for pieces [first, last) of the order that lie in
+  /// the n-th run, which is [start, end).
+  template <class Body> void forEachRun(Body const& body) const {
+    ParallelOptions options;
+    options.grain = 1024;
+    parallelFor(
+        static_cast<std::int64_t>(start(0)), static_cast<std::int64_t>(m_end),
+        [&](std::int64_t begin, std::int64_t end) {
+          auto at = static_cast<std::uint64_t>(begin);
+          auto const last = static_cast<std::uint64_t>(end);
+          std::size_t run = runOf(at);
+          std::uint64_t first = start(run);
+          for (; at < last; ++run) {
+            std::uint64_t const next = start(run + 1);
+            body(run, first, next, at, std::min(next, last));
+            at = first = next;
+          }
+        },
+        options);
+  }
+
+private:
+  /// The last run that begins at or before a position of the order.
+  std::size_t runOf(std::uint64_t at) const {
+    std::size_t low = 0, high = m_tiles.size();
+    while (high - low > 1) {
+      std::size_t const middle = low + (high - low) / 2;
+      (start(middle) <= at ? low : high) = middle;
+    }
+    return low;
+  }
+
+  std::vector<std::uint64_t> const& m_tiles;
+  TileArrivals const& m_arrivals;
+  std::uint64_t m_end;
+};
+
+} // namespace Internal
+
 template <class T> bool ChannelData<T>::holdsAll(std::vector<ElementToFrom> const& moves, int depth) const {
   if (moves.empty() || !m_data) return true;
   if (depth < 0 || depth >= kChannelDepths) return false;
@@ -54,7 +106,7 @@ void ChannelData<T>::allocateElements(std::vector<std::uint64_t> const& tiles, T
   if (tiles.empty() || !m_data) return;
   cloneData();
   auto& all = depthTiles(depth);
-  auto const plan = Internal::planArrivals(tiles, arrivals, moveCount);
+  Internal::ArrivalRuns const runs(tiles, arrivals, moveCount);
   ParallelOptions options;
   options.grain = 64;
   parallelFor(
@@ -62,7 +114,7 @@ void ChannelData<T>::allocateElements(std::vector<std::uint64_t> const& tiles, T
       [&](std::int64_t begin, std::int64_t end) {
         for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
           Vector& tile = all[tiles[n]];
-          Internal::resizeOutOfBlock(tile, tile.size() + plan.count(n), T{});
+          Internal::resizeOutOfBlock(tile, tile.size() + (runs.start(n + 1) - runs.start(n)), T{});
         }
       },
       options);
@@ -75,16 +127,17 @@ void ChannelData<T>::copyElements(std::vector<ElementToFrom> const& moves,
                                   int depth) {
   if (tiles.empty() || !m_data) return;
   auto& all = depthTiles(depth);
-  auto const plan = Internal::planArrivals(tiles, arrivals, order.size());
-  plan.forEachRun([&](std::size_t run, std::uint64_t at, std::uint64_t stop) {
-    // The run fills the end of its tile, which allocateElements() has added.
-    Vector& tile = all[tiles[run]];
-    T* to = tile.data() + (tile.size() - plan.count(run)) + (at - plan.starts[run]);
-    for (; at < stop; ++at) {
-      ElementToFrom const& move = moves[order[at]];
-      *to++ = vector(TreeIndex{move.from, move.fromDepth})[static_cast<std::size_t>(move.fromElement)];
-    }
-  });
+  Internal::ArrivalRuns const runs(tiles, arrivals, order.size());
+  runs.forEachRun(
+      [&](std::size_t run, std::uint64_t start, std::uint64_t next, std::uint64_t at, std::uint64_t stop) {
+        // The run fills the end of its tile, which allocateElements() has added.
+        Vector& tile = all[tiles[run]];
+        T* to = tile.data() + (tile.size() - (next - start)) + (at - start);
+        for (; at < stop; ++at) {
+          ElementToFrom const& move = moves[order[at]];
+          *to++ = vector(TreeIndex{move.from, move.fromDepth})[static_cast<std::size_t>(move.fromElement)];
+        }
+      });
 }
 
 template <class T>

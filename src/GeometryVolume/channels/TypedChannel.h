@@ -40,7 +40,8 @@ public:
   void setChannelData(unsigned int kind, Ostil::Any const& type, Ostil::Ptr<void> const& data) override;
   /// Gives every tile that the tree has and the channel lacks its elements, and drops tiles at the end that
   /// the tree lacks.
-  /// @error A static block that cannot be allocated leaves the channel as it was.
+  /// @error A static block that cannot be allocated leaves the channel as it was, and so does what is thrown,
+  /// by this and the other updates.
   void updateTilesAdded(Component const& tree) override;
   void updateTilesRemoved(TileRemovalList const& removed, Component const& tree) override;
   void updateTilesPermuted(TilePermutation const& newToOld) override;
@@ -129,6 +130,8 @@ protected:
 private:
   /// Runs `change` on a Data that no other channel sees, and tells the accounting when the storage changes.
   void write(FunctionRef<void(ChannelData<T>&)> change);
+  /// Makes this channel the only holder of its Data.
+  void ownData();
   void replaceEmptyName();
 };
 

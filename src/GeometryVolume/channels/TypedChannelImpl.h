@@ -10,6 +10,7 @@
 #include "GeometryVolume/core/LoggerHooks.h"
 #include "GeometryVolume/core/Parallel.h"
 
+#include <algorithm>
 #include <limits>
 #include <utility>
 
@@ -55,13 +56,26 @@ template <class T> void TypedChannel<T>::replaceEmptyName() {
 
 template <class T> void TypedChannel<T>::write(FunctionRef<void(ChannelData<T>&)> change) {
   ChannelBase::Change const announced(*this);
-  void const* const before = dataPtr();
-  if (m_data && !m_data.unique()) m_data = Ostil::MutablePtr<ChannelData<T>>(std::move(m_data));
+  /// Tells of new storage, also when something is thrown.
+  struct Accounted {
+    TypedChannel const& channel;
+    void const* const before = channel.dataPtr();
+    ~Accounted() {
+      void const* const after = channel.dataPtr();
+      if (after == before) return;
+      pointerDeAllocated(before, &channel);
+      pointerAllocated(after, &channel);
+    }
+  } const accounted{*this};
+  ownData();
   change(*m_data);
-  void const* const after = dataPtr();
-  if (after == before) return;
-  pointerDeAllocated(before, this);
-  pointerAllocated(after, this);
+}
+
+template <class T> void TypedChannel<T>::ownData() {
+  if (!m_data || m_data.unique()) return;
+  // The handle is given up when its copy exists, not before.
+  Ostil::MutablePtr<ChannelData<T>> own{Ostil::Ptr<ChannelData<T>>(m_data)};
+  m_data = std::move(own);
 }
 
 template <class T> Ostil::Ptr<TileStorage<T>> const& TypedChannel<T>::cloneData() {
@@ -109,20 +123,24 @@ template <class T> void TypedChannel<T>::setMinDepth(int minDepth, Component con
   int const old = this->minDepth();
   if (minDepth == old) return;
   write([&](ChannelData<T>& data) { data.setMinDepth(minDepth); });
+  Internal::Rollback range([&] { m_data->setMinDepth(old); });
   if (old <= minDepth)
     remove(old, minDepth - 1);
   else
     this->update(source);
+  range.dismiss();
 }
 
 template <class T> void TypedChannel<T>::setDepth(int depth, Component const& source) {
   int const old = this->depth();
   if (depth == old) return;
   write([&](ChannelData<T>& data) { data.setDepth(depth); });
+  Internal::Rollback range([&] { m_data->setDepth(old); });
   if (old >= depth)
     remove(depth + 1, old);
   else
     this->update(source);
+  range.dismiss();
 }
 
 template <class T> bool TypedChannel<T>::hasElementType(Ostil::Any const& type) const {
@@ -203,8 +221,28 @@ template <class T> void TypedChannel<T>::updateTileResizeNoDispatch(Component co
 
 template <class T>
 void TypedChannel<T>::updateTilesRemoved(TileRemovalList const& removed, Component const& tree) {
-  write([&](ChannelData<T>& data) { data.moveTiles(removed, [&](int d) { return tree.tileCount(d); }); });
-  updateTileResizeNoDispatch(tree);
+  /// The tree's tiles, and no fewer than there are.
+  class Grown final : public Internal::TileCounts {
+  public:
+    Grown(Internal::TileCounts const& tiles, ChannelData<T> const& data)
+        : m_tiles(tiles)
+        , m_data(data) {}
+    std::int64_t tileCount(int d) const override {
+      return std::max(m_tiles.tileCount(d), m_data.tileCount(d));
+    }
+    std::int64_t elementCount(TreeIndex const& tile) const override { return m_tiles.elementCount(tile); }
+
+  private:
+    Internal::TileCounts const& m_tiles;
+    ChannelData<T> const& m_data;
+  };
+  Internal::ComponentCounts const counts(tree);
+  write([&](ChannelData<T>& data) {
+    // What may fail comes first, and dropping the tiles at the ends last.
+    data.resizeTiles(Grown(counts, data));
+    data.moveTiles(removed, [&](int d) { return tree.tileCount(d); });
+    data.resizeTiles(counts);
+  });
 }
 template <class T> void TypedChannel<T>::updateTilesNoDispatch(TileRemovalList const* removed) {
   // Nothing is known about which tiles go: all keep their elements.
@@ -223,7 +261,7 @@ template <class T> bool TypedChannel<T>::permute(TilePermutation const* newToOld
 template <class T> void TypedChannel<T>::updateTilePermuteNoDispatch(TilePermutation const* newToOld) {
   ChannelBase::Change const change(*this);
   void const* const before = dataPtr();
-  if (m_data && !m_data.unique()) m_data = Ostil::MutablePtr<ChannelData<T>>(std::move(m_data));
+  ownData();
   m_data->permuteTiles(*newToOld);
   if (dataPtr() != before) pointerReAllocated(before, dataPtr());
 }

@@ -29,12 +29,17 @@ Base::Base(Base const& other)
 }
 
 Base& Base::operator=(Base const& other) {
-  if (this != &other) m_name = other.m_name;
+  if (this != &other) setName(other.m_name);
   return *this;
 }
 
 Base::~Base() {
-  if (auto const* hooks = loggerHooks()) hooks->baseDestroyed(this);
+  if (auto const* hooks = Internal::anyLoggerHooks()) hooks->baseDestroyed(this);
+}
+
+void Base::setName(Ostil::String const& name) {
+  m_name = name;
+  if (auto const* hooks = Internal::anyLoggerHooks(); hooks && hooks->baseRenamed) hooks->baseRenamed(this);
 }
 
 void Base::dump(std::ostream& os) const { os << Streaming::pad(os) << "name = " << m_name << '\n' << '\n'; }
@@ -45,7 +50,7 @@ void Base::memUse(std::uint64_t& used, std::uint64_t& allocated, bool) const {
 }
 
 void Base::copyTo(Base& target) const {
-  if (&target != this) target.m_name = m_name;
+  if (&target != this) target.setName(m_name);
 }
 
 } // namespace VLN

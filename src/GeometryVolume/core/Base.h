@@ -26,7 +26,7 @@ public:
   virtual void memUse(std::uint64_t& used, std::uint64_t& allocated, bool notShared) const;
 
   Ostil::String const& name() const { return m_name; }
-  void setName(Ostil::String const& name) { m_name = name; }
+  void setName(Ostil::String const& name);
 
 protected:
   /// Assigns the name to `target`, unless it is this object.

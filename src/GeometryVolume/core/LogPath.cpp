@@ -14,7 +14,7 @@ namespace {
 
 Ostil::String temporaryDirectory() {
   for (char const* variable : {"TEMP", "tmp", "temp"})
-    if (char const* value = std::getenv(variable); value && *value) return value;
+    if (char const* value = std::getenv(variable)) return value;
   std::error_code error;
   auto const path = std::filesystem::temp_directory_path(error);
   return error ? Ostil::String("/tmp") : path.string();

@@ -1,5 +1,6 @@
-// What the library tells the object logger. The logger itself lives elsewhere and installs its table while it
-// is enabled; with no table each hook costs one test.
+// What the library tells the object logger. The logger itself lives elsewhere and installs its table once it
+// is enabled; with no table each hook costs one test. Switched off again it leaves a table that does not
+// record, so that it still hears which of the objects that it knows are gone.
 #pragma once
 
 #include "GeometryVolume/core/Export.h"
@@ -20,24 +21,36 @@ struct LoggerHooks {
   /// May be null in a table of one's own.
   void (*baseIncomplete)(Base const*) = nullptr;
   void (*baseComplete)(Base const*) = nullptr;
+  void (*baseRenamed)(Base const*) = nullptr;
+  /// Without it nothing is told but destruction, new names, and blocks that go or move.
+  bool recording = true;
 };
 
 namespace Internal {
-/// Null while logging is off. Readers only test and call: the table is never freed.
+/// Null until logging is first turned on. Readers only test and call: the table is never freed.
 extern VLN_API std::atomic<LoggerHooks const*> g_loggerHooks;
 } // namespace Internal
 
-inline LoggerHooks const* loggerHooks() { return Internal::g_loggerHooks.load(std::memory_order_relaxed); }
+namespace Internal {
+inline LoggerHooks const* anyLoggerHooks() { return g_loggerHooks.load(std::memory_order_relaxed); }
+} // namespace Internal
+
+/// Null while logging is off.
+inline LoggerHooks const* loggerHooks() {
+  auto const* hooks = Internal::anyLoggerHooks();
+  return hooks && hooks->recording ? hooks : nullptr;
+}
 
 inline bool loggingEnabled() { return loggerHooks() != nullptr; }
 inline bool loggerDumpInProgress() {
   auto const* hooks = loggerHooks();
   return hooks && hooks->isDumpInProgress();
 }
-/// For classes whose memUse() follows pointers: between objectIncomplete() and objectComplete(), which may
-/// nest, a report that another thread writes does not ask the object for its size. A base class tells the
-/// first in its constructors; the class that completes it tells the second at the end of its constructors,
-/// and the first again at the beginning of its destructor.
+/// Every class of ours whose memUse() reads members tells when it is complete. One that never does is
+/// measured by reports of the thread that made it; other threads cannot know when it is. Between
+/// objectIncomplete() and objectComplete(), which may nest, a report that another thread writes does not ask
+/// the object for its size. A base class tells the first in its constructors; the class that completes it
+/// tells the second at the end of its constructors, and the first again at the beginning of its destructor.
 inline void objectIncomplete(Base const* base) {
   if (auto const* hooks = loggerHooks(); hooks && hooks->baseIncomplete) hooks->baseIncomplete(base);
 }
@@ -63,10 +76,10 @@ inline void pointerAllocated(void const* block, Base const* owner) {
   if (auto const* hooks = loggerHooks()) hooks->pointerAllocated(block, owner);
 }
 inline void pointerDeAllocated(void const* block, Base const* owner) {
-  if (auto const* hooks = loggerHooks()) hooks->pointerDeAllocated(block, owner);
+  if (auto const* hooks = Internal::anyLoggerHooks()) hooks->pointerDeAllocated(block, owner);
 }
 inline void pointerReAllocated(void const* from, void const* to) {
-  if (auto const* hooks = loggerHooks()) hooks->pointerReAllocated(from, to);
+  if (auto const* hooks = Internal::anyLoggerHooks()) hooks->pointerReAllocated(from, to);
 }
 
 } // namespace VLN

@@ -1,5 +1,7 @@
 #include "GeometryVolume/core/Object.h"
 
+#include "GeometryVolume/core/TakenComponentImpl.h"
+
 #include <utility>
 
 namespace VLN {
@@ -63,9 +65,7 @@ Ostil::Ptr<Component> Object::component(Ostil::String const& name) const {
 
 Ostil::MutablePtr<Component> Object::extractComponent(Ostil::String const& name) {
   if (!component(name)) return nullptr;
-  Ostil::Any property = WriteAccess(*this)->extractProperty(name);
-  Ostil::Ptr<Component> taken = std::move(*property.get<Ostil::Ptr<Component>>());
-  return Ostil::MutablePtr<Component>(std::move(taken));
+  return Internal::TakenComponent<Component>(*this, name).keep();
 }
 
 void Object::removeComponent(Ostil::String const& name, Component*) {

@@ -19,6 +19,9 @@ namespace VLN {
 class VLN_API Object {
 public:
   Object();
+  // Copying shares. Moving does the same: a handle is never without an object.
+  Object(Object const&) = default;
+  Object& operator=(Object const&) = default;
 
   // Properties
   std::uint64_t size() const { return m_object->size(); }

@@ -38,6 +38,11 @@ public:
     if (m_object) putBack(std::move(m_component));
   }
   T& operator*() const { return *m_component; }
+  /// The component for good: its key goes.
+  Ostil::MutablePtr<T> keep() {
+    std::exchange(m_object, nullptr)->eraseProperty(m_name);
+    return std::move(m_component);
+  }
 
 private:
   void putBack(Ostil::Ptr<VLN::Component> component) {

@@ -7,11 +7,13 @@
 
 #include <algorithm>
 #include <chrono>
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <set>
 #include <shared_mutex>
 #include <tbb/concurrent_hash_map.h>
+#include <thread>
 #include <unordered_set>
 #include <vector>
 
@@ -29,6 +31,13 @@ struct Record {
   Base const* base;
   /// How often it is incomplete; the report asks for its size at 0 only.
   std::int32_t incomplete;
+  /// Whether it has ever told that it is complete.
+  bool announced;
+  std::thread::id maker;
+  /// The object's own may be changed at any moment.
+  Ostil::String name;
+  /// It died while the logger was off. Its key stays until an object comes to live there, or clear().
+  bool dead = false;
 };
 
 struct HashAddress {
@@ -68,6 +77,14 @@ State& state() {
   return *s;
 }
 
+/// A walk of this thread. What the hooks are told meanwhile, by objects that make others to measure
+/// themselves, waits until the maps may change.
+struct Walk {
+  std::vector<std::function<void()>> later;
+  std::unordered_set<Base const*> destroyed;
+};
+thread_local Walk* t_walk = nullptr;
+
 class HookLock {
 public:
   explicit HookLock(State& s)
@@ -84,12 +101,23 @@ class WalkLock {
 public:
   explicit WalkLock(State& s)
       : m_lock(s.mutex, std::defer_lock) {
+    if (t_walk) return;
     std::lock_guard const gate(s.gate);
     m_lock.lock();
+    t_walk = &m_walk;
   }
+  ~WalkLock() {
+    if (!m_lock) return;
+    t_walk = nullptr;
+    m_lock.unlock();
+    for (auto const& hook : m_walk.later) hook();
+  }
+  WalkLock(WalkLock const&) = delete;
+  WalkLock& operator=(WalkLock const&) = delete;
 
 private:
   std::unique_lock<std::shared_mutex> m_lock;
+  Walk m_walk;
 };
 
 void count(LoggerCounter counter) { ++state().counters[counter]; }
@@ -109,7 +137,7 @@ std::int32_t activeCopies(State& s, Ostil::String const& name) {
   if (!BaseLogger::enabled() || name == Internal::kPooledName || name == Internal::kScratchName) return 0;
   std::unordered_set<Base const*> bearers;
   for (auto const& [base, record] : s.baseMap)
-    if (base->name() == name) bearers.insert(base);
+    if (!record.dead && record.name == name) bearers.insert(base);
   if (bearers.empty()) return 0;
   bool const traced = isTraced(name);
   std::int32_t blocks = 0;
@@ -126,7 +154,8 @@ std::int32_t activeCopies(State& s, Ostil::String const& name) {
 
 std::int32_t activeCopiesOfAll(State& s) {
   std::set<Ostil::String> names;
-  for (auto const& [base, record] : s.baseMap) names.insert(base->name());
+  for (auto const& [base, record] : s.baseMap)
+    if (!record.dead) names.insert(record.name);
   std::int32_t sum = 0;
   for (auto const& name : names)
     if (passesVoxelTest(name) && name != Internal::kTreeName && name != Internal::kScratchName)
@@ -134,39 +163,81 @@ std::int32_t activeCopiesOfAll(State& s) {
   return sum;
 }
 
-// Hooks
+// Hooks. They throw nothing: where there is no memory the object is not accounted for.
+
+template <class Body> void attempt(LoggerCounter failed, Body const& body) noexcept {
+  try {
+    body();
+  } catch (...) { count(failed); }
+}
+/// Runs `body` now, or, copied, after the walk of this thread.
+template <class Body> void hook(LoggerCounter failed, Body const& body) noexcept {
+  attempt(failed, [&] {
+    if (t_walk)
+      t_walk->later.emplace_back([failed, body] { attempt(failed, body); });
+    else
+      body();
+  });
+}
 
 void baseBuilt(Base const* base) {
+  // The name is taken along: the object may be gone when its turn comes.
+  attempt(Internal::kAllocNotOK, [&] {
+    hook(Internal::kAllocNotOK, [base, name = base->name(), maker = std::this_thread::get_id()] {
+      State& s = state();
+      HookLock const lock(s);
+      std::int32_t const number = s.copyCounter.fetch_add(1);
+      if (number == kTrap) std::cout << "" << std::flush;
+      auto const ticks = std::chrono::steady_clock::now().time_since_epoch().count();
+      BaseMap::accessor entry;
+      bool const isNew = s.baseMap.insert(entry, base);
+      entry->second = Record{ticks, number, base, 0, false, maker, name};
+      count(isNew ? Internal::kAllocOK : Internal::kAllocNotOK);
+    });
+  });
+}
+
+bool forget(Base const* base) {
   State& s = state();
   HookLock const lock(s);
-  std::int32_t const number = s.copyCounter.fetch_add(1);
-  if (number == kTrap) std::cout << "" << std::flush;
-  auto const ticks = std::chrono::steady_clock::now().time_since_epoch().count();
-  bool const isNew = s.baseMap.emplace(base, Record{ticks, number, base, 0});
-  count(isNew ? Internal::kAllocOK : Internal::kAllocNotOK);
+  return s.baseMap.erase(base);
 }
 
 void baseDestroyed(Base const* base) {
-  State& s = state();
-  bool erased;
-  {
-    HookLock const lock(s);
-    erased = s.baseMap.erase(base);
-  }
-  count(erased ? Internal::kDeAllocOK : Internal::kDeAllocNotOK);
-  if (!erased) writeLine("Warning: Base '", base->name(), "' NOT deallocated OK");
+  if (t_walk) attempt(Internal::kDeAllocNotOK, [&] { t_walk->destroyed.insert(base); });
+  attempt(Internal::kDeAllocNotOK, [&] {
+    hook(Internal::kDeAllocNotOK, [base, name = base->name()] {
+      bool const erased = forget(base);
+      count(erased ? Internal::kDeAllocOK : Internal::kDeAllocNotOK);
+      if (!erased) writeLine("Warning: Base '", name, "' NOT deallocated OK");
+    });
+  });
 }
 
-void changeIncomplete(Base const* base, std::int32_t by) {
+void changeRecord(Base const* base, FunctionRef<void(Record&)> change) {
   State& s = state();
   HookLock const lock(s);
   BaseMap::accessor entry;
-  if (!s.baseMap.find(entry, base)) return;
-  // The logger may have been switched on in between.
-  entry->second.incomplete = std::max(0, entry->second.incomplete + by);
+  if (s.baseMap.find(entry, base)) change(entry->second);
 }
-void baseIncomplete(Base const* base) { changeIncomplete(base, 1); }
-void baseComplete(Base const* base) { changeIncomplete(base, -1); }
+void baseIncomplete(Base const* base) {
+  hook(Internal::kAllocNotOK, [base] { changeRecord(base, [](Record& record) { ++record.incomplete; }); });
+}
+void baseComplete(Base const* base) {
+  hook(Internal::kAllocNotOK, [base] {
+    changeRecord(base, [](Record& record) {
+      // The logger may have been switched on in between.
+      record.incomplete = std::max(0, record.incomplete - 1);
+      record.announced = true;
+    });
+  });
+}
+void baseRenamed(Base const* base) {
+  attempt(Internal::kAllocNotOK, [&] {
+    hook(Internal::kAllocNotOK,
+         [base, name = base->name()] { changeRecord(base, [&](Record& record) { record.name = name; }); });
+  });
+}
 
 /// @return Whether the block was new.
 bool addOwner(State& s, void const* block, Base const* owner) {
@@ -177,9 +248,8 @@ bool addOwner(State& s, void const* block, Base const* owner) {
   return isNew;
 }
 
-void hookPointerAllocated(void const* block, Base const* owner) {
+void accountBlock(void const* block, Base const* owner, Ostil::String const& name) {
   State& s = state();
-  Ostil::String const& name = owner->name();
   bool const watched =
       passesVoxelTest(name) && name != Internal::kTreeName && name != "voxel_signed_distance";
   // Counting walks the maps, so it must not lie inside the lock that the insertion takes.
@@ -196,47 +266,82 @@ void hookPointerAllocated(void const* block, Base const* owner) {
     if (rose) writeLine("Extra copy introduced");
   }
 }
-
-void hookPointerDeAllocated(void const* block, Base const* owner) {
-  State& s = state();
-  int outcome;
-  {
-    HookLock const lock(s);
-    PointerMap::accessor entry;
-    if (!s.pointerMap.find(entry, block)) {
-      outcome = 1;
-    } else {
-      Owners& owners = entry->second;
-      auto const at = std::find(owners.begin(), owners.end(), owner);
-      if (at == owners.end()) {
-        outcome = 2;
-      } else {
-        owners.erase(at);
-        outcome = owners.empty() ? 3 : 4;
-        if (owners.empty()) s.pointerMap.erase(entry);
-      }
-    }
-  }
-  count(outcome <= 2 ? Internal::kVoidDeAllocNotOK : Internal::kVoidDeAllocOK);
-  if (outcome <= 2)
-    writeLine("pointerDeAllocated.", outcome, ": DeAlloc Error");
-  else if (isTraced(owner->name()))
-    writeLine("pointerDeAllocated.", outcome, ": ", owner->name());
+void hookPointerAllocated(void const* block, Base const* owner) {
+  attempt(Internal::kVoidAllocNotOK, [&] {
+    hook(Internal::kVoidAllocNotOK,
+         [block, owner, name = owner->name()] { accountBlock(block, owner, name); });
+  });
 }
 
-void hookPointerReAllocated(void const* from, void const* to) {
+/// @return 1 for an unknown block, 2 for one of others, 3 for the last owner, 4 for another.
+int removeOwner(void const* block, Base const* owner) {
+  State& s = state();
+  HookLock const lock(s);
+  PointerMap::accessor entry;
+  if (!s.pointerMap.find(entry, block)) return 1;
+  Owners& owners = entry->second;
+  auto const at = std::find(owners.begin(), owners.end(), owner);
+  if (at == owners.end()) return 2;
+  owners.erase(at);
+  if (!owners.empty()) return 4;
+  s.pointerMap.erase(entry);
+  return 3;
+}
+
+void hookPointerDeAllocated(void const* block, Base const* owner) {
+  attempt(Internal::kVoidDeAllocNotOK, [&] {
+    hook(Internal::kVoidDeAllocNotOK, [block, owner, name = owner->name()] {
+      int const outcome = removeOwner(block, owner);
+      count(outcome <= 2 ? Internal::kVoidDeAllocNotOK : Internal::kVoidDeAllocOK);
+      if (outcome <= 2)
+        writeLine("pointerDeAllocated.", outcome, ": DeAlloc Error");
+      else if (isTraced(name))
+        writeLine("pointerDeAllocated.", outcome, ": ", name);
+    });
+  });
+}
+
+/// Moves the owners of a block to another.
+/// @return Whether the first was known, and whether the second is new.
+std::pair<bool, bool> moveOwners(void const* from, void const* to) {
   State& s = state();
   HookLock const lock(s);
   Owners owners;
   {
     PointerMap::accessor entry;
-    if (!s.pointerMap.find(entry, from)) return count(Internal::kVoidDeAllocNotOK);
+    if (!s.pointerMap.find(entry, from)) return {false, false};
     owners = entry->second;
     s.pointerMap.erase(entry);
   }
-  count(Internal::kVoidDeAllocOK);
-  bool const isNew = s.pointerMap.emplace(to, std::move(owners));
-  count(isNew ? Internal::kVoidAllocOK : Internal::kVoidAllocNotOK);
+  return {true, s.pointerMap.emplace(to, std::move(owners))};
+}
+
+void hookPointerReAllocated(void const* from, void const* to) {
+  hook(Internal::kVoidAllocNotOK, [from, to] {
+    auto const [known, isNew] = moveOwners(from, to);
+    count(known ? Internal::kVoidDeAllocOK : Internal::kVoidDeAllocNotOK);
+    if (known) count(isNew ? Internal::kVoidAllocOK : Internal::kVoidAllocNotOK);
+  });
+}
+
+// While the logger is off: what it knows must not outlive what it knows it of. Nothing is counted or said.
+
+template <class Body> void quietly(Body const& body) noexcept {
+  try {
+    body();
+  } catch (...) {}
+}
+void baseDestroyedOff(Base const* base) {
+  quietly([&] { changeRecord(base, [](Record& record) { record.dead = true; }); });
+}
+void baseRenamedOff(Base const* base) {
+  quietly([&] { changeRecord(base, [&](Record& record) { record.name = base->name(); }); });
+}
+void pointerDeAllocatedOff(void const* block, Base const* owner) {
+  quietly([&] { removeOwner(block, owner); });
+}
+void pointerReAllocatedOff(void const* from, void const* to) {
+  quietly([&] { moveOwners(from, to); });
 }
 
 constexpr LoggerHooks kHooks{&baseBuilt,
@@ -246,7 +351,11 @@ constexpr LoggerHooks kHooks{&baseBuilt,
                              &hookPointerReAllocated,
                              &BaseLogger::isDumpInProgress,
                              &baseIncomplete,
-                             &baseComplete};
+                             &baseComplete,
+                             &baseRenamed};
+constexpr LoggerHooks kOffHooks{
+    nullptr, &baseDestroyedOff, nullptr, &pointerDeAllocatedOff, &pointerReAllocatedOff,
+    nullptr, nullptr,           nullptr, &baseRenamedOff,        false};
 
 } // namespace
 
@@ -254,7 +363,9 @@ void BaseLogger::enable() {
   state();
   Internal::g_loggerHooks.store(&kHooks, std::memory_order_release);
 }
-void BaseLogger::disable() { Internal::g_loggerHooks.store(nullptr, std::memory_order_release); }
+void BaseLogger::disable() {
+  if (enabled()) Internal::g_loggerHooks.store(&kOffHooks, std::memory_order_release);
+}
 bool BaseLogger::enabled() { return loggingEnabled(); }
 
 void BaseLogger::clear() {
@@ -313,12 +424,16 @@ std::map<Ostil::String, NameSummary> summarizeNames() {
   WalkLock const lock(s);
   std::map<Ostil::String, NameSummary> names;
   for (auto const& [base, record] : s.baseMap) {
-    std::uint64_t used = 0, allocated = 0;
-    if (record.incomplete == 0)
-      base->memUse(used, allocated, false);
-    else
-      base->Base::memUse(used, allocated, false);
-    NameSummary& summary = names[base->name()];
+    if (record.dead) continue;
+    std::uint64_t used = sizeof(Base), allocated = sizeof(Base);
+    bool const gone = t_walk->destroyed.contains(base);
+    bool const known = record.announced || record.maker == std::this_thread::get_id();
+    if (!gone && known && record.incomplete == 0) {
+      try {
+        base->memUse(used, allocated, false);
+      } catch (...) { used = allocated = sizeof(Base); }
+    }
+    NameSummary& summary = names[record.name];
     if (summary.objects++ == 0 || record.number < summary.number)
       summary.base = base, summary.number = record.number, summary.size = used;
     summary.used += used, summary.allocated += allocated;

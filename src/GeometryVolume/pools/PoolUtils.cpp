@@ -38,14 +38,19 @@ Environment& environment() {
 }
 [[maybe_unused]] Environment const& g_readAtLoad = environment();
 
-std::uint64_t parseBytes(std::string_view text) {
+/// The number that a text begins with; what may follow it is the caller's to say.
+std::uint64_t parseBytes(std::string_view text, std::string_view unit = "") {
   auto const first = text.find_first_not_of(" \t");
   if (first == std::string_view::npos) throw std::runtime_error("no number");
   text.remove_prefix(first);
   std::uint64_t value = 0;
   auto const [end, error] = std::from_chars(text.data(), text.data() + text.size(), value);
+  if (end == text.data()) throw std::runtime_error("no number");
+  auto rest = text.substr(static_cast<std::size_t>(end - text.data()));
+  rest.remove_prefix(std::min(rest.size(), rest.find_first_not_of(" \t\r")));
+  if (auto const last = rest.find_last_not_of(" \t\r"); last != rest.npos) rest = rest.substr(0, last + 1);
+  if (rest != unit) throw std::runtime_error("no number");
   if (error == std::errc::result_out_of_range) return UINT64_MAX;
-  if (error != std::errc{} || end == text.data()) throw std::runtime_error("no number");
   return value;
 }
 
@@ -55,7 +60,7 @@ MemoryStats machineStats() {
   for (std::string line; std::getline(file, line) && !(total && available);) {
     auto const value = [&](std::string_view key, std::optional<std::uint64_t>& out) {
       if (line.compare(0, key.size(), key) == 0)
-        out = parseBytes(std::string_view(line).substr(key.size())) * 1024;
+        out = parseBytes(std::string_view(line).substr(key.size()), "kB") * 1024;
     };
     value("MemTotal:", total);
     value("MemAvailable:", available);

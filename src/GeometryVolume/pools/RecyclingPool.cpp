@@ -261,10 +261,14 @@ void RecyclingPool::countHandOut(void const* address) { m_lastHandOut[address] =
 // Freeing
 
 template <class Keep> void RecyclingPool::keepEntries(Store& store, Keep const& keep) {
-  Store kept;
-  for (Held& held : store)
-    if (keep(held.entry)) kept.append(std::move(held));
-  store.swap(kept);
+  // In place: a list that had to grow could fail with half of the entries moved.
+  std::uint64_t kept = 0;
+  for (std::uint64_t n = 0; n < store.size(); ++n) {
+    if (!keep(store[n].entry)) continue;
+    if (n != kept) std::swap(store[n], store[kept]);
+    ++kept;
+  }
+  while (store.size() > kept) store.removeLast();
 }
 
 void RecyclingPool::freeMemoryNotUsedSinceCount(std::uint64_t count) {

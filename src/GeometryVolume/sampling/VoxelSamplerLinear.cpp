@@ -92,6 +92,19 @@ VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::findTile(int i, int j, int k, int depth) 
   return m_channelCore->tileData(at);
 }
 
+VLN_SAMPLER_TEMPLATE float VLN_SAMPLER::sampleAbove(TreeIndex const& tile, int3 const& ijk,
+                                                    Position const& weights) const {
+  if (tile.index < 0 || tile.depth > TraitsT::kMaxDepth || tile.index >= m_container->tileCount(tile.depth))
+    return m_defaultValue;
+  auto const& there = m_container->tile(tile.index, tile.depth);
+  float const width = static_cast<float>(there.tileVoxelWidth()) / static_cast<float>(D);
+  Position p{};
+  for (int a = 0; a < 3; ++a)
+    p[a] = static_cast<float>(there.tijk()[a]) +
+           (static_cast<float>(ijk[a]) + weights[a] + this->m_offset[a]) * width;
+  return sample(p, m_maxDepth, kSamplerTileSpace);
+}
+
 VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::cachedCell(TreeIndex const& tile, int3 const& ijk,
                                                   Position const& weights) const -> Cell {
   auto const entry = [&](auto& cache) -> auto& {

@@ -88,8 +88,10 @@ public:
     this->locate(position, space, std::min(depth, m_maxDepth), place);
     return covers(place.tile) ? cellOf(place).value() : m_defaultValue;
   }
-  /// The interpolation proper, of a cell as prepareToSample() gives it.
+  /// The interpolation proper, of a cell as prepareToSample() gives it. A tile deeper than the channel stands
+  /// for the same place at the channel's deepest depth.
   float sample(TreeIndex const& tile, int3 const& ijk, Position const& weights) const {
+    if (tile.depth > m_maxDepth) return sampleAbove(tile, ijk, weights);
     if (!covers(tile)) return m_defaultValue;
     return cellOf({tile, 0.0f, Internal::lanesOf(ijk), Internal::lanesOf(weights)}).value();
   }
@@ -197,6 +199,7 @@ private:
     auto const& tiles = (*channel.tileArrays())[static_cast<std::size_t>(tile.depth)];
     return tiles[static_cast<std::size_t>(tile.index)].data();
   }
+  float sampleAbove(TreeIndex const& tile, int3 const& ijk, Position const& weights) const;
   Cell cachedCell(TreeIndex const& tile, int3 const& ijk, Position const& weights) const;
 
   void bind(CoreChannel const* core, WideChannel const* wide);

@@ -250,6 +250,8 @@ template <class TraitsT> bool Container<TraitsT>::checkConsistency(bool verbose)
 // --- Derived caches ---
 
 template <class TraitsT> void Container<TraitsT>::buildAccessorAccelerationStructure(int maxDepth) {
+  // First: where no depth qualifies, an older grid must not stay.
+  clearAccessorAccelerationStructure();
   buildAccelerationGrid(*this, *m_data, maxDepth);
 }
 template <class TraitsT> void Container<TraitsT>::precomputeTileNeighbors() {

@@ -164,6 +164,8 @@ public:
   /// Adds the smallest tile that holds the box.
   TileType const& addTile(int3 const& min, int3 const& max);
   /// Adds the tiles of a depth over a box, its max exclusive. Positions out of the domain are left out.
+  /// @edges `min` is aligned to its tile first, `max` is taken as it stands: with `max` at or below `min` on
+  /// an axis, the tile that holds `min` is still added where its corner lies below `max`.
   void addTiles(int3 const& min, int3 const& max, int depth);
   /// Adds the tiles that hold the listed points, by depth, all at once: existing ones are left, those between
   /// a listed tile and the next coarser one above it, listed or there, are made as well, and branch sizes are

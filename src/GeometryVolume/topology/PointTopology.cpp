@@ -1,6 +1,7 @@
 #include "GeometryVolume/topology/PointTopology.h"
 
 #include "GeometryVolume/core/Const.h"
+#include "GeometryVolume/core/LoggerHooks.h"
 #include "GeometryVolume/core/Streaming.h"
 
 #include <ostream>
@@ -9,15 +10,33 @@ namespace VLN::TileTree3D {
 
 template <class TraitsT>
 PointTopology<TraitsT>::PointTopology(Ostil::String const& name)
-    : Component(name.empty() ? Ostil::String(Const::TileTreePointTopologyName) : name) {}
+    : Component(name.empty() ? Ostil::String(Const::TileTreePointTopologyName) : name, Incomplete()) {
+  objectComplete(this);
+}
 
-template <class TraitsT> PointTopology<TraitsT>::~PointTopology() = default;
+template <class TraitsT>
+PointTopology<TraitsT>::PointTopology(PointTopology const& other)
+    : Component(other, Incomplete())
+    , m_counts(other.m_counts) {
+  objectComplete(this);
+}
+
+template <class TraitsT>
+PointTopology<TraitsT>& PointTopology<TraitsT>::operator=(PointTopology const& other) {
+  ObjectChange const change(this);
+  Component::operator=(other);
+  m_counts = other.m_counts;
+  return *this;
+}
+
+template <class TraitsT> PointTopology<TraitsT>::~PointTopology() { objectIncomplete(this); }
 
 template <class TraitsT> std::uint64_t PointTopology<TraitsT>::size() const {
   return static_cast<std::uint64_t>(elementCount(-1));
 }
 
 template <class TraitsT> void PointTopology<TraitsT>::update(VLN::Component const& source) {
+  ObjectChange const change(this);
   if (auto const* container = dynamic_cast<Container<TraitsT> const*>(&source))
     m_counts.takeTiles(*container, 0);
   else if (auto const* other = dynamic_cast<Component const*>(&source))

@@ -11,8 +11,8 @@ template <class TraitsT> class VLN_API PointTopology : public Component {
 public:
   /// An empty name becomes Const::TileTreePointTopologyName.
   explicit PointTopology(Ostil::String const& name);
-  PointTopology(PointTopology const&) = default;
-  PointTopology& operator=(PointTopology const&) = default;
+  PointTopology(PointTopology const& other);
+  PointTopology& operator=(PointTopology const& other);
   ~PointTopology() override;
 
   void dump(std::ostream& os) const override;

@@ -4,10 +4,17 @@
 #include "GeometryVolume/tiletree/Traits.h"
 
 #include <algorithm>
+#include <numeric>
 
 namespace VLN::TileTree3D {
 
 template <int Depths> void TreeCounts<Depths>::takeTiles(Component const& tree, std::uint32_t newElements) {
+  // Room first: either all depths follow or none.
+  for (int d = 0; d < Depths; ++d) {
+    auto& tiles = elementsPerTile[static_cast<std::size_t>(d)];
+    auto const n = static_cast<std::size_t>(tree.tileCount(d));
+    if (n > tiles.capacity()) tiles.reserve(std::max(n, 2 * tiles.size()));
+  }
   tileCountTotal = tree.tileCount(-1);
   for (int d = 0; d < Depths; ++d) {
     auto const depth = static_cast<std::size_t>(d);
@@ -17,6 +24,20 @@ template <int Depths> void TreeCounts<Depths>::takeTiles(Component const& tree, 
 }
 
 template <int Depths> void TreeCounts<Depths>::takeElements(Component const& source, std::uint32_t atLeast) {
+  // What is thrown half-way leaves depths that have followed and others that have not: the sums must say so.
+  struct Sums {
+    TreeCounts& counts;
+    bool taken = false;
+    ~Sums() {
+      if (taken) return;
+      counts.elementCountTotal = 0;
+      for (std::size_t d = 0; d < counts.elementsPerTile.size(); ++d) {
+        auto const& tiles = counts.elementsPerTile[d];
+        counts.elementCounts[d] = std::accumulate(tiles.begin(), tiles.end(), std::int64_t(0));
+        counts.elementCountTotal += counts.elementCounts[d];
+      }
+    }
+  } sums{*this};
   elementCountTotal = 0;
   for (int d = 0; d < Depths; ++d) {
     auto const depth = static_cast<std::size_t>(d);
@@ -36,6 +57,7 @@ template <int Depths> void TreeCounts<Depths>::takeElements(Component const& sou
         [](std::int64_t x, std::int64_t y) { return x + y; });
     elementCountTotal += elementCounts[depth];
   }
+  sums.taken = true;
 }
 
 template <int Depths>

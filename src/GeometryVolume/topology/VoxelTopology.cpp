@@ -1,6 +1,7 @@
 #include "GeometryVolume/topology/VoxelTopology.h"
 
 #include "GeometryVolume/core/Const.h"
+#include "GeometryVolume/core/LoggerHooks.h"
 #include "GeometryVolume/core/Streaming.h"
 
 #include <ostream>
@@ -9,16 +10,40 @@ namespace VLN::TileTree3D {
 
 template <class TraitsT>
 VoxelTopology<TraitsT>::VoxelTopology(Ostil::String const& name, VoxelOffsetType offsetType)
-    : Component(name.empty() ? Ostil::String(Const::TileTreeVoxelTopologyName) : name)
-    , m_offsetType(offsetType) {}
+    : Component(name.empty() ? Ostil::String(Const::TileTreeVoxelTopologyName) : name, Incomplete())
+    , m_offsetType(offsetType) {
+  objectComplete(this);
+}
 
-template <class TraitsT> VoxelTopology<TraitsT>::~VoxelTopology() = default;
+template <class TraitsT>
+VoxelTopology<TraitsT>::VoxelTopology(VoxelTopology const& other)
+    : Component(other, Incomplete())
+    , m_counts(other.m_counts)
+    , m_offsetType(other.m_offsetType)
+    , m_voxelSize(other.m_voxelSize)
+    , m_voxelSizeInv(other.m_voxelSizeInv) {
+  objectComplete(this);
+}
+
+template <class TraitsT>
+VoxelTopology<TraitsT>& VoxelTopology<TraitsT>::operator=(VoxelTopology const& other) {
+  ObjectChange const change(this);
+  Component::operator=(other);
+  m_offsetType = other.m_offsetType;
+  m_counts = other.m_counts;
+  m_voxelSize = other.m_voxelSize;
+  m_voxelSizeInv = other.m_voxelSizeInv;
+  return *this;
+}
+
+template <class TraitsT> VoxelTopology<TraitsT>::~VoxelTopology() { objectIncomplete(this); }
 
 template <class TraitsT> std::uint64_t VoxelTopology<TraitsT>::size() const {
   return static_cast<std::uint64_t>(tileCount(-1)) * TraitsT::kTileSize;
 }
 
 template <class TraitsT> void VoxelTopology<TraitsT>::update(VLN::Component const& source) {
+  ObjectChange const change(this);
   constexpr auto kElements = static_cast<std::uint32_t>(TraitsT::kTileDataSize);
   if (auto const* container = dynamic_cast<Container<TraitsT> const*>(&source)) {
     m_counts.takeTiles(*container, kElements);

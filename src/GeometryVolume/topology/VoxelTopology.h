@@ -13,8 +13,8 @@ template <class TraitsT> class VLN_API VoxelTopology : public Component {
 public:
   /// An empty name becomes Const::TileTreeVoxelTopologyName.
   VoxelTopology(Ostil::String const& name, VoxelOffsetType offsetType);
-  VoxelTopology(VoxelTopology const&) = default;
-  VoxelTopology& operator=(VoxelTopology const&) = default;
+  VoxelTopology(VoxelTopology const& other);
+  VoxelTopology& operator=(VoxelTopology const& other);
   ~VoxelTopology() override;
 
   void dump(std::ostream& os) const override;

@@ -1,0 +1,93 @@
+// Allocations that fail on purpose: the n-th, once or from then on, of operator new and of the bulk
+// allocator.
+//
+// The binary of this room replaces both. Nothing fails unless an Armed lives.
+#pragma once
+
+#include <cstdint>
+#include <functional>
+#include <new>
+#include <string>
+#include <utility>
+
+namespace test::faults {
+
+enum class Mode { kOnce, kFromThenOn };
+
+/// While it lives, the n-th allocation of the process fails.
+class Armed {
+public:
+  Armed(std::int64_t n, Mode mode);
+  ~Armed();
+  Armed(Armed const&) = delete;
+  Armed& operator=(Armed const&) = delete;
+};
+/// How many allocations have failed since the latest Armed was made.
+std::int64_t failures();
+/// Blocks of the bulk allocator that are in use.
+std::int64_t bulkBlocks();
+
+/// Something that is done to something else, told in three functions. `State` says what can be seen of the
+/// subject.
+template <class Subject> struct Scenario {
+  std::function<Subject()> make;
+  std::function<void(Subject&)> act;
+  std::function<std::string(Subject const&)> state;
+  /// Whether what is thrown leaves the subject as it was. Else it is enough that `act` works on it
+  /// afterwards.
+  bool strong = true;
+};
+
+/// Failures to try: each of them when the environment holds VLN_FAULTS_ALL, else each of the first and ever
+/// fewer.
+std::int64_t nextTry(std::int64_t n);
+/// Reports a scenario's counts, and what was wrong.
+void report(char const* name, std::int64_t tries, std::int64_t thrown);
+void expect(bool condition, std::string const& what);
+
+template <class Subject> void everyAllocation(char const* name, Scenario<Subject> const& scenario) {
+  std::string done;
+  {
+    Subject subject = scenario.make();
+    scenario.act(subject);
+    done = scenario.state(subject);
+  }
+  std::int64_t tries = 0, thrown = 0;
+  for (Mode const mode : {Mode::kOnce, Mode::kFromThenOn}) {
+    bool failed = true;
+    for (std::int64_t n = 1; failed; n = nextTry(n)) {
+      std::string const where = std::string(name) + ", allocation " + std::to_string(n) +
+                                (mode == Mode::kOnce ? " once" : " and all behind it");
+      std::int64_t const bulkBefore = bulkBlocks();
+      {
+        Subject subject = scenario.make();
+        std::string const before = scenario.state(subject);
+        bool threw = false, other = false;
+        {
+          Armed const armed(n, mode);
+          try {
+            scenario.act(subject);
+          } catch (std::bad_alloc const&) { threw = true; } catch (...) {
+            other = true;
+          }
+          failed = failures() > 0;
+        }
+        expect(!other, where + ": something else was thrown");
+        std::string const after = scenario.state(subject);
+        if (threw && scenario.strong) expect(after == before, where + ": changed although it threw");
+        if (!threw) expect(after == done || (failed && after == before), where + ": half done");
+        // Whatever happened, it works now. What was done need not be done again.
+        if (after != done || scenario.strong) {
+          Subject again = threw || after == before ? std::move(subject) : scenario.make();
+          scenario.act(again);
+          expect(scenario.state(again) == done, where + ": did not work afterwards");
+        }
+        ++tries, thrown += threw ? 1 : 0;
+      }
+      expect(bulkBlocks() == bulkBefore, where + ": lost bulk memory");
+    }
+  }
+  report(name, tries, thrown);
+}
+
+} // namespace test::faults
