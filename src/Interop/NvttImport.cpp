@@ -5,6 +5,7 @@
 #include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/pools/ChannelPool.h"
 #include "GeometryVolume/topology/Command.h"
+#include "GeometryVolume/utils/ChannelParser.h"
 #include "Interop/FileError.h"
 #include "Interop/NvttRead.h"
 #include "Interop/VolumeFile.h"
@@ -31,12 +32,17 @@ int levelsOf(nanovtt::TileBlock const& block) {
 
 class Importer {
 public:
-  Importer(MappedNvtt const& file, std::string const& path, Progress const& progress)
+  Importer(MappedNvtt const& file, std::string const& path, std::string const& filter,
+           Progress const& progress)
       : m_reader(file.reader())
+      , m_filter(filter)
       , m_path(path)
       , m_progress(progress) {}
 
   VdbImport run(std::uint64_t memoryBytes) {
+    if (!m_filter.empty())
+      if (auto const status = m_parser.parses(m_filter); !status)
+        throw FileError(m_path, "the filter '" + oneLine(m_filter, 60) + "' is none: " + status.message);
     collectTiles(memoryBytes);
     double const voxelSize = m_reader.gridCount() ? m_reader.grid(0).voxelSize() : 1.0;
     VdbVolume volume;
@@ -56,6 +62,7 @@ public:
       auto const grid = m_reader.grid(n);
       std::string name = grid.name();
       if (name.empty()) name = "unnamed";
+      if (!m_filter.empty() && !m_parser.accepts(name)) continue;
       std::string const base = name;
       for (int k = 2; object->hasProperty(name) || name == kVdbContainerName || name == kVdbTopologyName; ++k)
         name = base + "_" + std::to_string(k);
@@ -228,6 +235,8 @@ private:
   }
 
   nanovtt::BufferReader m_reader;
+  std::string const& m_filter;
+  Utils::ChannelParser m_parser;
   std::string m_path;
   Progress const& m_progress;
   Tree::TileLists m_corners;
@@ -242,7 +251,7 @@ VdbImport importNvtt(std::string const& path, VdbReadLimits const& limits, Progr
   std::uint64_t memory = limits.memoryBytes;
   if (memory == 0) memory = TileTree3D::ChannelPool::availablePhysicalMemory() / 4 * 3;
   if (memory == 0) memory = ~std::uint64_t(0);
-  return Importer(file, path, progress).run(memory);
+  return Importer(file, path, limits.channels, progress).run(memory);
 }
 
 VdbImport importVolumes(std::string const& path, VdbReadLimits const& limits, Progress const& progress) {

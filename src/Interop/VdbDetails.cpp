@@ -43,11 +43,23 @@ std::string textOf(openvdb::MetaMap const& map, char const* name) {
 } // namespace
 
 std::vector<VdbGridDetails> detailsOf(VdbVolume const& volume) {
+  // Beyond the domain there is nothing but the background.
+  constexpr int kFar = VdbTraits::kMaxTileCoord + 1;
+  constexpr Velorn::Math::int3 kNowhere{kFar, kFar, kFar};
   openvdb::initialize();
   std::vector<VdbGridDetails> all;
   Ostil::Any const holder = volume.object->getProperty(kVdbGridsProperty);
   auto const* records = holder.get<Ostil::Array<VdbGridRecord>>();
-  if (!records) return all;
+  if (!records) {
+    for (VdbChannel const& channel : volume.channels) {
+      VdbGridDetails details;
+      details.gridClass = "unknown";
+      if (auto const values = ChannelValues::of(volume, channel.name))
+        details.background = values->text(kNowhere);
+      all.push_back(std::move(details));
+    }
+    return all;
+  }
   for (VdbGridRecord const& record : *records) {
     openvdb::MetaMap const map = read(record.metadata);
     VdbGridDetails details;
@@ -59,10 +71,8 @@ std::vector<VdbGridDetails> detailsOf(VdbVolume const& volume) {
     details.half = textOf(map, openvdb::GridBase::META_SAVE_HALF_FLOAT) == "true";
     details.compression = textOf(map, openvdb::GridBase::META_FILE_COMPRESSION);
     details.metadata = listOf(map);
-    // Beyond the domain there is nothing but the background.
-    constexpr int kFar = VdbTraits::kMaxTileCoord;
     if (auto const values = ChannelValues::of(volume, record.channel))
-      details.background = values->text({kFar + 1, kFar + 1, kFar + 1});
+      details.background = values->text(kNowhere);
     all.push_back(std::move(details));
   }
   return all;

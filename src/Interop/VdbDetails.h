@@ -20,7 +20,7 @@ struct VdbGridDetails {
   bool half = false;                  ///< whether the file stores 16-bit floats
   std::vector<VdbMetadatum> metadata; ///< what is not told above
 };
-/// One for each channel of the volume, in the same order.
+/// One for each channel of the volume, in the same order; what only a .vdb file tells is empty for others.
 VLN_API std::vector<VdbGridDetails> detailsOf(VdbVolume const& volume);
 
 /// The metadata of the file itself.

@@ -5,6 +5,7 @@
 #include "GeometryVolume/tiletree/Container.h"
 #include "GeometryVolume/topology/Command.h"
 #include "GeometryVolume/topology/VoxelTopology.h"
+#include "GeometryVolume/utils/ChannelParser.h"
 #include "Interop/FileError.h"
 #include "Interop/IndexToWorldImpl.h"
 #include "Interop/VdbImportImpl.h"
@@ -254,7 +255,15 @@ VdbImport importGrids(VdbFile const& file, Progress const& progress) {
 
 VdbImport importVdb(std::string const& path, VdbReadLimits const& limits, Progress const& progress) {
   tell(progress, "reading", 0);
-  VdbFile const file = readVdbFile(path, limits);
+  VdbFile file = readVdbFile(path, limits);
+  if (!limits.channels.empty()) {
+    Utils::ChannelParser filter;
+    if (auto const status = filter.parses(limits.channels); !status)
+      throw FileError(path, "the filter '" + oneLine(limits.channels, 60) + "' is none: " + status.message);
+    std::erase_if(file.grids, [&](auto const& grid) {
+      return !filter.accepts(grid->getName().empty() ? "unnamed" : grid->getName());
+    });
+  }
   return importGrids(file, progress);
 }
 

@@ -26,6 +26,7 @@ void declareManual(CLI::App& self);
 
 /// Refuses what is no finite number, for options that take doubles.
 CLI::Option* finite(CLI::Option* option);
+void addChannelFilter(CLI::App& self, VLN::Interop::VdbReadLimits& limits);
 void addMemoryLimit(CLI::App& self, VLN::Interop::VdbReadLimits& limits);
 
 } // namespace Vln

@@ -13,7 +13,7 @@ void declareFlatten(CLI::App& self) {
   auto const options = std::make_shared<FlattenOptions>();
   auto& o = *options;
   auto& f = o.flat;
-  self.add_option("IN", o.file, "A .vdb file")->required()->type_name("IN");
+  self.add_option("IN", o.file, "A .vdb or .nvtt file")->required()->type_name("IN");
   self.add_option("OUT", o.output, "The .nvtt file to write")->required()->type_name("OUT.nvtt");
   self.add_option("--channels", f.channels, "Channels by name, such as \"density temp* !temp_old\"")
       ->capture_default_str()

@@ -27,13 +27,20 @@ void addMemoryLimit(CLI::App& self, VLN::Interop::VdbReadLimits& limits) {
       ->type_name("MB");
 }
 
+void addChannelFilter(CLI::App& self, VLN::Interop::VdbReadLimits& limits) {
+  self.add_option("--channels", limits.channels,
+                  "Only channels by these names, such as \"density temp* !temp_old\" (default: all)")
+      ->type_name("FILTER");
+}
+
 void declareInfo(CLI::App& self) {
   auto const options = std::make_shared<InfoOptions>();
   auto& o = *options;
-  self.add_option("FILE", o.files, "Files, .vdb or .ply")->required();
+  self.add_option("FILE", o.files, "Files, .vdb, .nvtt or .ply")->required();
   auto* json = self.add_flag("--json", o.json, "One JSON object instead of tables");
   self.add_flag("--memory", o.memory, "Also what accounts for memory: objects, their data, and the pools")
       ->excludes(json);
+  addChannelFilter(self, o.limits);
   self.add_flag("--brief", o.brief, "One line for each file")->excludes("--memory")->excludes(json);
   addMemoryLimit(self, o.limits);
   self.callback([options] { info(*options); });
@@ -42,7 +49,7 @@ void declareInfo(CLI::App& self) {
 void declareSlice(CLI::App& self) {
   auto const options = std::make_shared<SliceOptions>();
   auto& o = *options;
-  self.add_option("FILE", o.file, "A .vdb file")->required();
+  self.add_option("FILE", o.file, "A .vdb or .nvtt file")->required();
   self.add_option("--channel", o.channel, "Name of the channel, as info tells it")
       ->required()
       ->type_name("NAME");
@@ -108,6 +115,7 @@ void declareConvert(CLI::App& self) {
   auto& o = *options;
   self.add_option("IN", o.file, "A .vdb file")->required()->type_name("IN.vdb");
   self.add_option("OUT", o.output, "The .vdb file to write")->required()->type_name("OUT.vdb");
+  addChannelFilter(self, o.limits);
   self.add_flag("--strict", o.strict, "Write nothing where anything of the file would be left out");
   addMemoryLimit(self, o.limits);
   self.callback([options] { convert(*options); });
@@ -116,7 +124,7 @@ void declareConvert(CLI::App& self) {
 void declareProbe(CLI::App& self) {
   auto const options = std::make_shared<ProbeOptions>();
   auto& o = *options;
-  self.add_option("FILE", o.file, "A .vdb file")->required();
+  self.add_option("FILE", o.file, "A .vdb or .nvtt file")->required();
   self.add_option("X Y Z", o.positions,
                   "World positions, three numbers each; - reads them from standard input")
       ->type_name("...");

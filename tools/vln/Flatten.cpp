@@ -50,28 +50,28 @@ void report(VdbVolume const& volume, FlatVolume const& flat, bool quantised) {
     for (std::uint32_t n = 0; n < container.tileCount(); ++n) halos += grid.block(n).hasHalo();
   }
   std::int64_t voxels = 0;
-  std::ostream& out = std::cout;
-  out << fmt::format("  tiles       {}, {} of them with a halo, roots at depth {}\n", container.tileCount(),
-                     halos, container.rootDepth());
-  out << fmt::format("  container   {}\n", megabytes(container.containerSize()));
+  std::ostream& text = out();
+  text << fmt::format("  tiles       {}, {} of them with a halo, roots at depth {}\n", container.tileCount(),
+                      halos, container.rootDepth());
+  text << fmt::format("  container   {}\n", megabytes(container.containerSize()));
   for (std::uint32_t n = 0; n < reader.gridCount(); ++n) {
     auto const grid = reader.grid(n);
     VdbChannel const* const channel = volume.channel(grid.name());
     if (channel) voxels = std::max(voxels, channel->activeVoxels);
-    out << fmt::format("  grid        {}, {}\n", megabytes(grid.gridSize()), oneLine(grid.name(), 60));
+    text << fmt::format("  grid        {}, {}\n", megabytes(grid.gridSize()), oneLine(grid.name(), 60));
   }
-  if (!flat.traversal.empty()) out << fmt::format("  traversal   {}\n", megabytes(flat.traversal.size()));
-  if (!flat.neighbors.empty()) out << fmt::format("  neighbours  {}\n", megabytes(flat.neighbors.size()));
+  if (!flat.traversal.empty()) text << fmt::format("  traversal   {}\n", megabytes(flat.traversal.size()));
+  if (!flat.neighbors.empty()) text << fmt::format("  neighbours  {}\n", megabytes(flat.neighbors.size()));
   std::string const each =
       voxels > 0 ? fmt::format(", {:.2f} bytes per active voxel", double(flat.buffer.size()) / double(voxels))
                  : "";
-  out << fmt::format("  buffer      {}{}; made in {:.1f} ms, {:.2f} GB/s\n", megabytes(flat.buffer.size()),
-                     each, flat.seconds * 1e3,
-                     double(flat.buffer.size()) / 1e9 / std::max(flat.seconds, 1e-9));
+  text << fmt::format("  buffer      {}{}; made in {:.1f} ms, {:.2f} GB/s\n", megabytes(flat.buffer.size()),
+                      each, flat.seconds * 1e3,
+                      double(flat.buffer.size()) / 1e9 / std::max(flat.seconds, 1e-9));
   if (!quantised) return;
   for (auto const& error : flatErrors(*volume.object, flat))
-    out << fmt::format("  error       largest {:.3g}, mean {:.3g}, {}\n", error.largest, error.mean,
-                       oneLine(error.channel, 60));
+    text << fmt::format("  error       largest {:.3g}, mean {:.3g}, {}\n", error.largest, error.mean,
+                        oneLine(error.channel, 60));
 }
 
 } // namespace
@@ -96,9 +96,9 @@ void flatten(FlattenOptions const& options) {
     writeNvtt(options.output, {flat.buffer.data(), flat.buffer.size(), flat.traversal.data(),
                                flat.traversal.size(), flat.neighbors.data(), flat.neighbors.size()});
   }
-  std::ostream& out = remarks(options.output);
-  out << options.output << '\n';
-  if (&out == &std::cout) report(*volume, flat, options.flat.quantisation != Quantisation::kNone);
+  std::ostream& text = remarks(options.output);
+  text << options.output << '\n';
+  if (&text == &out()) report(*volume, flat, options.flat.quantisation != Quantisation::kNone);
   if (!volume->transform.empty())
     std::cerr << fmt::format("vln: {}: note: a flat buffer holds one voxel size; the transform is {}\n",
                              options.file, volume->transform);
@@ -115,9 +115,8 @@ void flatten(FlattenOptions const& options) {
 void validate(ValidateOptions const& options) {
   MappedNvtt const file(options.file, NvttCheck::kPages);
   auto const& reader = file.reader();
-  std::cout << fmt::format("{}: sound; {} tiles, {} {}, {} bytes\n", options.file,
-                           reader.container().tileCount(), reader.gridCount(),
-                           reader.gridCount() == 1 ? "grid" : "grids", file.bufferLength());
+  out() << fmt::format("{}: sound; {} tiles, {} {}, {} bytes\n", options.file, reader.container().tileCount(),
+                       reader.gridCount(), reader.gridCount() == 1 ? "grid" : "grids", file.bufferLength());
 }
 
 } // namespace Vln

@@ -9,7 +9,7 @@
 #include "InfoVolume.h"
 #include "Interop/FileError.h"
 #include "Interop/VdbDetails.h"
-#include "Interop/VdbImport.h"
+#include "Interop/VolumeFile.h"
 #include "PointsFile.h"
 #include "ProgressBar.h"
 #include "StandardOutput.h"
@@ -201,7 +201,7 @@ VdbImport read(std::string const& file, InfoOptions const& options) {
       input.file = content.file = file;
       content.points = readPointVolumes(input, bar.progress());
     } else {
-      content = importVdb(file, options.limits, bar.progress());
+      content = importVolumes(file, options.limits, bar.progress());
     }
   }
   for (auto const& volume : content.points) noteLosses(content.file, volume);

@@ -6,7 +6,7 @@
 #include "Interop/ChannelValues.h"
 #include "Interop/FileFormat.h"
 #include "Interop/OutputFile.h"
-#include "Interop/VdbImport.h"
+#include "Interop/VolumeFile.h"
 #include "Positions.h"
 #include "ProgressBar.h"
 #include "StandardOutput.h"
@@ -185,7 +185,7 @@ void probe(ProbeOptions const& options) {
   VdbImport content;
   {
     ProgressBar bar;
-    content = importVdb(options.file, options.limits, bar.progress());
+    content = importVolumes(options.file, options.limits, bar.progress());
   }
   auto const& volume = volumeWith(content, options.channel);
   auto const prober = proberOf(volume, options.channel);

@@ -2,7 +2,7 @@
 #include "Content.h"
 #include "Interop/FileError.h"
 #include "Interop/FileFormat.h"
-#include "Interop/VdbImport.h"
+#include "Interop/VolumeFile.h"
 #include "ProgressBar.h"
 #include "StandardOutput.h"
 
@@ -21,7 +21,7 @@ void slice(SliceOptions const& options) {
   std::string summary;
   {
     ProgressBar bar;
-    auto const content = importVdb(options.file, options.limits, bar.progress());
+    auto const content = importVolumes(options.file, options.limits, bar.progress());
     auto const& volume = volumeWith(content, options.channel);
     try {
       auto plane = options.plane;
