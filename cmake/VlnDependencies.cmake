@@ -2,7 +2,7 @@
 
 find_package(Threads REQUIRED)
 find_package(TBB CONFIG REQUIRED)
-find_package(NanoVDB)
+find_package(NanoVDB REQUIRED)
 if(VLN_BUILD_INTEROP)
   find_package(OpenVDB REQUIRED)
   find_package(PNG REQUIRED)
