@@ -18,10 +18,10 @@ struct VdbReadLimits {
   /// Most memory that reading the file may take, and then again most for the volumes made of it. 0: three
   /// quarters of what the machine has available.
   std::uint64_t memoryBytes = 0;
-  /// A filter of grids by name, as ChannelParser takes it: others are left out. Empty: all come in.
-  std::string channels;
   /// Most processor time that reading the file may take. 0: ten seconds, and one more for each MB.
   unsigned seconds = 0;
+  /// A filter of grids by name, as ChannelParser takes it: others are left out. Empty: all come in.
+  std::string channels = {};
 };
 
 /// A grid that does not come in.
