@@ -151,7 +151,7 @@ TEST_F(PointsProgramTest, RegressionTilesStandInTheWorld) {
     grid->setTransform(openvdb::math::Transform::createLinearTransform(size));
     grid->transform().postRotate(0.5, openvdb::math::Z_AXIS);
     grid->transform().postTranslate(at);
-    grid->tree().setValueOn({0, 0, 0}, 1.0f);
+    grid->tree().setValueOn({1, 1, 1}, 1.0f);
     return grid;
   };
   openvdb::GridPtrVec const grids{box("near", 0.5, {0, 0, 0}), box("far", 2, {1000, 0, 0})};
