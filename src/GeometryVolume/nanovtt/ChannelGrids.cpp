@@ -12,7 +12,6 @@ namespace {
 
 constexpr char const* kFogName = "voxel_fog_density";
 
-
 GridType storedType(GridType type, Build build) {
   if (type != GridType::kFloat) return type;
   switch (build) {
