@@ -1,6 +1,7 @@
 #include "Interop/VdbGridImpl.h"
 
 #include <algorithm>
+#include <iterator>
 
 namespace VLN::Interop {
 
@@ -77,6 +78,32 @@ int rootDepth(std::vector<GridSummary> const& grids) {
   };
   while (depth > 0 && tooWide(depth)) --depth;
   return depth;
+}
+
+int cheapestRootDepth(std::vector<int3> leaves, std::vector<int3> tiles, int deepest) {
+  // A few tiles more or less are not worth the search.
+  if (deepest == kMaxDepth || tiles.size() < leaves.size() / 8) return deepest;
+  std::sort(leaves.begin(), leaves.end(), mortonLess);
+  std::sort(tiles.begin(), tiles.end(), mortonLess);
+  auto const raise = [](std::vector<int3>& corners, int depth) { // stays sorted
+    for (int3& c : corners)
+      c = {VdbTraits::align(c.x, depth), VdbTraits::align(c.y, depth), VdbTraits::align(c.z, depth)};
+    corners.erase(std::unique(corners.begin(), corners.end()), corners.end());
+  };
+  int best = deepest;
+  std::size_t least = ~std::size_t(0), below = 0;
+  std::vector<int3> roots;
+  for (int depth = deepest; depth >= 0; --depth) {
+    raise(leaves, depth);
+    raise(tiles, depth);
+    roots.clear();
+    std::set_union(leaves.begin(), leaves.end(), tiles.begin(), tiles.end(), std::back_inserter(roots),
+                   mortonLess);
+    if (below + roots.size() < least) least = below + roots.size(), best = depth;
+    below += leaves.size();
+    if (below >= least) break;
+  }
+  return best;
 }
 
 void completeCorners(TileCorners& corners, int rootDepth) {

@@ -65,6 +65,9 @@ public:
   /// Why the grid cannot be placed in the tree; nothing when it can.
   virtual std::optional<std::string> whyNotPlaced() const = 0;
   virtual GridSummary summarize() const = 0;
+  /// Appends the corners of all leaves, and of the file's tiles with another value than the background.
+  virtual void collectStored(std::vector<Velorn::Math::int3>& leaves,
+                             std::vector<Velorn::Math::int3>& tiles) const = 0;
   /// Appends the corners of the tiles that the grid needs, without their ancestors: see VdbImport.h.
   /// @param mostTiles The shells of the widest tiles are left out where they would take more.
   virtual void collectTiles(int rootDepth, std::uint64_t mostTiles, TileCorners& corners) const = 0;
@@ -103,8 +106,12 @@ std::unique_ptr<GridSource> makeVectorSource(openvdb::GridBase::ConstPtr const& 
 openvdb::GridBase::Ptr makeScalarGrid(std::string const& type, GridToWrite const& from);
 openvdb::GridBase::Ptr makeVectorGrid(std::string const& type, GridToWrite const& from);
 
-/// Depth of all roots for grids with these summaries.
+/// The deepest depth at which all roots for grids with these summaries may lie.
 int rootDepth(std::vector<GridSummary> const& grids);
+/// That depth or a shallower one, whichever takes fewer tiles: deep roots are many where they have to cover
+/// wide tiles, shallow ones stand above more ancestors.
+int cheapestRootDepth(std::vector<Velorn::Math::int3> leaves, std::vector<Velorn::Math::int3> tiles,
+                      int deepest);
 /// Adds each tile's parents down from `rootDepth`, sorts each depth along the Z-shaped curve and drops
 /// duplicates.
 void completeCorners(TileCorners& corners, int rootDepth);

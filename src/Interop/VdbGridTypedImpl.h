@@ -171,6 +171,14 @@ public:
     return summary;
   }
 
+  void collectStored(std::vector<int3>& leaves, std::vector<int3>& tiles) const override {
+    for (Leaf const* leaf : m_leaves) leaves.push_back(toInt3(leaf->origin()));
+    Value const background = m_grid->background();
+    forEachTile(m_grid->tree(), [&](Coord const& c, int width, Value const& value, bool) {
+      if (!sameBits(value, background) && fitsTheTree(c, width)) tiles.push_back(toInt3(c));
+    });
+  }
+
   void collectTiles(int rootDepth, std::uint64_t mostTiles, TileCorners& corners) const override {
     auto at = [&](int depth) -> std::vector<int3>& { return corners[static_cast<std::size_t>(depth)]; };
     constexpr int kWidestDepth = depthOfSamples(kNodeWidths[2]);

@@ -138,7 +138,9 @@ std::string metadataBytes(openvdb::MetaMap const& metadata) {
 VdbVolume buildVolume(VdbFile const& file, Group const& group, std::uint64_t& memoryLeft,
                       Progress const& progress, double from, double to) {
   tell(progress, "building the tree", from);
-  int const root = rootDepth(group.summaries);
+  std::vector<int3> leaves, wideTiles;
+  for (auto const& grid : group.grids) grid->collectStored(leaves, wideTiles);
+  int const root = cheapestRootDepth(std::move(leaves), std::move(wideTiles), rootDepth(group.summaries));
   TileCorners corners;
   // A half for the shells of wide tiles: ancestors take an eighth or more, and lists of corners their part.
   std::uint64_t const mostTiles = memoryLeft / 2 / bytesFor(1, group);

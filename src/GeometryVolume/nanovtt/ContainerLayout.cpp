@@ -56,15 +56,15 @@ int ContainerLayout::rootEntries(int depth, int& size, int3& lowest) const {
 
 void ContainerLayout::chooseRootDepth() {
   int size;
-  int3 lowest;
   m_rootDepth = 0;
   int const limit = std::max(m_settings.rootLevelLimit, m_settings.finestLevel);
   for (int d = kMaxDepth - std::clamp(limit, 0, kMaxDepth); d > 0; --d) {
-    if (m_tree.tileCount(d) > 0 && rootEntries(d, size, lowest) <= kRootsAcross) {
+    if (m_tree.tileCount(d) > 0 && rootEntries(d, size, m_lowest) <= kRootsAcross) {
       m_rootDepth = d;
-      break;
+      return;
     }
   }
+  rootEntries(m_rootDepth, size, m_lowest);
 }
 
 /// What is visible in coarse tiles pulls the root depth up to them.
@@ -82,6 +82,7 @@ void ContainerLayout::raiseToCoarseContent(VLN::Object const& object) {
     }
     return false;
   };
+  int const chosen = m_rootDepth;
   for (int d = 0; (fog || distance) && d < m_rootDepth; ++d) {
     std::atomic<bool> found = false;
     forEachTile(m_tree, d, [&](TileType const& tile, std::int64_t) {
@@ -90,6 +91,7 @@ void ContainerLayout::raiseToCoarseContent(VLN::Object const& object) {
     });
     if (found) m_rootDepth = d;
   }
+  if (m_rootDepth == chosen) return;
   // Coarser depths can have roots of their own, further out than the table reaches.
   int size;
   while (rootEntries(m_rootDepth, size, m_lowest) > kRootsAcross && m_rootDepth > 0) --m_rootDepth;
@@ -111,8 +113,8 @@ void ContainerLayout::reportRoots() const {
 }
 
 bool ContainerLayout::rootsFit() const {
-  for (auto root = m_tree.cbeginRoots(); root != m_tree.cendRoots(); ++root) {
-    if (root->second.depth <= m_rootDepth) continue;
+  for (int d = m_rootDepth + 1; d <= kMaxDepth; ++d) {
+    if (m_tree.rootCount(d) == 0) continue;
     std::cerr << "VTTToNanoVTT: roots at depths finer than rootDepth (in this case " << m_rootDepth
               << " not supported)\n";
     return false;
