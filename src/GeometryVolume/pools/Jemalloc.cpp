@@ -4,6 +4,7 @@
 
 #include <atomic>
 #include <chrono>
+#include <exception>
 #include <mutex>
 #include <sstream>
 #include <tbb/parallel_for.h>
@@ -27,7 +28,7 @@ constexpr std::chrono::milliseconds kPatience(10);
 /// A cache can be flushed by its own thread only: spread one flush over each worker. Workers that all wait
 /// for a lock which the flushing thread holds never come for the task: after a while this thread runs it
 /// itself.
-void flushWorkers() {
+void flushEachWorker() {
   int const threads = tbb::this_task_arena::max_concurrency();
   if (threads < 2) return;
   tbb::task_arena arena(threads, 1);
@@ -49,6 +50,14 @@ void flushWorkers() {
   arena.terminate();
 }
 
+/// Caches are flushed when memory is short, so that there may be none for the flushing itself: then they stay
+/// as they are.
+void flushWorkers() noexcept {
+  try {
+    flushEachWorker();
+  } catch (...) {}
+}
+
 } // namespace
 
 void* allocate_jemalloc(std::uint64_t count, std::uint64_t elementSize) {
@@ -65,7 +74,9 @@ void jemalloc_flushCache() {
     ~Reset() { g_flushing.store(false, std::memory_order_release); }
   } const reset;
   flushOwnCache();
-  std::thread(flushWorkers).join();
+  try {
+    std::thread(flushWorkers).join();
+  } catch (std::exception const&) {} // no thread is to be had
 }
 
 namespace Internal {
