@@ -5,11 +5,10 @@
 //   memcpy     the same number of bytes, into memory that is mapped anew like that of a new buffer
 //   validate   of the whole buffer before it is trusted
 //   read       a million active voxels, leaf by leaf or at random, through NanoVDB's accessor and through a
-//   cursor
-//              on the flat buffer; an item is a voxel
+//              cursor on the flat buffer; an item is a voxel
 //   trilinear  in the cells of the same voxels, through NanoVDB's sampler and from tiles with halo
 //
-// "bytes a voxel" counts active voxels; "error" is the largest difference of any active voxel.
+// "bytes a voxel" counts active voxels. NanoVDB's conversion takes threads of its own, whatever it is given.
 #include "BenchGrids.h"
 #include "GeometryVolume/channels/Channel.h"
 #include "GeometryVolume/core/Parallel.h"
