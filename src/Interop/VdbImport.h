@@ -17,9 +17,9 @@
 // exactly what the grid gives. (Blocks that hold an active voxel have tiles in any case.)
 //
 // Above them stands the chain of ancestors up to one depth of roots, the deepest at which the whole box is at
-// most 64 tiles wide on each axis and no tile that the file needs lies higher, or a shallower one where that takes
-// fewer tiles. Grids of one object share the
-// union of their trees. Every sample of every tile holds the grid's value at the sample's corner.
+// most 64 tiles wide on each axis and no tile that the file needs lies higher, or a shallower one where that
+// takes fewer tiles. Grids of one object share the union of their trees. Every sample of every tile holds the
+// grid's value at the sample's corner.
 //
 // What else the file holds is kept as plain properties of the object, see VdbRecord.h. Where values do not
 // tell which samples are active, a channel of bytes beside the grid's own does.
