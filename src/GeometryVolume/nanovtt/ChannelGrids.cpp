@@ -55,7 +55,7 @@ void ChannelGrids::add(GridElement const& element, Ostil::String const& name,
   Grid grid{&element, name, std::move(channel), std::make_unique<GridTask>(m_layout, m_settings)};
   GridTask& task = *grid.task;
   task.source = element.tiles(*grid.channel);
-  task.type = storedType(element.type, m_settings.build);
+  task.setType(storedType(element.type, m_settings.build));
   task.gridClass = classOf(task, name);
   if (m_settings.fogFix && name == kFogName) task.fixFog = element.fixFog;
   if (task.quantised()) task.dither = makeDither(m_settings.dither);
@@ -127,7 +127,7 @@ void ChannelGrids::write(Grid& grid, std::uint64_t index, std::uint8_t* buffer, 
   m_log.line("name = '", name, "'");
   m_log.line("containerOffset = ", offset + kTreeOffset);
   m_log.line("Size of tile data = ", task.end() - task.tableBytes());
-  if (!m_layout.coalesced() || m_layout.hasDeadTiles()) writeTable(task);
+  if (m_layout.hasDeadTiles()) writeTable(task);
   if (task.bricksAcross > 0) {
     // What a texture read takes that finds no tile.
     std::uint64_t const size = elementBytes(task.type), width = task.bricksAcross * kHaloTileWidth;
@@ -194,17 +194,13 @@ void ChannelGrids::writeHeader(Grid const& grid, std::uint64_t index, std::uint6
   std::memcpy(bytes + kTreeDefaultOffset, task.source.defaultValue, elementBytes(task.type));
 }
 
+/// For the numbers of dead tiles, which nobody visits. The entries of the others are written again.
 void ChannelGrids::writeTable(GridTask const& task) const {
-  VLN::parallelFor(0, m_layout.tileCount(),
-                   [&](std::int64_t begin, std::int64_t end) {
-                     for (auto n = static_cast<std::uint32_t>(begin); n < static_cast<std::uint32_t>(end);
-                          ++n)
-                       store<std::uint64_t>(task.table() + 8 * std::uint64_t(n), task.entry(n));
-                   },
-                   {.grain = 16384});
-  if (task.type != GridType::kFpN || !m_layout.hasDeadTiles()) return;
-  for (std::uint32_t n = 0; n < m_layout.tileCount(); ++n)
-    store(task.table() + task.offset(n), task.records[n]);
+  for (std::uint32_t n = 0; n < m_layout.tileCount(); ++n) {
+    std::uint64_t const offset = task.offset(n);
+    store(task.table() + 8 * std::uint64_t(n), task.entry(n, offset, m_layout.hasHalo(n), 0));
+    if (task.type == GridType::kFpN) store(task.table() + offset, task.records[n]);
+  }
 }
 
 void ChannelGrids::writeBoxes(Grid const& grid, ActiveBoxes const& boxes,

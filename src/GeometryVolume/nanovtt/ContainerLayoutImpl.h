@@ -38,8 +38,10 @@ public:
   /// @return false when a root lies deeper than the root depth, which standard error then tells.
   /// @error std::runtime_error for more tiles than numbers.
   bool plan(VLN::Object const& object, BufferMaker const& makeBuffer);
+  /// Clears what write() leaves out.
+  void clear(std::uint8_t* bytes) const;
   /// Writes the section.
-  /// @pre The bytes are zero, size() of them.
+  /// @pre The bytes are cleared, size() of them.
   void write(std::uint8_t* bytes, std::uint64_t bufferSize) const;
 
   Tree const& tree() const { return m_tree; }

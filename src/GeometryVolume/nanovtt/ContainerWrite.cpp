@@ -6,6 +6,12 @@
 
 namespace nanovtt::Internal {
 
+void ContainerLayout::clear(std::uint8_t* bytes) const {
+  // All but the root table, which is filled whole.
+  fillZeros(bytes, kRootTableOffset);
+  fillZeros(bytes + kLlcOffset, m_size - kLlcOffset);
+}
+
 void ContainerLayout::write(std::uint8_t* bytes, std::uint64_t bufferSize) const {
   store<std::uint64_t>(bytes + kBufferSizeOffset, bufferSize);
   store<std::uint64_t>(bytes + kContainerSizeOffset, m_size);
@@ -55,20 +61,17 @@ void ContainerLayout::writeRoots(std::uint8_t* bytes) const {
   std::uint8_t* const table = bytes + kRootTableOffset;
   std::memset(table, 0xFF, std::size_t(kMaxRoots) * 4);
   std::uint32_t const shift = static_cast<std::uint32_t>(kTileSpaceBits - m_rootDepth);
-  for (std::int64_t n = 0; n < m_tree.tileCount(m_rootDepth); ++n) {
-    TileType const& tile = m_tree.tile(n, m_rootDepth);
-    if (!tile.valid()) continue;
-    std::uint32_t slot[3];
-    bool inside = true;
-    for (int a = 0; a < 3; ++a) {
-      slot[a] = static_cast<std::uint32_t>(tile.tijk()[a]) - static_cast<std::uint32_t>(m_lowest[a]);
-      slot[a] >>= shift;
-      inside = inside && slot[a] < kRootTableWidth;
-    }
-    if (inside)
-      store<std::uint32_t>(table + 4 * ((slot[2] * kRootTableWidth + slot[1]) * kRootTableWidth + slot[0]),
+  std::uint32_t const low[3] = {static_cast<std::uint32_t>(m_lowest.x),
+                                static_cast<std::uint32_t>(m_lowest.y),
+                                static_cast<std::uint32_t>(m_lowest.z)};
+  forEachTile(m_tree, m_rootDepth, [=, this](TileType const& tile, std::int64_t n) {
+    std::uint32_t const x = (static_cast<std::uint32_t>(tile.ti()) - low[0]) >> shift;
+    std::uint32_t const y = (static_cast<std::uint32_t>(tile.tj()) - low[1]) >> shift;
+    std::uint32_t const z = (static_cast<std::uint32_t>(tile.tk()) - low[2]) >> shift;
+    if (std::max({x, y, z}) < kRootTableWidth)
+      store<std::uint32_t>(table + 4 * ((z * kRootTableWidth + y) * kRootTableWidth + x),
                            number(m_rootDepth, n));
-  }
+  });
 }
 
 void ContainerLayout::writeTile(std::uint8_t* bytes, TileType const& tile) const {

@@ -61,7 +61,7 @@ bool convert(VLN::Object const& object, Ostil::String const& filter, ConversionS
                                               : blockSize(sizes.buffer, settings.elementBytes);
     std::uint8_t* const bytes = makeBuffer(BufferRole::kMain, size);
     if (grids.writesAllTiles()) {
-      fillZeros(bytes, layout.size());
+      layout.clear(bytes);
       grids.clearGaps(bytes);
       fillZeros(bytes + used, size - used);
     } else {

@@ -22,7 +22,8 @@ struct GridTask {
 
   // What is stored
   VLN::TileTree3D::Internal::ErasedTiles source;
-  GridType type = GridType::kFloat;
+  GridType type = GridType::kFloat;            ///< set by setType()
+  std::uint64_t plainBytes = 0, haloBytes = 0; ///< of one tile; FpN tiles differ
   GridClass gridClass = GridClass::kOther;
   /// Null unless asked for and this is the channel that it is for.
   FogFix fixFog = nullptr;
@@ -39,13 +40,17 @@ struct GridTask {
   bool quantised() const { return isQuantised(type); }
   bool isLevelSet() const { return gridClass == GridClass::kLevelSet; }
   std::uint64_t tableBytes() const { return (std::uint64_t(layout.tileCount()) + 1) * 8; }
+  /// Settles how elements are stored, and with it the sizes of tiles.
+  void setType(GridType stored) {
+    type = stored;
+    plainBytes = tileBytes(stored, false), haloBytes = tileBytes(stored, true);
+  }
 
   /// Where the data of a tile begins, counted from the tile table; the end of the data for tileCount().
   std::uint64_t offset(std::uint32_t number) const {
     if (layout.coalesced()) return tableBytes() + layout.samplesBefore(number) * elementBytes(type);
     if (type == GridType::kFpN) return offsets[number];
-    std::uint64_t const plain = tileBytes(type, false), halo = tileBytes(type, true);
-    return tableBytes() + number * plain + layout.halosBefore(number) * (halo - plain);
+    return tableBytes() + number * plainBytes + layout.halosBefore(number) * (haloBytes - plainBytes);
   }
   std::uint64_t end() const {
     if (bricksAcross > 0) {
@@ -62,14 +67,16 @@ struct GridTask {
     std::uint64_t const c = std::uint64_t(number) + 1, q = bricksAcross;
     return {c % q, c % (q * q) / q, c / (q * q)};
   }
-  /// Entry of the tile table, for every tile that is not in a coalesced block.
-  std::uint64_t entry(std::uint32_t number) const {
+  /// Entry of the tile table.
+  /// @param levels Of the coalesced block that the tile heads.
+  std::uint64_t entry(std::uint32_t number, std::uint64_t offset, bool halo, int levels) const {
     if (bricksAcross > 0) {
       Brick const at = brick(number);
       return textureEntry(at.x, at.y, at.z);
     }
-    if (quantised()) return offset(number);
-    return tileEntry(offset(number), layout.hasHalo(number) ? kHaloTileWidth : kTileWidth, 0);
+    if (quantised()) return offset;
+    return tileEntry(offset, (std::uint64_t(kTileWidth) << levels) + halo,
+                     static_cast<std::uint64_t>(levels));
   }
   std::uint8_t* table() const { return bytes + kTileTableOffset; }
 };

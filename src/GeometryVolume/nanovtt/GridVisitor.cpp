@@ -65,43 +65,54 @@ bool holds(ActiveBox const& box, TileType const& tile) {
 
 } // namespace
 
+void GridVisitor::visit(int depth, std::int64_t begin, std::int64_t end) {
+  ContainerLayout const& layout = m_task.layout;
+  for (std::int64_t n = begin; n < end; ++n) {
+    TileType const& tile = layout.tree().tile(n, depth);
+    if (!tile.valid()) continue;
+    if (layout.coalesced())
+      GridVisitor::beginTile(tile);
+    else
+      storeTile(tile, layout.number(depth, n));
+  }
+}
+
 void GridVisitor::beginTile(TileType const& tile) {
   ContainerLayout const& layout = m_task.layout;
-  bool const inBlock = layout.inBlock(tile.depth(), tile.index());
-  int const levels = layout.coalesced() ? layout.blockLevels(tile) : 0;
-  if (inBlock) {
-    TileType const& head = layout.blockHead(tile);
-    int const bottom = head.depth() + layout.blockLevels(head);
-    if (tile.depth() < bottom) return; // all its voxels are refined, and others hold its data
-    bool halo = layout.hasHalo(layout.number(head.depth(), head.index()));
-    // Away from the block's high edge the core is all that is stored, and the halo computation leaves a core
-    // as it is: but not below the channel's last depth, where it blends, nor under the fog fix, which looks
-    // beyond it.
-    if (halo && !m_task.fixFog && tile.depth() <= m_task.source.maxDepth) {
-      bool touches = false;
-      for (int a = 0; a < 3; ++a)
-        touches |= tile.tijk()[a] + tile.tileVoxelWidth() == head.tijk()[a] + head.tileVoxelWidth();
-      halo = touches;
-    }
-    StoredTile const stored = m_samples.get(tile, halo);
-    storeInBlock(tile, head, stored);
-    return grow(tile, stored);
-  }
+  if (!layout.inBlock(tile.depth(), tile.index()))
+    return storeTile(tile, layout.number(tile.depth(), tile.index()));
 
-  std::uint32_t const number = layout.number(tile.depth(), tile.index());
+  TileType const& head = layout.blockHead(tile);
+  int const bottom = head.depth() + layout.blockLevels(head);
+  if (tile.depth() < bottom) return; // all its voxels are refined, and others hold its data
+  bool halo = layout.hasHalo(layout.number(head.depth(), head.index()));
+  // Away from the block's high edge the core is all that is stored, and the halo computation leaves a core
+  // as it is: but not below the channel's last depth, where it blends, nor under the fog fix, which looks
+  // beyond it.
+  if (halo && !m_task.fixFog && tile.depth() <= m_task.source.maxDepth) {
+    bool touches = false;
+    for (int a = 0; a < 3; ++a)
+      touches |= tile.tijk()[a] + tile.tileVoxelWidth() == head.tijk()[a] + head.tileVoxelWidth();
+    halo = touches;
+  }
+  StoredTile const stored = m_samples.get(tile, halo);
+  storeInBlock(tile, head, stored);
+  grow(tile, stored);
+}
+
+void GridVisitor::storeTile(TileType const& tile, std::uint32_t number) {
+  ContainerLayout const& layout = m_task.layout;
   bool const halo = layout.hasHalo(number);
   StoredTile const stored = m_samples.get(tile, halo);
-  if (m_task.layout.coalesced()) {
-    std::uint64_t const width = (std::uint64_t(kTileWidth) << levels) + halo;
-    store(m_task.table() + 8 * std::uint64_t(number),
-          tileEntry(m_task.offset(number), width, static_cast<std::uint64_t>(levels)));
-  }
+  std::uint64_t const offset = m_task.offset(number);
+  int const levels = layout.coalesced() ? layout.blockLevels(tile) : 0;
+  store(m_task.table() + 8 * std::uint64_t(number), m_task.entry(number, offset, halo, levels));
   if (m_task.quantised())
-    quantise(stored, number);
+    quantise(stored, number, m_task.table() + offset);
   else if (m_task.bricksAcross > 0)
     storeBrick(number, stored);
   else if (levels == 0)
-    std::memcpy(m_task.table() + m_task.offset(number), stored.samples, tileBytes(m_task.type, halo));
+    std::memcpy(m_task.table() + offset, stored.samples, halo ? m_task.haloBytes : m_task.plainBytes);
   grow(tile, stored);
 }
 

@@ -21,9 +21,13 @@ namespace Internal {
 class GridVisitor : public Tree::VisitorType {
 public:
   ActiveBoxes const& boxes() const { return m_boxes; }
+  void startFrom(ActiveBoxes const& boxes) { m_boxes = boxes; }
 
   using Tree::VisitorType::beginTile;
   void beginTile(TileType const& tile) override;
+  /// Visits the live tiles with indices begin to end of a depth, in the order in which memory holds them: a
+  /// tile's samples and its place in the grid follow from its own number, so the order is free.
+  void visit(int depth, std::int64_t begin, std::int64_t end);
   void join(Tree::VisitorType const& other) override {
     m_boxes.join(static_cast<GridVisitor const&>(other).m_boxes);
   }
@@ -40,10 +44,11 @@ protected:
   /// Bits of the 64 core samples, i fastest, that are active: below 0 in a level set, else those that differ
   /// from the default value by more than `threshold`.
   virtual std::uint64_t active(StoredTile const& tile, float threshold) const = 0;
-  /// Writes a quantised tile.
-  virtual void quantise(StoredTile const& tile, std::uint32_t number) const = 0;
+  /// Writes a quantised tile to `out`.
+  virtual void quantise(StoredTile const& tile, std::uint32_t number, std::uint8_t* out) const = 0;
 
 private:
+  void storeTile(TileType const& tile, std::uint32_t number);
   void storeInBlock(TileType const& bottom, TileType const& head, StoredTile const& tile) const;
   void storeBrick(std::uint32_t number, StoredTile const& tile) const;
   void grow(TileType const& tile, StoredTile const& stored);
@@ -74,7 +79,7 @@ public:
 
 protected:
   std::uint64_t active(Internal::StoredTile const& tile, float threshold) const override;
-  void quantise(Internal::StoredTile const& tile, std::uint32_t number) const override;
+  void quantise(Internal::StoredTile const& tile, std::uint32_t number, std::uint8_t* out) const override;
 };
 
 } // namespace nanovtt

@@ -161,9 +161,11 @@ template <class TraitsT> void Container<TraitsT>::tileSpaceBounds(int d, bbox<in
       0, tiles.size(), 16384, Box{},
       [&](std::int64_t begin, std::int64_t end) {
         Box part;
-        for (std::int64_t n = begin; n < end; ++n) {
-          if (tiles[n].valid()) tiles[n].tileSpaceBounds(part);
-        }
+        for (std::int64_t n = begin; n < end; ++n)
+          if (tiles[n].valid()) part.grow(tiles[n].tijk());
+        // All tiles of a depth are as wide; the far corner of the domain's last one fits into int32.
+        int const w = tileVoxelWidth(d);
+        if (!part.empty()) part.grow({part.max.x + w, part.max.y + w, part.max.z + w});
         return part;
       },
       [](Box a, Box const& b) {
