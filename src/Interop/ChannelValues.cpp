@@ -21,7 +21,7 @@ template <class T> class TypedValues final : public ChannelValues {
   using Scalar = typename ScalarOf<T>::type;
 
 public:
-  static constexpr int kComponents = sizeof(T) / sizeof(Scalar);
+  static constexpr int kComponents = kComponentsOf<T>;
   static_assert(kComponents <= kMostComponents);
 
   TypedValues(TileTree3D::Container<VdbTraits> const& tree, ChannelT const& channel)
@@ -33,27 +33,20 @@ public:
   bool wide() const override { return std::is_same_v<Scalar, double>; }
   void at(int3 const& voxel, double* values) const override {
     T const& value = m_reader.value(voxel);
-    for (int c = 0; c < kComponents; ++c) values[c] = static_cast<double>(part(value, c));
+    for (int c = 0; c < kComponents; ++c) values[c] = static_cast<double>(componentOf(value, c));
   }
   std::string text(int3 const& voxel) const override {
     T const& value = m_reader.value(voxel);
     std::string result;
     for (int c = 0; c < kComponents; ++c) {
       char digits[32];
-      auto const end = std::to_chars(digits, digits + sizeof digits, +part(value, c)).ptr;
+      auto const end = std::to_chars(digits, digits + sizeof digits, +componentOf(value, c)).ptr;
       result.append(c > 0 ? "," : "").append(digits, end);
     }
     return result;
   }
 
 private:
-  static Scalar part(T const& value, int c) {
-    if constexpr (kComponents == 1)
-      return value;
-    else
-      return value[c];
-  }
-
   TileTree3D::ChannelReader<ChannelT> m_reader;
 };
 
@@ -67,19 +60,17 @@ void tryType(VdbVolume const& volume, std::string const& channel, std::unique_pt
 
 } // namespace
 
+double lengthOf(double const* v, int count) {
+  double const first = std::hypot(v[0], count > 1 ? v[1] : 0, count > 2 ? v[2] : 0);
+  return count > 3 ? std::hypot(first, v[3]) : first;
+}
+
 ChannelValues::~ChannelValues() = default;
 
 std::unique_ptr<ChannelValues> ChannelValues::of(VdbVolume const& volume, std::string const& channel) {
   std::unique_ptr<ChannelValues> result;
 #define VLN_TRY_TYPE(type_, name_) tryType<type_>(volume, channel, result);
-  VLN_ELEMENT_FLOAT(VLN_TRY_TYPE)
-  VLN_ELEMENT_DOUBLE(VLN_TRY_TYPE)
-  VLN_ELEMENT_UINT8(VLN_TRY_TYPE)
-  VLN_ELEMENT_INT32(VLN_TRY_TYPE)
-  VLN_ELEMENT_INT64(VLN_TRY_TYPE)
-  VLN_ELEMENT_FLOAT3(VLN_TRY_TYPE)
-  VLN_ELEMENT_DOUBLE3(VLN_TRY_TYPE)
-  VLN_ELEMENT_INT3(VLN_TRY_TYPE)
+  VLN_FOR_EACH_FILE_ELEMENT_TYPE(VLN_TRY_TYPE)
 #undef VLN_TRY_TYPE
   return result;
 }

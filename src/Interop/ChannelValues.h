@@ -10,7 +10,10 @@
 
 namespace VLN::Interop {
 
-inline constexpr int kMostComponents = 3;
+inline constexpr int kMostComponents = 4;
+
+/// Length of a vector of one to four components.
+VLN_API double lengthOf(double const* components, int count);
 
 /// @space Tile space. Sample (i, j, k) of the deepest tiles lies at that index, where the file has its voxel.
 /// @threads One copy for each thread.

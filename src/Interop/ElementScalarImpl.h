@@ -1,4 +1,7 @@
+// Element types as numbers: their components, and the list of those that files bring.
 #pragma once
+
+#include "GeometryVolume/core/ElementTypes.h"
 
 namespace VLN::Interop {
 
@@ -10,4 +13,25 @@ struct ScalarOf<T> {
   using type = typename T::Scalar;
 };
 
+template <class T> inline constexpr int kComponentsOf = sizeof(T) / sizeof(typename ScalarOf<T>::type);
+
+/// A scalar itself, or a component of a vector: those lie one behind the other.
+template <class T> typename ScalarOf<T>::type componentOf(T const& value, int c) {
+  return reinterpret_cast<typename ScalarOf<T>::type const*>(&value)[c];
+}
+
 } // namespace VLN::Interop
+
+/// Expands X(type, name) for each element type that a file of any format brings, as far as this build has it.
+#define VLN_FOR_EACH_FILE_ELEMENT_TYPE(X)                                                                    \
+  VLN_ELEMENT_FLOAT(X)                                                                                       \
+  VLN_ELEMENT_DOUBLE(X)                                                                                      \
+  VLN_ELEMENT_UINT8(X)                                                                                       \
+  VLN_ELEMENT_INT16(X)                                                                                       \
+  VLN_ELEMENT_INT32(X)                                                                                       \
+  VLN_ELEMENT_UINT32(X)                                                                                      \
+  VLN_ELEMENT_INT64(X)                                                                                       \
+  VLN_ELEMENT_FLOAT3(X)                                                                                      \
+  VLN_ELEMENT_FLOAT4(X)                                                                                      \
+  VLN_ELEMENT_DOUBLE3(X)                                                                                     \
+  VLN_ELEMENT_INT3(X)

@@ -9,6 +9,7 @@
 #include "GeometryVolume/tiletree/Container.h"
 #include "Interop/ChannelValues.h"
 #include "Interop/ColorMap.h"
+#include "Interop/ElementScalarImpl.h"
 #include "Interop/VdbDetails.h"
 
 #include <algorithm>
@@ -51,14 +52,12 @@ std::string number(double value) {
 // Gives a sample as a number: of a vector a component, or its length.
 using Reader = std::function<float(TreeIndex const&, int3 const&)>;
 
-float asNumber(auto const& value, int component) {
-  using T = std::remove_cvref_t<decltype(value)>;
-  if constexpr (std::is_arithmetic_v<T>)
-    return static_cast<float>(value);
-  else if (component >= 0)
-    return static_cast<float>(value[component]);
-  else
-    return static_cast<float>(std::hypot(double(value.x), double(value.y), double(value.z)));
+template <class T> float asNumber(T const& value, int component) {
+  if (kComponentsOf<T> == 1 || component >= 0)
+    return static_cast<float>(componentOf(value, std::max(component, 0)));
+  double components[kMostComponents] = {};
+  for (int c = 0; c < kComponentsOf<T>; ++c) components[c] = static_cast<double>(componentOf(value, c));
+  return static_cast<float>(lengthOf(components, kComponentsOf<T>));
 }
 
 template <class T> void tryReader(ChannelBase const& channel, int component, Reader& reader) {
@@ -72,14 +71,7 @@ template <class T> void tryReader(ChannelBase const& channel, int component, Rea
 Reader readerOf(ChannelBase const& channel, int component) {
   Reader reader;
 #define VLN_TRY_TYPE(type_, name_) tryReader<type_>(channel, component, reader);
-  VLN_ELEMENT_FLOAT(VLN_TRY_TYPE)
-  VLN_ELEMENT_DOUBLE(VLN_TRY_TYPE)
-  VLN_ELEMENT_UINT8(VLN_TRY_TYPE)
-  VLN_ELEMENT_INT32(VLN_TRY_TYPE)
-  VLN_ELEMENT_INT64(VLN_TRY_TYPE)
-  VLN_ELEMENT_FLOAT3(VLN_TRY_TYPE)
-  VLN_ELEMENT_DOUBLE3(VLN_TRY_TYPE)
-  VLN_ELEMENT_INT3(VLN_TRY_TYPE)
+  VLN_FOR_EACH_FILE_ELEMENT_TYPE(VLN_TRY_TYPE)
 #undef VLN_TRY_TYPE
   return reader;
 }
@@ -234,7 +226,7 @@ std::vector<Sample> blendedSamples(Plane const& plane, Container const& tree, Ch
       own->linear(p, v);
       double const shown = component >= 0           ? v[component]
                            : own->components() == 1 ? v[0]
-                                                    : std::hypot(v[0], v[1], v[2]);
+                                                    : lengthOf(v, own->components());
       return {static_cast<float>(shown), true};
     };
   });
@@ -371,7 +363,7 @@ void check(VdbChannel const& info, ChannelValues const& values, SliceOptions con
     throw std::invalid_argument("the range must begin below its end");
   if (options.component >= values.components() || (options.component >= 0 && values.components() == 1))
     throw std::invalid_argument("channel '" + info.name + "' has no component " +
-                                std::string(1, "xyz"[std::min(options.component, 2)]));
+                                std::string(1, "xyzw"[std::min(options.component, 3)]));
 }
 
 } // namespace

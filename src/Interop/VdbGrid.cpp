@@ -17,16 +17,9 @@ void grow(IndexBox& box, IndexBox const& other) {
   box.grow(other.min), box.grow(other.max);
 }
 
-// Whether a comes before b along the Z-shaped curve: the axis whose coordinates differ in the highest bit
-// decides.
-bool mortonLess(int3 const& a, int3 const& b) {
-  std::uint32_t highest = 0;
-  int axis = 0;
-  for (int n = 0; n < 3; ++n) {
-    auto const differ = static_cast<std::uint32_t>(a[n]) ^ static_cast<std::uint32_t>(b[n]);
-    if (highest < differ && highest < (highest ^ differ)) highest = differ, axis = n;
-  }
-  return a[axis] < b[axis];
+void sortCorners(std::vector<int3>& corners) {
+  if (!std::is_sorted(corners.begin(), corners.end(), MortonOrder()))
+    std::sort(corners.begin(), corners.end(), MortonOrder());
 }
 
 } // namespace
@@ -36,11 +29,6 @@ GridSummary joinSummaries(GridSummary a, GridSummary const& b) {
   a.shallowest = std::min(a.shallowest, b.shallowest);
   a.activeVoxels += b.activeVoxels;
   a.activeTiles += b.activeTiles;
-  if (b.hasRange) {
-    a.minimum = a.hasRange ? std::min(a.minimum, b.minimum) : b.minimum;
-    a.maximum = a.hasRange ? std::max(a.maximum, b.maximum) : b.maximum;
-    a.hasRange = true;
-  }
   return a;
 }
 
@@ -83,8 +71,8 @@ int rootDepth(std::vector<GridSummary> const& grids) {
 int cheapestRootDepth(std::vector<int3> leaves, std::vector<int3> tiles, int deepest) {
   // A few tiles more or less are not worth the search.
   if (deepest == kMaxDepth || tiles.size() < leaves.size() / 8) return deepest;
-  std::sort(leaves.begin(), leaves.end(), mortonLess);
-  std::sort(tiles.begin(), tiles.end(), mortonLess);
+  sortCorners(leaves);
+  sortCorners(tiles);
   auto const raise = [](std::vector<int3>& corners, int depth) { // stays sorted
     for (int3& c : corners)
       c = {VdbTraits::align(c.x, depth), VdbTraits::align(c.y, depth), VdbTraits::align(c.z, depth)};
@@ -98,7 +86,7 @@ int cheapestRootDepth(std::vector<int3> leaves, std::vector<int3> tiles, int dee
     raise(tiles, depth);
     roots.clear();
     std::set_union(leaves.begin(), leaves.end(), tiles.begin(), tiles.end(), std::back_inserter(roots),
-                   mortonLess);
+                   MortonOrder());
     if (below + roots.size() < least) least = below + roots.size(), best = depth;
     below += leaves.size();
     if (below >= least) break;
@@ -106,17 +94,34 @@ int cheapestRootDepth(std::vector<int3> leaves, std::vector<int3> tiles, int dee
   return best;
 }
 
+void joinSorted(std::vector<int3>& corners, std::size_t known, std::vector<int3> others) {
+  auto const begin = corners.begin(), middle = begin + static_cast<std::ptrdiff_t>(known);
+  std::inplace_merge(begin, middle, corners.end(), MortonOrder());
+  if (others.empty()) return;
+  sortCorners(others);
+  auto const count = static_cast<std::ptrdiff_t>(corners.size());
+  corners.insert(corners.end(), others.begin(), others.end());
+  std::inplace_merge(corners.begin(), corners.begin() + count, corners.end(), MortonOrder());
+}
+
 void completeCorners(TileCorners& corners, int rootDepth) {
   auto at = [&](int depth) -> std::vector<int3>& { return corners[static_cast<std::size_t>(depth)]; };
   // From the bottom up, each tile brings its parent.
+  std::vector<int3> parents, all;
   for (int depth = kMaxDepth; depth >= rootDepth; --depth) {
-    std::sort(at(depth).begin(), at(depth).end(), mortonLess);
+    sortCorners(at(depth));
+    if (!parents.empty()) {
+      all.clear();
+      std::set_union(at(depth).begin(), at(depth).end(), parents.begin(), parents.end(),
+                     std::back_inserter(all), MortonOrder());
+      at(depth).swap(all);
+    }
     at(depth).erase(std::unique(at(depth).begin(), at(depth).end()), at(depth).end());
-    if (depth == rootDepth) break;
+    parents.clear();
     for (int3 const& c : at(depth)) {
       int3 const parent{VdbTraits::align(c.x, depth - 1), VdbTraits::align(c.y, depth - 1),
                         VdbTraits::align(c.z, depth - 1)};
-      if (at(depth - 1).empty() || at(depth - 1).back() != parent) at(depth - 1).push_back(parent);
+      if (parents.empty() || parents.back() != parent) parents.push_back(parent);
     }
   }
 }

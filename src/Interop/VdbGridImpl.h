@@ -112,6 +112,26 @@ int rootDepth(std::vector<GridSummary> const& grids);
 /// wide tiles, shallow ones stand above more ancestors.
 int cheapestRootDepth(std::vector<Velorn::Math::int3> leaves, std::vector<Velorn::Math::int3> tiles,
                       int deepest);
+/// Whether a comes before b along the Z-shaped curve: the axis whose coordinates differ in the highest bit
+/// decides.
+inline bool mortonLess(Velorn::Math::int3 const& a, Velorn::Math::int3 const& b) {
+  std::uint32_t highest = 0;
+  int axis = 0;
+  for (int n = 0; n < 3; ++n) {
+    auto const differ = static_cast<std::uint32_t>(a[n]) ^ static_cast<std::uint32_t>(b[n]);
+    if (highest < differ && highest < (highest ^ differ)) highest = differ, axis = n;
+  }
+  return a[axis] < b[axis];
+}
+/// For algorithms, which do not see through a pointer to a function.
+struct MortonOrder {
+  bool operator()(Velorn::Math::int3 const& a, Velorn::Math::int3 const& b) const { return mortonLess(a, b); }
+};
+/// Brings into order along that curve: corners whose first `known` and whose others are each so, and more.
+void joinSorted(std::vector<Velorn::Math::int3>& corners, std::size_t known,
+                std::vector<Velorn::Math::int3> others);
+/// Joins extents and counts; neither has a range yet.
+GridSummary joinSummaries(GridSummary a, GridSummary const& b);
 /// Adds each tile's parents down from `rootDepth`, sorts each depth along the Z-shaped curve and drops
 /// duplicates.
 void completeCorners(TileCorners& corners, int rootDepth);

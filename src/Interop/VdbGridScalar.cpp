@@ -1,4 +1,5 @@
 #include "GeometryVolume/core/ElementTypes.h"
+#include "Interop/VdbGridBuilderImpl.h"
 #include "Interop/VdbGridTypedImpl.h"
 
 namespace VLN::Interop {

@@ -1,7 +1,10 @@
 // Flat files: written whole, used in place, and no damage goes unseen.
+#include "Interop/ChannelValues.h"
 #include "Interop/FileError.h"
 #include "Interop/NvttRead.h"
 #include "Interop/NvttWrite.h"
+#include "Interop/Slice.h"
+#include "Interop/VolumeFile.h"
 #include "support/FlatVolume.h"
 #include "support/TempFolder.h"
 
@@ -74,6 +77,53 @@ TEST(Hash64, RequirementKnownValues) {
   EXPECT_EQ(hash("a"), 0xD24EC4F1A98C6E5Bu);
   EXPECT_EQ(hash("abc"), 0x44BC2CF5AD770999u);
   EXPECT_EQ(hash("Nobody inspects the spammish repetition"), 0xFBCEA83C8A378BF1u);
+}
+
+/// A buffer with one channel, as a volume again.
+template <class T> VdbVolume volumeOf(T const& defaultValue) {
+  FlatVolume volume;
+  for (int n = 0; n < 8; ++n) volume.add({n % 2 * 4, n / 2 % 2 * 4, n / 4 * 4}, 26, 28);
+  volume.finish();
+  std::mt19937 random(7);
+  volume.channel<T>("c", defaultValue, [&](auto const&, int) { return Support::flatValue<T>(random); });
+  Support::FlatOptions options;
+  options.rootLevelLimit = 2;
+  auto const handle = Support::flatten<>(*volume.object, options);
+  TempFolder const folder;
+  std::string const path = folder / "c.nvtt";
+  writeNvtt(path, {handle.data(), handle.size(), nullptr, 0, nullptr, 0});
+  auto content = importVolumes(path);
+  EXPECT_EQ(content.volumes.size(), 1u);
+  return std::move(content.volumes.at(0));
+}
+
+// requirement: whatever type a file brings, its values are printed and drawn
+template <class T> void expectShown(T const& defaultValue, int components) {
+  VdbVolume const volume = volumeOf<T>(defaultValue);
+  auto const values = ChannelValues::of(volume, "c");
+  ASSERT_TRUE(values);
+  EXPECT_EQ(values->components(), components);
+  double v[kMostComponents] = {};
+  values->at({1, 2, 3}, v);
+  EXPECT_FALSE(values->text({1, 2, 3}).empty());
+  EXPECT_NO_THROW(drawSlice(volume, "c"));
+}
+
+TEST(Nvtt, RegressionEveryTypeIsShown) {
+#if VLN_HAS_ELEMENT_INT16
+  expectShown<short>(3, 1);
+#endif
+#if VLN_HAS_ELEMENT_UINT32
+  expectShown<unsigned>(3, 1);
+#endif
+#if VLN_HAS_ELEMENT_FLOAT4
+  expectShown<Velorn::Math::float4>({1, 2, 3, 4}, 4);
+  double const v[] = {1, 2, 2, 4};
+  EXPECT_DOUBLE_EQ(lengthOf(v, 4), 5);
+  EXPECT_DOUBLE_EQ(lengthOf(v, 3), 3);
+#endif
+  expectShown<Velorn::Math::float3>({1, 2, 3}, 3);
+  expectShown<int>(3, 1);
 }
 
 TEST(Nvtt, RequirementWhatIsWrittenIsReadInPlace) {

@@ -52,16 +52,9 @@ void ContainerLayout::planHalos() {
     m_halo = Halo::kSome;
     m_halosBefore.assign(std::size_t(tileCount()) + 1, 0);
     for (int d = m_rootDepth; d <= m_maxDepth; ++d) {
-      VLN::parallelFor(0, m_tree.tileCount(d),
-                       [&](std::int64_t begin, std::int64_t end) {
-                         auto const accessor = m_tree.tileAccessor();
-                         for (std::int64_t n = begin; n < end; ++n) {
-                           TileType const& tile = m_tree.tile(n, d);
-                           if (tile.valid() && !inBlock(d, n))
-                             m_halosBefore[number(d, n) + 1] = wantsHalo(tile, accessor);
-                         }
-                       },
-                       {.grain = 256});
+      forEachTileWithAccessor(m_tree, d, [&](TileType const& tile, std::int64_t n, auto const& accessor) {
+        if (!inBlock(d, n)) m_halosBefore[number(d, n) + 1] = wantsHalo(tile, accessor);
+      });
     }
     for (std::size_t n = 1; n < m_halosBefore.size(); ++n) m_halosBefore[n] += m_halosBefore[n - 1];
   }

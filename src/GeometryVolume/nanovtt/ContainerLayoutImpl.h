@@ -51,7 +51,6 @@ public:
   std::uint64_t size() const { return m_size; }
   std::uint32_t tileCount() const { return m_tileCountAccum[kTileCountAccumEntries - 1]; }
   std::uint64_t haloTileCount() const { return m_haloTiles; }
-  std::uint64_t plainTileCount() const { return m_plainTiles; }
   /// Whether some numbers belong to dead tiles, which nobody writes.
   bool hasDeadTiles() const { return m_deadTiles > 0; }
 

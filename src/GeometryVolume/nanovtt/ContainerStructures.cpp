@@ -29,23 +29,15 @@ void ContainerLayout::makeNeighbors(BufferMaker const& makeBuffer) const {
   std::uint8_t* const bytes = makeBuffer(BufferRole::kNeighbors, size);
   fillZeros(bytes, size);
   for (int d = m_rootDepth; d <= m_maxDepth; ++d) {
-    VLN::parallelFor(0, m_tree.tileCount(d),
-                     [&](std::int64_t begin, std::int64_t end) {
-                       auto const accessor = m_tree.tileAccessor();
-                       for (std::int64_t n = begin; n < end; ++n) {
-                         TileType const& tile = m_tree.tile(n, d);
-                         if (!tile.valid()) continue;
-                         std::uint8_t* const row = bytes + number(d, n) * kNeighborRowBytes;
-                         for (int direction = 0; direction < VLN::TileTree3D::kNeighborCount; ++direction) {
-                           TileType const& there = accessor.tileNeighbor(
-                               tile, static_cast<VLN::TileTree3D::NeighborDirection>(direction));
-                           bool const numbered = there.valid() && there.depth() >= m_rootDepth;
-                           store<std::uint32_t>(row + 4 * direction,
-                                                numbered ? number(there.depth(), there.index()) : kNoTile);
-                         }
-                       }
-                     },
-                     {.grain = 256});
+    forEachTileWithAccessor(m_tree, d, [&](TileType const& tile, std::int64_t n, auto const& accessor) {
+      std::uint8_t* const row = bytes + number(d, n) * kNeighborRowBytes;
+      for (int direction = 0; direction < VLN::TileTree3D::kNeighborCount; ++direction) {
+        TileType const& there =
+            accessor.tileNeighbor(tile, static_cast<VLN::TileTree3D::NeighborDirection>(direction));
+        bool const numbered = there.valid() && there.depth() >= m_rootDepth;
+        store<std::uint32_t>(row + 4 * direction, numbered ? number(there.depth(), there.index()) : kNoTile);
+      }
+    });
   }
 }
 

@@ -115,4 +115,17 @@ template <class Body> void forEachTile(Tree const& tree, int depth, Body const& 
                    {.grain = 1024});
 }
 
+/// The same with an accessor for each thread: `body(tile, index, accessor)`.
+template <class Body> void forEachTileWithAccessor(Tree const& tree, int depth, Body const& body) {
+  VLN::parallelFor(0, tree.tileCount(depth),
+                   [&](std::int64_t begin, std::int64_t end) {
+                     auto const accessor = tree.tileAccessor();
+                     for (std::int64_t n = begin; n < end; ++n) {
+                       TileType const& tile = tree.tile(n, depth);
+                       if (tile.valid()) body(tile, n, accessor);
+                     }
+                   },
+                   {.grain = 256});
+}
+
 } // namespace nanovtt::Internal
