@@ -20,7 +20,8 @@ namespace {
 enum Order { kInOrder, kAtRandom };
 enum Start { kNew, kAgain };
 
-/// A cube of voxels: k fastest, which is OpenVDB's own order, i fastest, which is this library's, or shuffled.
+/// A cube of voxels: k fastest, which is OpenVDB's own order, i fastest, which is this library's, or
+/// shuffled.
 constexpr int kWidth = 160;
 
 struct Case {
@@ -83,7 +84,9 @@ void BM_VdbSetValue(benchmark::State& state) {
   }
   report(state, c.positions.size());
 }
-BENCHMARK(BM_VdbSetValue)->ArgsProduct({{kInOrder, kAtRandom}, {kNew, kAgain}})->Unit(benchmark::kMillisecond);
+BENCHMARK(BM_VdbSetValue)
+    ->ArgsProduct({{kInOrder, kAtRandom}, {kNew, kAgain}})
+    ->Unit(benchmark::kMillisecond);
 
 void BM_FieldSet(benchmark::State& state) {
   auto const start = static_cast<Start>(state.range(1));

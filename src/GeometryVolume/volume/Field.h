@@ -27,9 +27,7 @@ template <class T> struct Stencil {
   T values[kWidth * kWidth * kWidth];
 
   T const& value(int i, int j, int k) const { return values[index(i, j, k)]; }
-  static constexpr int index(int i, int j, int k) {
-    return i + 1 + kWidth * (j + 1 + kWidth * (k + 1));
-  }
+  static constexpr int index(int i, int j, int k) { return i + 1 + kWidth * (j + 1 + kWidth * (k + 1)); }
 };
 
 /// The 64 elements of a tile of the deepest depth.
@@ -107,11 +105,11 @@ public:
   /// @edges The background where there is no tile, and for positions that are no numbers.
   /// @cost A sampler is made when the field has changed since the last call: write first, then sample. See
   /// VoxelSamplerLinear for the rest.
-  float sample(float3 const& position, SamplerSpace space = kSamplerWorldSpace) const
-      requires std::is_same_v<T, float>;
+  float sample(float3 const& position,
+               SamplerSpace space = kSamplerWorldSpace) const requires std::is_same_v<T, float>;
   /// In world space, whatever the position is given in.
-  float3 gradient(float3 const& position, SamplerSpace space = kSamplerWorldSpace) const
-      requires std::is_same_v<T, float>;
+  float3 gradient(float3 const& position,
+                  SamplerSpace space = kSamplerWorldSpace) const requires std::is_same_v<T, float>;
 
   // The parts
   /// The channel, in step with the tree.

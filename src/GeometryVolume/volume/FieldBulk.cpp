@@ -1,6 +1,6 @@
 // Writing many elements: which lie in which block, and which tiles are missing.
-#include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/volume/FieldBulk.h"
+#include "GeometryVolume/core/Parallel.h"
 
 #include <algorithm>
 #include <stdexcept>
@@ -83,7 +83,15 @@ BulkRuns planBulk(VolumeData& volume, FieldSlot& slot, std::span<int3 const> pos
       for (int3 const& p : chunk.missing) finest.append(p);
     volume.makeTiles(lists);
     volume.prepareWrite(slot);
-    chunks = findRuns(slot.blocks, positions);
+    // Blocks that were there have their new tiles; the others are looked up again.
+    parallelFor(0, static_cast<std::int64_t>(chunks.size()), [&](std::int64_t begin, std::int64_t end) {
+      for (auto c = begin; c < end; ++c)
+        for (BulkRun& run : chunks[static_cast<std::size_t>(c)].runs) {
+          if (run.block != FieldBlocks::noBlock()) continue;
+          int3 const& p = positions[static_cast<std::size_t>(run.begin)];
+          run.block = slot.blocks.find(p.x, p.y, p.z);
+        }
+    });
   }
   BulkRuns out;
   if (parallelThreads() == 1) {

@@ -15,8 +15,8 @@ struct BulkRun {
   std::int64_t begin, count;
 };
 
-/// Runs by bucket. Those of one block are in one bucket, in the order of the positions: who writes the buckets
-/// in parallel, each in its order, writes what comes last last.
+/// Runs by bucket. Those of one block are in one bucket, in the order of the positions: who writes the
+/// buckets in parallel, each in its order, writes what comes last last.
 struct BulkRuns {
   static constexpr std::size_t kBuckets = 256;
   std::vector<BulkRun> runs;

@@ -31,14 +31,13 @@ template <class T> struct TypedSlot final : FieldSlot {
   explicit TypedSlot(Ostil::Ptr<ChannelType> channel)
       : m_channel(std::move(channel)) {
     name = m_channel->name();
-    for (std::size_t d = 0; d < m_filled.size(); ++d) m_filled[d] = static_cast<std::int64_t>(tiles()[d].size());
+    for (std::size_t d = 0; d < m_filled.size(); ++d)
+      m_filled[d] = static_cast<std::int64_t>(tiles()[d].size());
   }
 
   Ostil::Ptr<ChannelBase> channel() const override { return m_channel; }
   char const* typeName() const override { return elementTypeName<T>(); }
-  std::unique_ptr<FieldSlot> share() const override {
-    return std::make_unique<TypedSlot>(m_channel);
-  }
+  std::unique_ptr<FieldSlot> share() const override { return std::make_unique<TypedSlot>(m_channel); }
 
   void detach(VolumeData& volume) override {
     if (exclusive.load(std::memory_order_relaxed)) return;
@@ -53,24 +52,24 @@ template <class T> struct TypedSlot final : FieldSlot {
     volume.epoch.fetch_add(1, std::memory_order_relaxed);
   }
 
-  void follow(VolumeData& volume) override {
+  void follow(VolumeData& volume, int firstDepth) override {
     VolumeTree const& tree = *volume.tree;
     std::int64_t added = 0;
     auto const missing = [&](int d) {
       return tree.tileCount(d) - static_cast<std::int64_t>(tiles()[static_cast<std::size_t>(d)].size());
     };
-    for (int d = 0; d <= kFinest; ++d) added += std::max<std::int64_t>(0, missing(d));
+    for (int d = firstDepth; d <= kFinest; ++d) added += std::max<std::int64_t>(0, missing(d));
     if (added > 0) {
       detach(volume);
       if (added > kFewTiles) {
         volume.updateTopology();
         m_channel->update(*volume.topology);
       } else {
-        for (int d = 0; d <= kFinest; ++d)
+        for (int d = firstDepth; d <= kFinest; ++d)
           if (std::int64_t const n = missing(d); n > 0) m_channel->appendTiles(d, n);
       }
     }
-    for (int d = 0; d <= kFinest; ++d) fillNew(tree, d);
+    for (int d = firstDepth; d <= kFinest; ++d) fillNew(tree, d);
     enterBlocks(tree);
     version.store(volume.version, std::memory_order_release);
   }
@@ -95,7 +94,8 @@ template <class T> struct TypedSlot final : FieldSlot {
     std::string const haloName = name + "_halo";
     if (!volume.rest.component<HaloChannelType>(haloName))
       Command::createChannel<T, 2, 4, 4, 0, 1>(haloName, *volume.topology, volume.rest,
-                                               m_channel->defaultValue(), kInitializeDefaultValue, 0, kFinest);
+                                               m_channel->defaultValue(), kInitializeDefaultValue, 0,
+                                               kFinest);
     auto halo = volume.rest.extractComponent<HaloChannelType>(haloName);
     computeHalo<VolumeShape, T, 0, 0, 0, 1>(*m_channel, *volume.tree, *halo, -1, -1);
     volume.rest.putComponent(std::move(halo));
@@ -298,8 +298,8 @@ float Field<T>::sample(float3 const& position, SamplerSpace space) const require
 }
 
 template <class T>
-float3 Field<T>::gradient(float3 const& position, SamplerSpace space) const
-    requires std::is_same_v<T, float> {
+float3 Field<T>::gradient(float3 const& position,
+                          SamplerSpace space) const requires std::is_same_v<T, float> {
   float3 out;
   static_cast<FloatVoxelSamplerLinear<Internal::VolumeShape> const*>(sampler())->sampleGradient(position,
                                                                                                 space, &out);
@@ -361,13 +361,14 @@ template <class T> void Field<T>::gather(std::int64_t n, Stencil<T>& out) const 
             T* const row = out.values + Stencil<T>::index(to(di), to(dj) + j, to(dk) + k);
             int const fj = first(dj) + j, fk = first(dk) + k;
             for (int i = 0; i < width(di); ++i)
-              row[i] = from ? from[first(di) + i + 4 * (fj + 4 * fk)]
-                            : coarse(x + first(di) + i, y + fj, z + fk);
+              row[i] =
+                  from ? from[first(di) + i + 4 * (fj + 4 * fk)] : coarse(x + first(di) + i, y + fj, z + fk);
           }
       }
 }
 
-template <class T> Field<T> Volume::addField(std::string const& name, std::type_identity_t<T> const& background) {
+template <class T>
+Field<T> Volume::addField(std::string const& name, std::type_identity_t<T> const& background) {
   using namespace Internal;
   checkNewName(name);
   m_data->sync();

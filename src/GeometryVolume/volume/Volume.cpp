@@ -68,8 +68,7 @@ Volume::Volume(VLN::Object const& object)
   m_data->rest.eraseProperty(m_data->tree->name());
   m_data->rest.eraseProperty(m_data->topology->name());
   for (auto const& name : names) {
-    auto slot =
-        makeSlot(object.component<ChannelBase>(name), *m_data->tree, m_data->topology->name());
+    auto slot = makeSlot(object.component<ChannelBase>(name), *m_data->tree, m_data->topology->name());
     if (!slot) continue;
     m_data->slots.push_back(std::move(slot));
     m_data->rest.eraseProperty(name);
@@ -170,8 +169,7 @@ void Volume::refineWhere(int3 const& low, int3 const& high, FunctionRef<bool(Til
           std::vector<int3> accepted;
           for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n)
             for (int slot = 0; slot < Shape::kTileSize; ++slot) {
-              int3 const corner =
-                  frontier[n] + int3{slot & 1, slot >> 1 & 1, slot >> 2} * width;
+              int3 const corner = frontier[n] + int3{slot & 1, slot >> 1 & 1, slot >> 2} * width;
               if (meets(corner, width) && predicate({corner, width, d})) accepted.push_back(corner);
             }
           return accepted;

@@ -27,8 +27,8 @@ struct TileBox {
 
 /// Tiles of 4 x 4 x 4 samples, which lie on the low corners of their voxels.
 ///
-/// What changes the tree, a field's set() foremost, leaves the other parts behind for a moment; each call here
-/// and in Field brings into step what it shows. Copies share everything until one of them is written.
+/// What changes the tree, a field's set() foremost, leaves the other parts behind for a moment; each call
+/// here and in Field brings into step what it shows. Copies share everything until one of them is written.
 /// @threads Const calls may run at once. All others need the volume, and its fields, for themselves.
 class VLN_API Volume {
 public:
@@ -86,8 +86,8 @@ public:
   void fillHalos();
 
   // Points in this tree
-  /// Puts points into the tiles that hold them, makes those that are missing, and gives them the name of their
-  /// topology. Positions are the channel `name`_positions of object().
+  /// Puts points into the tiles that hold them, makes those that are missing, and gives them the name of
+  /// their topology. Positions are the channel `name`_positions of object().
   /// @space World space.
   /// @return How many lie in the domain: the others are left out.
   std::int64_t addPoints(std::string const& name, std::span<float3 const> positions);

@@ -70,14 +70,14 @@ void VolumeData::sync() {
   std::lock_guard const lock(mutex);
   updateTopology();
   for (auto& slot : slots)
-    if (slot->version.load(std::memory_order_relaxed) != version) slot->follow(*this);
+    if (slot->version.load(std::memory_order_relaxed) != version) slot->follow(*this, 0);
   updateRest(nullptr);
   syncedVersion.store(version, std::memory_order_release);
 }
 
 void VolumeData::follow(FieldSlot& slot) {
   std::lock_guard const lock(mutex);
-  if (slot.version.load(std::memory_order_relaxed) != version) slot.follow(*this);
+  if (slot.version.load(std::memory_order_relaxed) != version) slot.follow(*this, 0);
 }
 
 void VolumeData::prepareWrite(FieldSlot& slot) {
@@ -108,17 +108,17 @@ void VolumeData::makeTile(FieldSlot& slot, int i, int j, int k) {
     throw std::out_of_range("(" + std::to_string(i) + ", " + std::to_string(j) + ", " + std::to_string(k) +
                             ") lies outside the domain of a volume");
   prepareWrite(slot);
-  VolumeTree& edited = editTree();
+  editTree();
   constexpr int kFinest = VolumeShape::kMaxDepth;
   TreeIndex const above = m_accessor.treeIndex(i, j, k, kFinest, false);
   if (above.depth == kFinest) return;
   // Fields that share elements with another volume will leave them when they follow.
   if (slots.size() > 1) epoch.fetch_add(1, std::memory_order_relaxed);
   ++version;
-  if (!above.valid()) m_accessor.addTile(i, j, k, rootDepth());
+  int const first = above.valid() ? above.depth + 1 : rootDepth();
+  if (!above.valid()) m_accessor.addTile(i, j, k, first);
   m_accessor.addTile(i, j, k, kFinest);
-  (void)edited;
-  slot.follow(*this);
+  slot.follow(*this, first);
 }
 
 void VolumeData::growTree(FunctionRef<void(VolumeTree&)> change) {
@@ -142,8 +142,7 @@ void VolumeData::makeTiles(VolumeTree::TileLists& lists) {
         if (!any || corner != last) roots.append(corner);
         any = true, last = corner;
       }
-    m_accessor.addTiles(lists);
-    (void)edited;
+    edited.tileAccessor().addTiles(lists);
   });
 }
 

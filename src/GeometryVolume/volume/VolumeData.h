@@ -38,7 +38,8 @@ struct VLN_API FieldSlot {
   virtual std::unique_ptr<FieldSlot> share() const = 0;
   /// Takes in the tiles that are new in the tree, with the values that were read there before, and completes
   /// `blocks`. The caller holds the lock or is the only user of the volume.
-  virtual void follow(VolumeData& volume) = 0;
+  /// @param firstDepth Above it no tile is new to the field.
+  virtual void follow(VolumeData& volume, int firstDepth) = 0;
   /// Makes the channel and its elements the volume's alone.
   virtual void detach(VolumeData& volume) = 0;
   virtual void tilesRemoved(VolumeData& volume, TileRemovalList const& moves) = 0;
