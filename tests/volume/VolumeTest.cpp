@@ -205,7 +205,7 @@ TEST(VolumeTest, RequirementStencilsSeeNeighborsAcrossTilesAndBeyondThem) {
              static_cast<int>(random() % 24) - 12, static_cast<int>(random() % 1000));
   forEachSample(from, to, [](Neighbors<int> const& n) {
     int sum = 0;
-    for (int c = 0; c < 27; ++c) sum = sum * 3 + n(c % 3 - 1, c / 3 % 3 - 1, c / 9 - 1);
+    for (int c = 0; c < 27; ++c) sum += (c * c + 1) * n(c % 3 - 1, c / 3 % 3 - 1, c / 9 - 1);
     return sum;
   });
   std::int64_t checked = 0;
@@ -215,7 +215,7 @@ TEST(VolumeTest, RequirementStencilsSeeNeighborsAcrossTilesAndBeyondThem) {
       int3 const p{corner.x + e % 4, corner.y + e / 4 % 4, corner.z + e / 16};
       int sum = 0;
       for (int c = 0; c < 27; ++c)
-        sum = sum * 3 + from.get(p.x + c % 3 - 1, p.y + c / 3 % 3 - 1, p.z + c / 9 - 1);
+        sum += (c * c + 1) * from.get(p.x + c % 3 - 1, p.y + c / 3 % 3 - 1, p.z + c / 9 - 1);
       ASSERT_EQ(to.get(p), sum) << p;
     }
   }

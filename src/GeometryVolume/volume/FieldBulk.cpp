@@ -3,25 +3,31 @@
 #include "GeometryVolume/core/Parallel.h"
 
 #include <algorithm>
-#include <stdexcept>
-#include <string>
 
 namespace VLN::TileTree3D::Internal {
 
 namespace {
 
-/// The runs of a chunk of positions, and the tiles that they lack, each once.
+/// What a chunk of positions lacks, each tile once.
 struct Chunk {
-  std::vector<BulkRun> runs;
   std::vector<int3> missing;
   std::int64_t outside = -1;
 };
 
+/// Which share writes a block: neighbours in space go to different ones.
+std::size_t shareOf(int3 const& at, std::size_t shares) {
+  auto const x = static_cast<std::uint32_t>(at.x) >> 3, y = static_cast<std::uint32_t>(at.y) >> 3,
+             z = static_cast<std::uint32_t>(at.z) >> 3;
+  return (x + 3 * y + 5 * z) % shares;
+}
+
 /// A first pass over an empty volume finds the tiles of each row again and again: what a chunk has listed it
 /// need not list once more, and large chunks list less.
+/// @param lists One for each share.
 Chunk findRuns(FieldBlocks const& blocks, std::span<int3 const> positions, std::int64_t begin,
-               std::int64_t end) {
+               std::int64_t end, std::size_t shares, std::vector<BulkRun>* lists) {
   Chunk out;
+  BulkRun* run = nullptr;
   FieldBlocks listed;
   FieldBlock* block = nullptr;
   FieldBlock* listedBlock = nullptr;
@@ -37,9 +43,11 @@ Chunk findRuns(FieldBlocks const& blocks, std::span<int3 const> positions, std::
       at = {p.x & ~7, p.y & ~7, p.z & ~7};
       block = blocks.find(p.x, p.y, p.z);
       listedBlock = nullptr;
-      out.runs.push_back({block, n, 0});
+      auto& list = lists[shareOf(at, shares)];
+      list.push_back({block, n, 0});
+      run = &list.back();
     }
-    ++out.runs.back().count;
+    ++run->count;
     std::size_t const slot = FieldBlock::slot(p.x, p.y, p.z);
     if (block->tiles[slot]) continue;
     if (!listedBlock) listedBlock = listed.find(p.x, p.y, p.z);
@@ -51,76 +59,40 @@ Chunk findRuns(FieldBlocks const& blocks, std::span<int3 const> positions, std::
   return out;
 }
 
-std::vector<Chunk> findRuns(FieldBlocks const& blocks, std::span<int3 const> positions) {
-  auto const n = static_cast<std::int64_t>(positions.size());
-  std::int64_t const grain = std::clamp<std::int64_t>(n / 16, 16384, 1 << 20);
-  std::vector<Chunk> chunks(static_cast<std::size_t>(chunkCount(0, n, grain)));
-  parallelChunks(0, n, grain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-    chunks[static_cast<std::size_t>(chunk)] = findRuns(blocks, positions, begin, end);
-  });
-  for (Chunk const& chunk : chunks) {
-    if (chunk.outside < 0) continue;
-    int3 const& p = positions[static_cast<std::size_t>(chunk.outside)];
-    throw std::out_of_range("(" + std::to_string(p.x) + ", " + std::to_string(p.y) + ", " +
-                            std::to_string(p.z) + ") lies outside the domain of a volume");
-  }
-  return chunks;
-}
-
-std::size_t bucketOf(FieldBlock const* block) {
-  return (reinterpret_cast<std::uintptr_t>(block) >> 6) * 0x9e3779b97f4a7c15ull >> 56;
-}
-
 } // namespace
 
 BulkRuns planBulk(VolumeData& volume, FieldSlot& slot, std::span<int3 const> positions) {
   volume.prepareWrite(slot);
-  auto chunks = findRuns(slot.blocks, positions);
-  if (std::any_of(chunks.begin(), chunks.end(), [](Chunk const& c) { return !c.missing.empty(); })) {
-    VolumeTree::TileLists lists;
-    auto& finest = lists[static_cast<std::size_t>(VolumeShape::kMaxDepth)];
-    for (Chunk const& chunk : chunks)
-      for (int3 const& p : chunk.missing) finest.append(p);
-    volume.makeTiles(lists);
-    volume.prepareWrite(slot);
-    // Blocks that were there have their new tiles; the others are looked up again.
-    parallelFor(0, static_cast<std::int64_t>(chunks.size()), [&](std::int64_t begin, std::int64_t end) {
-      for (auto c = begin; c < end; ++c)
-        for (BulkRun& run : chunks[static_cast<std::size_t>(c)].runs) {
-          if (run.block != FieldBlocks::noBlock()) continue;
-          int3 const& p = positions[static_cast<std::size_t>(run.begin)];
-          run.block = slot.blocks.find(p.x, p.y, p.z);
-        }
-    });
-  }
+  auto const n = static_cast<std::int64_t>(positions.size());
+  std::int64_t const grain = std::clamp<std::int64_t>(n / 16, 16384, 1 << 20);
+  std::vector<Chunk> chunks(static_cast<std::size_t>(chunkCount(0, n, grain)));
   BulkRuns out;
-  if (parallelThreads() == 1) {
-    out.ends.assign(1, 0);
-    for (Chunk const& chunk : chunks) out.runs.insert(out.runs.end(), chunk.runs.begin(), chunk.runs.end());
-    out.ends[0] = out.runs.size();
-    return out;
-  }
-  // A stable sort by bucket.
-  using Counts = std::array<std::size_t, BulkRuns::kBuckets>;
-  std::vector<Counts> starts(chunks.size());
-  auto const forEachChunk = [&](FunctionRef<void(Chunk const&, Counts&)> body) {
-    parallelFor(0, static_cast<std::int64_t>(chunks.size()), [&](std::int64_t begin, std::int64_t end) {
-      for (auto c = static_cast<std::size_t>(begin); c < static_cast<std::size_t>(end); ++c)
-        body(chunks[c], starts[c]);
-    });
-  };
-  forEachChunk([](Chunk const& chunk, Counts& counts) {
-    counts.fill(0);
-    for (BulkRun const& run : chunk.runs) ++counts[bucketOf(run.block)];
+  out.shares = static_cast<std::size_t>(parallelThreads());
+  out.lists.resize(chunks.size() * out.shares);
+  parallelChunks(0, n, grain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+    auto const c = static_cast<std::size_t>(chunk);
+    chunks[c] = findRuns(slot.blocks, positions, begin, end, out.shares, &out.lists[c * out.shares]);
   });
-  std::size_t sum = 0;
-  for (std::size_t b = 0; b < BulkRuns::kBuckets; ++b) {
-    for (Counts& counts : starts) sum += std::exchange(counts[b], sum);
-    out.ends.push_back(sum);
+  bool missing = false;
+  for (Chunk const& chunk : chunks) {
+    if (chunk.outside >= 0) throwOutside(positions[static_cast<std::size_t>(chunk.outside)]);
+    missing = missing || !chunk.missing.empty();
   }
-  out.runs.resize(sum);
-  forEachChunk([&](Chunk const& chunk, Counts& next) {
-    for (BulkRun const& run : chunk.runs) out.runs[next[bucketOf(run.block)]++] = run;
+  if (!missing) return out;
+  VolumeTree::TileLists lists;
+  auto& finest = lists[static_cast<std::size_t>(VolumeShape::kMaxDepth)];
+  for (Chunk const& chunk : chunks)
+    for (int3 const& p : chunk.missing) finest.append(p);
+  volume.makeTiles(lists);
+  volume.prepareWrite(slot);
+  // Blocks that were there have their new tiles; the others are looked up again.
+  parallelFor(0, static_cast<std::int64_t>(out.lists.size()), [&](std::int64_t begin, std::int64_t end) {
+    for (auto list = begin; list < end; ++list)
+      for (BulkRun& run : out.lists[static_cast<std::size_t>(list)]) {
+        if (run.block != FieldBlocks::noBlock()) continue;
+        int3 const& p = positions[static_cast<std::size_t>(run.begin)];
+        run.block = slot.blocks.find(p.x, p.y, p.z);
+      }
   });
   return out;
 }

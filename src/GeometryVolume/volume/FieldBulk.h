@@ -15,12 +15,12 @@ struct BulkRun {
   std::int64_t begin, count;
 };
 
-/// Runs by bucket. Those of one block are in one bucket, in the order of the positions: who writes the
-/// buckets in parallel, each in its order, writes what comes last last.
+/// Runs by share, in the order of the positions: list `c * shares + s` holds those of share `s` in a chunk of
+/// positions. A block belongs to one share. Whoever writes each share chunk by chunk writes what comes last
+/// last, whatever the number of shares.
 struct BulkRuns {
-  static constexpr std::size_t kBuckets = 256;
-  std::vector<BulkRun> runs;
-  std::vector<std::size_t> ends; ///< of each bucket; one bucket alone for one thread
+  std::size_t shares = 1;
+  std::vector<std::vector<BulkRun>> lists;
 };
 
 /// Makes the tiles that are missing, and groups the positions.

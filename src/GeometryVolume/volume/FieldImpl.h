@@ -254,9 +254,10 @@ template <class T> void Field<T>::set(std::span<int3 const> positions, std::span
       tile[FieldBlock::element(p.x, p.y, p.z)] = values[n];
     }
   };
-  parallelFor(0, static_cast<std::int64_t>(plan.ends.size()), [&](std::int64_t begin, std::int64_t end) {
-    for (auto b = static_cast<std::size_t>(begin); b < static_cast<std::size_t>(end); ++b)
-      for (std::size_t n = b ? plan.ends[b - 1] : 0; n < plan.ends[b]; ++n) write(plan.runs[n]);
+  parallelFor(0, static_cast<std::int64_t>(plan.shares), [&](std::int64_t begin, std::int64_t end) {
+    for (auto share = static_cast<std::size_t>(begin); share < static_cast<std::size_t>(end); ++share)
+      for (std::size_t list = share; list < plan.lists.size(); list += plan.shares)
+        for (BulkRun const& run : plan.lists[list]) write(run);
   });
 }
 

@@ -19,6 +19,11 @@ static_assert(VolumeShape::width(kRootDepth) == 4096);
 
 FieldSlot::~FieldSlot() = default;
 
+void throwOutside(int3 const& p) {
+  throw std::out_of_range("(" + std::to_string(p.x) + ", " + std::to_string(p.y) + ", " +
+                          std::to_string(p.z) + ") lies outside the domain of a volume");
+}
+
 void VolumeData::beginSharing() {
   std::lock_guard const lock(mutex);
   for (auto& slot : slots) slot->exclusive.store(false, std::memory_order_relaxed);
@@ -104,9 +109,7 @@ int VolumeData::rootDepth() const {
 }
 
 void VolumeData::makeTile(FieldSlot& slot, int i, int j, int k) {
-  if (!VolumeShape::inDomain(i, j, k))
-    throw std::out_of_range("(" + std::to_string(i) + ", " + std::to_string(j) + ", " + std::to_string(k) +
-                            ") lies outside the domain of a volume");
+  if (!VolumeShape::inDomain(i, j, k)) throwOutside({i, j, k});
   prepareWrite(slot);
   editTree();
   constexpr int kFinest = VolumeShape::kMaxDepth;

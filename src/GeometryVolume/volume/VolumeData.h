@@ -108,6 +108,9 @@ private:
   VolumeTree const* m_accessorTree = nullptr;
 };
 
+/// @error std::out_of_range, always.
+[[noreturn]] void throwOutside(int3 const& position);
+
 /// Makes the elements of `component` and itself the holder's alone.
 template <class T> void makeUnique(Ostil::Ptr<T>& component) {
   if (component.unique()) return;
