@@ -94,8 +94,8 @@ public:
 
   // Many elements
   /// As set() for each position in turn: of equal positions the last counts. In parallel.
-  /// @error std::invalid_argument for spans of different lengths, std::out_of_range beyond the domain; then
-  /// nothing has changed.
+  /// @error std::invalid_argument for spans of different lengths, std::out_of_range beyond the domain; no
+  /// value has changed then.
   /// @numeric The same volume for any number of threads.
   void set(std::span<int3 const> positions, std::span<T const> values);
   /// Every element of every tile, coarse ones too. Makes no tiles.

@@ -14,10 +14,11 @@ struct Chunk {
   std::int64_t outside = -1;
 };
 
-/// Which share writes a block: neighbours in space go to different ones.
+/// Which share writes a block. Shares are made of cubes of 32 samples: small enough to balance, and wide
+/// enough that positions in order are read in order.
 std::size_t shareOf(int3 const& at, std::size_t shares) {
-  auto const x = static_cast<std::uint32_t>(at.x) >> 3, y = static_cast<std::uint32_t>(at.y) >> 3,
-             z = static_cast<std::uint32_t>(at.z) >> 3;
+  auto const x = static_cast<std::uint32_t>(at.x) >> 5, y = static_cast<std::uint32_t>(at.y) >> 5,
+             z = static_cast<std::uint32_t>(at.z) >> 5;
   return (x + 3 * y + 5 * z) % shares;
 }
 
@@ -65,35 +66,44 @@ BulkRuns planBulk(VolumeData& volume, FieldSlot& slot, std::span<int3 const> pos
   volume.prepareWrite(slot);
   auto const n = static_cast<std::int64_t>(positions.size());
   std::int64_t const grain = std::clamp<std::int64_t>(n / 16, 16384, 1 << 20);
-  std::vector<Chunk> chunks(static_cast<std::size_t>(chunkCount(0, n, grain)));
+  std::int64_t const chunks = chunkCount(0, n, grain);
   BulkRuns out;
   out.shares = static_cast<std::size_t>(parallelThreads());
-  out.lists.resize(chunks.size() * out.shares);
-  parallelChunks(0, n, grain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-    auto const c = static_cast<std::size_t>(chunk);
-    chunks[c] = findRuns(slot.blocks, positions, begin, end, out.shares, &out.lists[c * out.shares]);
-  });
-  bool missing = false;
-  for (Chunk const& chunk : chunks) {
-    if (chunk.outside >= 0) throwOutside(positions[static_cast<std::size_t>(chunk.outside)]);
-    missing = missing || !chunk.missing.empty();
+  out.lists.resize(static_cast<std::size_t>(chunks) * out.shares);
+  std::vector<Chunk> found(static_cast<std::size_t>(chunks));
+  // Round by round, each as long as all before it: positions at random ask for the same tiles over and over,
+  // and those that the first rounds have made are not listed again.
+  for (std::int64_t first = 0, last = 1; first < chunks; first = last, last *= 2) {
+    last = std::min(last, chunks);
+    auto const forEachChunk = [&](FunctionRef<void(std::size_t)> body) {
+      parallelFor(first, last, [&](std::int64_t begin, std::int64_t end) {
+        for (auto c = begin; c < end; ++c) body(static_cast<std::size_t>(c));
+      });
+    };
+    forEachChunk([&](std::size_t c) {
+      std::int64_t const begin = static_cast<std::int64_t>(c) * grain;
+      found[c] = findRuns(slot.blocks, positions, begin, std::min(n, begin + grain), out.shares,
+                          &out.lists[c * out.shares]);
+    });
+    VolumeTree::TileLists lists;
+    auto& finest = lists[static_cast<std::size_t>(VolumeShape::kMaxDepth)];
+    for (auto c = static_cast<std::size_t>(first); c < static_cast<std::size_t>(last); ++c) {
+      if (found[c].outside >= 0) throwOutside(positions[static_cast<std::size_t>(found[c].outside)]);
+      for (int3 const& p : found[c].missing) finest.append(p);
+    }
+    if (finest.size() == 0) continue;
+    volume.makeTiles(lists);
+    volume.prepareWrite(slot);
+    // Blocks that were there have their new tiles; the others are looked up again.
+    forEachChunk([&](std::size_t c) {
+      for (std::size_t list = c * out.shares; list < (c + 1) * out.shares; ++list)
+        for (BulkRun& run : out.lists[list]) {
+          if (run.block != FieldBlocks::noBlock()) continue;
+          int3 const& p = positions[static_cast<std::size_t>(run.begin)];
+          run.block = slot.blocks.find(p.x, p.y, p.z);
+        }
+    });
   }
-  if (!missing) return out;
-  VolumeTree::TileLists lists;
-  auto& finest = lists[static_cast<std::size_t>(VolumeShape::kMaxDepth)];
-  for (Chunk const& chunk : chunks)
-    for (int3 const& p : chunk.missing) finest.append(p);
-  volume.makeTiles(lists);
-  volume.prepareWrite(slot);
-  // Blocks that were there have their new tiles; the others are looked up again.
-  parallelFor(0, static_cast<std::int64_t>(out.lists.size()), [&](std::int64_t begin, std::int64_t end) {
-    for (auto list = begin; list < end; ++list)
-      for (BulkRun& run : out.lists[static_cast<std::size_t>(list)]) {
-        if (run.block != FieldBlocks::noBlock()) continue;
-        int3 const& p = positions[static_cast<std::size_t>(run.begin)];
-        run.block = slot.blocks.find(p.x, p.y, p.z);
-      }
-  });
   return out;
 }
 

@@ -24,7 +24,7 @@ struct BulkRuns {
 };
 
 /// Makes the tiles that are missing, and groups the positions.
-/// @error std::out_of_range beyond the domain, before anything has changed.
+/// @error std::out_of_range beyond the domain. Tiles may have been made then, which changes no value.
 VLN_API BulkRuns planBulk(VolumeData& volume, FieldSlot& slot, std::span<int3 const> positions);
 
 } // namespace VLN::TileTree3D::Internal
