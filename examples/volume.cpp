@@ -7,7 +7,7 @@
 using namespace VLN::TileTree3D;
 
 int main() {
-  // A first volume.
+  // snippet: first
   Volume volume(0.1f); // samples lie 0.1 world units apart
   auto heat = volume.addField<float>("heat", 0);
   auto solid = volume.addField<unsigned char>("solid", 0); // a second field on the same tiles
@@ -16,10 +16,13 @@ int main() {
       for (int i = -10; i <= 10; ++i)
         if (i * i + j * j + k * k <= 100) heat.set(i, j, k, 1);
   solid.set(0, 0, 0, 1);
+  float const blended = heat.sample({0.35f, 0.4f, 0.5f}); // in world space
+  // end snippet
   std::cout << "heat " << heat.get(3, 4, 5) << " inside, " << heat.get(30, 40, 50) << " outside, "
-            << volume.tileCount() << " tiles\n";
+            << volume.tileCount() << " tiles; blended " << blended << "\n";
 
-  // Diffusion: room for the heat to spread, then ten steps of a seven-point stencil.
+  // snippet: diffusion
+  // Room for the heat to spread, then ten steps of a seven-point stencil, in parallel and across tiles.
   volume.addTiles({-24, -24, -24}, {24, 24, 24});
   auto next = volume.addField<float>("next", 0);
   for (int step = 0; step < 10; ++step) {
@@ -29,6 +32,7 @@ int main() {
     });
     std::swap(heat, next);
   }
+  // end snippet
 
   // No heat is lost: none has reached the rim.
   double sum = 0;

@@ -1,5 +1,5 @@
 // Writing many elements: which lie in which block, and which tiles are missing.
-#include "GeometryVolume/volume/FieldBulk.h"
+#include "GeometryVolume/volume/FieldBulkImpl.h"
 #include "GeometryVolume/core/Parallel.h"
 
 #include <algorithm>

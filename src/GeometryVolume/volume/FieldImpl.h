@@ -6,7 +6,7 @@
 #include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/sampling/VoxelSamplerLinear.h"
 #include "GeometryVolume/topology/Command.h"
-#include "GeometryVolume/volume/FieldBulk.h"
+#include "GeometryVolume/volume/FieldBulkImpl.h"
 #include "GeometryVolume/volume/Volume.h"
 
 #include <algorithm>
