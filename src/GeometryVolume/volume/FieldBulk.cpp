@@ -1,6 +1,6 @@
 // Writing many elements: which lie in which block, and which tiles are missing.
-#include "GeometryVolume/volume/FieldBulkImpl.h"
 #include "GeometryVolume/core/Parallel.h"
+#include "GeometryVolume/volume/FieldBulkImpl.h"
 
 #include <algorithm>
 
