@@ -114,7 +114,8 @@ public:
   // The parts
   /// The channel, in step with the tree.
   ChannelType const& channel() const;
-  /// The same, the volume's alone, to write elements. It may not be resized.
+  /// The same, the volume's alone, to write elements. It may not be resized. Ask again after sample(): writes
+  /// through an old reference are not noticed.
   ChannelType& editChannel();
   /// The channel with one layer of halo that Volume::fillHalos() filled last.
   /// @error std::logic_error before it has.

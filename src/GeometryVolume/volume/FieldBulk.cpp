@@ -32,31 +32,42 @@ Chunk findRuns(FieldBlocks const& blocks, std::span<int3 const> positions, std::
   FieldBlocks listed;
   FieldBlock* block = nullptr;
   FieldBlock* listedBlock = nullptr;
-  int3 at{0, 0, 0};
+  int3 at{0, 0, 0}, tile{0, 0, 0};
+  auto const holds = [](int3 const& corner, int width, int3 const& p) {
+    return static_cast<std::uint32_t>((p.x ^ corner.x) | (p.y ^ corner.y) | (p.z ^ corner.z)) <
+           static_cast<std::uint32_t>(width);
+  };
+  std::int64_t runBegin = begin;
+  auto const endRun = [&](std::int64_t n) {
+    if (run) run->count = n - runBegin;
+  };
   for (auto n = begin; n < end; ++n) {
     int3 const& p = positions[static_cast<std::size_t>(n)];
-    if (!block || static_cast<std::uint32_t>((p.x ^ at.x) | (p.y ^ at.y) | (p.z ^ at.z)) >=
-                      std::uint32_t(FieldBlock::kWidth)) {
+    if (run && holds(tile, 4, p)) continue;
+    if (!run || !holds(at, FieldBlock::kWidth, p)) {
       if (!VolumeShape::inDomain(p.x, p.y, p.z)) {
         out.outside = n;
         return out;
       }
+      endRun(n);
       at = {p.x & ~7, p.y & ~7, p.z & ~7};
       block = blocks.find(p.x, p.y, p.z);
       listedBlock = nullptr;
       auto& list = lists[shareOf(at, shares)];
       list.push_back({block, n, 0});
       run = &list.back();
+      runBegin = n;
     }
-    ++run->count;
+    tile = {p.x & ~3, p.y & ~3, p.z & ~3};
     std::size_t const slot = FieldBlock::slot(p.x, p.y, p.z);
     if (block->tiles[slot]) continue;
     if (!listedBlock) listedBlock = listed.find(p.x, p.y, p.z);
     if (listedBlock->tiles[slot]) continue;
     listed.insert(p, &out);
     listedBlock = listed.find(p.x, p.y, p.z);
-    out.missing.push_back({p.x & ~3, p.y & ~3, p.z & ~3});
+    out.missing.push_back(tile);
   }
+  endRun(end);
   return out;
 }
 
