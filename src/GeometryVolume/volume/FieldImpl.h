@@ -211,9 +211,10 @@ template <class T> void Field<T>::moveToWrite(int i, int j, int k) {
 }
 
 template <class T> T* Field<T>::make(int i, int j, int k) {
-  using Internal::FieldBlock;
+  using Internal::FieldBlock, Internal::FieldBlocks;
   m_volume->makeTile(*m_slot, i, j, k);
-  moveToWrite(i, j, k);
+  // A block that was there has the new tile.
+  if (m_block == FieldBlocks::noBlock() || !near(i, j, k, m_writeEpoch)) moveToWrite(i, j, k);
   void* tile = m_block->tiles[FieldBlock::slot(i, j, k)];
   if (!tile) throw std::logic_error("field \"" + m_slot->name + "\": a tile holds no elements");
   return static_cast<T*>(tile);
