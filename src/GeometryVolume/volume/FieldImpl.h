@@ -160,6 +160,7 @@ private:
     }
     blocksBuilt = true;
   }
+
   Ostil::Ptr<ChannelType> m_channel;
   TileArrays<T>* m_tiles = nullptr; ///< of the channel, while it is exclusive
   DepthCounts m_filled{};           ///< tiles that hold what they should
