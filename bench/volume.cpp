@@ -10,6 +10,7 @@
 #include <algorithm>
 #include <memory>
 #include <random>
+#include <string>
 #include <vector>
 
 using namespace VLN::TileTree3D;
@@ -56,6 +57,11 @@ std::vector<int3> const& turned() {
   return list;
 }
 
+/// What the first two arguments say.
+void label(benchmark::State& state) {
+  state.SetLabel(std::string(state.range(0) == kInOrder ? "in order, " : "at random, ") +
+                 (state.range(1) == kNew ? "new" : "again"));
+}
 void report(benchmark::State& state, std::size_t count) {
   state.SetItemsProcessed(state.iterations() * static_cast<std::int64_t>(count));
 }
@@ -82,6 +88,7 @@ void BM_VdbSetValue(benchmark::State& state) {
     }
     write();
   }
+  label(state);
   report(state, c.positions.size());
 }
 BENCHMARK(BM_VdbSetValue)
@@ -106,6 +113,7 @@ void BM_FieldSet(benchmark::State& state) {
     }
     write();
   }
+  label(state);
   report(state, c.positions.size());
 }
 BENCHMARK(BM_FieldSet)->ArgsProduct({{kInOrder, kAtRandom}, {kNew, kAgain}})->Unit(benchmark::kMillisecond);
@@ -128,6 +136,7 @@ void BM_FieldSetBulk(benchmark::State& state) {
       field.set(c.positions, c.values);
     }
   });
+  label(state);
   report(state, c.positions.size());
 }
 BENCHMARK(BM_FieldSetBulk)
