@@ -16,3 +16,12 @@ foreach(source IN LISTS sources)
     set_tests_properties(examples.${name} PROPERTIES LABELS examples TIMEOUT 600)
   endif()
 endforeach()
+
+# What the documents show is what these programs do.
+find_program(VLN_PYTHON3 python3)
+mark_as_advanced(VLN_PYTHON3)
+if(VLN_BUILD_TESTS AND VLN_PYTHON3)
+  add_test(NAME examples.documents
+    COMMAND "${VLN_PYTHON3}" "${PROJECT_SOURCE_DIR}/scripts/check_snippets")
+  set_tests_properties(examples.documents PROPERTIES LABELS examples TIMEOUT 60)
+endif()

@@ -7,7 +7,7 @@ cd "$root"
 
 step "install dependencies" sh scripts/install-deps.sh
 failed=
-for check in check_format check_layers check_paths check_headers check_install; do
+for check in check_format check_layers check_paths check_snippets check_headers check_install; do
   step "$check" "scripts/$check" || failed="$failed $check"
 done
 if [ -n "$failed" ]; then

@@ -56,6 +56,24 @@ TEST(UpdateTiles, RequirementNewTilesHoldTheDefaultValue) {
   }
 }
 
+TEST(UpdateTiles, RequirementAppendedTilesAreAsThoseOfAnUpdate) {
+  Haloed channel(Flags{}, 2.5f);
+  channel.update(FakeTree().set(3, 2).set(28, 1));
+  Haloed const copy(channel);
+  channel.appendTiles(28, 40);
+  channel.appendTiles(3, 1);
+  expectSize(channel, 28, 41, 216);
+  expectSize(channel, 3, 3, 216);
+  for (float v : std::as_const(channel).tileData(40, 28)) ASSERT_EQ(v, 2.5f);
+  EXPECT_EQ(channel.tileCount(-1), 44);
+  EXPECT_EQ(copy.tileCount(-1), 3) << "who shared the tiles keeps what it had";
+  channel.update(FakeTree().set(3, 3).set(28, 41));
+  EXPECT_EQ(channel.tileCount(-1), 44);
+  channel.setDepth(20, FakeTree().set(3, 3));
+  channel.appendTiles(28, 1);
+  EXPECT_EQ(channel.tileCount(28), 0) << "out of the channel's depths";
+}
+
 TEST(UpdateTiles, RequirementExistingElementsAreNeverTouched) {
   for (bool useStatic : {false, true}) {
     Points channel(Flags{useStatic});

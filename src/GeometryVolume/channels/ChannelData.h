@@ -129,6 +129,9 @@ public:
   bool permuteTiles(TilePermutation const& newToOld);
   void removeDepths(int first, int last);
   bool resizeDepth(int depth, std::int64_t tileCount, int elementCount);
+  /// Appends tiles of `layout().size` elements to a depth of the range.
+  /// @error What is thrown leaves the tiles that were appended before.
+  void appendTiles(int depth, std::int64_t count);
   /// Grows tiles that hold fewer elements than `source` says.
   void growElements(Internal::TileCounts const& source);
   /// Whether the tiles and elements that the moves to one depth name exist. A negative destination is no

@@ -296,6 +296,17 @@ template <class T> bool ChannelData<T>::resizeDepth(int depth, std::int64_t tile
   return true;
 }
 
+template <class T> void ChannelData<T>::appendTiles(int depth, std::int64_t n) {
+  if (!m_data || depth < firstDepth() || depth > lastDepth()) return;
+  cloneData();
+  auto& tiles = depthTiles(depth);
+  Internal::reserveDepthTiles(tiles, static_cast<std::int64_t>(tiles.size()) + n);
+  for (; n > 0; --n) {
+    tiles.push_back(m_allocateEmptyTileData ? Vector() : newTile(m_layout.size, nullptr));
+    ++count(depth), ++m_tileCountTotal;
+  }
+}
+
 template <class T> void ChannelData<T>::growElements(Internal::TileCounts const& source) {
   if (!m_data) return;
   Spans spans;

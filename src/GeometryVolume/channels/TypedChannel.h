@@ -85,6 +85,10 @@ public:
   bool resize(int depth, std::int64_t tileCount, int elementCount);
   /// @shape `tileCounts` has 29 entries.
   bool resize(std::int64_t const* tileCounts, int elementCount);
+  /// Appends tiles to one depth, their elements at the default value: for who follows a tree tile by tile.
+  /// Never in a static block.
+  /// @cost Amortised constant for each tile, where updateTilesAdded() looks at all depths.
+  void appendTiles(int depth, std::int64_t count);
   /// false without storage.
   bool removeAll();
   /// Puts tiles in a new order: new tile i of depth d is old tile newToOld[d][i]. Returns true.

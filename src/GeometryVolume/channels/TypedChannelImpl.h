@@ -280,6 +280,10 @@ template <class T> bool TypedChannel<T>::removeAll() {
   return true;
 }
 
+template <class T> void TypedChannel<T>::appendTiles(int depth, std::int64_t count) {
+  write([&](ChannelData<T>& data) { data.appendTiles(depth, count); });
+}
+
 template <class T> bool TypedChannel<T>::resize(int depth, std::int64_t tileCount, int elementCount) {
   bool resized = false;
   write([&](ChannelData<T>& data) { resized = data.resizeDepth(depth, tileCount, elementCount); });

@@ -1,0 +1,79 @@
+// FieldBlocks: where the finest tiles of one field lie in memory, by position.
+//
+//   slots of a hash table          blocks of 8 x 8 x 8 samples
+//   [corner | block] ------------> [ * * 0 * 0 0 0 * ]    a pointer for each tile of 4 x 4 x 4, null where
+//   [corner | block]                 |                     the field has none
+//                                    '--> 64 elements
+//
+// Unlike the tables of a ChannelReader these grow with the field, a tile at a time.
+#pragma once
+
+#include "GeometryVolume/core/Export.h"
+#include "Velorn/Math.h"
+
+#include <array>
+#include <cstddef>
+#include <cstdint>
+#include <memory>
+#include <vector>
+
+namespace VLN::TileTree3D::Internal {
+
+using Velorn::Math::int3;
+
+/// Tiles as slots of their parent, i fastest. A block stays where it is for as long as its table lives.
+struct alignas(64) FieldBlock {
+  static constexpr int kWidth = 8;
+  std::array<void*, 8> tiles{};
+
+  static std::size_t slot(int i, int j, int k) {
+    return static_cast<std::size_t>((i >> 2 & 1) | (j >> 1 & 2) | (k & 4));
+  }
+  static std::size_t element(int i, int j, int k) {
+    return static_cast<std::size_t>((i & 3) | (j & 3) << 2 | (k & 3) << 4);
+  }
+};
+
+/// @threads As a container of the standard library.
+class VLN_API FieldBlocks {
+public:
+  /// The block that holds the position; noBlock() where there is none.
+  FieldBlock* find(int i, int j, int k) const {
+    int3 const at{i >> 3, j >> 3, k >> 3};
+    for (std::size_t n = hash(at) & m_mask;; n = (n + 1) & m_mask) {
+      Slot const& slot = m_slots[n];
+      if (!slot.block || slot.at == at) return slot.block ? slot.block : noBlock();
+    }
+  }
+  /// The elements of the tile at a position, or null.
+  void* tile(int i, int j, int k) const { return find(i, j, k)->tiles[FieldBlock::slot(i, j, k)]; }
+  /// Enters the tile at a position.
+  void insert(int3 const& corner, void* elements);
+  void clear();
+  /// Makes room, so that the next inserts of `tiles` tiles in a row move no slots.
+  void reserve(std::int64_t tiles);
+  /// A block without tiles, the same for all tables. Nothing writes it.
+  static FieldBlock* noBlock();
+
+private:
+  struct Slot {
+    int3 at;
+    FieldBlock* block;
+  };
+  static constexpr std::size_t kChunk = 256;
+
+  static std::size_t hash(int3 const& at) {
+    std::uint64_t h = static_cast<std::uint32_t>(at.x) * 0x9e3779b97f4a7c15ull;
+    h ^= (static_cast<std::uint32_t>(at.y) * 0xc2b2ae3d27d4eb4full) ^
+         (static_cast<std::uint32_t>(at.z) * 0x165667b19e3779f9ull);
+    return static_cast<std::size_t>((h ^ h >> 32) * 0xd6e8feb86659fd93ull >> 32);
+  }
+  void resize(std::size_t slots);
+
+  std::vector<Slot> m_slots = std::vector<Slot>(16, Slot{{0, 0, 0}, nullptr});
+  std::size_t m_mask = 15, m_used = 0;
+  std::vector<std::unique_ptr<FieldBlock[]>> m_chunks;
+  std::size_t m_left = 0; ///< blocks of the last chunk that are not in use
+};
+
+} // namespace VLN::TileTree3D::Internal

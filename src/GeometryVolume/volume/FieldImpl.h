@@ -1,0 +1,395 @@
+// Definitions of Field and of the slot behind it. Only the generated sources include this.
+#pragma once
+
+#include "GeometryVolume/channels/Halo.h"
+#include "GeometryVolume/channels/NonLeafValues.h"
+#include "GeometryVolume/core/Parallel.h"
+#include "GeometryVolume/sampling/VoxelSamplerLinear.h"
+#include "GeometryVolume/topology/Command.h"
+#include "GeometryVolume/volume/FieldBulkImpl.h"
+#include "GeometryVolume/volume/Volume.h"
+
+#include <algorithm>
+#include <array>
+#include <cstring>
+#include <stdexcept>
+#include <utility>
+
+namespace VLN::TileTree3D {
+
+namespace Internal {
+
+inline constexpr int kFinest = VolumeShape::kMaxDepth;
+inline constexpr std::size_t kTileElements = 64;
+
+template <class T> char const* elementTypeName();
+
+template <class T> struct TypedSlot final : FieldSlot {
+  using ChannelType = Channel<VolumeShape, T, 4, 0>;
+  using HaloChannelType = Channel<VolumeShape, T, 4, 1>;
+
+  explicit TypedSlot(Ostil::Ptr<ChannelType> channel)
+      : m_channel(std::move(channel)) {
+    name = m_channel->name();
+    for (std::size_t d = 0; d < m_filled.size(); ++d)
+      m_filled[d] = static_cast<std::int64_t>(tiles()[d].size());
+  }
+
+  Ostil::Ptr<ChannelBase> channel() const override { return m_channel; }
+  char const* typeName() const override { return elementTypeName<T>(); }
+  std::unique_ptr<FieldSlot> share() const override { return std::make_unique<TypedSlot>(m_channel); }
+
+  void detach(VolumeData& volume) override {
+    if (exclusive.load(std::memory_order_relaxed)) return;
+    void const* const before = m_channel->tileArrays();
+    makeUnique(m_channel);
+    m_tiles = m_channel->cloneData().get();
+    if (m_tiles != before) {
+      blocksBuilt = false;
+      version.store(0, std::memory_order_relaxed);
+    }
+    exclusive.store(true, std::memory_order_relaxed);
+    volume.epoch.fetch_add(1, std::memory_order_relaxed);
+  }
+
+  void follow(VolumeData& volume, int firstDepth) override {
+    VolumeTree const& tree = *volume.tree;
+    std::int64_t added = 0;
+    auto const missing = [&](int d) {
+      return tree.tileCount(d) - static_cast<std::int64_t>(tiles()[static_cast<std::size_t>(d)].size());
+    };
+    for (int d = firstDepth; d <= kFinest; ++d) added += std::max<std::int64_t>(0, missing(d));
+    if (added > 0) {
+      detach(volume);
+      if (added > kFewTiles) {
+        volume.updateTopology();
+        m_channel->update(*volume.topology);
+      } else {
+        for (int d = firstDepth; d <= kFinest; ++d)
+          if (std::int64_t const n = missing(d); n > 0) m_channel->appendTiles(d, n);
+      }
+    }
+    for (int d = firstDepth; d <= kFinest; ++d) fillNew(tree, d);
+    enterBlocks(tree);
+    version.store(volume.version, std::memory_order_release);
+  }
+
+  void tilesRemoved(VolumeData& volume, TileRemovalList const& moves) override {
+    detach(volume);
+    m_channel->updateTilesRemoved(moves, *volume.topology);
+    m_tiles = m_channel->cloneData().get();
+    for (int d = 0; d <= kFinest; ++d) m_filled[static_cast<std::size_t>(d)] = volume.tree->tileCount(d);
+    blocksBuilt = false;
+    enterBlocks(*volume.tree);
+    written.store(true, std::memory_order_relaxed);
+    version.store(volume.version, std::memory_order_release);
+  }
+
+  void fillCoarse(VolumeData& volume) override {
+    setNonLeafValueToChildValue(*m_channel, *volume.tree, volume.topology->offsetType(), 0, kFinest - 1);
+    volume.valuesChanged(*this);
+  }
+
+  void fillHalo(VolumeData& volume) override {
+    std::string const haloName = name + "_halo";
+    if (!volume.rest.component<HaloChannelType>(haloName))
+      Command::createChannel<T, 2, 4, 4, 0, 1>(haloName, *volume.topology, volume.rest,
+                                               m_channel->defaultValue(), kInitializeDefaultValue, 0,
+                                               kFinest);
+    auto halo = volume.rest.extractComponent<HaloChannelType>(haloName);
+    computeHalo<VolumeShape, T, 0, 0, 0, 1>(*m_channel, *volume.tree, *halo, -1, -1);
+    volume.rest.putComponent(std::move(halo));
+  }
+
+  TileArrays<T> const& tiles() const { return *std::as_const(*m_channel).tileArrays(); }
+  TileVector<T> const& tile(TreeIndex const& at) const {
+    return tiles()[static_cast<std::size_t>(at.depth)][static_cast<std::size_t>(at.index)];
+  }
+  ChannelType& typed() { return *m_channel; }
+
+private:
+  /// Fewer new tiles are appended one by one; more are worth a parallel pass.
+  static constexpr std::int64_t kFewTiles = 256;
+
+  /// New tiles take the values of the coarser samples that were read at their places.
+  void fillNew(VolumeTree const& tree, int depth) {
+    auto const d = static_cast<std::size_t>(depth);
+    std::int64_t const begin = m_filled[d], end = static_cast<std::int64_t>(tiles()[d].size());
+    if (begin >= end) return;
+    if (depth > 0) {
+      auto const body = [&](std::int64_t b, std::int64_t e) {
+        for (auto n = b; n < e; ++n) fillFromParent(tree, n, depth);
+      };
+      if (end - begin < kFewTiles)
+        body(begin, end);
+      else
+        parallelFor(begin, end, body, {.grain = kFewTiles});
+    }
+    m_filled[d] = end;
+  }
+  void fillFromParent(VolumeTree const& tree, std::int64_t n, int depth) {
+    auto const& made = tree.tile(n, depth);
+    if (!made.valid() || made.isRoot()) return;
+    TreeIndex const above = made.parentTreeIndex();
+    TileVector<T> const& from = tile(above);
+    TileVector<T>& to = (*m_tiles)[static_cast<std::size_t>(depth)][static_cast<std::size_t>(n)];
+    if (from.size() < kTileElements || to.size() < kTileElements) return;
+    int3 const slot = tree.tile(above).childIJK(made);
+    std::size_t const first = ConstTileData<T, 4, 0>::index(2 * slot.x, 2 * slot.y, 2 * slot.z);
+    T const* const p = from.data() + first;
+    T const& value = m_channel->defaultValue();
+    auto const same = [&](std::size_t at) { return std::memcmp(p + at, &value, sizeof(T)) == 0; };
+    if (same(0) && same(1) && same(4) && same(5) && same(16) && same(17) && same(20) && same(21)) return;
+    for (std::size_t at = 0; at < kTileElements; ++at)
+      to[at] = p[(at & 3) / 2 + (at >> 2 & 3) / 2 * 4 + (at >> 4) / 2 * 16];
+  }
+  /// Enters the finest tiles that the table lacks.
+  void enterBlocks(VolumeTree const& tree) {
+    if (!blocksBuilt) {
+      blocks.clear();
+      m_entered = 0;
+    }
+    auto const& finest = tiles()[static_cast<std::size_t>(kFinest)];
+    auto const count = std::min(static_cast<std::int64_t>(finest.size()), tree.tileCount(kFinest));
+    if (count - m_entered > kFewTiles) blocks.reserve(count - m_entered);
+    for (; m_entered < count; ++m_entered) {
+      auto const& at = tree.tile(m_entered, kFinest);
+      TileVector<T> const& elements = finest[static_cast<std::size_t>(m_entered)];
+      if (at.valid() && elements.size() >= kTileElements)
+        blocks.insert(at.tijk(), const_cast<T*>(elements.data()));
+    }
+    blocksBuilt = true;
+  }
+
+  Ostil::Ptr<ChannelType> m_channel;
+  TileArrays<T>* m_tiles = nullptr; ///< of the channel, while it is exclusive
+  DepthCounts m_filled{};           ///< tiles that hold what they should
+  std::int64_t m_entered = 0;       ///< finest tiles in the table
+};
+
+} // namespace Internal
+
+template <class T> struct Field<T>::Sampler {
+  FloatVoxelSamplerLinear<Internal::VolumeShape> linear;
+  std::uint64_t epoch, version, values;
+};
+
+template <class T>
+Field<T>::Field(Field const& other)
+    : m_volume(other.m_volume)
+    , m_slot(other.m_slot)
+    , m_block(other.m_block)
+    , m_at(other.m_at)
+    , m_readEpoch(other.m_readEpoch)
+    , m_writeEpoch(other.m_writeEpoch) {}
+template <class T> Field<T>::Field(Field&& other) noexcept = default;
+template <class T> Field<T>& Field<T>::operator=(Field const& other) {
+  if (this != &other) *this = Field(other);
+  return *this;
+}
+template <class T> Field<T>& Field<T>::operator=(Field&& other) noexcept = default;
+template <class T> Field<T>::~Field() = default;
+
+namespace Internal {
+template <class T> TypedSlot<T>& typed(FieldSlot& slot) { return static_cast<TypedSlot<T>&>(slot); }
+} // namespace Internal
+
+template <class T> T const& Field<T>::background() const {
+  return Internal::typed<T>(*m_slot).typed().defaultValue();
+}
+
+template <class T> void Field<T>::moveToRead(int i, int j, int k) const {
+  m_volume->sync(*m_slot);
+  m_readEpoch = m_volume->epoch.load(std::memory_order_relaxed);
+  m_writeEpoch = m_slot->exclusive.load(std::memory_order_relaxed) ? m_readEpoch : 0;
+  m_at = {i & ~7, j & ~7, k & ~7};
+  m_block = m_slot->blocks.find(i, j, k);
+}
+
+template <class T> void Field<T>::moveToWrite(int i, int j, int k) {
+  m_volume->prepareWrite(*m_slot);
+  moveToRead(i, j, k);
+}
+
+template <class T> T* Field<T>::make(int i, int j, int k) {
+  using Internal::FieldBlock, Internal::FieldBlocks;
+  m_volume->makeTile(*m_slot, i, j, k);
+  // A block that was there has the new tile.
+  if (m_block == FieldBlocks::noBlock() || !near(i, j, k, m_writeEpoch)) moveToWrite(i, j, k);
+  void* tile = m_block->tiles[FieldBlock::slot(i, j, k)];
+  if (!tile) throw std::logic_error("field \"" + m_slot->name + "\": a tile holds no elements");
+  return static_cast<T*>(tile);
+}
+
+template <class T> T Field<T>::coarse(int i, int j, int k) const {
+  using namespace Internal;
+  moveToRead(i, j, k); // the tile may have been made through another handle
+  if (auto const* const tile = static_cast<T const*>(m_block->tiles[FieldBlock::slot(i, j, k)]))
+    return tile[FieldBlock::element(i, j, k)];
+  auto& slot = typed<T>(*m_slot);
+  auto const accessor = std::as_const(*m_volume->tree).tileAccessor();
+  TreeIndex at = accessor.treeIndex(i, j, k, kFinest, false);
+  while (at.valid()) {
+    auto const& elements = slot.tile(at);
+    auto const& tile = accessor.tile(at);
+    if (elements.size() >= kTileElements) {
+      int3 const p = tile.childDataIJK(i, j, k);
+      return elements[static_cast<std::size_t>(ConstTileData<T, 4, 0>::index(p))];
+    }
+    at = tile.parentTreeIndex();
+  }
+  return slot.typed().defaultValue();
+}
+
+template <class T> void Field<T>::set(std::span<int3 const> positions, std::span<T const> values) {
+  using namespace Internal;
+  if (positions.size() != values.size())
+    throw std::invalid_argument("field \"" + m_slot->name + "\": " + std::to_string(positions.size()) +
+                                " positions with " + std::to_string(values.size()) + " values");
+  BulkRuns const plan = planBulk(*m_volume, *m_slot, positions);
+  m_volume->valuesChanged(*m_slot);
+  auto const write = [&](BulkRun const& run) {
+    auto const begin = static_cast<std::size_t>(run.begin), count = static_cast<std::size_t>(run.count);
+    for (std::size_t n = begin; n < begin + count; ++n) {
+      int3 const& p = positions[n];
+      auto* const tile = static_cast<T*>(run.block->tiles[FieldBlock::slot(p.x, p.y, p.z)]);
+      tile[FieldBlock::element(p.x, p.y, p.z)] = values[n];
+    }
+  };
+  parallelFor(0, static_cast<std::int64_t>(plan.shares), [&](std::int64_t begin, std::int64_t end) {
+    for (auto share = static_cast<std::size_t>(begin); share < static_cast<std::size_t>(end); ++share)
+      for (std::size_t list = share; list < plan.lists.size(); list += plan.shares)
+        for (BulkRun const& run : plan.lists[list]) write(run);
+  });
+}
+
+template <class T> void Field<T>::fill(T const& value) {
+  T const copy = value;
+  auto& channel = editChannel();
+  for (T& element : channel) element = copy;
+}
+
+template <class T> void const* Field<T>::sampler() const {
+  if constexpr (std::is_same_v<T, float>) {
+    auto const epoch = m_volume->epoch.load(std::memory_order_relaxed);
+    if (m_slot->written.load(std::memory_order_acquire)) {
+      std::lock_guard const lock(m_volume->mutex);
+      if (m_slot->written.load(std::memory_order_relaxed)) {
+        m_slot->values.fetch_add(1, std::memory_order_release);
+        m_slot->written.store(false, std::memory_order_release);
+      }
+    }
+    auto const values = m_slot->values.load(std::memory_order_acquire);
+    if (!m_sampler || m_sampler->epoch != epoch || m_sampler->version != m_volume->version ||
+        m_sampler->values != values) {
+      m_volume->sync();
+      m_sampler.reset(new Sampler{{*m_volume->tree, *m_volume->topology, channel()},
+                                  m_volume->epoch.load(std::memory_order_relaxed),
+                                  m_volume->version,
+                                  values});
+    }
+    return &m_sampler->linear;
+  } else {
+    return nullptr;
+  }
+}
+
+template <class T>
+float Field<T>::sample(float3 const& position, SamplerSpace space) const requires std::is_same_v<T, float> {
+  return static_cast<FloatVoxelSamplerLinear<Internal::VolumeShape> const*>(sampler())->sample(position,
+                                                                                               space);
+}
+
+template <class T>
+float3 Field<T>::gradient(float3 const& position,
+                          SamplerSpace space) const requires std::is_same_v<T, float> {
+  float3 out;
+  static_cast<FloatVoxelSamplerLinear<Internal::VolumeShape> const*>(sampler())->sampleGradient(position,
+                                                                                                space, &out);
+  return out;
+}
+
+template <class T> auto Field<T>::channel() const -> ChannelType const& {
+  m_volume->sync(*m_slot);
+  return Internal::typed<T>(*m_slot).typed();
+}
+
+template <class T> auto Field<T>::editChannel() -> ChannelType& {
+  m_volume->sync();
+  m_volume->prepareWrite(*m_slot);
+  m_volume->valuesChanged(*m_slot);
+  return Internal::typed<T>(*m_slot).typed();
+}
+
+template <class T> auto Field<T>::halos() const -> Channel<Internal::VolumeShape, T, 4, 1> const& {
+  m_volume->sync();
+  auto const found =
+      m_volume->rest.template component<Channel<Internal::VolumeShape, T, 4, 1>>(m_slot->name + "_halo");
+  if (!found) throw std::logic_error("field \"" + m_slot->name + "\": fill its halos first");
+  return *found;
+}
+
+template <class T> void Field<T>::forEachTileRange(RangeBody body) {
+  editChannel();
+  std::as_const(*this).forEachTileRange(body);
+}
+
+template <class T> void Field<T>::forEachTileRange(RangeBody body) const {
+  m_volume->sync();
+  parallelFor(0, std::as_const(*m_volume->tree).tileCount(Internal::kFinest), body, {.grain = 64});
+}
+
+template <class T> TileBlock<T> Field<T>::tileBlock(std::int64_t n) const {
+  auto const& tile = std::as_const(*m_volume->tree).tile(n, Internal::kFinest);
+  auto const& elements = Internal::typed<T>(*m_slot).tile({n, Internal::kFinest});
+  bool const whole = tile.valid() && elements.size() >= Internal::kTileElements;
+  return {tile.tijk(), whole ? const_cast<T*>(elements.data()) : nullptr};
+}
+
+template <class T> void Field<T>::gather(std::int64_t n, Stencil<T>& out) const {
+  using namespace Internal;
+  int3 const at = std::as_const(*m_volume->tree).tile(n, kFinest).tijk();
+  out.corner = at;
+  auto const& blocks = m_slot->blocks;
+  for (int dk = -1; dk <= 1; ++dk)
+    for (int dj = -1; dj <= 1; ++dj)
+      for (int di = -1; di <= 1; ++di) {
+        int const x = at.x + 4 * di, y = at.y + 4 * dj, z = at.z + 4 * dk;
+        auto const first = [](int d) { return d < 0 ? 3 : 0; };
+        auto const width = [](int d) { return d ? 1 : 4; };
+        auto const to = [](int d) { return d < 0 ? -1 : d == 0 ? 0 : 4; };
+        auto const* const from = static_cast<T const*>(blocks.tile(x, y, z));
+        for (int k = 0; k < width(dk); ++k)
+          for (int j = 0; j < width(dj); ++j) {
+            T* const row = out.values + Stencil<T>::index(to(di), to(dj) + j, to(dk) + k);
+            int const fj = first(dj) + j, fk = first(dk) + k;
+            for (int i = 0; i < width(di); ++i)
+              row[i] =
+                  from ? from[first(di) + i + 4 * (fj + 4 * fk)] : coarse(x + first(di) + i, y + fj, z + fk);
+          }
+      }
+}
+
+template <class T>
+Field<T> Volume::addField(std::string const& name, std::type_identity_t<T> const& background) {
+  using namespace Internal;
+  checkNewName(name);
+  m_data->sync();
+  Ostil::Ptr<Channel<VolumeShape, T, 4, 0>> channel = Command::createChannel<T, 2, 4, 4, 0, 0>(
+      name, *m_data->topology, background, kInitializeDefaultValue, 0, kFinest);
+  return Field<T>(*m_data, addSlot(std::make_unique<TypedSlot<T>>(std::move(channel))));
+}
+
+template <class T> Field<T> Volume::field(std::string const& name) const {
+  auto& slot = findSlot(name);
+  if (!dynamic_cast<Internal::TypedSlot<T>*>(&slot))
+    throw std::invalid_argument("field \"" + name + "\" holds " + slot.typeName() + ", not " +
+                                Internal::elementTypeName<T>());
+  return Field<T>(*m_data, slot);
+}
+
+template <class T> bool Volume::hasField(std::string const& name) const {
+  return dynamic_cast<Internal::TypedSlot<T>*>(m_data->find(name)) != nullptr;
+}
+
+} // namespace VLN::TileTree3D

@@ -1,0 +1,121 @@
+// What a volume holds, and what its fields share. For Volume and Field alone.
+//
+// The tree grows at a write; everything else follows at the first access that needs it:
+//
+//   Field a: set() -- makes tiles --> tree, version n+1
+//                  -- follows ------> a, version n+1
+//                                     topology, b, c: still at n; they follow when they are asked for
+//
+// What a handle remembers of a field holds as long as the epoch stays: it rises when elements move in memory,
+// and when they begin to be shared.
+#pragma once
+
+#include "GeometryVolume/channels/ChannelBase.h"
+#include "GeometryVolume/core/Object.h"
+#include "GeometryVolume/tiletree/Container.h"
+#include "GeometryVolume/topology/VoxelTopology.h"
+#include "GeometryVolume/volume/FieldBlocks.h"
+
+#include <atomic>
+#include <cstdint>
+#include <memory>
+#include <mutex>
+#include <vector>
+
+namespace VLN::TileTree3D::Internal {
+
+using VolumeShape = PowerOfTwoTraits;
+using VolumeTree = Container<VolumeShape>;
+using VolumeTopology = VoxelTopology<VolumeShape>;
+
+struct VolumeData;
+
+/// One field of a volume, without its element type.
+struct VLN_API FieldSlot {
+  virtual ~FieldSlot();
+  virtual Ostil::Ptr<ChannelBase> channel() const = 0;
+  virtual char const* typeName() const = 0;
+  virtual std::unique_ptr<FieldSlot> share() const = 0;
+  /// Takes in the tiles that are new in the tree, with the values that were read there before, and completes
+  /// `blocks`. The caller holds the lock or is the only user of the volume.
+  /// @param firstDepth Above it no tile is new to the field.
+  virtual void follow(VolumeData& volume, int firstDepth) = 0;
+  /// Makes the channel and its elements the volume's alone.
+  virtual void detach(VolumeData& volume) = 0;
+  virtual void tilesRemoved(VolumeData& volume, TileRemovalList const& moves) = 0;
+  virtual void fillCoarse(VolumeData& volume) = 0;
+  virtual void fillHalo(VolumeData& volume) = 0;
+
+  std::string name;
+  FieldBlocks blocks;
+  bool blocksBuilt = false;
+  std::atomic<std::uint64_t> version{0}; ///< of the tree that the field has followed to
+  std::atomic<bool> exclusive{false};    ///< whether nobody else sees the elements
+  std::atomic<bool> written{false};      ///< since a sampler asked last
+  std::atomic<std::uint64_t> values{1};  ///< rises when a sampler finds that the field was written
+};
+
+struct VLN_API VolumeData {
+  VolumeData() = default;
+  VolumeData(VolumeData const&) = delete;
+  VolumeData& operator=(VolumeData const&) = delete;
+
+  /// A volume of its own on the same components.
+  std::unique_ptr<VolumeData> share();
+  /// Brings the whole volume into step.
+  void sync();
+  /// Brings one field into step.
+  void sync(FieldSlot& slot) {
+    if (slot.version.load(std::memory_order_acquire) != version) follow(slot);
+  }
+  /// Before elements are written.
+  void prepareWrite(FieldSlot& slot);
+  /// Tells that elements of the field were or may be written.
+  void valuesChanged(FieldSlot& slot) { slot.written.store(true, std::memory_order_relaxed); }
+  /// Makes the finest tile at a position, where there is none, and lets the field follow.
+  /// @error std::out_of_range beyond the domain.
+  void makeTile(FieldSlot& slot, int i, int j, int k);
+  /// Makes the finest tiles of many positions, and roots above them.
+  void makeTiles(VolumeTree::TileLists& lists);
+  /// Lets `change` grow the tree.
+  void growTree(FunctionRef<void(VolumeTree&)> change);
+  /// Removes branches.
+  void removeTiles(TileIndexLists const& lists);
+  void updateTopology();
+  FieldSlot* find(std::string const& name) const;
+  /// The depth of the roots that a new tile gets.
+  int rootDepth() const;
+  /// From here on others see the components.
+  void beginSharing();
+
+  Ostil::Ptr<VolumeTree> tree;
+  Ostil::Ptr<VolumeTopology> topology;
+  VLN::Object rest; ///< all else: plain properties, channels of other layouts, other topologies
+  std::vector<std::unique_ptr<FieldSlot>> slots;
+  std::uint64_t version = 1; ///< of the tree
+  std::uint64_t topologyVersion = 0, restVersion = 0;
+  std::atomic<std::uint64_t> syncedVersion{0};
+  std::atomic<std::uint64_t> epoch{1};
+  std::mutex mutex;
+
+private:
+  void follow(FieldSlot& slot);
+  void updateRest(TileRemovalList const* removed);
+
+  VolumeTree& editTree();
+
+  VolumeTree::TileAccessor m_accessor;
+  VolumeTree const* m_accessorTree = nullptr;
+};
+
+/// @error std::out_of_range, always.
+[[noreturn]] void throwOutside(int3 const& position);
+
+/// Makes the elements of `component` and itself the holder's alone.
+template <class T> void makeUnique(Ostil::Ptr<T>& component) {
+  if (component.unique()) return;
+  Ostil::MutablePtr<T> copy{Ostil::Ptr<T>(component)};
+  component = std::move(copy);
+}
+
+} // namespace VLN::TileTree3D::Internal
