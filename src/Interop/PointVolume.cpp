@@ -3,7 +3,7 @@
 #include "GeometryVolume/channels/ElementReTile.h"
 #include "GeometryVolume/core/Numeric.h"
 #include "GeometryVolume/core/Parallel.h"
-#include "GeometryVolume/core/TakenComponentImpl.h"
+#include "GeometryVolume/core/TakenComponent.h"
 #include "GeometryVolume/tiletree/Morton.h"
 #include "GeometryVolume/topology/Command.h"
 
