@@ -15,13 +15,30 @@ namespace test::faults {
 
 enum class Mode { kOnce, kFromThenOn };
 
-/// While it lives, the n-th allocation of the process fails.
+/// While it lives, the n-th allocation of the process fails. Processes that it forks have memory.
 class Armed {
 public:
   Armed(std::int64_t n, Mode mode);
   ~Armed();
   Armed(Armed const&) = delete;
   Armed& operator=(Armed const&) = delete;
+};
+/// While it lives, the n-th allocation and all behind it fail in each process that is forked.
+class ArmedChildren {
+public:
+  explicit ArmedChildren(std::int64_t n);
+  ~ArmedChildren();
+  ArmedChildren(ArmedChildren const&) = delete;
+  ArmedChildren& operator=(ArmedChildren const&) = delete;
+};
+/// While it lives, nothing fails inside calls of OpenVDB: its trees allocate while they are destroyed, which
+/// ends the process where it throws. Each allocation costs a look at the stack.
+class OpenVdbSpared {
+public:
+  OpenVdbSpared();
+  ~OpenVdbSpared();
+  OpenVdbSpared(OpenVdbSpared const&) = delete;
+  OpenVdbSpared& operator=(OpenVdbSpared const&) = delete;
 };
 /// How many allocations have failed since the latest Armed was made.
 std::int64_t failures();
@@ -44,13 +61,15 @@ template <class Subject> struct Scenario {
   After after = After::kUnchanged;
   /// What must hold of the subject even then, also when what is thrown leaves it changed.
   std::function<bool(Subject const&)> sound = {};
+  /// How many of the first failures are tried one by one. Fewer where each is dear.
+  int dense = 60;
   /// Whether it documents errors of its own for want of memory, beside std::bad_alloc.
   bool ownErrors = false;
 };
 
 /// Failures to try: each of them when the environment holds VLN_FAULTS_ALL, else each of the first and ever
 /// fewer.
-std::int64_t nextTry(std::int64_t n);
+std::int64_t nextTry(std::int64_t n, int dense);
 /// Reports a scenario's counts, and what was wrong.
 void report(char const* name, std::int64_t tries, std::int64_t thrown);
 void expect(bool condition, std::string const& what);
@@ -65,7 +84,7 @@ template <class Subject> void everyAllocation(char const* name, Scenario<Subject
   std::int64_t tries = 0, thrown = 0;
   for (Mode const mode : {Mode::kOnce, Mode::kFromThenOn}) {
     bool failed = true;
-    for (std::int64_t n = 1; failed; n = nextTry(n)) {
+    for (std::int64_t n = 1; failed; n = nextTry(n, scenario.dense)) {
       std::string const where = std::string(name) + ", allocation " + std::to_string(n) +
                                 (mode == Mode::kOnce ? " once" : " and all behind it");
       std::int64_t const bulkBefore = bulkBlocks();

@@ -200,6 +200,7 @@ void tryFlatten(std::string const& name, Support::FlatOptions const& options, bo
        },
        After::kUnchanged,
        {},
+       24,
        true});
 }
 

@@ -4,6 +4,7 @@
 #include "Faults.h"
 
 #include "GeometryVolume/channels/Channel.h"
+#include "Interop/FileError.h"
 #include "Interop/Flatten.h"
 #include "Interop/NvttRead.h"
 #include "Interop/NvttWrite.h"
@@ -17,6 +18,7 @@
 #include <gtest/gtest.h>
 #include <memory>
 #include <string>
+#include <unistd.h>
 
 namespace {
 
@@ -76,10 +78,30 @@ TEST(FileFaults, RequirementImport) {
                                    [](Read const& r) { return stateOf(r.content); },
                                    After::kUnchanged,
                                    {},
+                                   8,
                                    true});
+}
+TEST(FileFaults, RegressionTheChildThatReadsHasNoMemory) {
+  // It tells so, and ends: what is thrown in it must not go on as a second copy of this process.
+  torus();
+  pid_t const self = getpid();
+  std::int64_t refused = 0;
+  for (std::int64_t n = 1;; n = test::faults::nextTry(n, 5)) {
+    test::faults::ArmedChildren const armed(n);
+    try {
+      probeVdbFile(torus());
+      break;
+    } catch (FileError const& error) {
+      ++refused;
+      EXPECT_FALSE(error.reason().empty());
+    }
+    if (getpid() != self) _exit(1);
+  }
+  EXPECT_GT(refused, 5);
 }
 TEST(FileFaults, RequirementExport) {
   imported();
+  test::faults::OpenVdbSpared const spared;
   struct Written {};
   everyAllocation<Written>("export", {[] {
                                         std::filesystem::remove(folder() + "/export.vdb");
@@ -89,6 +111,7 @@ TEST(FileFaults, RequirementExport) {
                                       [](Written const&) { return stateOfFile("export.vdb").substr(0, 1); },
                                       After::kUsable,
                                       {},
+                                      8,
                                       true});
 }
 TEST(FileFaults, RequirementFlatFiles) {
@@ -106,6 +129,7 @@ TEST(FileFaults, RequirementFlatFiles) {
                             [](Written const&) { return stateOfFile("flat.nvtt"); },
                             After::kUnchanged,
                             {},
+                            30,
                             true});
   writeNvtt(path, {flat->buffer.data(), flat->buffer.size()});
   struct Mapped {
@@ -119,6 +143,7 @@ TEST(FileFaults, RequirementFlatFiles) {
          [](Mapped const& m) { return std::to_string(m.file ? m.file->bufferLength() : 0); },
          After::kUnchanged,
          {},
+         30,
          true});
   struct Read {
     VdbImport content;
@@ -128,6 +153,7 @@ TEST(FileFaults, RequirementFlatFiles) {
                                            [](Read const& r) { return stateOf(r.content); },
                                            After::kUnchanged,
                                            {},
+                                           30,
                                            true});
   everyAllocation<Read>("flattened", {[] { return Read(); },
                                       [](Read& r) {
@@ -140,6 +166,7 @@ TEST(FileFaults, RequirementFlatFiles) {
                                       [](Read const& r) { return r.content.file; },
                                       After::kUnchanged,
                                       {},
+                                      30,
                                       true});
 }
 

@@ -5,6 +5,7 @@
 
 #include <array>
 #include <iterator>
+#include <optional>
 #include <utility>
 #include <vector>
 
@@ -18,7 +19,9 @@ public:
       : m_data(*tree.m_data)
       , m_before(tree.m_data->m_tileCounts)
       , m_newTiles(newTiles) {
-    for (std::size_t d = 0; newTiles && d < m_listed.size(); ++d) m_listed[d] = (*newTiles)[d].size();
+    if (!newTiles) return;
+    auto& listed = m_listed.emplace();
+    for (std::size_t d = 0; d < listed.size(); ++d) listed[d] = (*newTiles)[d].size();
   }
   ~Growth() {
     if (!m_kept) takeBack();
@@ -72,13 +75,14 @@ private:
           if (isNew(t.childIndex(slot), d + 1)) t.childIndex(slot) = -1;
       }
     }
-    for (std::size_t d = 0; m_newTiles && d < m_listed.size(); ++d) (*m_newTiles)[d].resize(m_listed[d]);
+    for (std::size_t d = 0; m_listed && d < m_listed->size(); ++d) (*m_newTiles)[d].resize((*m_listed)[d]);
   }
 
   Data& m_data;
   Counts m_before;
   TileLists* m_newTiles;
-  std::array<std::uint64_t, TraitsT::kDepths> m_listed{};
+  /// How long the lists were. Not there for the addition of single tiles, which is to be quick.
+  std::optional<std::array<std::uint64_t, static_cast<std::size_t>(TraitsT::kDepths)>> m_listed;
   std::vector<typename Roots::node_type> m_adopted;
   bool m_kept = false;
 };
