@@ -70,6 +70,7 @@ std::string stateOfFile(std::string const& name) {
 
 TEST(FileFaults, RequirementImport) {
   torus();
+  test::faults::OpenVdbSpared const spared;
   struct Read {
     VdbImport content;
   };

@@ -156,7 +156,8 @@ public:
   /// Whether the records of the tree agree with each other. The verbose form reports on standard error.
   bool checkConsistency(bool verbose) const;
 
-  // Derived caches: built on demand, dropped by every change of the tree
+  // Derived caches: built on demand, dropped by every change of the tree. Where one finds no memory it is not
+  // built: the grid is off, the tables are those of before.
   /// Dense grid of tile indices for fast entry: at the deepest depth up to `maxDepth` whose tiles span at
   /// most 64 cells on each axis. @cost Linear in the tiles of the depths tried.
   void buildAccessorAccelerationStructure(int maxDepth);
@@ -182,9 +183,11 @@ public:
   /// @param newTiles If given, the corner of every tile made is appended to the list of its depth.
   /// @param setBranchSizesAtEnd Else branch sizes are stale afterwards.
   /// @error std::runtime_error(VLN::exceptionMessage) when the host cancels the job; the depths finished so
-  /// far stay.
+  /// far stay. So they do with std::bad_alloc, and branch sizes are right then where `setBranchSizesAtEnd`
+  /// asks.
   /// @cost Linear in the sources' tiles, each with a lookup near the previous one.
   void refine(std::vector<Container const*> const& sources, TileLists* newTiles, bool setBranchSizesAtEnd);
+  // What throws std::bad_alloc in these four leaves the tree as it was.
   /// Fills the holes of dead tiles. `moves` tells what went where.
   void compact(TileMoves* moves = nullptr);
   /// Reorders the tiles: the tile at index i of depth d goes to perms[d][i]. An empty permutation leaves its
