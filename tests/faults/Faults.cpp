@@ -3,6 +3,7 @@
 #include "vljemalloc/vljemalloc.h"
 
 #include <algorithm>
+#include <array>
 #include <atomic>
 #include <cerrno>
 #include <cstddef>
@@ -47,20 +48,28 @@ public:
 constinit std::atomic<bool> g_spareOpenVdb{false};
 constinit thread_local bool t_looking = false;
 
-/// Whether a function of OpenVDB's stands on the stack. The room's binary exports the names that tell.
+/// Whether code belongs to OpenVDB. The room's binary exports the names that tell. Answers are remembered.
+bool isOpenVdb(void* code) {
+  static constinit std::array<std::atomic<std::uintptr_t>, 1 << 14> known{};
+  auto const address = reinterpret_cast<std::uintptr_t>(code);
+  auto& entry = known[(address * 0x9e3779b97f4a7c15u) >> 50];
+  std::uintptr_t const value = entry.load(std::memory_order_relaxed);
+  if (value >> 1 == address) return value & 1;
+  Dl_info info;
+  bool const found =
+      dladdr(code, &info) && (std::strstr(info.dli_fname, "libopenvdb") ||
+                              (info.dli_sname && (std::strncmp(info.dli_sname, "_ZN7openvdb", 11) == 0 ||
+                                                  std::strncmp(info.dli_sname, "_ZNK7openvdb", 12) == 0)));
+  entry.store(address << 1 | (found ? 1 : 0), std::memory_order_relaxed);
+  return found;
+}
+/// Whether a function of OpenVDB's stands on the stack.
 bool insideOpenVdb() {
   if (t_looking) return true;
   t_looking = true;
   void* frames[100];
   int const count = backtrace(frames, 100);
-  bool found = false;
-  for (int n = 0; n < count && !found; ++n) {
-    Dl_info info;
-    if (!dladdr(frames[n], &info)) continue;
-    found = std::strstr(info.dli_fname, "libopenvdb") ||
-            (info.dli_sname && (std::strncmp(info.dli_sname, "_ZN7openvdb", 11) == 0 ||
-                                std::strncmp(info.dli_sname, "_ZNK7openvdb", 12) == 0));
-  }
+  bool const found = std::any_of(frames, frames + count, &isOpenVdb);
   t_looking = false;
   return found;
 }
