@@ -39,6 +39,13 @@ if(vln_cuda)
 endif()
 set_source_files_properties(src/GeometryVolume/nanovtt/CudaRuntime.cpp PROPERTIES
   COMPILE_DEFINITIONS "VLN_WITH_CUDA=$<BOOL:${vln_cuda}>")
+if(VLN_SANITIZE MATCHES "thread")
+  # See the source: it holds the scheduler's templates, and tells the sanitizer what they hand over.
+  set_source_files_properties(src/GeometryVolume/core/Scheduler.cpp PROPERTIES
+    COMPILE_OPTIONS "-fno-sanitize=thread" COMPILE_DEFINITIONS "VLN_THREAD_NOTES=1")
+  # Threads give way by seed at chosen places: see src/GeometryVolume/core/YieldPointImpl.h.
+  target_compile_definitions(GeometryVolume PUBLIC $<BUILD_INTERFACE:VLN_YIELD_POINTS>)
+endif()
 
 target_compile_features(GeometryVolume PUBLIC cxx_std_20)
 target_include_directories(GeometryVolume PUBLIC

@@ -35,7 +35,13 @@ foreach(room IN LISTS rooms)
   target_compile_definitions(${target} PRIVATE
     "VLN_TEST_DATA_DIR=\"${vln_test_data}\"" "VLN_TEST_ALLOCATOR=\"${VLN_ALLOCATOR}\"")
   target_link_libraries(${target} PRIVATE
-    test_support GeometryVolume TBB::tbb Threads::Threads GTest::gmock GTest::gtest GTest::gtest_main)
+    test_support GeometryVolume TBB::tbb Threads::Threads ${CMAKE_DL_LIBS}
+    GTest::gmock GTest::gtest GTest::gtest_main)
+  if(room STREQUAL "faults" AND TARGET GeometryVolumeInterop)
+    target_link_libraries(${target} PRIVATE GeometryVolumeInterop)
+    target_compile_definitions(${target} PRIVATE VLN_TEST_INTEROP)
+    set_target_properties(${target} PROPERTIES ENABLE_EXPORTS ON) # its stacks are looked at by name
+  endif()
   if(room STREQUAL "interop" OR room STREQUAL "vln")
     target_link_libraries(${target} PRIVATE GeometryVolumeInterop)
     vln_uses_openvdb(${target})

@@ -3,6 +3,7 @@
 #include "GeometryVolume/channels/ElementReTile.h"
 #include "GeometryVolume/core/Numeric.h"
 #include "GeometryVolume/core/Parallel.h"
+#include "GeometryVolume/core/TakenComponent.h"
 #include "GeometryVolume/tiletree/Morton.h"
 #include "GeometryVolume/topology/Command.h"
 
@@ -176,9 +177,13 @@ PointSet pointSetOf(PointVolume const& volume) {
 
 AdvectStatistics advect(PointVolume& volume, Velorn::Math::double3 const& velocity) {
   Object& object = *volume.object;
-  auto tree = object.extractComponent<PointContainer>(kPointContainerName);
-  auto topology = object.extractComponent<PointTopology>(kPointTopologyName);
-  auto positions = object.extractComponent<PositionChannel>(kPositionsName);
+  // They come back whatever is thrown.
+  VLN::Internal::TakenComponent<PointContainer> const takenTree(object, kPointContainerName);
+  VLN::Internal::TakenComponent<PointTopology> const takenTopology(object, kPointTopologyName);
+  VLN::Internal::TakenComponent<PositionChannel> const takenPositions(object, kPositionsName);
+  auto* const tree = &*takenTree;
+  auto* const topology = &*takenTopology;
+  auto* const positions = &*takenPositions;
   auto const step = velocity * (1 / volume.voxelSize);
   positions->cloneData();
   for (int d = 0; d <= kDeepest; ++d) {
@@ -201,9 +206,6 @@ AdvectStatistics advect(PointVolume& volume, Velorn::Math::double3 const& veloci
                                    });
   statistics.tilesGained = grown - before;
   statistics.tilesLost = grown - tree->tileCount(-1);
-  object.putComponent(std::move(tree));
-  object.putComponent(std::move(topology));
-  object.putComponent(std::move(positions));
   return statistics;
 }
 

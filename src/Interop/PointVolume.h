@@ -49,6 +49,7 @@ struct AdvectStatistics {
   std::int64_t tilesGained = 0, tilesLost = 0;
 };
 /// Moves all points by a world vector, and each into its tile; tiles without points go.
+/// @error What re-tiling throws; all components are still there then, but out of step.
 VLN_API AdvectStatistics advect(PointVolume& volume, Velorn::Math::double3 const& velocity);
 
 } // namespace VLN::Interop

@@ -208,19 +208,19 @@ void writeAll(int fd, std::string const& text) {
 
 // Out of memory in the child: an exception would need memory on its way, so the verdict is given at once.
 int verdictEnd = -1;
-std::string memoryVerdict;
+std::string const* memoryVerdict = nullptr;
 void onNoMemory() {
-  writeAll(verdictEnd, memoryVerdict);
+  writeAll(verdictEnd, *memoryVerdict);
   _exit(0);
 }
 
-// The child's whole life. It writes "ok", or the reason why not, and never returns.
-[[noreturn]] void runChild(std::string const& path, VdbReadLimits const& limits, Memory const& start,
-                           int fd) {
+// Writes "ok", or the reason why not.
+void readInChild(std::string const& path, VdbReadLimits const& limits, Memory const& start, int fd,
+                 std::string const& noMemory) {
   // The parent's worker threads do not exist here: loops that OpenVDB runs while it reads or gives up must
   // not wait for them.
   tbb::global_control const alone(tbb::global_control::max_allowed_parallelism, 1);
-  verdictEnd = fd, memoryVerdict = memoryReason(limits.memoryBytes);
+  verdictEnd = fd, memoryVerdict = &noMemory;
   std::set_new_handler(onNoMemory);
   prctl(PR_SET_PDEATHSIG, SIGKILL); // nobody waits for the verdict of an orphan
   // A sanitizer reserves address space by the terabyte; there the parent's watch over resident memory is the
@@ -242,8 +242,38 @@ void onNoMemory() {
     writeAll(fd, "ok");
     _exit(0);
   } catch (...) { writeAll(fd, currentReason(limits.memoryBytes)); }
+}
+
+// The child's whole life. It never returns, whatever is thrown: what left this function would go on as a
+// second copy of the parent.
+// @param noMemory Made before the fork: the child may have no memory for it.
+[[noreturn]] void runChild(std::string const& path, VdbReadLimits const& limits, Memory const& start, int fd,
+                           std::string const& noMemory) noexcept {
+  try {
+    readInChild(path, limits, start, fd, noMemory);
+  } catch (...) { writeAll(fd, noMemory); }
   _exit(0);
 }
+
+// The parent's side. Where watching ends early, by what is thrown, the child ends too.
+struct Child {
+  int end = -1;
+  pid_t process = -1;
+
+  int wait(rusage& usage) {
+    int status = 0;
+    while (wait4(process, &status, 0, &usage) < 0 && errno == EINTR) {}
+    process = -1;
+    return status;
+  }
+  ~Child() {
+    if (end >= 0) close(end);
+    if (process < 0) return;
+    kill(process, SIGKILL);
+    rusage unused;
+    wait(unused);
+  }
+};
 
 // What came of a child.
 struct Verdict {
@@ -298,22 +328,19 @@ VdbReadLimits effective(VdbReadLimits limits, std::uint64_t fileSize) {
 // Reads the file in one child.
 // @return Whether it stalled, and nothing is known of the file.
 bool probeOnce(std::string const& path, VdbReadLimits const& limits, double stallSeconds) {
+  Memory const start = memoryOf("self");
+  std::string const noMemory = memoryReason(limits.memoryBytes);
   int ends[2];
   if (pipe2(ends, O_CLOEXEC) != 0) throw FileError(path, std::string("no pipe: ") + std::strerror(errno));
-  Memory const start = memoryOf("self");
-  pid_t const child = fork();
-  if (child < 0) {
-    int const error = errno;
-    close(ends[0]), close(ends[1]);
-    throw FileError(path, std::string("no process to read it in: ") + std::strerror(error));
-  }
-  if (child == 0) runChild(path, limits, start, ends[1]);
+  Child child{ends[0], fork()};
+  int const error = errno;
+  if (child.process == 0) runChild(path, limits, start, ends[1], noMemory);
   close(ends[1]);
-  Verdict verdict = watchChild(ends[0], child, limits, start, stallSeconds);
-  close(ends[0]);
-  int status = 0;
+  if (child.process < 0)
+    throw FileError(path, std::string("no process to read it in: ") + std::strerror(error));
+  Verdict verdict = watchChild(child.end, child.process, limits, start, stallSeconds);
   rusage usage = {};
-  while (wait4(child, &status, 0, &usage) < 0 && errno == EINTR) {}
+  int const status = child.wait(usage);
   if (verdict.stalled && !verdict.reason) return true;
   // A child that was quicker than the watch; its greatest size is told in kB.
   if (!verdict.reason &&

@@ -12,6 +12,7 @@ namespace {
 using namespace VLN;
 using namespace VLN::TileTree3D;
 using namespace VLN::Test;
+using test::faults::After;
 using test::faults::everyAllocation;
 
 using Points = Channel<PowerOfTwoTraits, int, 4, 0>;
@@ -159,8 +160,9 @@ TEST(ChannelFaults, RequirementCopiesAndArrays) {
     return stateOf(*c.source.channel) + (c.copy ? stateOf(static_cast<Points const&>(*c.copy)) : "") +
            (c.nested ? " arrays" : "");
   };
-  everyAllocation<Copied>("a deep copy", {[] { return Copied(); },
-                                          [](Copied& c) { c.source.channel->copyTo(c.copy); }, state, false});
+  everyAllocation<Copied>(
+      "a deep copy",
+      {[] { return Copied(); }, [](Copied& c) { c.source.channel->copyTo(c.copy); }, state, After::kUsable});
   everyAllocation<Copied>("arrays and back", {[] { return Copied(); },
                                               [](Copied& c) {
                                                 Ostil::Any const type(std::type_index(typeid(int)));

@@ -22,6 +22,7 @@ namespace {
 using namespace VLN;
 using namespace VLN::TileTree3D;
 using namespace VLN::Test;
+using test::faults::After;
 using test::faults::everyAllocation;
 
 using Shape = PowerOfTwoTraits;
@@ -73,7 +74,7 @@ TEST(ObjectFaults, RequirementComponentsComeBack) {
   tree.set(3, 9, 2);
   everyAllocation<Pair>(
       "a dispatched update",
-      {&pairOfChannels, [&](Pair& p) { updateTilesAdded(tree, p.object); }, &stateOfPair, false});
+      {&pairOfChannels, [&](Pair& p) { updateTilesAdded(tree, p.object); }, &stateOfPair, After::kUsable});
   everyAllocation<Pair>("a component is taken out",
                         {&pairOfChannels,
                          [](Pair& p) { auto const a = p.object.extractComponent<Points>("a"); },
@@ -118,7 +119,8 @@ TEST(TreeFaults, RequirementTopologiesAndCopies) {
   };
   everyAllocation<Copied>("a tree is copied",
                           {[] { return Copied(); }, [](Copied& v) { v.tree->copyTo(v.copy); },
-                           [](Copied const& v) { return stateOfVolume(v) + (v.copy ? "+" : ""); }, false});
+                           [](Copied const& v) { return stateOfVolume(v) + (v.copy ? "+" : ""); },
+                           After::kUsable});
 }
 
 /// Text to nowhere: the pools and the logger write while things fail.
@@ -159,7 +161,7 @@ TEST(PoolFaults, RegressionNothingIsLostWhenEntriesGo) {
   };
   everyAllocation<Holder>(
       "idle arrays are freed",
-      {make, [](Holder&) { ArrayPool::freeMemory(std::uint64_t(1) << 60); }, state, false});
+      {make, [](Holder&) { ArrayPool::freeMemory(std::uint64_t(1) << 60); }, state, After::kUsable});
   // It needs no memory at all.
   Holder const h = make();
   test::faults::Armed const armed(1, test::faults::Mode::kFromThenOn);

@@ -17,7 +17,6 @@
 #include <fstream>
 #include <random>
 #include <stdexcept>
-#include <tbb/task_arena.h>
 #include <thread>
 #include <unistd.h>
 
@@ -267,20 +266,22 @@ TEST(PoolFlush, RequirementAFlushReturnsWhileEveryWorkerIsBlocked) {
   std::atomic<bool> release{false};
   std::atomic<int> blocked{0};
   int const workers = std::max(1, VLN::parallelThreads() - 1);
-  tbb::task_arena arena(workers + 1);
-  for (int i = 0; i < 4 * workers; ++i)
-    arena.enqueue([&] {
-      ++blocked;
-      while (!release) std::this_thread::sleep_for(1ms);
+  std::thread blocker([&] {
+    VLN::withThreads(workers + 1, [&] {
+      VLN::parallelFor(0, 4 * (workers + 1), [&](std::int64_t, std::int64_t) {
+        ++blocked;
+        while (!release) std::this_thread::sleep_for(1ms);
+      });
     });
-  while (blocked < workers) std::this_thread::sleep_for(1ms);
+  });
+  while (blocked < workers + 1) std::this_thread::sleep_for(1ms); // the thread of the loop, and all workers
   auto const begin = Clock::now();
   VLN::jemalloc_flushCache();
   auto const took = Clock::now() - begin;
   EXPECT_FALSE(release);
   EXPECT_LT(took, 5s);
   release = true;
-  while (blocked < 4 * workers) std::this_thread::sleep_for(1ms);
+  blocker.join();
 }
 
 TEST_F(ChannelPoolTest, RequirementAFlushUnderTheLockReturnsWhileWorkersWaitForIt) {

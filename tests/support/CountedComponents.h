@@ -4,6 +4,7 @@
 #include "GeometryVolume/core/Component.h"
 #include "Ostil/Ptr.h"
 
+#include <atomic>
 #include <utility>
 #include <vector>
 
@@ -38,7 +39,7 @@ public:
 
 private:
   int m_number;
-  static inline int s_live = 0;
+  static inline std::atomic<int> s_live{0};
 };
 
 /// Another class, for wrong-type lookups.

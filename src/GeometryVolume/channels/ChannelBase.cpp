@@ -2,6 +2,7 @@
 
 #include "GeometryVolume/core/LoggerHooks.h"
 #include "GeometryVolume/core/Streaming.h"
+#include "GeometryVolume/core/YieldPointImpl.h"
 #include "GeometryVolume/tiletree/Traits.h"
 
 #include <algorithm>
@@ -14,12 +15,15 @@ ChannelBase::~ChannelBase() = default;
 
 ChannelBase::Change::Change(ChannelBase const& channel)
     : m_channel(&channel) {
+  VLN_YIELD_POINT();
   channel.m_gate.beginChange();
+  VLN_YIELD_POINT(); // the gate is shut, the logger does not know yet
   objectIncomplete(m_channel);
 }
 ChannelBase::Change::~Change() {
   if (!m_channel) return;
   objectComplete(m_channel);
+  VLN_YIELD_POINT();
   m_channel->m_gate.endChange();
 }
 

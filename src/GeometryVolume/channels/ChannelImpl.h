@@ -11,11 +11,15 @@ Channel<TraitsT, T, E, H>::Channel(Ostil::String const& name, T const* defaultVa
                                    DataElementInitializerType initializer, bool useStaticAllocation,
                                    bool callElementConstructor, int minDepth, int depth)
     : Base(name, Ostil::makePtr<Data>(defaultValue, initializer, useStaticAllocation, callElementConstructor,
-                                      minDepth, depth)) {}
+                                      minDepth, depth)) {
+  objectComplete(this);
+}
 
 template <class TraitsT, class T, int E, int H>
 Channel<TraitsT, T, E, H>::Channel(Channel const& other)
-    : Base(other) {}
+    : Base(other) {
+  objectComplete(this);
+}
 
 template <class TraitsT, class T, int E, int H>
 Channel<TraitsT, T, E, H>& Channel<TraitsT, T, E, H>::operator=(Channel const& other) {
@@ -24,7 +28,9 @@ Channel<TraitsT, T, E, H>& Channel<TraitsT, T, E, H>::operator=(Channel const& o
 }
 
 // Not defaulted: a defaulted destructor cannot be instantiated alone.
-template <class TraitsT, class T, int E, int H> Channel<TraitsT, T, E, H>::~Channel() {}
+template <class TraitsT, class T, int E, int H> Channel<TraitsT, T, E, H>::~Channel() {
+  objectIncomplete(this);
+}
 
 template <class TraitsT, class T, int E, int H>
 void Channel<TraitsT, T, E, H>::copyTo(Ostil::Ptr<VLN::Component>& target) const {

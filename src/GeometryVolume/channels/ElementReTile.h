@@ -31,7 +31,9 @@ using TreeChanged = FunctionRef<void(TileRemovalList const* removed)>;
 /// dropped where there is none.
 /// @pre Tree, topology and channels are in step, and nothing else uses them during the call. `tree`,
 /// `topology` and `positions` are taken out of the object; positions that lie in it are set aside meanwhile.
-/// @error std::runtime_error(VLN::exceptionMessage) when the host cancels the job while the tree grows.
+/// @error std::runtime_error(VLN::exceptionMessage) when the host cancels the job while the tree grows;
+/// std::bad_alloc. Each component is then whole, and the object holds what it held, but tree, topology and
+/// channels may be out of step with each other: give the volume up.
 /// @numeric The result does not depend on the number of threads.
 /// @cost A point that stays costs one multiply, one floor and one comparison an axis.
 template <class TraitsT>

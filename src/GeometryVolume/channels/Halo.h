@@ -52,7 +52,8 @@ constexpr bool isIndexHalo(int a, int b, int c, int d) {
 /// @pre Two channels that have followed `tree`; the layouts (0,0)->(0,0), (0,0)->(0,1), (0,0)->(1,0),
 /// (0,1)->(1,0) and (1,0)->(1,0) exist.
 /// @numeric The same bytes for any number of threads.
-/// @error std::runtime_error(VLN::exceptionMessage) when the host cancels the job.
+/// @error std::runtime_error(VLN::exceptionMessage) when the host cancels the job; std::bad_alloc. Some of
+/// the target's tiles may be filled then; the call can be repeated.
 /// @cost Parallel over the tiles of one depth at a time, coarse to fine.
 template <class TraitsT, class T, int SourceExtended, int SourceHalo, int TargetExtended, int TargetHalo>
 requires(Internal::isPlainHalo(SourceExtended, SourceHalo, TargetExtended, TargetHalo)) void computeHalo(
@@ -64,6 +65,7 @@ requires(Internal::isPlainHalo(SourceExtended, SourceHalo, TargetExtended, Targe
 /// depths, the source's default value.
 /// @pre E = W with (SourceHalo, TargetHalo) one of (0,1), (0,2), (1,1).
 /// @edges A mode outside 0..5 fills nothing. A scale of exactly 1 multiplies nothing.
+/// @error As the form above.
 template <class TraitsT, class T, int E, int SourceHalo, int TargetHalo>
 requires(E == TraitsT::kTDW && TargetHalo >= 1 && SourceHalo + TargetHalo <= 2) void computeHalo(
     HaloMode mode, HaloType type, int firstDepth, int lastDepth,

@@ -24,6 +24,7 @@ namespace VLN::TileTree3D {
 /// coordinate is limited to the last sample.
 /// @pre The layouts E = W with no halo or one layer, and E = W + 1.
 /// @numeric The same bytes for any number of threads.
+/// @error std::bad_alloc; some samples may have been copied then, and the call can be repeated.
 /// @cost Parallel over the tiles of one depth at a time.
 template <class TraitsT, class T, int E, int H>
 void setNonLeafValueToChildValue(Channel<TraitsT, T, E, H>& channel, Container<TraitsT> const& tree,

@@ -9,6 +9,7 @@
 #include "GeometryVolume/core/Const.h"
 #include "GeometryVolume/core/LoggerHooks.h"
 #include "GeometryVolume/core/Parallel.h"
+#include "GeometryVolume/core/YieldPointImpl.h"
 
 #include <algorithm>
 #include <limits>
@@ -22,7 +23,6 @@ TypedChannel<T>::TypedChannel(Ostil::String const& name, Ostil::Ptr<ChannelData<
     , m_data(std::move(data)) {
   replaceEmptyName();
   pointerAllocated(dataPtr(), this);
-  objectComplete(this);
 }
 
 template <class T>
@@ -32,7 +32,6 @@ TypedChannel<T>::TypedChannel(TypedChannel const& other)
   pointerAllocated(dataPtr(), this);
   replaceEmptyName();
   write([](ChannelData<T>&) {});
-  objectComplete(this);
 }
 
 template <class T> TypedChannel<T>& TypedChannel<T>::operator=(TypedChannel const& other) {
@@ -45,10 +44,7 @@ template <class T> TypedChannel<T>& TypedChannel<T>::operator=(TypedChannel cons
   return *this;
 }
 
-template <class T> TypedChannel<T>::~TypedChannel() {
-  objectIncomplete(this);
-  pointerDeAllocated(dataPtr(), this);
-}
+template <class T> TypedChannel<T>::~TypedChannel() { pointerDeAllocated(dataPtr(), this); }
 
 template <class T> void TypedChannel<T>::replaceEmptyName() {
   if (name().empty()) setName(Const::TileTreeChannelName);
@@ -73,6 +69,7 @@ template <class T> void TypedChannel<T>::write(FunctionRef<void(ChannelData<T>&)
 
 template <class T> void TypedChannel<T>::ownData() {
   if (!m_data || m_data.unique()) return;
+  VLN_YIELD_POINT(); // the other holder may go, or write, meanwhile
   // The handle is given up when its copy exists, not before.
   Ostil::MutablePtr<ChannelData<T>> own{Ostil::Ptr<ChannelData<T>>(m_data)};
   m_data = std::move(own);

@@ -2,7 +2,8 @@
 
 #include "GeometryVolume/core/FunctionRef.h"
 #include "GeometryVolume/core/Parallel.h"
-#include "GeometryVolume/core/TakenComponentImpl.h"
+#include "GeometryVolume/core/TakenComponent.h"
+#include "GeometryVolume/core/YieldPointImpl.h"
 
 #include <vector>
 
@@ -19,6 +20,7 @@ public:
     for (auto const& name : object.componentRange())
       if (belongs(object.component<ChannelBase>(name), tree)) names.push_back(name);
     m_channels.reserve(names.size());
+    VLN_YIELD_POINT(); // they are known, and not taken yet
     for (auto const& name : names) m_channels.emplace_back(object, name);
   }
 
@@ -26,7 +28,10 @@ public:
     auto const n = static_cast<std::int64_t>(m_channels.size());
     if (n == 1) return body(*m_channels.front());
     parallelFor(0, n, [&](std::int64_t begin, std::int64_t end) {
-      for (auto i = begin; i < end; ++i) body(*m_channels[static_cast<std::size_t>(i)]);
+      for (auto i = begin; i < end; ++i) {
+        VLN_YIELD_POINT();
+        body(*m_channels[static_cast<std::size_t>(i)]);
+      }
     });
   }
 

@@ -2,7 +2,7 @@
 
 #include "GeometryVolume/channels/ChannelBase.h"
 #include "GeometryVolume/channels/UpdateDispatch.h"
-#include "GeometryVolume/core/TakenComponentImpl.h"
+#include "GeometryVolume/core/TakenComponent.h"
 #include "GeometryVolume/topology/PointTopology.h"
 #include "GeometryVolume/topology/VoxelTopology.h"
 

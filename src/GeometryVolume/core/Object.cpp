@@ -1,6 +1,6 @@
 #include "GeometryVolume/core/Object.h"
 
-#include "GeometryVolume/core/TakenComponentImpl.h"
+#include "GeometryVolume/core/TakenComponent.h"
 
 #include <utility>
 

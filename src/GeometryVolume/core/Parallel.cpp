@@ -1,78 +1,16 @@
 #include "GeometryVolume/core/Parallel.h"
 
-#include "Ostil/Job.h"
-#include "Velorn/ExceptionMessage.h"
+#include "GeometryVolume/core/ThreadNotesImpl.h"
 
 #include <array>
-#include <atomic>
 #include <limits>
-#include <optional>
-#include <stdexcept>
-#include <tbb/blocked_range.h>
-#include <tbb/global_control.h>
-#include <tbb/parallel_for.h>
-#include <tbb/parallel_sort.h>
-#include <tbb/partitioner.h>
-#include <tbb/task_arena.h>
 #include <utility>
+#if !VLN_THREAD_NOTES
+#include <tbb/parallel_sort.h>
+#include <tbb/task_arena.h>
+#endif
 
 namespace VLN {
-
-struct AffinityPartitioner::Impl {
-  tbb::affinity_partitioner partitioner;
-};
-
-AffinityPartitioner::AffinityPartitioner()
-    : m_impl(std::make_unique<Impl>()) {}
-AffinityPartitioner::~AffinityPartitioner() = default;
-
-namespace {
-
-using Range = tbb::blocked_range<std::int64_t>;
-
-/// Polls the host before a chunk and remembers that a chunk was left out.
-class CancelGuard {
-public:
-  explicit CancelGuard(Cancellation mode)
-      : m_poll(mode == Cancellation::kPoll) {}
-  bool stop() {
-    if (!m_poll) return false;
-    if (m_cancelled.load(std::memory_order_relaxed)) return true;
-    if (!Ostil::isJobCancelled()) return false;
-    m_cancelled.store(true, std::memory_order_relaxed);
-    return true;
-  }
-  void throwIfCancelled() const {
-    if (m_cancelled.load(std::memory_order_relaxed)) throw std::runtime_error(exceptionMessage);
-  }
-
-private:
-  bool m_poll;
-  std::atomic<bool> m_cancelled{false};
-};
-
-} // namespace
-
-void parallelFor(std::int64_t begin, std::int64_t end, RangeBody body, ParallelOptions options) {
-  if (begin >= end) return;
-  CancelGuard guard(options.cancellation);
-  std::int64_t const grain = std::max<std::int64_t>(1, options.grain);
-  if (end - begin <= grain) {
-    if (!guard.stop()) body(begin, end);
-  } else {
-    auto const chunk = [&](Range const& r) {
-      if (!guard.stop()) body(r.begin(), r.end());
-    };
-    Range const range(begin, end, static_cast<std::size_t>(grain));
-    tbb::this_task_arena::isolate([&] {
-      if (options.affinity)
-        tbb::parallel_for(range, chunk, options.affinity->impl().partitioner);
-      else
-        tbb::parallel_for(range, chunk);
-    });
-  }
-  guard.throwIfCancelled();
-}
 
 void parallelChunks(std::int64_t begin, std::int64_t end, std::int64_t grain,
                     FunctionRef<void(std::int64_t, std::int64_t, std::int64_t)> body,
@@ -90,13 +28,30 @@ void parallelChunks(std::int64_t begin, std::int64_t end, std::int64_t grain,
       options);
 }
 
+namespace {
+
+template <class T, class Less> void sortAll(T* first, T* last, Less const& less) {
+#if VLN_THREAD_NOTES
+  // The scheduler's sort hands ranges from thread to thread out of sight. Halves keep the comparisons side by
+  // side.
+  T* const middle = first + (last - first) / 2;
+  parallelFor(0, 2, [&](std::int64_t begin, std::int64_t end) {
+    if (begin == 0) std::sort(first, middle, less);
+    if (end == 2) std::sort(middle, last, less);
+  });
+  std::inplace_merge(first, middle, last, less);
+#else
+  tbb::this_task_arena::isolate([&] { tbb::parallel_sort(first, last, less); });
+#endif
+}
+
+} // namespace
+
 void parallelSortPositions(std::uint64_t* order, std::int64_t n,
                            FunctionRef<bool(std::uint64_t, std::uint64_t)> less) {
-  tbb::this_task_arena::isolate([&] {
-    tbb::parallel_sort(order, order + n, [&](std::uint64_t a, std::uint64_t b) {
-      if (less(a, b)) return true;
-      return !less(b, a) && a < b;
-    });
+  sortAll(order, order + n, [&](std::uint64_t a, std::uint64_t b) {
+    if (less(a, b)) return true;
+    return !less(b, a) && a < b;
   });
 }
 
@@ -150,7 +105,7 @@ void parallelSort(SortRecord* records, std::int64_t n) {
   }
   if (sorted) return;
   if (!valuesRise || n > std::numeric_limits<std::uint32_t>::max()) {
-    tbb::this_task_arena::isolate([&] { tbb::parallel_sort(records, records + n, less); });
+    sortAll(records, records + n, less);
     return;
   }
   // Digit by digit from the lowest: linear. Digits in which no two records differ are left out.
@@ -164,23 +119,6 @@ void parallelSort(SortRecord* records, std::int64_t n) {
     }
   }
   if (from != records) std::copy_n(from, n, records);
-}
-
-void withThreads(int threads, FunctionRef<void()> body) {
-  // More threads than the machine has are given too: the scheduler's own limit would leave them out.
-  using Control = tbb::global_control;
-  auto const wanted = static_cast<std::size_t>(std::max(threads, 1));
-  std::optional<Control> limit;
-  if (wanted > Control::active_value(Control::max_allowed_parallelism))
-    limit.emplace(Control::max_allowed_parallelism, wanted);
-  tbb::task_arena arena(threads);
-  arena.execute([&] { body(); });
-}
-
-int parallelThreads() { return tbb::this_task_arena::max_concurrency(); }
-int parallelThreadIndex() {
-  int const index = tbb::this_task_arena::current_thread_index();
-  return index < 0 ? 0 : index;
 }
 
 } // namespace VLN

@@ -67,7 +67,8 @@ namespace nanovtt {
 /// @return An empty handle for an object without these components, and for a tree with roots deeper than the
 /// depth of the root table, which standard error then tells. Options that exclude each other are turned off,
 /// which standard error tells as well.
-/// @error std::runtime_error when a buffer cannot be had, and VLN::exceptionMessage for a cancelled job.
+/// @error std::runtime_error when a buffer cannot be had, and VLN::exceptionMessage for a cancelled job;
+/// std::bad_alloc. What was drawn from a pool stays drawn.
 /// @numeric The same bytes for any number of threads.
 /// @cost Linear in tiles and samples; parallel. Beside the buffers, 8 bytes for each tile that may have
 /// children, 4 for each tile where some have halos, and for FpN 20 for each tile.

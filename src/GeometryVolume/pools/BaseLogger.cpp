@@ -2,6 +2,7 @@
 
 #include "GeometryVolume/core/Base.h"
 #include "GeometryVolume/core/LoggerHooks.h"
+#include "GeometryVolume/core/YieldPointImpl.h"
 #include "GeometryVolume/pools/BaseLoggerImpl.h"
 #include "GeometryVolume/pools/PoolLogImpl.h"
 
@@ -89,6 +90,7 @@ class HookLock {
 public:
   explicit HookLock(State& s)
       : m_lock(s.mutex, std::defer_lock) {
+    VLN_YIELD_POINT();
     std::lock_guard const gate(s.gate);
     m_lock.lock();
   }
@@ -102,7 +104,9 @@ public:
   explicit WalkLock(State& s)
       : m_lock(s.mutex, std::defer_lock) {
     if (t_walk) return;
+    VLN_YIELD_POINT();
     std::lock_guard const gate(s.gate);
+    VLN_YIELD_POINT(); // hooks that come later wait, those that are in go on
     m_lock.lock();
     t_walk = &m_walk;
   }
@@ -191,6 +195,7 @@ void baseBuilt(Base const* base) {
       auto const ticks = std::chrono::steady_clock::now().time_since_epoch().count();
       BaseMap::accessor entry;
       bool const isNew = s.baseMap.insert(entry, base);
+      VLN_YIELD_POINT(); // it can be found, and says nothing yet
       entry->second = Record{ticks, number, base, 0, false, maker, name};
       count(isNew ? Internal::kAllocOK : Internal::kAllocNotOK);
     });
@@ -254,6 +259,7 @@ void accountBlock(void const* block, Base const* owner, Ostil::String const& nam
       passesVoxelTest(name) && name != Internal::kTreeName && name != "voxel_signed_distance";
   // Counting walks the maps, so it must not lie inside the lock that the insertion takes.
   std::int32_t const before = watched ? BaseLogger::numberOfActiveCopies(name) : 0;
+  VLN_YIELD_POINT();
   bool const isNew = addOwner(s, block, owner);
   count(Internal::kVoidAllocOK);
   bool const rose = watched && BaseLogger::numberOfActiveCopies(name) > before;
@@ -279,6 +285,7 @@ int removeOwner(void const* block, Base const* owner) {
   HookLock const lock(s);
   PointerMap::accessor entry;
   if (!s.pointerMap.find(entry, block)) return 1;
+  VLN_YIELD_POINT();
   Owners& owners = entry->second;
   auto const at = std::find(owners.begin(), owners.end(), owner);
   if (at == owners.end()) return 2;
@@ -313,6 +320,7 @@ std::pair<bool, bool> moveOwners(void const* from, void const* to) {
     owners = entry->second;
     s.pointerMap.erase(entry);
   }
+  VLN_YIELD_POINT(); // neither block is known
   return {true, s.pointerMap.emplace(to, std::move(owners))};
 }
 
@@ -429,6 +437,7 @@ std::map<Ostil::String, NameSummary> summarizeNames() {
     bool const gone = t_walk->destroyed.contains(base);
     bool const known = record.announced || record.maker == std::this_thread::get_id();
     if (!gone && known && record.incomplete == 0) {
+      VLN_YIELD_POINT(); // the object must not go before it has told its size
       try {
         base->memUse(used, allocated, false);
       } catch (...) { used = allocated = sizeof(Base); }

@@ -1,16 +1,12 @@
 #include "GeometryVolume/pools/Jemalloc.h"
 
+#include "GeometryVolume/core/WorkersImpl.h"
 #include "vljemalloc/vljemalloc.h"
 
 #include <atomic>
-#include <chrono>
 #include <exception>
 #include <mutex>
 #include <sstream>
-#include <tbb/parallel_for.h>
-#include <tbb/partitioner.h>
-#include <tbb/task_arena.h>
-#include <tbb/task_group.h>
 #include <thread>
 
 namespace VLN {
@@ -22,39 +18,11 @@ std::atomic<bool> g_flushing{false};
 
 void flushOwnCache() { vlje_mallctl("thread.tcache.flush", nullptr, nullptr, nullptr, 0); }
 
-/// How long the workers may leave the task lying.
-constexpr std::chrono::milliseconds kPatience(10);
-
-/// A cache can be flushed by its own thread only: spread one flush over each worker. Workers that all wait
-/// for a lock which the flushing thread holds never come for the task: after a while this thread runs it
-/// itself.
-void flushEachWorker() {
-  int const threads = tbb::this_task_arena::max_concurrency();
-  if (threads < 2) return;
-  tbb::task_arena arena(threads, 1);
-  arena.initialize();
-  arena.execute([&] {
-    std::atomic<bool> done{false};
-    tbb::task_group group;
-    group.run([&] {
-      tbb::parallel_for(
-          0, threads - 1, 1, [](int) { flushOwnCache(); }, tbb::simple_partitioner());
-      done.store(true, std::memory_order_release);
-    });
-    auto const until = std::chrono::steady_clock::now() + kPatience;
-    while (!done.load(std::memory_order_acquire) && std::chrono::steady_clock::now() < until)
-      std::this_thread::yield();
-    group.wait();
-  });
-  vlje_mallctl("arenas.purge", nullptr, nullptr, nullptr, 0);
-  arena.terminate();
-}
-
 /// Caches are flushed when memory is short, so that there may be none for the flushing itself: then they stay
 /// as they are.
 void flushWorkers() noexcept {
   try {
-    flushEachWorker();
+    if (Internal::runOnEachWorker(&flushOwnCache)) vlje_mallctl("arenas.purge", nullptr, nullptr, nullptr, 0);
   } catch (...) {}
 }
 

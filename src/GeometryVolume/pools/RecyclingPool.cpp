@@ -1,5 +1,7 @@
 #include "GeometryVolume/pools/RecyclingPoolImpl.h"
 
+#include "GeometryVolume/core/YieldPointImpl.h"
+
 #include <algorithm>
 #include <chrono>
 #include <limits>
@@ -32,7 +34,9 @@ std::uint64_t saturatingMultiply(std::uint64_t a, std::uint64_t b) {
 }
 
 RecyclingPool::CrossingLock::CrossingLock() {
+  VLN_YIELD_POINT();
   poolMutex(Kind::kArrays).lock();
+  VLN_YIELD_POINT(); // one of the two is held
   poolMutex(Kind::kChannels).lock();
 }
 RecyclingPool::CrossingLock::~CrossingLock() {
@@ -228,10 +232,12 @@ RecyclingPool::Entry RecyclingPool::bestFit(std::size_t store, std::uint64_t n,
       if (better) best = &entry, c = e;
     }
   }
+  VLN_YIELD_POINT(); // holders may let entries go, and copy what they hold
   return best ? *best : nullptr;
 }
 
 void RecyclingPool::settle(std::size_t store, Entry const& entry, bool intoPool) {
+  VLN_YIELD_POINT();
   Store& entries = m_stores[store];
   auto at =
       std::find_if(entries.begin(), entries.end(), [&](Held const& held) { return held.entry == entry; });
@@ -346,6 +352,7 @@ bool RecyclingPool::freeMemory(std::uint64_t requested, std::uint64_t physicalBe
   }
 
   auto candidates = idleEntries();
+  VLN_YIELD_POINT(); // an idle entry may be taken by who holds it in another way
   bool success = false;
   for (int tries = 1; !candidates.empty() && !success; ++tries) {
     log("Attempting freeing of memory, try #", tries);
@@ -360,6 +367,7 @@ bool RecyclingPool::freeMemory(std::uint64_t requested, std::uint64_t physicalBe
       candidates.erase(smallest);
     }
     log(" removing ", addresses.size(), " ", m_noun, " of total size ", toMB(taken), "MB");
+    VLN_YIELD_POINT();
     dropIdle(addresses);
     success = enoughAfterTry(need);
   }

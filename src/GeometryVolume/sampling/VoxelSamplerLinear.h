@@ -25,6 +25,7 @@ extern VLN_API int const kCacheSizeCoarserLevels;
 
 /// Refers to the volume, which must outlive it. A change of the tree or of the channel's values leaves what
 /// the caches hold behind: make a new sampler then.
+/// @error std::bad_alloc where a cache is to be filled; the sampler works on afterwards.
 /// @pre The channel has followed the container.
 template <class TraitsT, class Value, int Components, class Real, class Position, int, int>
 class VLN_API VoxelSamplerLinear : public VoxelSampler<TraitsT, Real, Position> {

@@ -57,10 +57,10 @@ Container<TraitsT>::Container(Container const& other)
 
 template <class TraitsT> Container<TraitsT>& Container<TraitsT>::operator=(Container const& other) {
   if (this == &other) return *this;
+  auto data = Ostil::makePtr<Data>(*other.m_data);
   ObjectChange const change(this);
   Component::operator=(other);
-  m_data = other.m_data;
-  cloneData();
+  m_data = std::move(data);
   return *this;
 }
 
@@ -214,7 +214,7 @@ template <class TraitsT>
 void Container<TraitsT>::reduce(VisitorType& visitor, TraversalMode mode, TraversalRange const& range) {
   TraversalEngine<false, TraitsT>::run(*this, visitor, mode, range, VisitorResults::kJoin);
 }
-template <class TraitsT> void Container<TraitsT>::setBranchSizes() {
+template <class TraitsT> void Container<TraitsT>::setBranchSizes(Cancellation cancellation) {
   // What a bottom-up traversal would do, as one loop over each array: nothing but sums of children.
   Canceller::cancelID(Canceller::kTraverse);
   m_data->detachTiles();
@@ -238,7 +238,7 @@ template <class TraitsT> void Container<TraitsT>::setBranchSizes() {
                     if (t.branchSize() != size) t.setBranchSize(size);
                   }
                 },
-                {.grain = 1024, .cancellation = Cancellation::kPoll});
+                {.grain = 1024, .cancellation = cancellation});
     Canceller::cancelID(Canceller::kTraverse);
   }
 }
@@ -254,7 +254,12 @@ template <class TraitsT> bool Container<TraitsT>::checkConsistency(bool verbose)
 template <class TraitsT> void Container<TraitsT>::buildAccessorAccelerationStructure(int maxDepth) {
   // First: where no depth qualifies, an older grid must not stay.
   clearAccessorAccelerationStructure();
-  buildAccelerationGrid(*this, *m_data, maxDepth);
+  try {
+    buildAccelerationGrid(*this, *m_data, maxDepth);
+  } catch (...) {
+    clearAccessorAccelerationStructure();
+    throw;
+  }
 }
 template <class TraitsT> void Container<TraitsT>::precomputeTileNeighbors() {
   m_data->m_neighbors = computeTileNeighbors(*this);

@@ -156,7 +156,8 @@ public:
   /// Whether the records of the tree agree with each other. The verbose form reports on standard error.
   bool checkConsistency(bool verbose) const;
 
-  // Derived caches: built on demand, dropped by every change of the tree
+  // Derived caches: built on demand, dropped by every change of the tree. Where one finds no memory it is not
+  // built: the grid is off, the tables are those of before.
   /// Dense grid of tile indices for fast entry: at the deepest depth up to `maxDepth` whose tiles span at
   /// most 64 cells on each axis. @cost Linear in the tiles of the depths tried.
   void buildAccessorAccelerationStructure(int maxDepth);
@@ -182,9 +183,11 @@ public:
   /// @param newTiles If given, the corner of every tile made is appended to the list of its depth.
   /// @param setBranchSizesAtEnd Else branch sizes are stale afterwards.
   /// @error std::runtime_error(VLN::exceptionMessage) when the host cancels the job; the depths finished so
-  /// far stay.
+  /// far stay. So they do with std::bad_alloc, and branch sizes are right then where `setBranchSizesAtEnd`
+  /// asks.
   /// @cost Linear in the sources' tiles, each with a lookup near the previous one.
   void refine(std::vector<Container const*> const& sources, TileLists* newTiles, bool setBranchSizesAtEnd);
+  // What throws std::bad_alloc in these four leaves the tree as it was.
   /// Fills the holes of dead tiles. `moves` tells what went where.
   void compact(TileMoves* moves = nullptr);
   /// Reorders the tiles: the tile at index i of depth d goes to perms[d][i]. An empty permutation leaves its
@@ -252,6 +255,8 @@ protected:
   /// Hangs `child` below `parent`, making the tiles between; returns the size of the branch that the parent
   /// gained, 0 when it went below an existing child.
   std::int64_t insertChild(TreeIndex parent, TreeIndex child);
+  /// A tile below an existing one, with those between.
+  TreeIndex addTileBelow(TreeIndex above, int i, int j, int k, int depth);
   /// A new live tile without parent at the aligned corner.
   TreeIndex makeTile(int i, int j, int k, int depth);
   std::int64_t allocateTile(int depth, TileType*& out);
@@ -266,7 +271,7 @@ protected:
   void tilesAdded();
   /// Drops them after tiles went; `moves` names, for each depth, what compaction did.
   void tilesRemoved(TileMoves const* moves);
-  void setBranchSizes();
+  void setBranchSizes(Cancellation cancellation = Cancellation::kPoll);
   void refineInternal(Container const& source, bool last, TileLists* newTiles);
   /// Removes one tile or its branch. A root without its branch goes only when no two of its children are
   /// adjacent; another tile always goes with its branch. Dead and unknown tiles are left alone.
@@ -283,11 +288,15 @@ protected:
   int decrementAffinityPartitionerUseCount() const { return m_data->m_affinityUseCount.fetch_sub(1); }
 
 private:
+  class Growth;
+
   /// A new tile without parent: a root, or one that hangs below a coarser tile with tiles between.
   struct Unlinked {
     std::int64_t index;
     TreeIndex above;
   };
+  /// A tile where there is none above.
+  TreeIndex addRootTile(int i, int j, int k, int depth, Growth& growth);
   /// Grows a depth by `n` tiles, of which the caller runs makeAt() for each index.
   void allocateForMaking(int depth, std::int64_t n);
   /// Makes the tile of a new index and links it to its parent, when that is known (not -1) or found.
@@ -296,14 +305,20 @@ private:
   bool makeAt(std::int64_t index, int depth, int3 const& corner, std::int64_t parent,
               ConstTileAccessor const& accessor, Unlinked& unlinked);
   /// Links what makeAt() could not, and lists what is new since the counts were `before`.
-  void finishMaking(int depth, std::vector<std::vector<Unlinked>> const& parts, Counts const& before,
+  void finishMaking(int depth, std::vector<std::vector<Unlinked>> const& parts, Growth& growth,
                     TileLists* newTiles);
   /// Appends the corners of all tiles made since the counts were `before`.
   void listNewTiles(Counts const& before, TileLists* newTiles) const;
   /// Hangs roots deeper than `depth` below roots of `depth` that hold them.
-  void adoptDeeperRoots(int depth);
+  void adoptDeeperRoots(int depth, Growth& growth);
+  /// Adds the tiles of a branch to the counts of their depths, until `budget` of them are counted.
+  void countBranch(TreeIndex const& at, Counts& counts, std::int64_t& budget) const;
   /// Takes a tile or its branch out of the tree; returns how many tiles died.
-  std::int64_t unlinkTile(TreeIndex const& at, bool withBranch, TileIndexLists& removed);
+  /// @param removed With room for what dies. @param spareRoots With room for each child that becomes a root.
+  std::int64_t unlinkTile(TreeIndex const& at, bool withBranch, TileIndexLists& removed, Roots& spareRoots);
+  std::int64_t invalidateBranch(TreeIndex const& at, TileIndexLists& removed);
+  /// Room in `moves` for each entry of `lists`, so that compact() needs no memory.
+  static void reserveMoves(TileIndexLists const& lists, TileMoves& moves);
   void compact(TileIndexLists& lists, TileMoves& moves);
   void truncate(int depth);
   void returnThreadLocal(int fromDepth);

@@ -5,7 +5,7 @@
 // between are added from the bottom up, and all are made from the top down.
 #pragma once
 
-#include "GeometryVolume/tiletree/Container.h"
+#include "GeometryVolume/tiletree/ContainerGrowthImpl.h"
 #include "GeometryVolume/tiletree/Morton.h"
 
 #include <algorithm>
@@ -148,10 +148,10 @@ void Container<TraitsT>::addTilesInBulk(TileLists const& corners, TileLists* new
   tilesAdded();
   Internal::WantedTiles<TraitsT> wanted(corners);
   wanted.addBetween(*this);
-  if (wanted.domain()) {
-    Counts const before = m_data->m_tileCounts;
-    addTile(kMinTileCoord, kMinTileCoord, kMinTileCoord, 0);
-    listNewTiles(before, newTiles);
+  Growth growth(*this, newTiles);
+  if (wanted.domain() && !tileIndex(kMinTileCoord, kMinTileCoord, kMinTileCoord, 0).valid()) {
+    addRootTile(kMinTileCoord, kMinTileCoord, kMinTileCoord, 0, growth);
+    listNewTiles(growth.before(), newTiles);
   }
   constexpr std::int64_t kGrain = 128;
   for (int d = 1; d <= kMaxDepth; ++d) {
@@ -223,9 +223,10 @@ void Container<TraitsT>::addTilesInBulk(TileLists const& corners, TileLists* new
     for (auto const& part : roots) {
       for (std::int64_t const index : part) addRoot(tile(index, d)), anyRoot = true;
     }
-    if (anyRoot) adoptDeeperRoots(d);
+    if (anyRoot) adoptDeeperRoots(d, growth);
     listNewTiles(before, newTiles);
   }
+  growth.keep();
   setBranchSizes();
 }
 

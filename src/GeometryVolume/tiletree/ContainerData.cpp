@@ -49,8 +49,10 @@ template <class TraitsT> void ContainerData<TraitsT>::linkArrays() {
 }
 
 template <class TraitsT> void ContainerData<TraitsT>::cloneTiles() {
-  if (!m_tiles.unique()) m_tiles = Ostil::makePtr<UpperArrays>(*m_tiles);
+  // Both or neither: the table of arrays must not lead to one that is another's.
+  auto upper = m_tiles.unique() ? m_tiles : Ostil::makePtr<UpperArrays>(*m_tiles);
   if (!m_tilesMaxDepth.unique()) m_tilesMaxDepth = Ostil::makePtr<Array>(*m_tilesMaxDepth);
+  m_tiles = std::move(upper);
   linkArrays();
 }
 

@@ -2,7 +2,7 @@
 #pragma once
 
 #include "GeometryVolume/core/Canceller.h"
-#include "GeometryVolume/tiletree/Container.h"
+#include "GeometryVolume/tiletree/ContainerGrowthImpl.h"
 #include "Ostil/Job.h"
 #include "Velorn/ExceptionMessage.h"
 
@@ -83,7 +83,7 @@ bool Container<TraitsT>::makeAt(std::int64_t index, int depth, int3 const& p, st
 
 template <class TraitsT>
 void Container<TraitsT>::finishMaking(int depth, std::vector<std::vector<Unlinked>> const& parts,
-                                      Counts const& before, TileLists* newTiles) {
+                                      Growth& growth, TileLists* newTiles) {
   bool anyRoot = false;
   for (auto const& part : parts) {
     for (Unlinked const& made : part) {
@@ -93,8 +93,8 @@ void Container<TraitsT>::finishMaking(int depth, std::vector<std::vector<Unlinke
         addRoot(tile(made.index, depth)), anyRoot = true;
     }
   }
-  if (anyRoot) adoptDeeperRoots(depth);
-  listNewTiles(before, newTiles);
+  if (anyRoot) adoptDeeperRoots(depth, growth);
+  listNewTiles(growth.before(), newTiles);
 }
 
 template <class TraitsT>
@@ -105,22 +105,23 @@ void Container<TraitsT>::listNewTiles(Counts const& before, TileLists* newTiles)
   }
 }
 
-template <class TraitsT> void Container<TraitsT>::adoptDeeperRoots(int depth) {
+template <class TraitsT> void Container<TraitsT>::adoptDeeperRoots(int depth, Growth& growth) {
   bool deeper = false;
   for (int d = depth + 1; d <= kMaxDepth; ++d) deeper |= rootCount(d) > 0;
   if (!deeper) return;
   // Roots never overlap, so a root of this depth that holds a deeper one is new.
-  std::vector<std::pair<TreeIndex, TreeIndex>> adoptions;
-  for (auto const& [at, index] : m_data->m_roots) {
+  auto& roots = m_data->m_roots;
+  std::vector<std::pair<TreeIndex, typename Roots::iterator>> adoptions;
+  for (auto root = roots.begin(); root != roots.end(); ++root) {
+    VoxelCoord const& at = root->first;
     if (at.depth <= depth) continue;
-    auto const above = m_data->m_roots.find(
+    auto const above = roots.find(
         {TraitsT::align(at.i, depth), TraitsT::align(at.j, depth), TraitsT::align(at.k, depth), depth});
-    if (above != m_data->m_roots.end()) adoptions.emplace_back(above->second, index);
+    if (above != roots.end()) adoptions.emplace_back(above->second, root);
   }
-  for (auto const& [parent, child] : adoptions) {
-    removeRoot(tile(child));
-    insertChild(parent, child);
-  }
+  growth.reserve(adoptions.size());
+  for (auto const& [parent, root] : adoptions) insertChild(parent, root->second);
+  for (auto const& adoption : adoptions) growth.adopt(adoption.second);
 }
 
 template <class TraitsT>
@@ -166,7 +167,7 @@ void Container<TraitsT>::refineInternal(Container const& source, bool last, Tile
       std::int64_t next = tileCount(d);
       for (std::int64_t& start : starts) next += std::exchange(start, next);
       if (next > tileCount(d)) {
-        Counts const before = m_data->m_tileCounts;
+        Growth growth(*this, newTiles);
         allocateForMaking(d, next - tileCount(d));
         std::vector<std::vector<Unlinked>> parts(starts.size());
         auto const make = [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
@@ -181,8 +182,9 @@ void Container<TraitsT>::refineInternal(Container const& source, bool last, Tile
             here[static_cast<std::size_t>(n)] = index++;
           }
         };
-        Internal::refinePass(count, make, next - before[static_cast<std::size_t>(d)]);
-        finishMaking(d, parts, before, newTiles);
+        Internal::refinePass(count, make, next - growth.before()[static_cast<std::size_t>(d)]);
+        finishMaking(d, parts, growth, newTiles);
+        growth.keep();
       }
       Internal::refineCheckpoint();
       above.swap(here);
@@ -194,8 +196,13 @@ void Container<TraitsT>::refineInternal(Container const& source, bool last, Tile
 template <class TraitsT>
 void Container<TraitsT>::refine(std::vector<Container const*> const& sources, TileLists* newTiles,
                                 bool setBranchSizesAtEnd) {
-  for (std::size_t n = 0; n < sources.size(); ++n)
-    refineInternal(*sources[n], setBranchSizesAtEnd && n + 1 == sources.size(), newTiles);
+  try {
+    for (std::size_t n = 0; n < sources.size(); ++n)
+      refineInternal(*sources[n], setBranchSizesAtEnd && n + 1 == sources.size(), newTiles);
+  } catch (std::bad_alloc const&) {
+    if (setBranchSizesAtEnd) setBranchSizes(Cancellation::kSuppress);
+    throw;
+  }
 }
 
 } // namespace VLN::TileTree3D

@@ -7,32 +7,12 @@
 #include "GeometryVolume/tiletree/Container.h"
 #include "GeometryVolume/tiletree/Morton.h"
 
+#include <utility>
+#include <vector>
+
 namespace VLN::TileTree3D {
 
 namespace Internal {
-
-/// Records the tiles of a branch and invalidates each after its children.
-template <class TraitsT> class RemoveTileVisitor final : public Visitor<Container<TraitsT>> {
-public:
-  using TileType = typename Container<TraitsT>::TileType;
-
-  explicit RemoveTileVisitor(TileIndexLists& removed)
-      : m_removed(removed) {
-    this->setBeginTileOverridden(false);
-  }
-  using Visitor<Container<TraitsT>>::endTile;
-  void endTile(TileType& tile) override {
-    m_removed[static_cast<std::size_t>(tile.depth())].push_back(tile.index());
-    tile.invalidate();
-    ++m_count;
-  }
-  RemoveTileVisitor* clone() const override { return new RemoveTileVisitor(m_removed); }
-  std::int64_t count() const { return m_count; }
-
-private:
-  TileIndexLists& m_removed;
-  std::int64_t m_count = 0;
-};
 
 /// Whether two occupied slots lie within one step of each other on each axis.
 template <class TileType> bool hasAdjacentChildren(TileType const& tile) {
@@ -48,10 +28,31 @@ template <class TileType> bool hasAdjacentChildren(TileType const& tile) {
 } // namespace Internal
 
 template <class TraitsT>
-std::int64_t Container<TraitsT>::unlinkTile(TreeIndex const& at, bool withBranch, TileIndexLists& removed) {
+void Container<TraitsT>::countBranch(TreeIndex const& at, Counts& counts, std::int64_t& budget) const {
+  if (--budget < 0) return;
+  ++counts[static_cast<std::size_t>(at.depth)];
+  TileType const& t = tile(at);
+  if (t.atMaxDepth()) return;
+  for (auto child = t.begin(); child != t.end(); ++child) countBranch(child.treeIndex(), counts, budget);
+}
+
+template <class TraitsT>
+std::int64_t Container<TraitsT>::invalidateBranch(TreeIndex const& at, TileIndexLists& removed) {
+  std::int64_t count = 1;
+  TileType& t = editTile(at);
+  if (!t.atMaxDepth())
+    for (auto child = t.begin(); child != t.end(); ++child)
+      count += invalidateBranch(child.treeIndex(), removed);
+  t.invalidate();
+  removed[static_cast<std::size_t>(at.depth)].push_back(at.index);
+  return count;
+}
+
+template <class TraitsT>
+std::int64_t Container<TraitsT>::unlinkTile(TreeIndex const& at, bool withBranch, TileIndexLists& removed,
+                                            Roots& spareRoots) {
   if (!TraitsT::isDepth(at.depth) || at.index < 0 || at.index >= tileCount(at.depth) || !tile(at).valid())
     return 0;
-  m_data->detachTiles();
   TileType& t = editTile(at);
   if (t.isRoot()) {
     if (!withBranch && Internal::hasAdjacentChildren(t)) return 0;
@@ -60,7 +61,10 @@ std::int64_t Container<TraitsT>::unlinkTile(TreeIndex const& at, bool withBranch
       for (auto child = t.begin(); child != t.end(); ++child) {
         TileType& c = editTile(child.treeIndex());
         c.setParentIndex(-1);
-        addRoot(c);
+        auto node = spareRoots.extract(spareRoots.begin());
+        node.key() = c.voxelCoord(), node.mapped() = c.treeIndex();
+        m_data->m_roots.insert(std::move(node));
+        ++m_data->m_rootCounts[static_cast<std::size_t>(c.depth())];
       }
       t.invalidate();
       removed[static_cast<std::size_t>(at.depth)].push_back(at.index);
@@ -73,14 +77,7 @@ std::int64_t Container<TraitsT>::unlinkTile(TreeIndex const& at, bool withBranch
     for (; above.index >= 0; above = tile(above).parentTreeIndex())
       editTile(above).setBranchSize(tile(above).branchSize() - branch);
   }
-  if (t.isLeaf()) {
-    t.invalidate();
-    removed[static_cast<std::size_t>(at.depth)].push_back(at.index);
-    return 1;
-  }
-  Internal::RemoveTileVisitor<TraitsT> visitor(removed);
-  traverse(visitor, kDepthFirst, {.start = at});
-  return visitor.count();
+  return invalidateBranch(at, removed);
 }
 
 template <class TraitsT>
@@ -91,18 +88,45 @@ void Container<TraitsT>::removeTile(TreeIndex const& at, bool withBranch, TileMo
 }
 
 template <class TraitsT>
+void Container<TraitsT>::reserveMoves(TileIndexLists const& lists, TileMoves& moves) {
+  moves.assign(static_cast<std::size_t>(kMaxDepth) + 1, {});
+  for (std::size_t d = 0; d < lists.size(); ++d) moves[d].reserve(lists[d].capacity());
+}
+
+template <class TraitsT>
 void Container<TraitsT>::removeTiles(TileIndexLists& lists, bool withBranch, TileMoves* moves) {
+  // All memory that is needed comes first. Branches of listed tiles may hold listed ones: where more would be
+  // counted than there are tiles, room is made for all.
+  Counts counts{};
+  Roots spareRoots;
+  std::int64_t budget = m_data->m_tileCountTotal;
+  auto const live = [&](TreeIndex const& at) {
+    return at.index >= 0 && at.index < tileCount(at.depth) && tile(at).valid();
+  };
+  for (int d = 0; d <= kMaxDepth && d < static_cast<int>(lists.size()); ++d) {
+    for (std::int64_t const index : lists[static_cast<std::size_t>(d)]) {
+      TreeIndex const at{index, d};
+      if (!live(at)) continue;
+      countBranch(at, counts, budget);
+      for (int n = withBranch ? 0 : tile(at).childCount(); n > 0; --n)
+        spareRoots.try_emplace({static_cast<int>(spareRoots.size()), 0, 0, 0});
+    }
+  }
   TileIndexLists removed(static_cast<std::size_t>(kMaxDepth) + 1);
+  for (std::size_t d = 0; d < removed.size(); ++d)
+    removed[d].reserve(static_cast<std::size_t>(budget < 0 ? m_data->m_tileCounts[d] : counts[d]));
+  TileMoves ownMoves;
+  TileMoves& made = moves ? *moves : ownMoves;
+  reserveMoves(removed, made);
+  m_data->detachTiles();
+
   std::int64_t count = 0;
   for (int d = 0; d <= kMaxDepth && d < static_cast<int>(lists.size()); ++d) {
     for (std::int64_t const index : lists[static_cast<std::size_t>(d)])
-      count += unlinkTile({index, d}, withBranch, removed);
+      count += unlinkTile({index, d}, withBranch, removed, spareRoots);
   }
   // Refused and dead entries have left the lists; branches have joined them.
   lists = std::move(removed);
-  TileMoves ownMoves;
-  TileMoves& made = moves ? *moves : ownMoves;
-  made.assign(static_cast<std::size_t>(kMaxDepth) + 1, {});
   if (count == 0) return;
   m_data->m_tileCountTotal -= count;
   if (compactOnRemoval()) compact(lists, made);
@@ -118,13 +142,13 @@ template <class TraitsT> void Container<TraitsT>::compact(TileMoves* moves) {
   }
   TileMoves ownMoves;
   TileMoves& made = moves ? *moves : ownMoves;
-  made.assign(static_cast<std::size_t>(kMaxDepth) + 1, {});
+  reserveMoves(dead, made);
+  m_data->detachTiles();
   compact(dead, made);
   tilesRemoved(&made);
 }
 
 template <class TraitsT> void Container<TraitsT>::compact(TileIndexLists& lists, TileMoves& moves) {
-  m_data->detachTiles();
   for (int d = 0; d <= kMaxDepth; ++d) {
     auto& holes = lists[static_cast<std::size_t>(d)];
     if (holes.empty()) continue;
@@ -145,24 +169,21 @@ template <class TraitsT> void Container<TraitsT>::compact(TileIndexLists& lists,
       filled = hole;
       dropDead();
     }
-    std::vector<std::uint8_t> movedRoots(made.size());
     parallelFor(0, static_cast<std::int64_t>(made.size()), [&](std::int64_t begin, std::int64_t end) {
       for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
         auto const [dst, src] = made[n];
-        reallocateTile(dst, src, d);
+        m_data->editTiles(d).relocate(dst, src);
         TileType& t = editTile({dst, d});
         t.setIndex(dst);
-        if (t.isRoot())
-          movedRoots[n] = 1;
-        else
-          editTile(t.parentTreeIndex()).childIndex(t) = dst;
+        if (!t.isRoot()) editTile(t.parentTreeIndex()).childIndex(t) = dst;
         for (auto child = t.begin(); child != t.end(); ++child)
           editTile(child.treeIndex()).setParentIndex(dst);
       }
     });
     resize(last + 1, d);
-    for (std::size_t n = 0; n < made.size(); ++n) {
-      if (movedRoots[n]) m_data->m_roots[tile(made[n].first, d).voxelCoord()] = {made[n].first, d};
+    for (auto const& [dst, src] : made) {
+      TileType const& t = tile(dst, d);
+      if (t.isRoot()) m_data->m_roots.find(t.voxelCoord())->second = {dst, d};
     }
   }
 }
@@ -177,12 +198,17 @@ template <class TraitsT> void Container<TraitsT>::permute(std::vector<std::int64
   auto const permuted = [&](int d) {
     return TraitsT::isDepth(d) && !perms[static_cast<std::size_t>(d)].empty();
   };
+  std::vector<typename Data::Array::Room> rooms(static_cast<std::size_t>(kMaxDepth) + 1);
+  for (int d = 0; d <= kMaxDepth; ++d)
+    if (permuted(d)) rooms[static_cast<std::size_t>(d)] = m_data->tiles(d).roomToPermute();
   // Each depth rewrites only its own records, from the permutations of the depths above and below.
   parallelFor(0, kMaxDepth + 1, [&](std::int64_t firstDepth, std::int64_t lastDepth) {
     for (int d = static_cast<int>(firstDepth); d < static_cast<int>(lastDepth); ++d) {
       if (!permuted(d - 1) && !permuted(d) && !permuted(d + 1)) continue;
       auto& tiles = m_data->editTiles(d);
-      if (permuted(d)) tiles.permute(perms[static_cast<std::size_t>(d)].data());
+      if (permuted(d))
+        tiles.permute(perms[static_cast<std::size_t>(d)].data(),
+                      std::move(rooms[static_cast<std::size_t>(d)]));
       parallelFor(0, tiles.size(),
                   [&](std::int64_t begin, std::int64_t end) {
                     for (std::int64_t n = begin; n < end; ++n) {

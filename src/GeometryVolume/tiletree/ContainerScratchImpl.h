@@ -13,25 +13,30 @@ inline constexpr VoxelCoord kScratchStart{0, 0, 0, 0};
 
 template <class TraitsT> Container<TraitsT>* Container<TraitsT>::threadLocalContainer(int keepEmpty) {
   Container* scratch = nullptr;
-  bool isNew = false;
   {
     std::lock_guard const lock(m_data->m_threadLocalFreeMutex);
     auto& idle = m_data->m_freeThreadLocal;
-    if (!idle.empty()) {
-      scratch = idle.front();
-      idle.erase(idle.begin());
-    } else {
-      auto made = Ostil::makePtr<Container>("voxel_tile_tree_thread_local", voxelSize());
-      scratch = made.get();
-      m_data->m_allThreadLocal.push_back(std::move(made));
-      isNew = true;
-    }
+    if (!idle.empty()) scratch = idle.front(), idle.erase(idle.begin());
   }
-  if (isNew && keepEmpty == 0) scratch->addTile(kScratchStart);
+  if (!scratch) {
+    auto made = Ostil::makePtr<Container>("voxel_tile_tree_thread_local", voxelSize());
+    scratch = made.get();
+    if (keepEmpty == 0) scratch->addTile(kScratchStart);
+    std::lock_guard const lock(m_data->m_threadLocalFreeMutex);
+    // Those that come back find room.
+    m_data->m_freeThreadLocal.reserve(m_data->m_allThreadLocal.size() + 1);
+    m_data->m_allThreadLocal.push_back(std::move(made));
+  }
   Counts counts{};
   for (int d = 0; d <= kMaxDepth; ++d) counts[static_cast<std::size_t>(d)] = scratch->tileCount(d);
-  std::lock_guard const lock(m_data->m_threadLocalMapMutex);
-  m_data->m_threadLocalCounts[scratch] = counts;
+  try {
+    std::lock_guard const lock(m_data->m_threadLocalMapMutex);
+    m_data->m_threadLocalCounts[scratch] = counts;
+  } catch (...) {
+    std::lock_guard const lock(m_data->m_threadLocalFreeMutex);
+    m_data->m_freeThreadLocal.push_back(scratch);
+    throw;
+  }
   return scratch;
 }
 

@@ -1,7 +1,7 @@
 // Lookup of tiles by position, and their creation. Included by Container.cpp alone.
 #pragma once
 
-#include "GeometryVolume/tiletree/Container.h"
+#include "GeometryVolume/tiletree/ContainerGrowthImpl.h"
 
 #include <limits>
 #include <stdexcept>
@@ -130,6 +130,15 @@ template <class TraitsT> void Container<TraitsT>::removeRoot(TileType const& til
     --m_data->m_rootCounts[static_cast<std::size_t>(tile.depth())];
 }
 
+template <class TraitsT>
+TreeIndex Container<TraitsT>::addTileBelow(TreeIndex above, int i, int j, int k, int depth) {
+  Growth growth(*this);
+  TreeIndex const made = makeTile(i, j, k, depth);
+  insertChild(above, made);
+  growth.keep();
+  return made;
+}
+
 template <class TraitsT> TreeIndex Container<TraitsT>::makeTile(int i, int j, int k, int depth) {
   TileType* made = nullptr;
   std::int64_t const index = allocateTile(depth, made);
@@ -142,31 +151,19 @@ template <class TraitsT> TreeIndex Container<TraitsT>::addTile(int i, int j, int
   if (!TraitsT::isDepth(depth) || !TraitsT::inDomain(i, j, k)) return {};
   TreeIndex const found = tileIndex(i, j, k, depth);
   if (found.depth == depth) return found;
+  if (found.valid()) return addTileBelow(found, i, j, k, depth);
+  Growth growth(*this);
+  TreeIndex const made = addRootTile(i, j, k, depth, growth);
+  growth.keep();
+  return made;
+}
+
+template <class TraitsT>
+TreeIndex Container<TraitsT>::addRootTile(int i, int j, int k, int depth, Growth& growth) {
   TreeIndex const made = makeTile(i, j, k, depth);
-  if (found.valid()) {
-    insertChild(found, made);
-    return made;
-  }
-  // A new root may stand above existing ones, which then hang below it.
-  bool deeperRoots = false;
-  for (int d = depth + 1; d <= kMaxDepth; ++d) deeperRoots |= rootCount(d) > 0;
-  if (deeperRoots) {
-    std::vector<TreeIndex> adopted;
-    TileType const& root = tile(made);
-    for (auto at = m_data->m_roots.begin(); at != m_data->m_roots.end();) {
-      TileType const& other = tile(at->second);
-      if (root.isAncestorOf(other) && root.contains(other.tijk())) {
-        if (adopted.size() == adopted.max_size()) throw std::length_error("list too long");
-        adopted.push_back(at->second);
-        --m_data->m_rootCounts[static_cast<std::size_t>(other.depth())];
-        at = m_data->m_roots.erase(at);
-      } else {
-        ++at;
-      }
-    }
-    for (TreeIndex const& child : adopted) insertChild(made, child);
-  }
   addRoot(tile(made));
+  // It may stand above existing roots, which then hang below it.
+  adoptDeeperRoots(depth, growth);
   return made;
 }
 

@@ -188,7 +188,6 @@ void buildAccelerationGrid(Container<TraitsT> const& tree, ContainerData<TraitsT
     if (largest / w > kMaxGridCells) continue;
 
     data.m_places.reset();
-    data.m_gridDepth = d;
     data.m_gridOrigin = box.min;
     data.m_gridCellWidth = static_cast<std::int32_t>(w);
     std::size_t cells = 1;
@@ -209,6 +208,7 @@ void buildAccelerationGrid(Container<TraitsT> const& tree, ContainerData<TraitsT
       }
       data.m_gridTable[at] = n;
     }
+    data.m_gridDepth = d; // lookups use it from here on
     data.m_places = computePlaces(tree, data);
     return;
   }

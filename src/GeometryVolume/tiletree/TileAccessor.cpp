@@ -141,8 +141,7 @@ auto TileAccessorOf<TraitsT>::addTile(int i, int j, int k, int depth) -> TileTyp
   if (!at.valid()) return this->moveTo(tree.tile(tree.addTile(i, j, k, depth)));
   at = this->descend(at, i, j, k, depth);
   if (at.depth != depth) {
-    TreeIndex const made = tree.makeTile(i, j, k, depth);
-    tree.insertChild(at, made);
+    tree.addTileBelow(at, i, j, k, depth);
     this->descend(at, i, j, k, depth);
   }
   return this->current();

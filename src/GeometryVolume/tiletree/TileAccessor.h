@@ -157,6 +157,7 @@ public:
   /// The tile of `depth` that holds the point, made with the tiles between it and the deepest existing one
   /// above.
   /// @edges The invalid tile for points and depths out of the domain.
+  /// @error std::bad_alloc; the tree is as it was then, without derived caches.
   /// @cost Drops the container's derived caches when a tile is made.
   TileType const& addTile(int i, int j, int k, int depth);
   TileType const& addTile(int3 const& p, int depth) { return addTile(p.x, p.y, p.z, depth); }
@@ -166,19 +167,22 @@ public:
   /// Adds the tiles of a depth over a box, its max exclusive. Positions out of the domain are left out.
   /// @edges `min` is aligned to its tile first, `max` is taken as it stands: with `max` at or below `min` on
   /// an axis, the tile that holds `min` is still added where its corner lies below `max`.
+  /// @error std::bad_alloc; the tiles added so far stay.
   void addTiles(int3 const& min, int3 const& max, int depth);
   /// Adds the tiles that hold the listed points, by depth, all at once: existing ones are left, those between
   /// a listed tile and the next coarser one above it, listed or there, are made as well, and branch sizes are
   /// right afterwards. New ones lie parent by parent in the parents' Morton order.
   /// @edges Points out of the domain are left out; a point may be listed more than once.
   /// @param newTiles If given, the corner of every tile made is appended to the list of its depth.
+  /// @error std::bad_alloc; tree and `newTiles` are as they were then.
   /// @cost Linear, but for one sort of the parents where they do not come in Morton order; runs in parallel.
   void addTiles(typename ContainerT::TileLists const& points,
                 typename ContainerT::TileLists* newTiles = nullptr) {
     m_mutableContainer->addTilesInBulk(points, newTiles);
   }
 
-  // Removal. With the container's compaction on, indices of other tiles may change: `moves` tells how.
+  // Removal. With the container's compaction on, indices of other tiles may change: `moves` tells how. What
+  // throws std::bad_alloc leaves the tree as it was.
   /// Removes one tile or its branch. A root without its branch goes only when no two of its children are
   /// adjacent; another tile always goes with its branch. Refusal is silent: ask the tile's valid().
   void removeTile(TreeIndex const& at, bool withBranch, TileMoves* moves = nullptr);

@@ -15,7 +15,8 @@ namespace VLN::TileTree3D {
 template <class TileT> class TileArray {
 public:
   TileArray() = default;
-  TileArray(TileArray const& other) {
+  TileArray(TileArray const& other)
+      : TileArray() { // made from here on: what a record's copy throws frees the block
     reserve(other.m_size);
     std::uninitialized_copy(other.begin(), other.end(), m_tiles);
     m_size = other.m_size;
@@ -34,9 +35,7 @@ public:
 
   void reserve(std::int64_t capacity) {
     if (capacity <= m_capacity) return;
-    // The system moves a large block's pages instead of copying them, and old ones need not be mapped anew.
-    m_tiles = checked(
-        std::realloc(static_cast<void*>(m_tiles), static_cast<std::size_t>(capacity) * sizeof(TileT)));
+    m_tiles = block(m_tiles, capacity);
     m_capacity = capacity;
   }
   /// Growing value-constructs records, shrinking frees the child tables of the dropped ones.
@@ -55,14 +54,28 @@ public:
     if (n > m_capacity) reserve(std::max(n, m_capacity + m_capacity / 2));
     m_size = n;
   }
+  /// Drops records that own nothing, made or not.
+  void shrinkRaw(std::int64_t n) { m_size = n; }
+  /// Moves the record at `src` over that at `dst`, bitwise. What is left at `src` owns nothing.
+  void relocate(std::int64_t dst, std::int64_t src) {
+    std::destroy_at(m_tiles + dst);
+    std::memcpy(static_cast<void*>(m_tiles + dst), static_cast<void const*>(m_tiles + src), sizeof(TileT));
+    new (static_cast<void*>(m_tiles + src)) TileT;
+  }
+
+  struct Free {
+    void operator()(TileT* room) const { std::free(static_cast<void*>(room)); }
+  };
+  using Room = std::unique_ptr<TileT, Free>;
+  /// What permute() needs.
+  Room roomToPermute() const { return Room(block(nullptr, m_size)); }
   /// Moves the record at i to perm[i], bitwise.
-  void permute(std::int64_t const* perm) {
-    auto* room =
-        checked(std::malloc(std::max<std::size_t>(1, static_cast<std::size_t>(m_size) * sizeof(TileT))));
+  void permute(std::int64_t const* perm, Room room) {
     for (std::int64_t i = 0; i < m_size; ++i)
-      std::memcpy(static_cast<void*>(room + perm[i]), static_cast<void const*>(m_tiles + i), sizeof(TileT));
+      std::memcpy(static_cast<void*>(room.get() + perm[i]), static_cast<void const*>(m_tiles + i),
+                  sizeof(TileT));
     std::free(static_cast<void*>(m_tiles));
-    m_tiles = room;
+    m_tiles = room.release();
     m_capacity = m_size;
   }
   void clear() {
@@ -73,7 +86,10 @@ public:
   }
 
 private:
-  static TileT* checked(void* room) {
+  /// The system moves a large block's pages instead of copying them, and old ones need not be mapped anew.
+  static TileT* block(TileT* old, std::int64_t capacity) {
+    auto const bytes = static_cast<std::size_t>(std::max<std::int64_t>(capacity, 1)) * sizeof(TileT);
+    void* const room = std::realloc(static_cast<void*>(old), bytes);
     if (!room) throw std::bad_alloc();
     return static_cast<TileT*>(room);
   }

@@ -1,6 +1,6 @@
 #include "GeometryVolume/topology/Command.h"
 
-#include "GeometryVolume/core/TakenComponentImpl.h"
+#include "GeometryVolume/core/TakenComponent.h"
 
 namespace VLN::TileTree3D::Command {
 
