@@ -420,8 +420,10 @@ double chooseVoxelSize(std::vector<double3> const& world, double pointsPerTile) 
   };
   // Finer by halves, until a tile holds fewer points than wanted; then whichever side comes nearer. Not finer
   // than what a float resolves, nor so fine that the cloud leaves the tree's reach.
-  double const finest = std::max(extent, largest) * 0x1p-22;
-  double size = std::exp2(std::ceil(std::log2(extent))), before = 0;
+  // Nor so fine that its inverse is infinite.
+  constexpr double kSmallest = 0x1p-1000;
+  double const finest = std::max(std::max(extent, largest) * 0x1p-22, kSmallest);
+  double size = std::exp2(std::ceil(std::log2(std::max(extent, kSmallest)))), before = 0;
   auto const n = double(finite.size());
   for (;;) {
     double const held = n / occupied(size);

@@ -128,6 +128,18 @@ TEST(Ply, TheVoxelSizeGivesAboutSoManyPointsPerTile) {
   EXPECT_GT(chooseVoxelSize(world, 1), 0);
 }
 
+// regression: a voxel so small that its inverse was infinite put points nowhere
+TEST(Ply, PointsNextToZeroStaySomewhere) {
+  std::string content = header("binary_little_endian", "element vertex 130\nproperty double x\n"
+                                                       "property double y\nproperty double z\n");
+  for (int n = 0; n < 130; ++n) content += bytesOf(n % 2 ? 5e-324 : 0.0) + bytesOf(0.0) + bytesOf(0.0);
+  auto const set = parse(content, {});
+  ASSERT_EQ(set.size(), 130u);
+  EXPECT_GT(set.voxelSize, 0);
+  EXPECT_TRUE(std::isfinite(1 / set.voxelSize));
+  for (auto const& p : set.positions) EXPECT_TRUE(std::isfinite(p.x) && std::isfinite(p.y)) << p.x;
+}
+
 TEST(Ply, WhatIsWrittenReadsBackExactly) {
   TempFolder folder;
   std::mt19937 random(2);
