@@ -22,4 +22,9 @@ TEST(OperationsFuzz, RequirementSequencesAgreeWithTheModels) {
   Support::replay<OperationsCase>("operations", seeds());
 }
 
+TEST(OperationsFuzz, RequirementMutatedSequencesAgreeWithTheModels) {
+  char const* const count = std::getenv("VLN_TEST_OPERATIONS");
+  Support::replayMutations<OperationsCase>(seeds(), count ? std::atoi(count) : 200, "");
+}
+
 } // namespace

@@ -41,9 +41,8 @@ template <class Case> void replay(std::string const& name, std::vector<std::stri
   for (std::string const& seed : seeds) {
     try {
       runCase<Case>(seed);
-    } catch (FuzzFailure const& failure) {
-      ADD_FAILURE() << failure.what() << "\nseed " << n << ": " << shownCase(seed);
-    }
+    } catch (FuzzFailure const& failure) { ADD_FAILURE() << failure.what(); }
+    ASSERT_FALSE(::testing::Test::HasFailure()) << "seed " << n << ": " << shownCase(seed);
     if (folder) std::ofstream(std::string(folder) + "/" + name + std::to_string(n), std::ios::binary) << seed;
     ++n;
   }
@@ -92,9 +91,8 @@ void replayMutations(std::vector<std::string> const& seeds, int cases, std::stri
     std::string const bytes = mutated(seeds[random() % seeds.size()], seeds, alphabet, random);
     try {
       accepted += runCase<Case>(bytes);
-    } catch (FuzzFailure const& failure) {
-      FAIL() << failure.what() << "\ncase " << n << ": " << shownCase(bytes);
-    }
+    } catch (FuzzFailure const& failure) { ADD_FAILURE() << failure.what(); }
+    ASSERT_FALSE(::testing::Test::HasFailure()) << "case " << n << ": " << shownCase(bytes);
   }
   EXPECT_GT(accepted, cases / 100) << "hardly any case is accepted: they do not reach far";
 }
