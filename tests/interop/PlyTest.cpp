@@ -128,6 +128,16 @@ TEST(Ply, TheVoxelSizeGivesAboutSoManyPointsPerTile) {
   EXPECT_GT(chooseVoxelSize(world, 1), 0);
 }
 
+// regression: the origin was taken to lie near a coordinate of a point that has another one which is no
+// number, and the other points lost their digits
+TEST(Ply, PointsThatAreNowhereDoNotMoveTheOrigin) {
+  auto const set = parse(header("ascii", "element vertex 3\nproperty double x\nproperty double y\n"
+                                         "property double z\n") +
+                         "1 2 3.25\nnan 0 1e30\n-1 0.5 inf\n");
+  ASSERT_EQ(set.size(), 3u);
+  EXPECT_EQ(set.world(0), (Velorn::Math::double3{1, 2, 3.25}));
+}
+
 // regression: a voxel so small that its inverse was infinite put points nowhere
 TEST(Ply, PointsNextToZeroStaySomewhere) {
   std::string content = header("binary_little_endian", "element vertex 130\nproperty double x\n"

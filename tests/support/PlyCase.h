@@ -59,24 +59,22 @@ private:
              "an attribute has not one value for each point");
   }
 
+  static bool somewhere(Velorn::Math::float3 const& p) {
+    return std::isfinite(p.x) && std::isfinite(p.y) && std::isfinite(p.z);
+  }
   /// What is somewhere at a voxel size of 1 is so at the size chosen.
   void checkFinite(PointSet const& points) const {
     PointSet const plain = VLN::Interop::parsePly("case.ply", m_data, m_size, {1.0, 64});
     demand(plain.size() == points.size(), "the number of points depends on the voxel size");
-    auto const somewhere = [](Velorn::Math::float3 const& p) {
-      return std::isfinite(p.x) && std::isfinite(p.y) && std::isfinite(p.z);
-    };
     for (std::size_t n = 0; n < points.size(); ++n)
       demand(!somewhere(plain.positions[n]) || somewhere(points.positions[n]),
              "a point is somewhere only at another voxel size");
   }
 
-  /// Equal as far as positions in units of a voxel tell: what is not a number stays none.
-  static bool close(double a, double b, PointSet const& first, PointSet const& second) {
-    if (!std::isfinite(a) || !std::isfinite(b)) return std::isnan(a) == std::isnan(b);
-    if (!first.doublePositions && a == b) return true;
-    double const unit = std::max(first.voxelSize, second.voxelSize);
-    return std::abs(a - b) <= unit * 0x1p-20 + 0x1p-22 * std::max(std::abs(a), std::abs(b));
+  /// Equal as far as a float tells that counts from an origin.
+  static bool close(double a, double b, double origin, double unit) {
+    return a == b ||
+           std::abs(a - b) <= unit * 0x1p-20 + 0x1p-22 * std::max(std::abs(a - origin), std::abs(a));
   }
   static void checkAgain(PointSet const& points) {
     static VLN::Test::TempFolder const folder;
@@ -90,9 +88,12 @@ private:
       auto const &a = points.attributes[n], &b = again.attributes[n];
       demand(a.name == b.name && a.type == b.type && a.bytes == b.bytes, "an attribute changes");
     }
+    double const unit = std::max(points.voxelSize, again.voxelSize);
     for (std::size_t n = 0; n < points.size(); ++n) {
-      for (int a = 0; a < 3; ++a)
-        demand(close(points.world(n)[a], again.world(n)[a], points, again), "a point moves");
+      bool const is = somewhere(points.positions[n]);
+      demand(is == somewhere(again.positions[n]), "a point comes or goes");
+      for (int a = 0; is && a < 3; ++a)
+        demand(close(points.world(n)[a], again.world(n)[a], points.origin[a], unit), "a point moves");
     }
   }
 
