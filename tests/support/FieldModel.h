@@ -103,13 +103,14 @@ public:
   void write(Tree const& tree, VLN::Object& object, Choices& choices) override {
     auto channel = object.template extractComponent<C>(m_name);
     channel->cloneData();
-    for (int n = choices.below(20); n >= 0 && !m_values.empty(); --n) {
+    for (int n = choices.below(12); n >= 0 && !m_values.empty(); --n) {
       auto const tile = std::next(m_values.begin(), choices.below(static_cast<int>(m_values.size())));
-      std::size_t const element = static_cast<std::size_t>(choices.below(C::kSize));
-      T const v = VLN::Test::value<T>(m_next++);
-      tile->second[element] = v;
-      TreeIndex const at = tree.tileAccessor().tile(tile->first, true).treeIndex();
-      channel->tileData(at)(static_cast<int>(element)) = v;
+      auto data = channel->tileData(tree.tileAccessor().tile(tile->first, true).treeIndex());
+      // Whole tiles and single elements.
+      int const first = choices.below(C::kSize + 1) % C::kSize,
+                last = choices.below(2) ? first : C::kSize - 1;
+      for (int e = first; e <= last; ++e)
+        tile->second[static_cast<std::size_t>(e)] = data(e) = VLN::Test::value<T>(m_next++);
     }
     object.putComponent(std::move(channel));
   }

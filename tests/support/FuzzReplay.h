@@ -1,5 +1,6 @@
 // The plain driver behind the fuzzers' tests: runs their cases one after the other. With FUZZ_SEEDS naming a
-// folder, seeds are also written there for scripts/fuzz.sh.
+// folder, seeds are also written there for scripts/fuzz.sh; the files of a folder named by FUZZ_CORPUS are
+// run as seeds.
 #pragma once
 
 #include "support/FuzzCheck.h"
@@ -8,7 +9,9 @@
 
 #include <cstdint>
 #include <cstdlib>
+#include <filesystem>
 #include <fstream>
+#include <iterator>
 #include <random>
 #include <string>
 #include <vector>
@@ -35,7 +38,13 @@ inline std::string shownCase(std::string const& bytes) {
 }
 
 /// Runs every seed.
-template <class Case> void replay(std::string const& name, std::vector<std::string> const& seeds) {
+template <class Case> void replay(std::string const& name, std::vector<std::string> seeds) {
+  if (char const* const corpus = std::getenv("FUZZ_CORPUS")) {
+    for (auto const& file : std::filesystem::directory_iterator(corpus)) {
+      std::ifstream in(file.path(), std::ios::binary);
+      seeds.emplace_back(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
+    }
+  }
   char const* const folder = std::getenv("FUZZ_SEEDS");
   int n = 0;
   for (std::string const& seed : seeds) {
