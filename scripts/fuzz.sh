@@ -8,6 +8,7 @@
 #   filter       filters of channel names
 #   operations   sequences of operations on a tree and its channels, held against models
 #   ply_file     the bytes of .ply files
+#   vdb_file     the bytes of .vdb files, read in a child process as the program does
 set -eu
 . "$(dirname -- "$0")/lib.sh"
 cd "$root"
@@ -41,6 +42,7 @@ case $target in
   # Some 100000 features: weighing them by rarity takes longer than the cases.
   operations) seeds=channels:OperationsFuzz options='-max_len=768 -entropic=0' ;;
   ply_file) seeds=interop:PlyFuzz options="-max_len=4096 -dict=$root/fuzz/ply_file.dict" ;;
+  vdb_file) seeds=interop:VdbFuzz options='-max_len=65536' ;;
   '') usage 2 >&2 ;;
   *) echo "fuzz.sh: no target '$target'" >&2 && usage 2 >&2 ;;
 esac

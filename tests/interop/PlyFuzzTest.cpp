@@ -47,6 +47,12 @@ std::vector<std::string> seeds() {
   list.push_back(header("ascii", "element vertex 0\n" + xyz));
   list.push_back("ply\r\nformat ascii 1.0\r\nelement vertex 1\r\nproperty double x\r\nproperty double y\r\n"
                  "property double z\r\nend_header\r\n1 2 3\r\n");
+  // Found by the fuzzer: points next to each other, and next to points that are nowhere.
+  std::string const wide = "property double x\nproperty double y\nproperty double z\n";
+  std::string next = header("ascii", "element vertex 130\n" + wide);
+  for (int n = 0; n < 130; ++n) next += n % 2 ? "5e-324 0 0\n" : "0 0 0\n";
+  list.push_back(next);
+  list.push_back(header("ascii", "element vertex 3\n" + wide) + "1 2 3.25\nnan 0 1e30\n-1 0.5 inf\n");
   return list;
 }
 
