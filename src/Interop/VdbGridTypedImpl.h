@@ -76,6 +76,22 @@ template <class TreeT, class F> void forEachTile(TreeT const& tree, F const& f) 
     for (auto it = node->cbeginValueAll(); it; ++it) f(it.getCoord(), kNodeWidths[0], *it, it.isValueOn());
 }
 
+/// Whether every node lies where a search for its position looks: the root's entries come from the file, and
+/// so do the corners of leaves of bools and masks.
+template <class TreeT> bool placesAgree(TreeT const& tree) {
+  using Upper = typename TreeT::RootNodeType::ChildNodeType;
+  using Lower = typename Upper::ChildNodeType;
+  bool ok = true;
+  auto const isEntry = [](Coord const& c) { return (c & -kNodeWidths[2]) == c; };
+  for (auto it = tree.root().cbeginChildOn(); it; ++it) ok = ok && isEntry(it.getCoord());
+  for (auto it = tree.root().cbeginValueAll(); it; ++it) ok = ok && isEntry(it.getCoord());
+  std::vector<Lower const*> parents;
+  tree.getNodes(parents);
+  for (Lower const* parent : parents)
+    for (auto it = parent->cbeginChildOn(); it; ++it) ok = ok && it.getCoord() == it->origin();
+  return ok;
+}
+
 /// As forEachTile(), active ones alone.
 template <class TreeT, class F> void forEachActiveTile(TreeT const& tree, F const& f) {
   using Upper = typename TreeT::RootNodeType::ChildNodeType;
@@ -128,7 +144,7 @@ public:
   std::size_t bytesPerSample() const override { return sizeof(Element); }
 
   std::optional<std::string> whyNotPlaced() const override {
-    bool ok = true;
+    bool ok = placesAgree(m_grid->tree());
     for (Leaf const* leaf : m_leaves) ok = ok && fitsTheTree(leaf->origin(), Leaf::DIM);
     forEachActiveTile(m_grid->tree(),
                       [&](Coord const& c, int width, Value const&) { ok = ok && fitsTheTree(c, width); });
