@@ -23,8 +23,8 @@ private:
   std::string m_reason;
 };
 
-/// The text on one line: control characters and bytes beyond ASCII become '?', line ends become spaces, and
-/// what is over `longest` characters is cut. Text out of a foreign file goes through here before it is shown.
+/// The text on one line: UTF-8 stays, line ends become spaces, what else is no text becomes \xNN, and what is
+/// over `longest` characters is cut. Text out of a foreign file goes through here before it is shown.
 VLN_API std::string oneLine(std::string const& text, std::size_t longest = 300);
 
 } // namespace VLN::Interop

@@ -41,6 +41,8 @@ bool scalarNamed(std::string const& name, Scalar& out) {
   return false;
 }
 
+bool isFinite(double3 const& p) { return std::isfinite(p.x) && std::isfinite(p.y) && std::isfinite(p.z); }
+
 struct Property {
   std::string name;
   Scalar type = Scalar::kFloat;
@@ -358,14 +360,18 @@ private:
         options.voxelSize > 0 ? options.voxelSize : chooseVoxelSize(m_world, options.pointsPerTile);
     double const s = 1 / m_points.voxelSize;
     if (m_points.doublePositions) {
+      // Of points that are somewhere: what stands beside a coordinate that is no number may be anything.
+      double low[3], high[3];
+      std::fill(low, low + 3, std::numeric_limits<double>::infinity());
+      std::fill(high, high + 3, -std::numeric_limits<double>::infinity());
+      for (double3 const& p : m_world) {
+        if (!isFinite(p)) continue;
+        for (int a = 0; a < 3; ++a) low[a] = std::min(low[a], p[a]), high[a] = std::max(high[a], p[a]);
+      }
       for (int a = 0; a < 3; ++a) {
-        double low = std::numeric_limits<double>::infinity(), high = -low;
-        for (double3 const& p : m_world) {
-          if (std::isfinite(p[a])) low = std::min(low, p[a]), high = std::max(high, p[a]);
-        }
         // A multiple of the tile's width keeps the tiles where they would be.
         double const step = 4 * m_points.voxelSize;
-        if (low <= high) m_points.origin[a] = std::floor((low / 2 + high / 2) / step) * step;
+        if (low[a] <= high[a]) m_points.origin[a] = std::floor((low[a] / 2 + high[a] / 2) / step) * step;
         if (!std::isfinite(m_points.origin[a])) m_points.origin[a] = 0;
       }
     }
@@ -397,7 +403,7 @@ double chooseVoxelSize(std::vector<double3> const& world, double pointsPerTile) 
   std::fill(high, high + 3, -std::numeric_limits<double>::infinity());
   std::vector<double3> finite;
   for (double3 const& p : world) {
-    if (!std::isfinite(p.x) || !std::isfinite(p.y) || !std::isfinite(p.z)) continue;
+    if (!isFinite(p)) continue;
     finite.push_back(p);
     for (int a = 0; a < 3; ++a) low[a] = std::min(low[a], p[a]), high[a] = std::max(high[a], p[a]);
   }
@@ -420,8 +426,10 @@ double chooseVoxelSize(std::vector<double3> const& world, double pointsPerTile) 
   };
   // Finer by halves, until a tile holds fewer points than wanted; then whichever side comes nearer. Not finer
   // than what a float resolves, nor so fine that the cloud leaves the tree's reach.
-  double const finest = std::max(extent, largest) * 0x1p-22;
-  double size = std::exp2(std::ceil(std::log2(extent))), before = 0;
+  // Nor so fine that its inverse is infinite.
+  constexpr double kSmallest = 0x1p-1000;
+  double const finest = std::max(std::max(extent, largest) * 0x1p-22, kSmallest);
+  double size = std::exp2(std::ceil(std::log2(std::max(extent, kSmallest)))), before = 0;
   auto const n = double(finite.size());
   for (;;) {
     double const held = n / occupied(size);

@@ -73,19 +73,20 @@ template <class TreeT, class F> void forEachTile(TreeT const& tree, F const& f) 
     for (auto it = node->cbeginValueAll(); it; ++it) f(it.getCoord(), kNodeWidths[0], *it, it.isValueOn());
 }
 
-/// As forEachTile(), active ones alone.
-template <class TreeT, class F> void forEachActiveTile(TreeT const& tree, F const& f) {
+/// Whether every node lies where a search for its position looks: the root's entries come from the file, and
+/// so do the corners of leaves of bools and masks.
+template <class TreeT> bool placesAgree(TreeT const& tree) {
   using Upper = typename TreeT::RootNodeType::ChildNodeType;
   using Lower = typename Upper::ChildNodeType;
-  for (auto it = tree.root().cbeginValueOn(); it; ++it) f(it.getCoord(), kNodeWidths[2], *it);
-  std::vector<Upper const*> uppers;
-  tree.getNodes(uppers);
-  for (Upper const* node : uppers)
-    for (auto it = node->cbeginValueOn(); it; ++it) f(it.getCoord(), kNodeWidths[1], *it);
-  std::vector<Lower const*> lowers;
-  tree.getNodes(lowers);
-  for (Lower const* node : lowers)
-    for (auto it = node->cbeginValueOn(); it; ++it) f(it.getCoord(), kNodeWidths[0], *it);
+  bool ok = true;
+  auto const isEntry = [](Coord const& c) { return (c & -kNodeWidths[2]) == c; };
+  for (auto it = tree.root().cbeginChildOn(); it; ++it) ok = ok && isEntry(it.getCoord());
+  for (auto it = tree.root().cbeginValueAll(); it; ++it) ok = ok && isEntry(it.getCoord());
+  std::vector<Lower const*> parents;
+  tree.getNodes(parents);
+  for (Lower const* parent : parents)
+    for (auto it = parent->cbeginChildOn(); it; ++it) ok = ok && it.getCoord() == it->origin();
+  return ok;
 }
 
 inline bool fitsTheTree(Coord const& corner, int width) {

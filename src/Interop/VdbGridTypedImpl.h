@@ -22,7 +22,7 @@ public:
       , m_background(m_grid->background()) {
     collectWideTiles();
     collectLeaves();
-    bool fits = true;
+    bool fits = placesAgree(m_grid->tree());
     for (Leaf const* leaf : m_leaves) fits = fits && fitsTheTree(leaf->origin(), Leaf::DIM);
     for (WideTile const& tile : m_wide) fits = fits && (!tile.active || fitsTheTree(tile.corner, tile.width));
     if (!fits)

@@ -43,6 +43,8 @@ void setIdentity(std::string& bytes) {
 void writeVdbFile(OutputFile& file, openvdb::GridPtrVec const& grids, openvdb::MetaMap const& metadata) {
   std::string bytes;
   try {
+    // Written anew; one of a foreign type would be in the way.
+    for (auto const& grid : grids) grid->removeMeta(openvdb::GridBase::META_FILE_COMPRESSION);
     bytes = MemoryArchive().write(grids, metadata);
   } catch (openvdb::Exception const& error) {
     throw FileError(file.path(), "cannot be written: " + oneLine(error.what()));

@@ -128,6 +128,28 @@ TEST(Ply, TheVoxelSizeGivesAboutSoManyPointsPerTile) {
   EXPECT_GT(chooseVoxelSize(world, 1), 0);
 }
 
+// regression: the origin was taken to lie near a coordinate of a point that has another one which is no
+// number, and the other points lost their digits
+TEST(Ply, PointsThatAreNowhereDoNotMoveTheOrigin) {
+  auto const set = parse(header("ascii", "element vertex 3\nproperty double x\nproperty double y\n"
+                                         "property double z\n") +
+                         "1 2 3.25\nnan 0 1e30\n-1 0.5 inf\n");
+  ASSERT_EQ(set.size(), 3u);
+  EXPECT_EQ(set.world(0), (Velorn::Math::double3{1, 2, 3.25}));
+}
+
+// regression: a voxel so small that its inverse was infinite put points nowhere
+TEST(Ply, PointsNextToZeroStaySomewhere) {
+  std::string content = header("binary_little_endian", "element vertex 130\nproperty double x\n"
+                                                       "property double y\nproperty double z\n");
+  for (int n = 0; n < 130; ++n) content += bytesOf(n % 2 ? 5e-324 : 0.0) + bytesOf(0.0) + bytesOf(0.0);
+  auto const set = parse(content, {});
+  ASSERT_EQ(set.size(), 130u);
+  EXPECT_GT(set.voxelSize, 0);
+  EXPECT_TRUE(std::isfinite(1 / set.voxelSize));
+  for (auto const& p : set.positions) EXPECT_TRUE(std::isfinite(p.x) && std::isfinite(p.y)) << p.x;
+}
+
 TEST(Ply, WhatIsWrittenReadsBackExactly) {
   TempFolder folder;
   std::mt19937 random(2);

@@ -1,5 +1,5 @@
 // Replays the fuzzer's cases without the fuzzer: seeds made from volumes, and mutations of them. With
-// FLAT_SEEDS naming a folder, the seeds are also written there for scripts/fuzz.sh.
+// FUZZ_SEEDS naming a folder, the seeds are also written there for scripts/fuzz.sh.
 #include "support/FlatCase.h"
 #include "support/FlatVolume.h"
 
@@ -54,7 +54,7 @@ std::vector<FlatCase> seeds() {
 TEST(FlatFuzz, RequirementSeedsAreAcceptedAndPackedWithoutLoss) {
   auto const cases = seeds();
   EXPECT_GE(cases.size(), 40u);
-  char const* const folder = std::getenv("FLAT_SEEDS");
+  char const* const folder = std::getenv("FUZZ_SEEDS");
   int n = 0;
   for (auto const& c : cases) {
     EXPECT_TRUE(c.run());

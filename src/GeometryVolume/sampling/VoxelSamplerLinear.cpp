@@ -83,8 +83,7 @@ VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::forgetTiles() {
   m_lastSlot.fill(-1);
 }
 
-VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::findTile(int i, int j, int k, int depth) const
-    -> ConstTileData<float, D, 0> {
+VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::findTile(int i, int j, int k, int depth) const -> CoreTile {
   TreeIndex const at = m_tileAccessor.treeIndex(i, j, k, depth, true);
   if (!at.valid() || depth < m_minDepth || depth > m_maxDepth ||
       at.index >= m_channelCore->tileCount(at.depth))

@@ -132,9 +132,10 @@ public:
   ConstIterator end(Voxel<TraitsT> const&, int, int, int) const { return {}; }
 
 protected:
+  using CoreTile = ConstTileData<float, D, 0>;
   /// The core channel's tile at exactly `depth` that holds a point of tile space; an empty handle without
   /// one.
-  ConstTileData<float, D, 0> findTile(int i, int j, int k, int depth) const;
+  CoreTile findTile(int i, int j, int k, int depth) const;
   /// The entry that holds the tile, filled if it does not yet.
   CacheEntry<OneSidedTile>& updateCache(std::int64_t tile, int depth,
                                         std::vector<CacheEntry<OneSidedTile>>& cache) const;
