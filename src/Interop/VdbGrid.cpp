@@ -117,6 +117,7 @@ void completeCorners(TileCorners& corners, int rootDepth) {
       at(depth).swap(all);
     }
     at(depth).erase(std::unique(at(depth).begin(), at(depth).end()), at(depth).end());
+    if (depth == rootDepth) break;
     parents.clear();
     for (int3 const& c : at(depth)) {
       int3 const parent{VdbTraits::align(c.x, depth - 1), VdbTraits::align(c.y, depth - 1),
