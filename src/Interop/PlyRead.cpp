@@ -9,6 +9,7 @@
 #include <cmath>
 #include <cstring>
 #include <fstream>
+#include <iterator>
 #include <limits>
 #include <set>
 #include <sstream>
@@ -42,6 +43,21 @@ bool scalarNamed(std::string const& name, Scalar& out) {
 }
 
 bool isFinite(double3 const& p) { return std::isfinite(p.x) && std::isfinite(p.y) && std::isfinite(p.z); }
+
+/// Of the points that are somewhere: what stands beside a coordinate that is no number may be anything.
+/// Without one the low corner lies above the high one.
+struct Extent {
+  double low[3], high[3];
+
+  explicit Extent(std::vector<double3> const& points) {
+    std::fill(low, low + 3, std::numeric_limits<double>::infinity());
+    std::fill(high, high + 3, -std::numeric_limits<double>::infinity());
+    for (double3 const& p : points) {
+      if (!isFinite(p)) continue;
+      for (int a = 0; a < 3; ++a) low[a] = std::min(low[a], p[a]), high[a] = std::max(high[a], p[a]);
+    }
+  }
+};
 
 struct Property {
   std::string name;
@@ -360,14 +376,7 @@ private:
         options.voxelSize > 0 ? options.voxelSize : chooseVoxelSize(m_world, options.pointsPerTile);
     double const s = 1 / m_points.voxelSize;
     if (m_points.doublePositions) {
-      // Of points that are somewhere: what stands beside a coordinate that is no number may be anything.
-      double low[3], high[3];
-      std::fill(low, low + 3, std::numeric_limits<double>::infinity());
-      std::fill(high, high + 3, -std::numeric_limits<double>::infinity());
-      for (double3 const& p : m_world) {
-        if (!isFinite(p)) continue;
-        for (int a = 0; a < 3; ++a) low[a] = std::min(low[a], p[a]), high[a] = std::max(high[a], p[a]);
-      }
+      auto const [low, high] = Extent(m_world);
       for (int a = 0; a < 3; ++a) {
         // A multiple of the tile's width keeps the tiles where they would be.
         double const step = 4 * m_points.voxelSize;
@@ -398,15 +407,9 @@ private:
 
 double chooseVoxelSize(std::vector<double3> const& world, double pointsPerTile) {
   // Of a large cloud every n-th point, with a share of the points: tiles that hold many stay full.
-  double low[3], high[3];
-  std::fill(low, low + 3, std::numeric_limits<double>::infinity());
-  std::fill(high, high + 3, -std::numeric_limits<double>::infinity());
+  auto const [low, high] = Extent(world);
   std::vector<double3> finite;
-  for (double3 const& p : world) {
-    if (!isFinite(p)) continue;
-    finite.push_back(p);
-    for (int a = 0; a < 3; ++a) low[a] = std::min(low[a], p[a]), high[a] = std::max(high[a], p[a]);
-  }
+  std::copy_if(world.begin(), world.end(), std::back_inserter(finite), isFinite);
   if (finite.empty()) return 1;
   double extent = 0, largest = 0;
   for (int a = 0; a < 3; ++a) {

@@ -54,24 +54,24 @@ public:
     // In the leaves, which are in order, and before them: only what lies before is out of order.
     std::vector<int3> before;
     std::size_t const known = at(VdbTraits::kMaxDepth).size();
-    collectInParallel(std::int64_t(m_leaves.size()), 256, at(VdbTraits::kMaxDepth), before,
-                      [&](std::int64_t n, Accessor& grid, auto& blocks, auto& blocksBefore) {
-                        Leaf const& leaf = *m_leaves[static_cast<std::size_t>(n)];
-                        Places places(grid, leaf.origin());
-                        unsigned const active = activeBlocks(leaf);
-                        for (int b = 0; b < 8; ++b) {
-                          int const x = b >> 2, y = b >> 1 & 1, z = b & 1;
-                          bool const spare =
-                              !(active >> b & 1) && places.isUniform(x, y, z) &&
-                              (leavesHaveTile || sameBits(places.valueAt(x, y, z), m_background));
-                          if (!spare) blocks.push_back(blockOf(leaf.origin(), x, y, z));
-                        }
-                        collectBeforeLeaf(places, leaf.origin(), blocksBefore);
-                      });
+    collectInParallel(
+        std::int64_t(m_leaves.size()), 256,
+        [&](std::int64_t n, Accessor& grid, auto& blocks, auto& blocksBefore) {
+          Leaf const& leaf = *m_leaves[static_cast<std::size_t>(n)];
+          Places places(grid, leaf.origin());
+          unsigned const active = activeBlocks(leaf);
+          for (int b = 0; b < 8; ++b) {
+            int const x = b >> 2, y = b >> 1 & 1, z = b & 1;
+            bool const spare = !(active >> b & 1) && places.isUniform(x, y, z) &&
+                               (leavesHaveTile || sameBits(places.valueAt(x, y, z), m_background));
+            if (!spare) blocks.push_back(blockOf(leaf.origin(), x, y, z));
+          }
+          collectBeforeLeaf(places, leaf.origin(), blocksBefore);
+        },
+        at(VdbTraits::kMaxDepth), before);
     if (leavesHaveTile)
       for (Leaf const* leaf : m_leaves) at(VdbTraits::kMaxDepth - 1).push_back(toInt3(leaf->origin()));
 
-    std::vector<WideTile> tiles;
     for (WideTile const& tile : m_wide) {
       int const depth = depthOfSamples(tile.width);
       int3 const c = toInt3(tile.corner);
@@ -81,10 +81,9 @@ public:
       at(rootDepth).push_back(alignTo(c, rootDepth));
       // And no sample that is wider than any tile of the file: the way back has no place for it.
       if (rootDepth < kWidestDepth) at(kWidestDepth).push_back(alignTo(c, kWidestDepth));
-      tiles.push_back(tile);
     }
     std::uint64_t const planned = at(VdbTraits::kMaxDepth).size() + before.size();
-    collectShells(tiles, planned, mostTiles, before);
+    collectShells(planned, mostTiles, before);
     joinSorted(at(VdbTraits::kMaxDepth), known, std::move(before));
   }
 
@@ -250,8 +249,8 @@ private:
 
   /// Appends what `collect(n, accessor, part...)` finds for each n to each of the lists, in order.
   template <class Collect, class... Lists>
-  void collectInParallelTo(std::int64_t count, std::int64_t grain, Collect const& collect,
-                           Lists&... lists) const {
+  void collectInParallel(std::int64_t count, std::int64_t grain, Collect const& collect,
+                         Lists&... lists) const {
     using Part = std::array<std::vector<int3>, sizeof...(Lists)>;
     std::vector<Part> parts(static_cast<std::size_t>(chunkCount(0, count, grain)));
     parallelChunks(0, count, grain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
@@ -267,17 +266,6 @@ private:
     };
     (append(lists), ...);
   }
-  template <class Collect>
-  void collectInParallel(std::int64_t count, std::int64_t grain, std::vector<int3>& out,
-                         Collect const& collect) const {
-    collectInParallelTo(count, grain, collect, out);
-  }
-  template <class Collect>
-  void collectInParallel(std::int64_t count, std::int64_t grain, std::vector<int3>& a, std::vector<int3>& b,
-                         Collect const& collect) const {
-    collectInParallelTo(count, grain, collect, a, b);
-  }
-
   static int3 blockOf(Coord const& leaf, int x, int y, int z) {
     return {leaf.x() + kBlockWidth * x, leaf.y() + kBlockWidth * y, leaf.z() + kBlockWidth * z};
   }
@@ -306,35 +294,38 @@ private:
   /// The blocks at the surfaces of wide tiles: those inside at the high sides, and those before the low ones.
   /// Inside such a block a value goes over to another one within one voxel.
   /// @param planned Tiles that there are already.
-  void collectShells(std::vector<WideTile> const& tiles, std::uint64_t planned, std::uint64_t mostTiles,
-                     std::vector<int3>& out) const {
+  void collectShells(std::uint64_t planned, std::uint64_t mostTiles, std::vector<int3>& out) const {
     for (int const width : kNodeWidths) {
-      std::vector<WideTile const*> exposed = exposedAmong(tiles, width);
+      std::vector<WideTile const*> exposed = exposedTiles(width);
       // A shell grows with the square of the width: where memory ends, the widest tiles stay coarse.
       int const across = width / kBlockWidth;
       planned += std::uint64_t(exposed.size()) * 6 * std::uint64_t(across) * std::uint64_t(across);
       if (planned > mostTiles) return;
       if (width == kLeafWidth) {
-        collectInParallel(std::int64_t(exposed.size()), 96, out,
-                          [&](std::int64_t n, Accessor& grid, auto& part) {
-                            collectRound(grid, exposed[static_cast<std::size_t>(n)]->corner, part);
-                          });
+        collectInParallel(
+            std::int64_t(exposed.size()), 96,
+            [&](std::int64_t n, Accessor& grid, auto& part) {
+              collectRound(grid, exposed[static_cast<std::size_t>(n)]->corner, part);
+            },
+            out);
         continue;
       }
       auto const rows = std::int64_t(across) + 1;
-      collectInParallel(std::int64_t(exposed.size()) * rows, 1, out,
-                        [&](std::int64_t n, Accessor& grid, auto& part) {
-                          collectSlice(grid, exposed[static_cast<std::size_t>(n / rows)]->corner, across,
-                                       static_cast<int>(n % rows) - 1, part);
-                        });
+      collectInParallel(
+          std::int64_t(exposed.size()) * rows, 1,
+          [&](std::int64_t n, Accessor& grid, auto& part) {
+            collectSlice(grid, exposed[static_cast<std::size_t>(n / rows)]->corner, across,
+                         static_cast<int>(n % rows) - 1, part);
+          },
+          out);
     }
   }
 
-  /// The tiles of a width beside which lies something else than their value.
-  std::vector<WideTile const*> exposedAmong(std::vector<WideTile> const& tiles, int width) const {
+  /// The tiles of a width with another value than the background, beside which lies something else.
+  std::vector<WideTile const*> exposedTiles(int width) const {
     std::vector<WideTile const*> list;
-    for (WideTile const& tile : tiles)
-      if (tile.width == width) list.push_back(&tile);
+    for (WideTile const& tile : m_wide)
+      if (tile.width == width && !sameBits(tile.value, m_background)) list.push_back(&tile);
     std::vector<char> exposed(list.size());
     parallelFor(0, std::int64_t(list.size()),
                 [&](std::int64_t begin, std::int64_t end) {

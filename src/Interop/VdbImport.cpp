@@ -238,12 +238,10 @@ VdbImport importGrids(VdbFile const& file, Progress const& progress) {
   result.file = file.path;
   result.skipped = file.skipped;
   if (file.metadata) result.metadata = metadataBytes(*file.metadata);
+  tell(progress, "looking through the grids", kReadDone);
   auto groups = groupByTransform(file, result.skipped);
   for (Group& group : groups)
-    for (auto const& grid : group.grids) {
-      tell(progress, "looking through the grids", kReadDone);
-      group.summaries.push_back(grid->summarize());
-    }
+    for (auto const& grid : group.grids) group.summaries.push_back(grid->summarize());
   std::uint64_t memoryLeft = file.memoryBytes > 0 ? file.memoryBytes : ~std::uint64_t(0);
   for (std::size_t n = 0; n < groups.size(); ++n) {
     double const share = (1 - kTreeDone) / double(groups.size());

@@ -86,24 +86,12 @@ private:
     bool const withBranch = m_places.coin(), later = m_places.coin();
     m_log +=
         std::string("remove") + (withBranch ? " with branch" : "") + (later ? ", compact later\n" : "\n");
-    TileIndexLists lists(static_cast<std::size_t>(TraitsT::kDepths));
-    std::vector<std::vector<VoxelCoord>> asked(lists.size());
+    std::vector<VoxelCoord> asked;
     for (int n = m_places.below(25); n >= 0 && !m_cloud.model.tiles().empty(); --n) {
       auto const& tiles = m_cloud.model.tiles();
-      VoxelCoord const at = *std::next(tiles.begin(), m_places.below(static_cast<int>(tiles.size())));
-      auto const d = static_cast<std::size_t>(at.depth);
-      lists[d].push_back(m_cloud.tree.tileAccessor().tile(at, true).index());
-      asked[d].push_back(at);
+      asked.push_back(*std::next(tiles.begin(), m_places.below(static_cast<int>(tiles.size()))));
     }
-    TileMoves moves;
-    m_cloud.tree.setCompactOnRemoval(!later);
-    m_cloud.tree.tileAccessor().removeTiles(lists, withBranch, &moves);
-    if (later) m_cloud.tree.compact(&moves);
-    m_cloud.tree.setCompactOnRemoval(true);
-    for (auto const& depth : asked) {
-      for (VoxelCoord const& at : depth) m_cloud.model.remove(at, withBranch);
-    }
-    m_cloud.shrank(moves);
+    m_cloud.remove(asked, withBranch, later);
   }
   void permute() {
     m_log += "permute\n";

@@ -229,30 +229,18 @@ private:
   void remove() {
     if (m_cloud.model.tiles().empty()) return;
     bool const withBranch = m_choices.coin(), later = m_choices.coin(), oneByOne = m_choices.below(4) == 0;
-    VLN::TileTree3D::TileMoves moves;
     if (oneByOne) {
+      VLN::TileTree3D::TileMoves moves;
       VoxelCoord const at = existing();
       auto accessor = m_cloud.tree.tileAccessor();
       accessor.removeTile(accessor.tile(at, true).treeIndex(), withBranch, &moves);
       m_cloud.model.remove(at, withBranch);
-    } else {
-      VLN::TileTree3D::TileIndexLists lists(static_cast<std::size_t>(TraitsT::kDepths));
-      std::vector<std::vector<VoxelCoord>> asked(lists.size());
-      for (int n = m_choices.below(12); n >= 0; --n) {
-        VoxelCoord const at = existing();
-        auto const d = static_cast<std::size_t>(at.depth);
-        lists[d].push_back(m_cloud.tree.tileAccessor().tile(at, true).index());
-        asked[d].push_back(at);
-      }
-      m_cloud.tree.setCompactOnRemoval(!later);
-      m_cloud.tree.tileAccessor().removeTiles(lists, withBranch, &moves);
-      if (later) m_cloud.tree.compact(&moves);
-      m_cloud.tree.setCompactOnRemoval(true);
-      for (auto const& depth : asked) {
-        for (VoxelCoord const& at : depth) m_cloud.model.remove(at, withBranch);
-      }
+      m_cloud.shrank(moves);
+      return;
     }
-    m_cloud.shrank(moves);
+    std::vector<VoxelCoord> asked;
+    for (int n = m_choices.below(12); n >= 0; --n) asked.push_back(existing());
+    m_cloud.remove(asked, withBranch, later);
   }
   void permute() {
     std::vector<std::vector<std::int64_t>> perms(static_cast<std::size_t>(TraitsT::kDepths));

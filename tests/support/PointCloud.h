@@ -81,6 +81,22 @@ public:
       at = model.has(at->first) ? std::next(at) : points.erase(at);
     labelNewVoxels();
   }
+  /// Removes tiles of tree and model, at once, or as dead tiles that a compaction takes out; all follows.
+  void remove(std::vector<VLN::TileTree3D::VoxelCoord> asked, bool withBranch, bool compactLater) {
+    // Depth by depth, as the tree does it.
+    std::stable_sort(asked.begin(), asked.end(),
+                     [](auto const& a, auto const& b) { return a.depth < b.depth; });
+    VLN::TileTree3D::TileIndexLists lists(static_cast<std::size_t>(TraitsT::kDepths));
+    for (auto const& at : asked)
+      lists[static_cast<std::size_t>(at.depth)].push_back(tree.tileAccessor().tile(at, true).index());
+    VLN::TileTree3D::TileMoves moves;
+    tree.setCompactOnRemoval(!compactLater);
+    tree.tileAccessor().removeTiles(lists, withBranch, &moves);
+    if (compactLater) tree.compact(&moves);
+    tree.setCompactOnRemoval(true);
+    for (auto const& at : asked) model.remove(at, withBranch);
+    shrank(moves);
+  }
   /// Everything follows a tree in a new order.
   void permuted(std::vector<std::vector<std::int64_t>> const& oldToNew) {
     auto const newToOld = VLN::TileTree3D::invertPermutation(oldToNew);
