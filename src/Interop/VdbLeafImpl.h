@@ -173,12 +173,13 @@ template <class V, class T> void copyBlock(V const* block, T* samples) {
     for (int j = 0; j < kBlockWidth; ++j) {
       Row r[4];
       for (int i = 0; i < kBlockWidth; ++i) std::memcpy(&r[i], block + 64 * i + 8 * j, sizeof(Row));
-      Row const a = __builtin_shuffle(r[0], r[1], Row{0, 4, 1, 5}), // k 0, 1 of i 0, 1
-          b = __builtin_shuffle(r[2], r[3], Row{0, 4, 1, 5}),       // of i 2, 3
-          c = __builtin_shuffle(r[0], r[1], Row{2, 6, 3, 7}),       // k 2, 3
-          d = __builtin_shuffle(r[2], r[3], Row{2, 6, 3, 7});
-      Row const out[4] = {__builtin_shuffle(a, b, Row{0, 1, 4, 5}), __builtin_shuffle(a, b, Row{2, 3, 6, 7}),
-                          __builtin_shuffle(c, d, Row{0, 1, 4, 5}), __builtin_shuffle(c, d, Row{2, 3, 6, 7})};
+      Row const a = __builtin_shufflevector(r[0], r[1], 0, 4, 1, 5), // k 0, 1 of i 0, 1
+          b = __builtin_shufflevector(r[2], r[3], 0, 4, 1, 5),       // of i 2, 3
+          c = __builtin_shufflevector(r[0], r[1], 2, 6, 3, 7),       // k 2, 3
+          d = __builtin_shufflevector(r[2], r[3], 2, 6, 3, 7);
+      Row const out[4] = {
+          __builtin_shufflevector(a, b, 0, 1, 4, 5), __builtin_shufflevector(a, b, 2, 3, 6, 7),
+          __builtin_shufflevector(c, d, 0, 1, 4, 5), __builtin_shufflevector(c, d, 2, 3, 6, 7)};
       for (int k = 0; k < kBlockWidth; ++k) std::memcpy(samples + 16 * k + 4 * j, &out[k], sizeof(Row));
     }
   } else {
