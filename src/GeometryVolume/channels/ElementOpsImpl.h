@@ -156,6 +156,9 @@ template <class T> struct TypedElementOps {
   }
 
   static ElementOps const& get() {
+    static_assert(std::find(kHaloElementSizes.begin(), kHaloElementSizes.end(), sizeof(T)) !=
+                      kHaloElementSizes.end(),
+                  "elements of a new size: add it to kHaloElementSizes");
     static ElementOps const ops{
         sizeof(T), &haloKernels(sizeof(T)), elements, elementsOf, blendParent, blendCorners, scale, broadcast,
         distance};

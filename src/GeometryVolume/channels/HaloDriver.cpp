@@ -205,7 +205,7 @@ void HaloDriver<TraitsT>::fillRegion(HaloRegion const& region, TileType const& t
   case kHaloModeLinearCoarse:
     return sample(region, tile, target, fill.scale, sampler);
   case kHaloModeConstant: {
-    alignas(16) std::byte value[64];
+    alignas(16) std::byte value[kLargestElement];
     m_source.ops->broadcast(fill.constant, value);
     return set(region, target, value);
   }
@@ -217,7 +217,7 @@ void HaloDriver<TraitsT>::fillRegion(HaloRegion const& region, TileType const& t
 template <class TraitsT>
 void HaloDriver<TraitsT>::fill(TileType const& tile, void* target, HaloFill const& fill,
                                HaloSampler<TraitsT>& sampler) {
-  if (fill.mode < kHaloModeDeepOnly || fill.mode > kHaloModeConstant) return;
+  if (!isHaloMode(fill.mode)) return;
   if (fill.type == kHaloAll && fill.mode != kHaloModeDeepOnly && m_table.kind != kHaloTileOther) {
     // Every region is written, so what has no tile beside may hold other bytes for a moment.
     if (void const* const own = m_source.elements(tile.treeIndex())) {

@@ -8,6 +8,7 @@
 // target without halo keeps the seven directions without a negative step, and one that is not extended none.
 #pragma once
 
+#include "GeometryVolume/channels/ChannelLayouts.h"
 #include "GeometryVolume/channels/ChannelTypes.h"
 #include "GeometryVolume/channels/HaloKernels.h"
 #include "GeometryVolume/tiletree/TreeIndex.h"
@@ -39,8 +40,8 @@ struct HaloAxis {
 };
 
 struct HaloTable {
-  static constexpr int kLargestWidth = 9;
-  static constexpr int kLargestTileWidth = 5;
+  static constexpr int kLargestWidth = kLargestChannelTileWidth;
+  static constexpr int kLargestTileWidth = std::max(PowerOfTwoTraits::kTW, OddTraits::kTW);
 
   int tileDataWidth = 0; ///< W
   int halo = 0;          ///< of the target

@@ -23,10 +23,4 @@ bool checkIfNonLeafValueIsSetToChildValue(Channel<TraitsT, T, E, H> const& chann
       static_cast<double>(tolerance), tree);
 }
 
-#define VLN_NON_LEAF_VALUES(S, T, E, H)                                                                      \
-  template VLN_API void setNonLeafValueToChildValue<S, T, E, H>(Channel<S, T, E, H>&, Container<S> const&,   \
-                                                                VoxelOffsetType, int, int);                  \
-  template VLN_API bool checkIfNonLeafValueIsSetToChildValue<S, T, E, H>(                                    \
-      Channel<S, T, E, H> const&, Container<S> const&, VoxelOffsetType, float, int, int);
-
 } // namespace VLN::TileTree3D

@@ -124,6 +124,8 @@ static_assert(PowerOfTwoTraits::kMaxDepth == 28 && PowerOfTwoTraits::kMinTileCoo
 static_assert(OddTraits::kMaxDepth == 12 && OddTraits::kMinTileCoord == -610351562 &&
               OddTraits::kMaxTileCoord == 610351562);
 
+inline constexpr int kShapeCount = 2;
+
 /// Depths that every per-depth array of a channel has, for both shapes.
 inline constexpr int kChannelDepths = 29;
 
