@@ -58,7 +58,7 @@ public:
     VdbImport content;
     content.file = m_path;
     for (std::uint32_t n = 0; n < m_reader.gridCount(); ++n) {
-      tell("filling the channels", 0.2 + 0.8 * n / m_reader.gridCount());
+      report("filling the channels", 0.2 + 0.8 * n / m_reader.gridCount());
       auto const grid = m_reader.grid(n);
       std::string name = grid.name();
       if (name.empty()) name = "unnamed";
@@ -81,17 +81,17 @@ public:
     object->putComponent(std::move(m_tree));
     volume.object = std::move(object);
     content.volumes.push_back(std::move(volume));
-    tell("done", 1);
+    report("done", 1);
     return content;
   }
 
 private:
-  void tell(char const* stage, double done) const {
+  void report(char const* stage, double done) const {
     if (m_progress) m_progress(stage, done);
   }
 
   void collectTiles(std::uint64_t memoryBytes) {
-    tell("reading the tiles", 0);
+    report("reading the tiles", 0);
     std::uint64_t bytes = 0;
     std::uint64_t perTile = 160;
     for (std::uint32_t n = 0; n < m_reader.gridCount(); ++n)

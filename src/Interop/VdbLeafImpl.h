@@ -243,7 +243,7 @@ public:
   /// The place x, y, z leaves away, each -1, 0 or 1.
   LeafPlace<TreeT> const& at(int x, int y, int z) {
     auto const n = static_cast<std::size_t>(9 * (x + 1) + 3 * (y + 1) + z + 1);
-    LeafPlace<TreeT>& place = m_places[n];
+    LeafPlace<TreeT>& place = m_lookupTable[n];
     if (!m_known[n]) {
       m_known[n] = true;
       place.lookUp(m_grid, m_origin.offsetBy(kLeafWidth * x, kLeafWidth * y, kLeafWidth * z));
@@ -273,7 +273,7 @@ private:
 
   Accessor& m_grid;
   Coord m_origin;
-  LeafPlace<TreeT> m_places[27];
+  LeafPlace<TreeT> m_lookupTable[27];
   bool m_known[27] = {};
 };
 

@@ -4,7 +4,7 @@
 #include "GeometryVolume/channels/ChannelData.h"
 #include "GeometryVolume/channels/ElementOps.h"
 #include "GeometryVolume/channels/ElementTraits.h"
-#include "GeometryVolume/core/FourLanes.h"
+#include "GeometryVolume/core/SimdLanes.h"
 
 #include <algorithm>
 #include <cstring>

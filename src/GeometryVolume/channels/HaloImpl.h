@@ -1,9 +1,9 @@
 // Definitions of the halo functions. Only the generated sources include this.
 #pragma once
 
-#include "GeometryVolume/channels/EraseTilesImpl.h"
 #include "GeometryVolume/channels/Halo.h"
 #include "GeometryVolume/channels/HaloDriver.h"
+#include "GeometryVolume/channels/UntypedTilesImpl.h"
 
 namespace VLN::TileTree3D {
 
@@ -13,9 +13,9 @@ void computeHalo(Internal::HaloChannel<TraitsT, T, SourceExtended, SourceHalo> c
                  Container<TraitsT> const& tree,
                  Internal::HaloChannel<TraitsT, T, TargetExtended, TargetHalo>& dst, int firstDepth,
                  int lastDepth) {
-  auto const target = Internal::eraseTarget<T>(dst);
+  auto const target = Internal::untypedTarget<T>(dst);
   Internal::runHaloPass<TraitsT>(
-      {Internal::eraseTiles<T>(src), target,
+      {Internal::untypedTiles<T>(src), target,
        &Internal::kHaloTable<TraitsT, SourceExtended, SourceHalo, TargetExtended, TargetHalo>, firstDepth,
        lastDepth},
       tree);
@@ -26,8 +26,8 @@ requires(E == TraitsT::kTDW && ModeHaloLayouts<SourceHalo, TargetHalo>) void com
     HaloMode mode, HaloType type, int firstDepth, int lastDepth,
     Channel<TraitsT, T, E, SourceHalo> const& src, Container<TraitsT> const& tree,
     Channel<TraitsT, T, E, TargetHalo>& dst, float scale, VoxelOffsetType offsetType, float constant) {
-  auto const target = Internal::eraseTarget<T>(dst);
-  Internal::runHaloPass<TraitsT>({Internal::eraseTiles<T>(src), target,
+  auto const target = Internal::untypedTarget<T>(dst);
+  Internal::runHaloPass<TraitsT>({Internal::untypedTiles<T>(src), target,
                                   &Internal::kHaloTable<TraitsT, 0, SourceHalo, 0, TargetHalo>, firstDepth,
                                   lastDepth},
                                  {mode, type, constant, scale, offsetType}, tree);
@@ -41,7 +41,7 @@ void setHaloTile(typename Container<TraitsT>::TileType const& tile,
                  Internal::HaloTile<TraitsT, T, TargetExtended, TargetHalo>& dst, HaloMode mode,
                  typename Container<TraitsT>::ConstTileAccessor& accessor,
                  Internal::HaloTile<TraitsT, T, TargetExtended, TargetHalo>& parentData) {
-  auto const source = Internal::eraseTiles<T>(src);
+  auto const source = Internal::untypedTiles<T>(src);
   Internal::HaloDriver<TraitsT> driver(
       source, Internal::kHaloTable<TraitsT, SourceExtended, SourceHalo, TargetExtended, TargetHalo>,
       accessor);
@@ -56,7 +56,7 @@ void setHaloTile(TreeIndex const& index,
                  HaloType type, typename Container<TraitsT>::ConstTileAccessor& accessor,
                  Internal::HaloTile<TraitsT, T, TargetExtended, TargetHalo>& dst, float constant, float scale,
                  VoxelOffsetType offsetType) {
-  auto const source = Internal::eraseTiles<T>(src);
+  auto const source = Internal::untypedTiles<T>(src);
   auto const& table = Internal::kHaloTable<TraitsT, SourceExtended, SourceHalo, TargetExtended, TargetHalo>;
   Internal::HaloDriver<TraitsT> driver(source, table, accessor);
   Internal::HaloSampler<TraitsT> sampler(source, table.sourceWidth, table.sourceOrigin, offsetType, accessor);

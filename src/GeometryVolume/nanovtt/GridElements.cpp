@@ -2,8 +2,8 @@
 
 #include "GeometryVolume/channels/Channel.h"
 #include "GeometryVolume/channels/ElementTraits.h"
-#include "GeometryVolume/channels/EraseTilesImpl.h"
 #include "GeometryVolume/channels/NonLeafValues.h"
+#include "GeometryVolume/channels/UntypedTilesImpl.h"
 #include "GeometryVolume/core/ElementTypes.h"
 #include "GeometryVolume/nanovtt/GridVisitorImpl.h"
 #include "GeometryVolume/pools/ChannelPool.h"
@@ -121,8 +121,8 @@ template <class T> ChannelOf<T> const& typed(ChannelBase const& channel) {
   return static_cast<ChannelOf<T> const&>(channel);
 }
 
-template <class T> VLN::TileTree3D::Internal::ErasedTiles tiles(ChannelBase const& channel) {
-  return VLN::TileTree3D::Internal::eraseTiles<T>(typed<T>(channel));
+template <class T> VLN::TileTree3D::Internal::UntypedTiles tiles(ChannelBase const& channel) {
+  return VLN::TileTree3D::Internal::untypedTiles<T>(typed<T>(channel));
 }
 
 template <class T>
@@ -150,7 +150,7 @@ Ostil::Ptr<ChannelBase> withCoarser(ChannelBase const& channel, Tree const& tree
   for (int d = 0; d < kChannelDepths; ++d) counts[static_cast<std::size_t>(d)] = tree.tileCount(d);
   copy->resize(counts.data(), kTileSamples);
 
-  auto const from = VLN::TileTree3D::Internal::eraseTiles<T>(source);
+  auto const from = VLN::TileTree3D::Internal::untypedTiles<T>(source);
   auto const storage = copy->cloneData();
   for (int d = std::max(source.minDepth(), 0); d <= std::min(source.depth(), kMaxDepth); ++d) {
     auto& to = (*storage)[static_cast<std::size_t>(d)];
