@@ -1,6 +1,6 @@
 #!/bin/sh
 # Installs the Debian packages that the build, the tests and the checks need. Asks nothing; when
-# all is there it does nothing and calls no network.
+# all is there it does nothing and calls no network. With the argument "python" those of the Python module as well.
 set -eu
 
 packages="
@@ -11,6 +11,12 @@ packages="
   libgtest-dev libgmock-dev libbenchmark-dev
   clang-format-14
 "
+if [ "${1:-}" = python ]; then
+  packages="$packages
+    python3-dev pybind11-dev python3-numpy python3-pip python3-venv python3-pytest mypy
+    python3-scipy python3-openvdb python3-vtk9
+  "
+fi
 
 if ! command -v dpkg-query >/dev/null 2>&1; then
   echo "install-deps: this is not a Debian system; install the counterparts of:" >&2

@@ -1,11 +1,10 @@
 // The module vln._vln: what Python's part of the package stands on.
 #include "Core.h"
-#include "DlPack.h"
 #include "Files.h"
+#include "Flat.h"
 
 #include "GeometryVolume/core/Version.h"
 #include "Interop/FileError.h"
-#include "Interop/NvttWrite.h"
 #include "Interop/VdbFile.h"
 
 namespace VLN::Python {
@@ -42,16 +41,6 @@ std::shared_ptr<FlatVolume> flatten(Core const& core, std::string const& channel
   return core.flatten(options);
 }
 
-void saveFlat(FlatVolume const& flat, std::string const& path) {
-  py::gil_scoped_release const nogil;
-  Interop::NvttContent content{.buffer = flat.buffer.data(), .bufferLength = flat.buffer.size()};
-  if (flat.traversal.size() > 0) {
-    content.traversal = flat.traversal.data();
-    content.traversalLength = flat.traversal.size();
-  }
-  Interop::writeNvtt(path, content);
-}
-
 void registerExceptions(py::module_& module) {
   static PyObject* fileError = PyErr_NewExceptionWithDoc(
       "vln.FileError", "A file that cannot be read or written, in one line.", PyExc_OSError, nullptr);
@@ -73,18 +62,7 @@ using namespace VLN::Python;
 
 PYBIND11_MODULE(_vln, module) {
   registerExceptions(module);
-  py::class_<FlatVolume, std::shared_ptr<FlatVolume>>(module, "Flat", py::buffer_protocol())
-      .def_buffer([](FlatVolume& flat) {
-        return py::buffer_info(flat.buffer.data(), 1, py::format_descriptor<std::uint8_t>::format(), 1,
-                               {flat.buffer.size()}, {std::size_t(1)}, true);
-      })
-      .def_property_readonly(
-          "address", [](FlatVolume const& f) { return reinterpret_cast<std::uintptr_t>(f.buffer.data()); })
-      .def_property_readonly("nbytes", [](FlatVolume const& f) { return f.buffer.size(); })
-      .def_property_readonly("seconds", [](FlatVolume const& f) { return f.seconds; })
-      .def("dlpack", &toDlPack)
-      .def("save", &saveFlat);
-
+  defineFlat(module);
   py::class_<Core, std::shared_ptr<Core>>(module, "Core")
       .def(py::init<double, std::array<double, 3> const&>())
       .def("names", &Core::names)
@@ -129,5 +107,8 @@ PYBIND11_MODULE(_vln, module) {
     return types;
   });
   module.attr("FINEST") = kFinest;
+  auto const& version = VLN::versionInfo();
+  module.attr("VERSION") = std::to_string(version.majorNumber) + "." + std::to_string(version.minorNumber) +
+                           "." + std::to_string(version.patchNumber);
   module.attr("OPENVDB_VERSION") = VLN::Interop::openvdbVersion();
 }

@@ -12,12 +12,11 @@ from __future__ import annotations
 
 from ._channel import Channel, WritableChannel
 from ._file import File, open
-from ._flat import Flat
 from ._points import Points
-from ._vln import FINEST, FileError, OPENVDB_VERSION
+from ._vln import FINEST, OPENVDB_VERSION, VERSION, FileError, Flat
 from ._volume import Volume
 
-__version__ = "0.1.0"
+__version__ = VERSION
 
 __all__ = [
     "Channel",

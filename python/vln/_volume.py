@@ -8,9 +8,8 @@ import numpy as np
 
 from . import _checks, _vln
 from ._channel import Channel, _depth
-from ._flat import Flat
 from ._points import Points
-from ._vln import FINEST
+from ._vln import FINEST, Flat
 
 Where = Callable[[np.ndarray, int], Any]
 _CHILDREN = np.array([(i & 1, i >> 1 & 1, i >> 2) for i in range(8)], dtype=np.int64)
@@ -252,8 +251,8 @@ class Volume:
         quantisation: "none", "fp4", "fp8", "fp16", or "fpn" with a tolerance.
         finest_level: levels above the deepest at which the buffer ends.
         """
-        return Flat(self._core.flatten(str(channels), str(quantisation), float(tolerance), bool(morton),
-                                       bool(coalesce), int(finest_level), bool(traversal)))
+        return self._core.flatten(str(channels), str(quantisation), float(tolerance), bool(morton), bool(coalesce),
+                                  int(finest_level), bool(traversal))
 
     @property
     def nbytes(self) -> int:
