@@ -16,6 +16,9 @@
 
 namespace VLN::Python {
 
+/// Tells Python, and lets it act on signals. `progress` may be None, and must outlive the result.
+Interop::Progress teller(py::object const& progress);
+
 using Long3 = std::array<std::int64_t, 3>;
 
 /// What .vdb files know of a grid beyond its values.
@@ -69,6 +72,9 @@ public:
   std::uint64_t bytes() const;
 
   void save(std::string const& path) const;
+  /// As .npz or .vti.
+  void saveDense(std::string const& path, Long3 const& low, Long3 const& high, int depth,
+                 py::object const& progress) const;
   std::shared_ptr<Interop::FlatVolume> flatten(Interop::FlattenOptions const& options) const;
   /// As a file's reader or writer has it.
   Interop::VdbVolume vdbVolume() const;

@@ -1,6 +1,7 @@
 // What changes the tree, and what leaves the volume whole.
 #include "Core.h"
 
+#include "Interop/DenseWrite.h"
 #include "Interop/FileError.h"
 #include "Interop/FileFormat.h"
 #include "Interop/NvttWrite.h"
@@ -33,6 +34,15 @@ private:
 };
 
 } // namespace
+
+Interop::Progress teller(py::object const& progress) {
+  py::handle const callback = progress.is_none() ? py::handle() : py::handle(progress);
+  return [callback](char const* stage, double done) {
+    py::gil_scoped_acquire const gil;
+    if (PyErr_CheckSignals() != 0) throw py::error_already_set();
+    if (callback) callback(stage, done);
+  };
+}
 
 void Core::refineAll(Long3 const& low, Long3 const& high, int depth) {
   int3 const from = toInt3(low, "low"), to = toInt3(high, "high");
@@ -105,6 +115,25 @@ void Core::save(std::string const& path) const {
   UsingOpenVdb const alone;
   Reading const reading(*m_state);
   Interop::save(m_state->volume, path);
+}
+
+void Core::saveDense(std::string const& path, Long3 const& low, Long3 const& high, int depth,
+                     py::object const& progress) const {
+  auto const format =
+      Interop::checkOutputAs(path, "dense boxes", {Interop::FileFormat::kNpz, Interop::FileFormat::kVti});
+  Interop::DenseVolume dense;
+  dense.box.min = toInt3(low, "box");
+  dense.box.max = toInt3(high, "box");
+  dense.depth = depth;
+  auto const tell = teller(progress);
+  for (auto const& name : names()) dense.channels.push_back(name);
+  py::gil_scoped_release const nogil;
+  Reading const reading(*m_state);
+  for (auto const& [name, note] : notes())
+    if (note.type == "bool" || note.type == "mask") dense.flags.push_back(name);
+  dense.object = m_state->volume.object();
+  dense.indexToWorld = m_state->indexToWorld;
+  format == Interop::FileFormat::kNpz ? writeNpz(path, dense, tell) : writeVti(path, dense, tell);
 }
 
 std::shared_ptr<Interop::FlatVolume> Core::flatten(Interop::FlattenOptions const& options) const {

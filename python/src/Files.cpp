@@ -14,16 +14,6 @@ namespace {
 
 using Interop::PointSet;
 
-/// Tells Python, and lets it act on signals.
-Interop::Progress teller(py::object const& progress) {
-  py::handle const callback = progress.is_none() ? py::handle() : py::handle(progress);
-  return [callback](char const* stage, double done) {
-    py::gil_scoped_acquire const gil;
-    if (PyErr_CheckSignals() != 0) throw py::error_already_set();
-    if (callback) callback(stage, done);
-  };
-}
-
 py::dict pointsToDict(PointSet const& set, std::string const& name) {
   py::dict result;
   auto const count = static_cast<py::ssize_t>(set.size());

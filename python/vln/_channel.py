@@ -92,7 +92,7 @@ class Channel:
         depth: of the samples. Above the deepest each is 2, 4, 8, ... indices wide, and the array holds those
         that the box meets.
         """
-        where = self._box_of(box)
+        where = self.box if box is None else _box(box)
         level = FINEST if depth is None else _depth(depth)
         if where is None:
             low = high = (0, 0, 0)
@@ -103,15 +103,6 @@ class Channel:
         count = [max(0, -(-b // width) - f) if b > a else 0 for a, b, f in zip(low, high, first)]
         dense = self._core.to_numpy(self._name, _three(first), _three(count), level)
         return self._shown(dense).swapaxes(0, 2)
-
-    def _box_of(self, box: Optional[Any]) -> Optional[Box]:
-        if box is None:
-            return self.box
-        try:
-            low, high = box
-        except (TypeError, ValueError):
-            raise ValueError("a box is ((x0, y0, z0), (x1, y1, z1))") from None
-        return _checks.long3(low, "box"), _checks.long3(high, "box")
 
     # At positions
 
@@ -226,5 +217,13 @@ def _depth(depth: Any) -> int:
     return int(depth)
 
 
-def _three(values: List[int]) -> Tuple[int, int, int]:
-    return (values[0], values[1], values[2])
+def _box(box: Any) -> Box:
+    try:
+        low, high = box
+    except (TypeError, ValueError):
+        raise ValueError("a box is ((x0, y0, z0), (x1, y1, z1))") from None
+    return _checks.long3(low, "box"), _checks.long3(high, "box")
+
+
+def _three(values: Any) -> Tuple[int, int, int]:
+    return (int(values[0]), int(values[1]), int(values[2]))

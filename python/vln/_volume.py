@@ -2,12 +2,13 @@
 
 from __future__ import annotations
 
+import os
 from typing import Any, Callable, Dict, Iterator, List, Mapping, Optional, Tuple
 
 import numpy as np
 
 from . import _checks, _vln
-from ._channel import Channel, _depth
+from ._channel import Channel, _box, _depth, _three
 from ._points import Points
 from ._vln import FINEST, Flat
 
@@ -232,9 +233,35 @@ class Volume:
 
     # Out
 
-    def save(self, path: Any) -> None:
-        """Writes all channels, whole or not at all, in the format of the suffix."""
-        self._core.save(_checks.path_of(path))
+    def save(
+        self,
+        path: Any,
+        box: Optional[Any] = None,
+        depth: Optional[int] = None,
+        progress: Optional[Callable[[str, float], Any]] = None,
+    ) -> None:
+        """Writes all channels, whole or not at all, in the format of the suffix: .vdb, .nvtt, or dense as .npz
+        (numpy) or .vti (ParaView).
+
+        box, depth, progress: of dense files alone; as in Channel.to_numpy(), and as in open().
+        """
+        target = _checks.path_of(path)
+        if os.path.splitext(target)[1].lower() not in (".npz", ".vti"):
+            if box is not None or depth is not None:
+                raise ValueError("a box and a depth are those of dense files: .npz and .vti")
+            self._core.save(target)
+            return
+        if progress is not None and not callable(progress):
+            raise TypeError("progress must be callable")
+        low, high = (0, 0, 0), (0, 0, 0)
+        if box is not None:
+            low, high = _box(box)
+        else:
+            boxes = [found for found in (self[name].box for name in self.names) if found is not None]
+            if boxes:
+                low = _three(np.min([b[0] for b in boxes], axis=0))
+                high = _three(np.max([b[1] for b in boxes], axis=0))
+        self._core.save_dense(target, low, high, FINEST if depth is None else _depth(depth), progress)
 
     def flatten(
         self,

@@ -113,8 +113,12 @@ void declareSlice(CLI::App& self) {
 void declareConvert(CLI::App& self) {
   auto const options = std::make_shared<ConvertOptions>();
   auto& o = *options;
-  self.add_option("IN", o.file, "A .vdb file")->required()->type_name("IN.vdb");
-  self.add_option("OUT", o.output, "The .vdb file to write")->required()->type_name("OUT.vdb");
+  self.add_option("IN", o.file, "A .vdb file; for dense files a .nvtt file too")
+      ->required()
+      ->type_name("IN.vdb");
+  self.add_option("OUT", o.output, "The file to write: .vdb, or dense .npz (numpy) or .vti (ParaView)")
+      ->required()
+      ->type_name("OUT");
   addChannelFilter(self, o.limits);
   self.add_flag("--strict", o.strict, "Write nothing where anything of the file would be left out");
   addMemoryLimit(self, o.limits);
