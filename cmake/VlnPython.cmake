@@ -43,11 +43,22 @@ add_dependencies(_vln vln_python_package)
 
 enable_testing()
 include(VlnTestData)
+set(test_environment "PYTHONPATH=${PROJECT_BINARY_DIR}/python" PYTHONDONTWRITEBYTECODE=1
+  "VLN_TEST_DATA_DIR=${vln_test_data}")
+if(VLN_SANITIZE MATCHES "address")
+  # The interpreter is not instrumented: the sanitizer must come first, and sees what Python never frees as leaks.
+  execute_process(COMMAND "${CMAKE_CXX_COMPILER}" -print-file-name=libasan.so
+    OUTPUT_VARIABLE libasan OUTPUT_STRIP_TRAILING_WHITESPACE)
+  execute_process(COMMAND "${CMAKE_CXX_COMPILER}" -print-file-name=libstdc++.so
+    OUTPUT_VARIABLE libstdcxx OUTPUT_STRIP_TRAILING_WHITESPACE)
+  # The C++ library too: what throws is looked up when the sanitizer is loaded.
+  list(APPEND test_environment "LD_PRELOAD=${libasan} ${libstdcxx}" PYTHONMALLOC=malloc
+    "ASAN_OPTIONS=detect_leaks=0:allocator_may_return_null=1" "UBSAN_OPTIONS=print_stacktrace=1:halt_on_error=1")
+endif()
 vln_glob(tests python/tests/test_*.py)
 foreach(test IN LISTS tests)
   get_filename_component(name "${test}" NAME_WE)
   add_test(NAME python.${name}
     COMMAND "${Python3_EXECUTABLE}" -m pytest -q -p no:cacheprovider "${test}")
-  set_tests_properties(python.${name} PROPERTIES LABELS python TIMEOUT 600
-    ENVIRONMENT "PYTHONPATH=${PROJECT_BINARY_DIR}/python;PYTHONDONTWRITEBYTECODE=1;VLN_TEST_DATA_DIR=${vln_test_data}")
+  set_tests_properties(python.${name} PROPERTIES LABELS python TIMEOUT 900 ENVIRONMENT "${test_environment}")
 endforeach()

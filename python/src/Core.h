@@ -71,6 +71,10 @@ public:
   std::string besidesScale() const { return m_state->indexToWorld.besidesScale(); }
   std::uint64_t bytes() const;
 
+  /// A slice across an axis as the bytes of a PNG file. @param at World position on the axis.
+  py::bytes picture(std::string const& name, int axis, std::optional<double> at, int size,
+                    bool gradient) const;
+
   void save(std::string const& path) const;
   /// As .npz or .vti.
   void saveDense(std::string const& path, Long3 const& low, Long3 const& high, int depth,

@@ -4,7 +4,7 @@
 #include "Interop/DenseWrite.h"
 #include "Interop/FileError.h"
 #include "Interop/FileFormat.h"
-#include "Interop/NvttWrite.h"
+#include "Interop/Slice.h"
 #include "Interop/VolumeIo.h"
 
 #include <algorithm>
@@ -108,6 +108,34 @@ void Core::fillCoarse() {
   py::gil_scoped_release const nogil;
   Changing const changing(*m_state);
   m_state->volume.fillCoarse();
+}
+
+py::bytes Core::picture(std::string const& name, int axis, std::optional<double> at, int size,
+                        bool gradient) const {
+  std::vector<unsigned char> png;
+  {
+    py::gil_scoped_release const nogil;
+    Reading const reading(*m_state);
+    auto const found = ChannelOps::of(m_state->volume, name)->active(ruleOf(name), false);
+    Interop::VdbVolume volume;
+    volume.object = Ostil::makePtr<Object>(m_state->volume.object());
+    volume.indexToWorld = m_state->indexToWorld;
+    volume.voxelSize = m_state->indexToWorld.voxelSize().x;
+    Interop::VdbChannel channel;
+    channel.name = channel.gridName = name;
+    channel.activeVoxels = found.count;
+    if (found.count > 0) channel.activeBox = {found.low, found.high};
+    volume.activeBox = channel.activeBox;
+    volume.channels.push_back(channel);
+    Interop::SliceOptions options;
+    options.axis = axis;
+    options.at = at;
+    options.size = size;
+    options.gradient = gradient;
+    options.title = name;
+    png = Interop::drawSlice(volume, name, options).image.png();
+  }
+  return {reinterpret_cast<char const*>(png.data()), png.size()};
 }
 
 void Core::save(std::string const& path) const {

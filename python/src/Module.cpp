@@ -94,6 +94,7 @@ PYBIND11_MODULE(_vln, module) {
       .def("voxel_size", &Core::voxelSize)
       .def("besides_scale", &Core::besidesScale)
       .def("nbytes", &Core::bytes)
+      .def("picture", &Core::picture)
       .def("save", &Core::save)
       .def("save_dense", &Core::saveDense)
       .def("flatten", &flatten);

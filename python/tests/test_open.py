@@ -150,3 +150,19 @@ def test_requirement_info_and_repr_say_what_there_is(bunny):
     assert "levels" in repr(bunny.volume) and "bytes" in repr(bunny.volume)
     assert "235046 active voxels" in repr(bunny["ls_bunny"])
     assert "ls_bunny" in repr(bunny)
+
+
+def test_requirement_notebooks_get_pictures_and_tables(bunny):
+    channel = bunny["ls_bunny"]
+    png = channel._repr_png_()
+    assert png.startswith(b"\x89PNG\r\n\x1a\n") and len(png) > 1000
+    assert channel.png("x", size=64) != channel.png("y", size=64)
+    assert channel.png(gradient=True) != channel.png()
+    assert "235046" in channel._repr_html_() and "data:image/png" in channel._repr_html_()
+    assert "ls_bunny" in bunny.volume._repr_html_()
+    empty = vln.Volume().add("<b>")
+    assert empty._repr_png_() is None and "&lt;b&gt;" in empty._repr_html_()
+    with pytest.raises(ValueError, match="axis"):
+        channel.png("w")
+    with pytest.raises(ValueError):
+        channel.png(at=1e9)

@@ -7,7 +7,7 @@ from typing import TYPE_CHECKING, Any, Dict, List, Optional, Tuple
 
 import numpy as np
 
-from . import _checks
+from . import _checks, _html
 from ._vln import FINEST, Core
 
 if TYPE_CHECKING:
@@ -145,6 +145,26 @@ class Channel:
             except ValueError:
                 raise ValueError(f"values of shape {array.shape} do not fit {len(rows)} indices") from None
         self._core.set(self._name, rows, array)
+
+    # As a picture
+
+    def png(self, axis: str = "z", at: Optional[float] = None, size: int = 512, gradient: bool = False) -> bytes:
+        """A slice across an axis, "x", "y" or "z", at a world position on it (by default the middle of the box), as
+        the bytes of a PNG file. gradient: draws the length of the gradient."""
+        if axis not in ("x", "y", "z"):
+            raise ValueError(f"axis is 'x', 'y' or 'z', not {axis!r}")
+        where = None if at is None else float(at)
+        return self._core.picture(self._name, "xyz".index(axis), where, int(size), bool(gradient))
+
+    def _repr_png_(self) -> Optional[bytes]:
+        try:
+            return self.png(size=256)
+        except ValueError:  # nothing to be drawn
+            return None
+
+    def _repr_html_(self) -> str:
+        info = self.info()
+        return _html.table(f"channel {self._name}", info, self._repr_png_())
 
     # In place
 

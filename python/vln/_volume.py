@@ -7,7 +7,7 @@ from typing import Any, Callable, Dict, Iterator, List, Mapping, Optional, Tuple
 
 import numpy as np
 
-from . import _checks, _vln
+from . import _checks, _html, _vln
 from ._channel import Channel, _box, _depth, _three
 from ._points import Points
 from ._vln import FINEST, Flat
@@ -294,6 +294,13 @@ class Volume:
             "bytes": self.nbytes,
             "channels": {name: self[name].info() for name in self.names},
         }
+
+    def _repr_html_(self) -> str:
+        info = self.info()
+        channels = info.pop("channels")
+        for name, channel in channels.items():
+            info[f"channel {name}"] = f"{channel['type']}, {channel['active']} active in {channel['box']}"
+        return _html.table("volume", info)
 
     def __repr__(self) -> str:
         tiles = self.tiles_by_depth
