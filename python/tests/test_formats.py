@@ -115,3 +115,34 @@ def test_negative_what_cannot_be_written_leaves_no_file(suffix, tmp_path):
     with pytest.raises(Enough):
         volume.save(path, depth=7, progress=stop)
     assert path.read_bytes() == before and len(list(tmp_path.iterdir())) == 1
+
+
+def test_requirement_a_turned_grid_stands_where_it_stood(tmp_path):
+    peer = pytest.importorskip("pyopenvdb")
+    grid = peer.FloatGrid()
+    grid.name = "ramp"
+    c, s = np.cos(0.6), np.sin(0.6)
+    grid.transform = peer.createLinearTransform([[c / 2, s / 2, 0, 0], [-s, c, 0, 0], [0, 0, 0.25, 0], [3, -1, 2, 1]])
+    ijk = np.argwhere(np.ones((24, 16, 16), bool)) + (-8, 0, 8)
+    world = np.array([grid.transform.indexToWorld(tuple(float(v) for v in p)) for p in ijk])
+    dense = (world @ (2, -1, 0.5) + 40).reshape(24, 16, 16)
+    grid.copyFromArray(dense, ijk=(-8, 0, 8))
+    peer.write(str(tmp_path / "a.vdb"), grids=[grid])
+
+    file = vln.open(tmp_path / "a.vdb")
+    assert "not one uniform scale" in file.volume.transform
+    assert np.allclose(file.volume.to_world(ijk), world, atol=1e-12)
+    assert np.allclose(file.volume.to_index(world), ijk, atol=1e-12)
+    inside = file.volume.to_world(np.random.default_rng(1).uniform((-8, 0, 8), (14.9, 14.9, 22.9), (200, 3)))
+    values, gradients = file["ramp"].sample(inside, gradient=True)
+    assert np.allclose(values, inside @ (2, -1, 0.5) + 40, atol=1e-4)
+    assert np.allclose(gradients, (2, -1, 0.5), atol=1e-3)
+
+    file.save(tmp_path / "a.vti")
+    image, found = read_vti(tmp_path / "a.vti")
+    assert np.array_equal(found["ramp"], file["ramp"].to_numpy())
+    for at in ijk[::997]:
+        assert np.allclose(image.GetPoint(image.ComputePointId([int(v) for v in at])), file.volume.to_world(at))
+    file.save(tmp_path / "a.npz")
+    with np.load(tmp_path / "a.npz") as content:
+        assert np.allclose((content["to_world"] @ (5, 6, 7, 1))[:3], file.volume.to_world(content["low"] + (5, 6, 7)))

@@ -59,9 +59,9 @@ TEST_F(CommandLineTest, NegativeSuffixesFitTheFormat) {
   expectFailure(vln({"slice", path, "--channel", "surface", "--axis", "x", "-o", m_folder / "a.jpg"}),
                 (m_folder / "a.jpg") + ": pictures are written as .png");
   expectFailure(vln({"convert", path, m_folder / "a.ply"}),
-                (m_folder / "a.ply") + ": grids are written as .vdb, .npz or .vti");
+                (m_folder / "a.ply") + ": grids are written as .vdb");
   expectFailure(vln({"make", "cloud", m_folder / "a.png"}),
-                (m_folder / "a.png") + ": grids are written as .vdb, .npz or .vti");
+                (m_folder / "a.png") + ": grids are written as .vdb");
   expectFailure(vln({"tiles", path, "--depth", "28", "-o", m_folder / "a.stl"}),
                 (m_folder / "a.stl") + ": boxes are written as .obj");
   EXPECT_EQ(vln({"convert", path, m_folder / "A.VDB"}).code, 0);

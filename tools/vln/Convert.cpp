@@ -2,6 +2,7 @@
 #include "Interop/DenseWrite.h"
 #include "Interop/FileError.h"
 #include "Interop/FileFormat.h"
+#include "Interop/OutputFile.h"
 #include "Interop/VdbExport.h"
 #include "Interop/VolumeFile.h"
 #include "PointsFile.h"
@@ -45,13 +46,16 @@ void writeDense(VdbImport const& content, FileFormat format, std::string const& 
 } // namespace
 
 void convert(ConvertOptions const& options) {
-  FileFormat const format =
-      checkOutputAs(options.output, "grids", {FileFormat::kVdb, FileFormat::kNpz, FileFormat::kVti});
+  FileFormat const format = formatOf(options.output);
+  bool const dense = format == FileFormat::kNpz || format == FileFormat::kVti;
+  if (dense)
+    checkOutput(options.output);
+  else
+    checkOutputAs(options.output, "grids", {FileFormat::kVdb});
   VdbImport content;
   std::size_t written = 0;
   {
     ProgressBar bar;
-    bool const dense = format != FileFormat::kVdb;
     content = dense ? importVolumes(options.file, options.limits, bar.progress(0, 0.7))
                     : importVdb(options.file, options.limits, bar.progress(0, 0.7));
     if (!dense) written = content.points.size();
