@@ -82,10 +82,10 @@ public:
   virtual ElementInfo const& element() const = 0;
   virtual void background(void* out) const = 0;
 
-  /// Slices [first, last) along z of a box of samples of a depth, x fastest.
-  /// @param low In samples of that depth. @param out Of slice `first`.
-  virtual void dense(int3 const& low, int3 const& count, int depth, std::int64_t first, std::int64_t last,
-                     void* out) const = 0;
+  /// A box of samples of a depth, x fastest.
+  /// @param low In samples of that depth. @param between Called between parts of the work.
+  virtual void dense(int3 const& low, int3 const& count, int depth, void* out,
+                     FunctionRef<void()> between) const = 0;
   /// Blended values; of integers those of the nearest samples. NaN where a position is none.
   /// @param positions In tile space. @param gradients Null, or for float fields three floats for each
   /// position, in tile space.

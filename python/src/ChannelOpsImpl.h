@@ -63,60 +63,50 @@ public:
   ElementInfo const& element() const override { return m_info; }
   void background(void* out) const override { std::memcpy(out, &m_field.background(), sizeof(T)); }
 
-  void dense(int3 const& low, int3 const& count, int depth, std::int64_t first, std::int64_t last,
-             void* out) const override {
-    auto const& channel = m_field.channel();
+  /// From coarse to fine: each tile paints those of its samples below which there is no finer tile, so that
+  /// every element is written once at most.
+  void dense(int3 const& low, int3 const& count, int depth, void* out,
+             FunctionRef<void()> between) const override {
     auto const& tree = m_volume.tree();
+    auto const& tiles = *m_field.channel().tileArrays();
+    Dense const dense{static_cast<T*>(out), sampleWidth(depth), low, count};
     T const background = m_field.background();
-    int const width = sampleWidth(depth);
-    auto* const values = static_cast<T*>(out);
-    // Rows of blocks of 4 x 4 x 4 samples, which are tiles of this depth.
-    auto const blockOf = [](std::int64_t sample) { return sample >> 2; };
-    std::int64_t const zBegin = low.z + first, zEnd = low.z + last;
-    std::int64_t const rows = blockOf(low.y + std::int64_t(count.y) - 1) - blockOf(low.y) + 1;
-    std::int64_t const layers = blockOf(zEnd - 1) - blockOf(zBegin) + 1;
-    if (count.x <= 0 || count.y <= 0 || last <= first) return;
-    parallelFor(0, rows * layers, [&](std::int64_t begin, std::int64_t end) {
-      auto const accessor = tree.tileAccessor();
-      for (auto n = begin; n < end; ++n) {
-        std::int64_t const bz = blockOf(zBegin) + n / rows, by = blockOf(low.y) + n % rows;
-        std::int64_t const z0 = std::max(bz * 4, zBegin), z1 = std::min(bz * 4 + 4, zEnd);
-        std::int64_t const y0 = std::max<std::int64_t>(by * 4, low.y),
-                           y1 = std::min<std::int64_t>(by * 4 + 4, low.y + std::int64_t(count.y));
-        std::int64_t const xEnd = low.x + std::int64_t(count.x);
-        for (std::int64_t x = low.x; x < xEnd;) {
-          std::int64_t const bx = blockOf(x), x1 = std::min(bx * 4 + 4, xEnd);
-          copyBlock(channel, accessor, background, {bx, by, bz}, width, depth, [&](auto const& valueAt) {
-            for (auto z = z0; z < z1; ++z)
-              for (auto y = y0; y < y1; ++y) {
-                T* const row = values + (x - low.x) +
-                               std::int64_t(count.x) * ((y - low.y) + std::int64_t(count.y) * (z - zBegin));
-                for (auto i = x; i < x1; ++i) row[i - x] = valueAt(int(i & 3), int(y & 3), int(z & 3));
-              }
-          });
-          x = x1;
-        }
-      }
+    std::int64_t const slice = std::int64_t(count.x) * count.y;
+    parallelFor(0, count.z, [&](std::int64_t begin, std::int64_t end) {
+      std::fill(dense.values + begin * slice, dense.values + end * slice, background);
     });
+    constexpr std::int64_t kPart = 1 << 18;
+    for (int d = 0; d <= depth; ++d)
+      for (std::int64_t part = 0; part < tree.tileCount(d); part += kPart) {
+        parallelFor(part, std::min(tree.tileCount(d), part + kPart),
+                    [&](std::int64_t begin, std::int64_t end) {
+                      for (auto n = begin; n < end; ++n) {
+                        auto const& tile = tree.tile(n, d);
+                        auto const& values = tiles[static_cast<std::size_t>(d)][static_cast<std::size_t>(n)];
+                        if (!tile.valid() || values.size() < kElements) continue;
+                        if (d == depth)
+                          dense.copy(tile.tijk(), values.data());
+                        else
+                          dense.paint(tile, sampleWidth(d), values.data(), background);
+                      }
+                    },
+                    {.grain = 256});
+        between();
+      }
   }
 
   void sample(double3 const* positions, std::int64_t count, void* out, float3* gradients) const override {
     auto* const values = static_cast<T*>(out);
     if constexpr (std::is_same_v<T, float>) {
-      TileTree3D::FloatVoxelSamplerLinear<Shape> const sampler(m_volume.tree(), m_volume.topology(),
-                                                               m_field.channel());
+      auto const blender = makeBlender();
       float const perSample = m_volume.voxelSize();
       parallelFor(0, count,
                   [&](std::int64_t begin, std::int64_t end) {
-                    auto const own = sampler;
-                    for (auto n = begin; n < end; ++n) {
-                      values[n] = sampleFloat(own, positions[n]);
-                      if (!gradients) continue;
-                      own.sampleGradient(toFloat(positions[n]), TileTree3D::kSamplerTileSpace, &gradients[n]);
-                      gradients[n] *= perSample;
-                    }
+                    auto const own = *blender;
+                    for (auto n = begin; n < end; ++n)
+                      values[n] = own.at(positions[n], perSample, gradients ? &gradients[n] : nullptr);
                   },
-                  {.grain = kGrain});
+                  {.grain = 8 * kGrain});
     } else {
       TileTree3D::ChannelReader<ChannelT> const reader(m_volume.tree(), m_field.channel());
       parallelFor(0, count,
@@ -180,11 +170,12 @@ public:
           layer * blocks[1], lastLayer * blocks[1], 8, std::vector<int3>(),
           [&](std::int64_t begin, std::int64_t end) {
             std::vector<int3> found;
-            T block[kElements];
             for (auto row = begin; row < end; ++row)
               for (std::int64_t x = 0; x < blocks[0]; ++x) {
                 int3 const corner = blockCorner(first, x, row % blocks[1], row / blocks[1]);
-                if (readBlock(array, low, corner, tolerance, background, block)) found.push_back(corner);
+                if (forEachFar(array, low, corner, tolerance, background,
+                               [](std::int64_t, T const&) { return true; }))
+                  found.push_back(corner);
               }
             return found;
           },
@@ -257,24 +248,101 @@ public:
 private:
   static float3 toFloat(double3 const& p) { return {float(p.x), float(p.y), float(p.z)}; }
 
-  /// The place is found with the whole part of the position, which a float holds, and the rest goes to the
-  /// weights: far from the origin nothing of it is lost.
-  template <class Sampler> static float sampleFloat(Sampler const& sampler, double3 const& p) {
-    double const x = std::floor(p.x), y = std::floor(p.y), z = std::floor(p.z);
-    constexpr double kWhole = 1 << 24;
-    if (!(std::abs(x) < kWhole && std::abs(y) < kWhole && std::abs(z) < kWhole))
-      return sampler.sample(toFloat(p), TileTree3D::kSamplerTileSpace);
-    TileTree3D::TreeIndex tile;
-    int3 ijk;
-    float3 weights;
-    float invVoxelWidth = 0;
-    if (!sampler.prepareToSample({float(x), float(y), float(z)}, TileTree3D::kSamplerTileSpace, tile, ijk,
-                                 weights, kFinest, &invVoxelWidth))
-      return sampler.sample(toFloat(p), TileTree3D::kSamplerTileSpace);
-    float const perSample = 2 * invVoxelWidth;
-    weights = {weights.x + float(p.x - x) * perSample, weights.y + float(p.y - y) * perSample,
-               weights.z + float(p.z - z) * perSample};
-    return sampler.sample(tile, ijk, weights);
+  /// A dense array that is filled: `low` and `count` in samples of its depth, which are `width` indices wide.
+  struct Dense {
+    T* values;
+    int width;
+    int3 low, count;
+
+    /// Cuts [from, to) of samples to the array. @return Whether anything is left.
+    bool cut(std::int64_t (&from)[3], std::int64_t (&to)[3]) const {
+      for (int a = 0; a < 3; ++a) {
+        from[a] = std::max<std::int64_t>(from[a] - low[a], 0);
+        to[a] = std::min<std::int64_t>(to[a] - low[a], count[a]);
+        if (from[a] >= to[a]) return false;
+      }
+      return true;
+    }
+    T* row(std::int64_t y, std::int64_t z) const {
+      return values + std::int64_t(count.x) * (y + count.y * z);
+    }
+
+    /// A tile of the array's own depth.
+    void copy(int3 const& corner, T const* elements) const {
+      std::int64_t const at[3] = {corner.x / width, corner.y / width, corner.z / width};
+      std::int64_t from[3] = {at[0], at[1], at[2]}, to[3] = {at[0] + 4, at[1] + 4, at[2] + 4};
+      if (!cut(from, to)) return;
+      std::int64_t const x = at[0] - low.x, y = at[1] - low.y, z = at[2] - low.z;
+      for (auto k = from[2]; k < to[2]; ++k)
+        for (auto j = from[1]; j < to[1]; ++j)
+          std::copy(elements + (from[0] - x) + 4 * ((j - y) + 4 * (k - z)),
+                    elements + (to[0] - x) + 4 * ((j - y) + 4 * (k - z)), row(j, k) + from[0]);
+    }
+    /// Samples of a coarser tile, each `wide` indices, below which there is no child.
+    template <class Tile>
+    void paint(Tile const& tile, int wide, T const* elements, T const& background) const {
+      int3 const corner = tile.tijk();
+      std::int64_t const step = wide / width;
+      std::int64_t from[3], to[3];
+      for (int a = 0; a < 3; ++a) from[a] = corner[a] / width, to[a] = from[a] + 4 * step;
+      if (!cut(from, to)) return;
+      for (int e = 0; e < int(kElements); ++e) {
+        int const i = e & 3, j = e >> 2 & 3, k = e >> 4;
+        if (tile.childIndex(i >> 1, j >> 1, k >> 1) >= 0) continue;
+        T const& value = elements[e];
+        if (std::memcmp(&value, &background, sizeof(T)) == 0) continue;
+        std::int64_t const at[3] = {corner.x / width + i * step, corner.y / width + j * step,
+                                    corner.z / width + k * step};
+        for (int a = 0; a < 3; ++a) from[a] = at[a], to[a] = at[a] + step;
+        if (!cut(from, to)) continue;
+        for (auto z = from[2]; z < to[2]; ++z)
+          for (auto y = from[1]; y < to[1]; ++y) std::fill(row(y, z) + from[0], row(y, z) + to[0], value);
+      }
+    }
+  };
+
+  /// Blends of a float channel. Where there is a tile of the deepest depth the eight samples are read one by
+  /// one, which needs no cache and so takes positions in any order; elsewhere the sampler blends coarser
+  /// ones.
+  struct Blender {
+    TileTree3D::ConstTileAccessorOf<Shape> accessor;
+    TileTree3D::ChannelReader<ChannelT> reader;
+    TileTree3D::FloatVoxelSamplerLinear<Shape> sampler;
+
+    float at(double3 const& p, float perSample, float3* gradient) const {
+      int3 const low{toIntFloor(p.x), toIntFloor(p.y), toIntFloor(p.z)};
+      bool inside = true;
+      for (int a = 0; a < 3; ++a)
+        inside = inside && low[a] > Shape::kMinTileCoord && low[a] < Shape::kMaxTileCoord;
+      if (!inside || !accessor.treeIndex(low.x, low.y, low.z, kFinest, true).valid()) {
+        if (!gradient) return sampler.sample(toFloat(p), TileTree3D::kSamplerTileSpace);
+        float const value = sampler.sampleGradient(toFloat(p), TileTree3D::kSamplerTileSpace, gradient);
+        *gradient *= perSample;
+        return value;
+      }
+      double const x = p.x - low.x, y = p.y - low.y, z = p.z - low.z;
+      double edge[4], slope[4]; // along x, in the order (0,0) (1,0) (0,1) (1,1) of y and z
+      for (int n = 0; n < 4; ++n) {
+        int const j = low.y + (n & 1), k = low.z + (n >> 1);
+        double const a = reader.value(low.x, j, k), b = reader.value(low.x + 1, j, k);
+        slope[n] = b - a;
+        edge[n] = a + (x > 0 ? x * slope[n] : 0);
+      }
+      auto const lerp = [](double a, double b, double t) { return t > 0 ? a + t * (b - a) : a; };
+      double const front = lerp(edge[0], edge[1], y), back = lerp(edge[2], edge[3], y);
+      if (gradient)
+        *gradient = {float(lerp(lerp(slope[0], slope[1], y), lerp(slope[2], slope[3], y), z)),
+                     float(lerp(edge[1] - edge[0], edge[3] - edge[2], z)), float(back - front)};
+      return float(lerp(front, back, z));
+    }
+  };
+
+  /// Apart, as the compiler takes what an accessor has not visited yet for an oversight where it sees all of
+  /// it.
+  [[gnu::noinline]] std::unique_ptr<Blender> makeBlender() const {
+    return std::unique_ptr<Blender>(new Blender{m_volume.tree().tileAccessor(),
+                                                {m_volume.tree(), m_field.channel()},
+                                                {m_volume.tree(), m_volume.topology(), m_field.channel()}});
   }
 
   static S componentOf(T const& value, int c) {
@@ -315,32 +383,6 @@ private:
       std::memcpy(&result, scalars, sizeof result);
       return result;
     }
-  }
-
-  /// Calls `write` with a function from the place in a block to the value there.
-  template <class Accessor, class Write>
-  static void copyBlock(ChannelT const& channel, Accessor const& accessor, T const& background,
-                        std::array<std::int64_t, 3> const& block, int width, int depth, Write const& write) {
-    std::int64_t const corner[3] = {block[0] * 4 * width, block[1] * 4 * width, block[2] * 4 * width};
-    bool inside = true;
-    for (auto const c : corner) inside = inside && c >= Shape::kMinTileCoord && c <= Shape::kMaxTileCoord;
-    auto at = inside ? accessor.treeIndex(int(corner[0]), int(corner[1]), int(corner[2]), depth, false)
-                     : TileTree3D::TreeIndex();
-    auto const& tiles = *channel.tileArrays();
-    auto const elements = [&]() -> auto const& {
-      return tiles[static_cast<std::size_t>(at.depth)][static_cast<std::size_t>(at.index)];
-    };
-    while (at.valid() && elements().size() < kElements) at = accessor.tile(at).parentTreeIndex();
-    if (!at.valid()) return write([&](int, int, int) -> T const& { return background; });
-    T const* const values = elements().data();
-    if (at.depth == depth)
-      return write([&](int i, int j, int k) -> T const& { return values[i + 4 * (j + 4 * k)]; });
-    auto const& tile = accessor.tile(at);
-    write([&](int i, int j, int k) -> T const& {
-      int3 const p = tile.childDataIJK(int(corner[0]) + i * width, int(corner[1]) + j * width,
-                                       int(corner[2]) + k * width);
-      return values[ChannelT::ConstTile::index(p)];
-    });
   }
 
   static bool insideBand(T const& value, T const& background) {
@@ -413,12 +455,12 @@ private:
     return {int((first.x + x) * 4), int((first.y + y) * 4), int((first.z + z) * 4)};
   }
 
-  /// The elements of a block of 4 x 4 x 4, the background beyond the array, and near it too.
-  /// @return Whether some element is not the background.
-  static bool readBlock(StridedArray const& array, int3 const& low, int3 const& corner, double tolerance,
-                        T const& background, T* block) {
-    bool differs = false;
-    std::fill_n(block, kElements, background);
+  /// Calls `body` for each element of a block of 4 x 4 x 4 that is not near the background, until it says
+  /// true.
+  /// @return Whether it did.
+  template <class Body>
+  static bool forEachFar(StridedArray const& array, int3 const& low, int3 const& corner, double tolerance,
+                         T const& background, Body const& body) {
     std::int64_t from[3], to[3];
     for (int a = 0; a < 3; ++a) {
       from[a] = std::max<std::int64_t>(0, std::int64_t(low[a]) - corner[a]);
@@ -430,16 +472,27 @@ private:
                          (corner.y + j - low.y) * array.step[1] + (corner.z + k - low.z) * array.step[2];
         for (auto i = from[0]; i < to[0]; ++i, at += array.step[0]) {
           T const value = readElement(array, at);
-          if (near(value, background, tolerance)) continue;
-          block[i + 4 * (j + 4 * k)] = value;
-          differs = true;
+          if (!near(value, background, tolerance) && body(i + 4 * (j + 4 * k), value)) return true;
         }
       }
-    return differs;
+    return false;
+  }
+  /// The elements of a block, the background where they are near it and beyond the array.
+  static void readBlock(StridedArray const& array, int3 const& low, int3 const& corner, double tolerance,
+                        T const& background, T* block) {
+    std::fill_n(block, kElements, background);
+    forEachFar(array, low, corner, tolerance, background, [&](std::int64_t n, T const& value) {
+      block[n] = value;
+      return false;
+    });
   }
   static T readElement(StridedArray const& array, char const* at) {
     T value{};
     auto* const to = reinterpret_cast<char*>(&value);
+    if constexpr (kComponents == 1) {
+      std::memcpy(to, at, sizeof(S));
+      return value;
+    }
     if (array.innerCount.empty()) {
       std::memcpy(to, at, sizeof(S));
     } else if (array.innerCount.size() == 1) {

@@ -222,13 +222,7 @@ py::array Core::toNumpy(std::string const& name, Long3 const& low, Long3 const& 
       result = newArray(element, {size.z, size.y, size.x});
       out = static_cast<char*>(result.mutable_data());
     }
-    std::int64_t const slice = std::int64_t(size.x) * size.y;
-    std::int64_t const step = std::max<std::int64_t>(4, (1 << 22) / std::max<std::int64_t>(1, slice));
-    for (std::int64_t z = 0; z < size.z; z += step) {
-      if (z > 0) checkSignals();
-      std::int64_t const last = std::min<std::int64_t>(size.z, z + step);
-      ops->dense(first, size, depth, z, last, out + z * slice * element.bytes);
-    }
+    ops->dense(first, size, depth, out, [] { checkSignals(); });
   }
   return result;
 }
