@@ -305,16 +305,20 @@ private:
   /// one, which needs no cache and so takes positions in any order; elsewhere the sampler blends coarser
   /// ones.
   struct Blender {
-    TileTree3D::ConstTileAccessorOf<Shape> accessor;
     TileTree3D::ChannelReader<ChannelT> reader;
     TileTree3D::FloatVoxelSamplerLinear<Shape> sampler;
 
+    /// Whether there is a tile of the deepest depth: the first two of its row are two elements then. A
+    /// coarser sample is wide enough to be both, and so is the background.
+    bool finest(int3 const& p) const {
+      return &reader.value(p.x & ~3, p.y, p.z) != &reader.value((p.x & ~3) | 1, p.y, p.z);
+    }
     float at(double3 const& p, float perSample, float3* gradient) const {
       int3 const low{toIntFloor(p.x), toIntFloor(p.y), toIntFloor(p.z)};
       bool inside = true;
       for (int a = 0; a < 3; ++a)
         inside = inside && low[a] > Shape::kMinTileCoord && low[a] < Shape::kMaxTileCoord;
-      if (!inside || !accessor.treeIndex(low.x, low.y, low.z, kFinest, true).valid()) {
+      if (!inside || !finest(low)) {
         if (!gradient) return sampler.sample(toFloat(p), TileTree3D::kSamplerTileSpace);
         float const value = sampler.sampleGradient(toFloat(p), TileTree3D::kSamplerTileSpace, gradient);
         *gradient *= perSample;
@@ -340,8 +344,7 @@ private:
   /// Apart, as the compiler takes what an accessor has not visited yet for an oversight where it sees all of
   /// it.
   [[gnu::noinline]] std::unique_ptr<Blender> makeBlender() const {
-    return std::unique_ptr<Blender>(new Blender{m_volume.tree().tileAccessor(),
-                                                {m_volume.tree(), m_field.channel()},
+    return std::unique_ptr<Blender>(new Blender{{m_volume.tree(), m_field.channel()},
                                                 {m_volume.tree(), m_volume.topology(), m_field.channel()}});
   }
 

@@ -248,3 +248,26 @@ def test_requirement_a_flat_buffer_has_the_buffer_protocol(bunny, tmp_path):
     assert (tmp_path / "raw").stat().st_size == flat.nbytes
     with pytest.raises(TypeError):
         view[0] = 1
+
+
+def test_requirement_coarse_samples_are_blended_where_there_are_no_finer_ones():
+    volume = vln.Volume.from_numpy(np.random.default_rng(8).random((16, 16, 16), np.float32))
+    channel = volume["density"]
+    volume.set_coarse_values()
+    volume.remove(np.ones(len(volume.origins()), bool))
+    coarse = channel.to_numpy(box=((0, 0, 0), (16, 16, 16)), depth=vln.FINEST - 1)
+    p = np.random.default_rng(9).uniform(0, 6.9, (300, 3))
+    low = np.floor(p).astype(int)
+    t = p - low
+    expected = np.zeros(len(p))
+    for corner in np.ndindex(2, 2, 2):
+        expected += np.prod(np.where(corner, t, 1 - t), axis=1) * coarse[tuple((low + corner).T)]
+    assert np.abs(channel.sample(2 * p, space="index") - expected).max() < 1e-5
+    _, gradient = channel.sample(2 * p, gradient=True, space="index")
+    step = 1e-3
+    for axis in range(3):
+        ahead = 2 * p
+        ahead[:, axis] += step
+        same_cell = (np.floor(ahead / 2) == low).all(axis=1)
+        slope = (channel.sample(ahead, space="index") - channel.sample(2 * p, space="index")) / step
+        assert np.abs(slope - gradient[:, axis])[same_cell].max() < 2e-2
