@@ -36,7 +36,8 @@ public:
   /// (element type, dtype, shape of an element, type in files)
   py::tuple typeOf(std::string const& name) const;
   py::array background(std::string const& name) const;
-  /// @param type As elementTypes() names it, or "bool". @param metadata OpenVDB's class, such as "level set".
+  /// @param type As ChannelOps::types() names it, or "bool". @param gridClass For .vdb files, such as "level
+  /// set".
   void add(std::string const& name, std::string const& type, py::array const& background,
            std::string const& gridClass);
   void removeChannel(std::string const& name);
