@@ -1,6 +1,7 @@
 #!/bin/sh
-# install-deps.sh [--checks]: installs the Debian packages that the build and the tests need, with --checks those
-# of scripts/check.sh too. Asks nothing; when all is there it does nothing and calls no network.
+# install-deps.sh [--checks|--python]: installs the Debian packages that the build and the tests need, with --checks
+# those of scripts/check.sh too, with --python those of the Python module. Asks nothing; when all is there it does
+# nothing and calls no network.
 set -eu
 
 packages="
@@ -13,6 +14,11 @@ packages="
 case ${1:-} in
   '') ;;
   --checks) packages="$packages clang-format-14 clang-tidy-14" ;;
+  --python)
+    packages="$packages python3-dev pybind11-dev python3-numpy python3-pip python3-venv python3-pytest mypy"
+    # Beside which the tests load the module, and whose readers they ask.
+    packages="$packages python3-scipy python3-openvdb python3-vtk9"
+    ;;
   *) echo "install-deps: unknown option '$1'" >&2 && exit 2 ;;
 esac
 

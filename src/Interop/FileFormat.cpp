@@ -22,13 +22,15 @@ struct Row {
 constexpr Row kTable[] = {
     {FileFormat::kCsv, ".csv", {}, FileContent::kValues},
     {FileFormat::kJson, ".json", {}, {}},
+    {FileFormat::kNpz, ".npz", {}, FileContent::kDense},
     {FileFormat::kNvtt, ".nvtt", FileContent::kVolumes | FileContent::kFlatBuffers,
      FileContent::kVolumes | FileContent::kFlatBuffers},
     {FileFormat::kObj, ".obj", {}, FileContent::kBoxes | FileContent::kPoints},
-    {FileFormat::kPly, ".ply", FileContent::kPoints, FileContent::kPoints},
+    {FileFormat::kPly, ".ply", FileContent::kPoints, FileContent::kPoints | FileContent::kPointData},
     {FileFormat::kPng, ".png", {}, FileContent::kPictures},
     {FileFormat::kVdb, ".vdb", FileContent::kVolumes | FileContent::kGrids | FileContent::kPoints,
-     FileContent::kVolumes | FileContent::kGrids | FileContent::kPoints},
+     FileContent::kVolumes | FileContent::kGrids | FileContent::kPoints | FileContent::kPointData},
+    {FileFormat::kVti, ".vti", {}, FileContent::kDense},
 };
 
 Row const* rowOf(FileFormat format) {
@@ -53,6 +55,10 @@ char const* nameOf(FileContent content) {
     return "pictures";
   case FileContent::kValues:
     return "values";
+  case FileContent::kDense:
+    return "dense boxes";
+  case FileContent::kPointData:
+    return "points";
   }
   return "";
 }

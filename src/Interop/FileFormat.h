@@ -8,7 +8,7 @@
 
 namespace VLN::Interop {
 
-enum class FileFormat { kUnknown, kVdb, kNvtt, kPly, kObj, kPng, kCsv, kJson };
+enum class FileFormat { kUnknown, kVdb, kNvtt, kPly, kObj, kPng, kCsv, kJson, kNpz, kVti };
 
 /// What a file holds, as messages call it.
 enum class FileContent : unsigned {
@@ -19,6 +19,8 @@ enum class FileContent : unsigned {
   kBoxes = 16,      ///< "boxes"
   kPictures = 32,   ///< "pictures"
   kValues = 64,     ///< "values": tables
+  kDense = 128,     ///< "dense boxes": arrays of one depth
+  kPointData = 256, ///< "points" again, with all that they have
 };
 constexpr FileContent operator|(FileContent a, FileContent b) {
   return FileContent(unsigned(a) | unsigned(b));

@@ -1,7 +1,10 @@
 #include "Commands.h"
+#include "Interop/DenseWrite.h"
 #include "Interop/FileError.h"
 #include "Interop/FileFormat.h"
+#include "Interop/OutputFile.h"
 #include "Interop/VdbExport.h"
+#include "Interop/VolumeFile.h"
 #include "PointsFile.h"
 #include "ProgressBar.h"
 #include "StandardOutput.h"
@@ -31,20 +34,35 @@ void checkWhole(VdbImport const& content) {
                       "would not be written whole; '" + oneLine(points.name, 60) + "': " + loss);
 }
 
+void writeDense(VdbImport const& content, FileFormat format, std::string const& output,
+                Progress const& progress) {
+  if (content.volumes.size() > 1)
+    throw FileError(content.file, "holds " + std::to_string(content.volumes.size()) +
+                                      " volumes, each with a transform of its own: choose with --channels");
+  auto const dense = denseVolumeOf(content.volumes.front());
+  format == FileFormat::kNpz ? writeNpz(output, dense, progress) : writeVti(output, dense, progress);
+}
+
 } // namespace
 
 void convert(ConvertOptions const& options) {
-  checkOutputFor(FileContent::kGrids, options.output);
+  FileFormat const format = formatOf(options.output);
+  bool const dense = isWritten(format, FileContent::kDense);
+  checkOutputFor(dense ? FileContent::kDense : FileContent::kGrids, options.output);
   VdbImport content;
   std::size_t written = 0;
   {
     ProgressBar bar;
-    content = importVdb(options.file, options.limits, bar.progress(0, 0.7));
-    written = content.points.size();
+    content = dense ? importVolumes(options.file, options.limits, bar.progress(0, 0.7))
+                    : importVdb(options.file, options.limits, bar.progress(0, 0.7));
+    if (!dense) written = content.points.size();
     for (auto const& volume : content.volumes) written += volume.channels.size();
     if (written == 0) throw FileError(options.file, "has no grid that could be written" + whyNot(content));
     if (options.strict) checkWhole(content);
-    exportVdb(content, options.output, bar.progress(0.7, 1));
+    if (dense)
+      writeDense(content, format, options.output, bar.progress(0.7, 1));
+    else
+      exportVdb(content, options.output, bar.progress(0.7, 1));
   }
   for (auto const& s : content.skipped)
     std::cerr << fmt::format("vln: {}: note: '{}' is left out: {}\n", options.file, oneLine(s.grid, 60),
