@@ -19,7 +19,7 @@ struct Row {
 constexpr Row kTable[] = {
     {FileFormat::kVdb, ".vdb"},   {FileFormat::kNvtt, ".nvtt"}, {FileFormat::kPly, ".ply"},
     {FileFormat::kObj, ".obj"},   {FileFormat::kPng, ".png"},   {FileFormat::kCsv, ".csv"},
-    {FileFormat::kJson, ".json"},
+    {FileFormat::kJson, ".json"}, {FileFormat::kExr, ".exr"},
 };
 
 std::string lowerSuffix(std::string const& path) {

@@ -8,7 +8,7 @@
 
 namespace VLN::Interop {
 
-enum class FileFormat { kUnknown, kVdb, kNvtt, kPly, kObj, kPng, kCsv, kJson };
+enum class FileFormat { kUnknown, kVdb, kNvtt, kPly, kObj, kPng, kCsv, kJson, kExr };
 
 /// As the suffix of the name tells, whatever its case.
 VLN_API FileFormat formatOf(std::string const& path);

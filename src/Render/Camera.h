@@ -1,14 +1,15 @@
-// Camera: a pinhole in world space, and how it is put before a box.
+// Camera: a pinhole in world space, and how it is put before what it shows.
 #pragma once
 
 #include "Render/Export.h"
 #include "Render/Vec.h"
 
 #include <optional>
+#include <vector>
 
 namespace VLN::Render {
 
-/// What was asked for; what was not follows from the box.
+/// What was asked for; what was not follows from what is shown.
 struct CameraOptions {
   std::optional<Vec3d> direction; ///< into the picture
   std::optional<Vec3d> position, focalPoint, viewUp;
@@ -21,11 +22,13 @@ struct CameraOptions {
 class VLN_RENDER_API Camera {
 public:
   Camera() = default;
-  /// Sees the whole box when neither position nor zoom says otherwise; without a direction from three
-  /// quarters and above.
+  /// Without a position it stands as near as lets all points be seen, in the middle of the picture unless a
+  /// focal point is given; without a direction it looks from three quarters and above.
   /// @space World.
+  /// @param margin World length by which the points are widened.
+  /// @pre There is a point.
   /// @error std::invalid_argument when position and focal point are one, or the up direction is that of view.
-  Camera(CameraOptions const& options, Vec3d boxLow, Vec3d boxHigh, double aspect);
+  Camera(CameraOptions const& options, std::vector<Vec3d> const& points, double margin, double aspect);
 
   Vec3d position, focalPoint, viewUp;
   double viewAngle = 30;

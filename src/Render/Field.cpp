@@ -5,8 +5,10 @@
 #include <algorithm>
 #include <cmath>
 #include <limits>
+#include <map>
 #include <stdexcept>
 #include <string>
+#include <tuple>
 
 namespace VLN::Render {
 
@@ -263,6 +265,35 @@ void Field::weigh(Weight const& weight, int threads) {
   });
   m_view.weights = m_weights.data();
   m_view.cells = m_cells.data();
+}
+
+std::vector<Vec3> Field::outline() const {
+  // Of each row of tiles along x the ends are enough.
+  std::map<std::tuple<std::int32_t, std::int32_t, int>, std::pair<std::int32_t, std::int32_t>> rows;
+  for (std::uint32_t n = 0; n < m_tiles.size(); ++n) {
+    TileRef const& t = m_tiles[n];
+    if (t.depth != nanovtt::kMaxDepth) continue;
+    if (value(m_bounds[n].low) == m_view.background && value(m_bounds[n].high) == m_view.background) continue;
+    auto const [at, isNew] = rows.try_emplace({t.corner.y, t.corner.z, t.width()}, t.corner.x, t.corner.x);
+    auto& [low, high] = at->second;
+    low = std::min(low, t.corner.x), high = std::max(high, t.corner.x);
+  }
+  std::vector<Vec3> corners;
+  auto const add = [&](Vec3d from, Vec3d to) {
+    Vec3 ends[2];
+    for (int a = 0; a < 3; ++a) {
+      ends[0][a] = std::clamp(static_cast<float>(from[a] - m_origin[a]), m_activeLow[a], m_activeHigh[a]);
+      ends[1][a] = std::clamp(static_cast<float>(to[a] - m_origin[a]), m_activeLow[a], m_activeHigh[a]);
+    }
+    for (int c = 0; c < 8; ++c) corners.push_back({ends[c & 1].x, ends[c >> 1 & 1].y, ends[c >> 2].z});
+  };
+  for (auto const& [key, range] : rows) {
+    auto const [y, z, width] = key;
+    add({double(range.first), double(y), double(z)},
+        {double(range.second) + width, double(y) + width, double(z) + width});
+  }
+  if (corners.empty()) add(m_origin + m_activeLow.as<double>(), m_origin + m_activeHigh.as<double>());
+  return corners;
 }
 
 std::vector<float> Field::sortedValues(std::size_t count) const {

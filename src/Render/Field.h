@@ -51,6 +51,9 @@ public:
   Vec3 activeLow() const { return m_activeLow; }
   Vec3 activeHigh() const { return m_activeHigh; }
   bool empty() const { return m_isEmpty; }
+  /// Corners of the boxes of what differs from the background, cut to the active box: what a picture shows
+  /// lies between them.
+  std::vector<Vec3> outline() const;
 
   /// How much a range of values matters to a picture: 0 for not at all.
   using Weight = std::function<float(float low, float high)>;
@@ -61,7 +64,8 @@ public:
   /// Rays stop at tiles of this depth.
   void limitDepth(int depth) { m_view.maxDepth = depth; }
 
-  /// Values of active samples, sorted: each n-th one, so that at most about `count` come.
+  /// Values that differ from the background, of the deepest tiles, sorted: each n-th one, so that at most
+  /// about `count` come.
   std::vector<float> sortedValues(std::size_t count) const;
 
 private:

@@ -24,6 +24,8 @@ constexpr Vec3 kKeyLight{1.0f, 0.96f, 0.9f}, kSky{0.55f, 0.6f, 0.68f}, kGround{0
 constexpr Vec3 kClay{0.72f, 0.68f, 0.62f};
 /// The most points of a lattice of light along its longest axis.
 constexpr double kLatticePoints = 128;
+/// Of a march through the diagonal: where voxels are large, steps are smaller than they are.
+constexpr double kFewestSteps = 320;
 
 /// A camera's ray in local space. Its origin is where it enters the field's box.
 struct Start {
@@ -40,6 +42,7 @@ struct Scene {
   Affine toLocal; ///< from the world
   Vec3d eye;      ///< local
   Vec3d light;    ///< world, unit
+  double diagonal; ///< of the field's box, world length
 
   bool start(double u, double v, Start& s) const {
     s.world = camera.ray(u, v);
@@ -73,10 +76,7 @@ struct Sample {
 
 /// Smallest world length of a voxel's edges.
 double voxelOf(Affine const& m) {
-  double least = std::numeric_limits<double>::max();
-  for (int a = 0; a < 3; ++a)
-    least = std::min(least, length(Vec3d{m.rows[0][a], m.rows[1][a], m.rows[2][a]}));
-  return least;
+  return std::min({m.edge(0), m.edge(1), m.edge(2)});
 }
 
 // --- Surfaces -------------------------------------------------------------------------------------------------
@@ -229,13 +229,14 @@ double chooseUnit(Scene const& scene, FogView& fog, double voxel) {
 } // namespace
 
 Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, RenderOptions const& options,
-               std::function<bool(double)> const& watch) {
+               std::function<void(double)> const& watch) {
   if (options.width < 1 || options.height < 1 || options.width > 32768 || options.height > 32768)
     throw std::invalid_argument("a picture has 1 to 32768 pixels an axis");
   double const determinant = tileToWorld.determinant();
   if (!std::isfinite(determinant) || determinant == 0)
     throw std::invalid_argument("its transform cannot be inverted");
-  Scene scene{field, camera, options, tileToWorld.inverse(), {}, {}};
+  Scene scene{field, camera, options, tileToWorld.inverse(), {}, {}, {}};
+  scene.diagonal = length(tileToWorld.vector((field.view().high - field.view().low).as<double>()));
   scene.toLocal.shift = scene.toLocal.shift - field.origin();
   scene.eye = scene.toLocal.point(camera.position);
   scene.light = length(options.light) > 0
@@ -281,7 +282,7 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
     fog.sky = kSky * (isFinal ? 1.0f : 0.35f);
     fog.ground = kGround * (isFinal ? 1.0f : 0.5f);
     fog.bounces = options.bounces;
-    fog.step = static_cast<float>(0.8 * voxel);
+    fog.step = static_cast<float>(std::min(0.8 * voxel, scene.diagonal / kFewestSteps));
     picture.opacityUnit = options.opacityUnit > 0 ? options.opacityUnit : chooseUnit(scene, fog, voxel);
     fog.perUnit = static_cast<float>(1 / picture.opacityUnit);
     if (!isFinal) {
@@ -289,7 +290,7 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
       double longest = 0;
       for (int pass = 0; pass < 2; ++pass)
         for (int a = 0; a < 3; ++a) {
-          double const edge = length(Vec3d{tileToWorld.rows[0][a], tileToWorld.rows[1][a], tileToWorld.rows[2][a]});
+          double const edge = tileToWorld.edge(a);
           double const extent = edge * double(fog.field.high[a] - fog.field.low[a]);
           if (pass == 0) longest = std::max(longest, extent);
           spacing[a] = static_cast<float>(std::max(1.0, longest / kLatticePoints / edge));
@@ -311,7 +312,7 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
                                                        : (isFinal ? 16 : 1);
 
   auto const pass = [&](int sample, auto const& shader) {
-    return forRanges(
+    forRanges(
         options.height, kRowGrain, options.threads,
         [&](std::int64_t begin, std::int64_t end) {
           for (std::int64_t y = begin; y < end; ++y)
@@ -336,29 +337,24 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
               if (!picture.value.empty()) picture.value[n] += got.value;
             }
         },
-        [&](double share) { return !watch || watch((sample + share) / samples); });
+        [&](double share) {
+          if (watch) watch((sample + share) / samples);
+        });
   };
   auto const began = Clock::now();
   auto const seconds = [&] { return std::chrono::duration<double>(Clock::now() - began).count(); };
   int done = 0;
   for (; done < samples; ++done) {
     if (done > 0 && options.timeLimit > 0 && seconds() >= options.timeLimit) break;
-    bool whole = true;
     if (options.mode == Mode::kSurface) {
       int const rays = options.occlusionRays >= 0 ? options.occlusionRays : 2;
-      double longest = 0;
-      for (int a = 0; a < 3; ++a)
-        longest = std::max(longest, length(Vec3d{tileToWorld.rows[0][a], tileToWorld.rows[1][a],
-                                                 tileToWorld.rows[2][a]}) *
-                                        double(field.activeHigh()[a] - field.activeLow()[a]));
-      whole = pass(done, SurfaceShader{scene, rays, static_cast<float>(0.25 * longest),
+      pass(done, SurfaceShader{scene, rays, static_cast<float>(0.15 * scene.diagonal),
                                        static_cast<float>(0.5 * voxel)});
     } else if (isFog) {
-      whole = pass(done, FogShader{fog, isFinal});
+      pass(done, FogShader{fog, isFinal});
     } else {
-      whole = pass(done, ProjectionShader{scene, static_cast<float>(0.5 * voxel), options.mode == Mode::kMean});
+      pass(done, ProjectionShader{scene, static_cast<float>(0.5 * voxel), options.mode == Mode::kMean});
     }
-    if (!whole) break;
   }
   picture.seconds = seconds();
   picture.samples = done;

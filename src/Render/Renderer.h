@@ -54,12 +54,11 @@ struct Picture {
 };
 
 /// @param tileToWorld The place in the world of a sample, from its tile-space position.
-/// @param watch Told the share that is done; false ends the work, and the picture holds the whole samples
-/// until then.
+/// @param watch Told now and then the share that is done, by the calling thread.
 /// @error std::invalid_argument for options that are none, and a transform without an inverse.
 /// @numeric The same bytes for any number of threads, unless a time limit ends it.
 VLN_RENDER_API Picture render(Field& field, Affine const& tileToWorld, Camera const& camera,
-                              RenderOptions const& options, std::function<bool(double)> const& watch = {});
+                              RenderOptions const& options, std::function<void(double)> const& watch = {});
 
 /// Light over a background, as sRGB bytes.
 /// @param background Linear light. @param opaque Alpha is 255 everywhere; else it is kept, the background is

@@ -10,9 +10,9 @@
 
 namespace VLN::Render {
 
-bool forRanges(std::int64_t count, std::int64_t grain, int threads,
+void forRanges(std::int64_t count, std::int64_t grain, int threads,
                std::function<void(std::int64_t, std::int64_t)> const& body,
-               std::function<bool(double)> const& watch) {
+               std::function<void(double)> const& watch) {
   grain = std::max<std::int64_t>(grain, 1);
   if (threads <= 0) threads = static_cast<int>(std::max(1u, std::thread::hardware_concurrency()));
   std::int64_t const pieces = (count + grain - 1) / grain;
@@ -28,7 +28,7 @@ bool forRanges(std::int64_t count, std::int64_t grain, int threads,
         std::int64_t const piece = next++;
         if (piece >= pieces) break;
         body(piece * grain, std::min(count, (piece + 1) * grain));
-        if (isCaller && watch && !watch(double(std::min(pieces, next.load())) / double(pieces))) stop = true;
+        if (isCaller && watch) watch(double(std::min(pieces, next.load())) / double(pieces));
       }
     } catch (...) {
       std::lock_guard const lock(errorLock);
@@ -43,7 +43,6 @@ bool forRanges(std::int64_t count, std::int64_t grain, int threads,
   work(true);
   for (auto& other : others) other.join();
   if (error) std::rethrow_exception(error);
-  return !stop;
 }
 
 } // namespace VLN::Render

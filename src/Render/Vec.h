@@ -50,6 +50,8 @@ struct Affine {
   Vec3d point(Vec3d p) const { return vector(p) + shift; }
   /// The transposed matrix times a vector: gradients go the other way than points.
   Vec3d transposed(Vec3d v) const { return rows[0] * v.x + rows[1] * v.y + rows[2] * v.z; }
+  /// Length of what an axis of unit length becomes.
+  double edge(int a) const { return length(Vec3d{rows[0][a], rows[1][a], rows[2][a]}); }
   double determinant() const { return dot(rows[0], cross(rows[1], rows[2])); }
   /// @pre The determinant is not 0.
   Affine inverse() const {
