@@ -267,13 +267,13 @@ void Field::weigh(Weight const& weight, int threads) {
   m_view.cells = m_cells.data();
 }
 
-std::vector<Vec3> Field::outline() const {
+std::vector<Vec3> Field::outline(std::function<bool(float, float)> const& shows) const {
   // Of each row of tiles along x the ends are enough.
   std::map<std::tuple<std::int32_t, std::int32_t, int>, std::pair<std::int32_t, std::int32_t>> rows;
   for (std::uint32_t n = 0; n < m_tiles.size(); ++n) {
     TileRef const& t = m_tiles[n];
     if (t.depth != nanovtt::kMaxDepth) continue;
-    if (value(m_bounds[n].low) == m_view.background && value(m_bounds[n].high) == m_view.background) continue;
+    if (!shows(value(m_bounds[n].low), value(m_bounds[n].high))) continue;
     auto const [at, isNew] = rows.try_emplace({t.corner.y, t.corner.z, t.width()}, t.corner.x, t.corner.x);
     auto& [low, high] = at->second;
     low = std::min(low, t.corner.x), high = std::max(high, t.corner.x);

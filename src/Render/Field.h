@@ -51,9 +51,10 @@ public:
   Vec3 activeLow() const { return m_activeLow; }
   Vec3 activeHigh() const { return m_activeHigh; }
   bool empty() const { return m_isEmpty; }
-  /// Corners of the boxes of what differs from the background, cut to the active box: what a picture shows
-  /// lies between them.
-  std::vector<Vec3> outline() const;
+  /// Corners of boxes between which all tiles lie whose bounds pass, cut to the active box; of that box when
+  /// none does.
+  /// @cost Looks at every tile; one thread.
+  std::vector<Vec3> outline(std::function<bool(float low, float high)> const& shows) const;
 
   /// How much a range of values matters to a picture: 0 for not at all.
   using Weight = std::function<float(float low, float high)>;

@@ -39,7 +39,8 @@ struct Scene {
   Field const& field;
   Camera const& camera;
   RenderOptions const& options;
-  Affine toLocal; ///< from the world
+  Affine toWorld; ///< from local space
+  Affine toLocal;
   Vec3d eye;      ///< local
   Vec3d light;    ///< world, unit
   double diagonal; ///< of the field's box, world length
@@ -226,6 +227,22 @@ double chooseUnit(Scene const& scene, FogView& fog, double voxel) {
   return double(*at) / kThick;
 }
 
+/// Rays end at the depth whose samples are about as wide as a pixel where the camera is nearest.
+void limitDepth(Field& field, Scene const& scene, RenderOptions const& options, double voxel) {
+  int depth = options.depth;
+  if (depth < 0) {
+    Vec3d nearest = scene.eye; // of the box, local
+    for (int a = 0; a < 3; ++a)
+      nearest[a] = std::clamp(nearest[a], double(field.activeLow()[a]), double(field.activeHigh()[a]));
+    double const distance = dot(scene.toWorld.point(nearest) - scene.camera.position, scene.camera.forward);
+    double const pixel = 2 * scene.camera.halfHeight / options.height * std::max(distance, 0.0);
+    double const voxels = pixel / voxel;
+    depth = nanovtt::kMaxDepth - (voxels >= 2 ? static_cast<int>(std::floor(std::log2(voxels))) : 0);
+  }
+  int const root = nanovtt::kTileSpaceBits - field.view().rootShift;
+  field.limitDepth(std::clamp(depth, root, nanovtt::kMaxDepth));
+}
+
 } // namespace
 
 Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, RenderOptions const& options,
@@ -235,9 +252,10 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
   double const determinant = tileToWorld.determinant();
   if (!std::isfinite(determinant) || determinant == 0)
     throw std::invalid_argument("its transform cannot be inverted");
-  Scene scene{field, camera, options, tileToWorld.inverse(), {}, {}, {}};
+  Affine toWorld = tileToWorld;
+  toWorld.shift = tileToWorld.point(field.origin());
+  Scene scene{field, camera, options, toWorld, toWorld.inverse(), {}, {}, {}};
   scene.diagonal = length(tileToWorld.vector((field.view().high - field.view().low).as<double>()));
-  scene.toLocal.shift = scene.toLocal.shift - field.origin();
   scene.eye = scene.toLocal.point(camera.position);
   scene.light = length(options.light) > 0
                     ? normalized(options.light)
@@ -250,12 +268,12 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
   Transfer transfer(options.transfer);
   picture.low = options.transfer.low, picture.high = options.transfer.high;
 
+  limitDepth(field, scene, options, voxel);
   FogView fog;
   LightLattice direct, above;
   switch (options.mode) {
   case Mode::kSurface:
-    field.weigh([&](float low, float high) { return low <= options.iso && high >= options.iso && low < high; },
-                options.threads);
+    field.weigh([&](float low, float high) { return crosses(low, high, options.iso) ? 1.0f : 0.0f; }, options.threads);
     break;
   case Mode::kMaximum:
     field.weigh([&](float low, float high) {
@@ -278,9 +296,9 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
     fog.lightLocal = scene.toLocal.vector(scene.light).as<float>();
     for (int a = 0; a < 3; ++a) fog.worldToLocal[a] = scene.toLocal.rows[a].as<float>();
     fog.viewUp = camera.viewUp.as<float>();
-    fog.lightColor = kKeyLight * (isFinal ? 2.2f : 1.6f);
-    fog.sky = kSky * (isFinal ? 1.0f : 0.35f);
-    fog.ground = kGround * (isFinal ? 1.0f : 0.5f);
+    fog.lightColor = kKeyLight * (isFinal ? 0.32f : 1.6f);
+    fog.sky = kSky * (isFinal ? 0.8f : 0.35f);
+    fog.ground = kGround * (isFinal ? 1.2f : 0.5f);
     fog.bounces = options.bounces;
     fog.step = static_cast<float>(std::min(0.8 * voxel, scene.diagonal / kFewestSteps));
     picture.opacityUnit = options.opacityUnit > 0 ? options.opacityUnit : chooseUnit(scene, fog, voxel);

@@ -34,6 +34,7 @@ struct RenderOptions {
   int bounces = 12;          ///< of final fogs
   int occlusionRays = -1;    ///< of surfaces, for each sample; -1: as the quality asks
   bool rangeFromPicture = false; ///< of projections: colours span the values drawn
+  int depth = -1;                ///< of the deepest tiles drawn; -1: where samples are as wide as pixels
   int threads = 0;
 };
 

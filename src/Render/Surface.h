@@ -26,7 +26,8 @@ NANOVTT_HD inline void cubicAlong(float const* p, int stride, Vec3 o, Vec3 d, fl
   c[3] = k7 * dxy * d.z;
 }
 
-/// The first root of c[0] + ... + c[3] s^3 in [0, end], or below 0 when there is none.
+/// The first place in [0, end] where c[0] + ... + c[3] s^3 goes from below 0 to not below it, or back; below 0
+/// when there is none.
 /// @formula Between the extrema, where the derivative's roots are, the cubic is monotonic; there regula falsi
 /// with the Illinois rule, to a part in a million of `end`.
 /// @source G. Marmitt and others, "Fast and Accurate Ray-Voxel Intersection Techniques for Iso-Surface Ray
@@ -49,10 +50,9 @@ NANOVTT_HD inline float firstRoot(float const c[4], float end) {
   }
   stops[count++] = end;
   float s0 = 0, f0 = c[0];
-  if (f0 == 0) return 0;
   for (int n = 0; n < count; ++n) {
     float s1 = stops[n], f1 = f(s1);
-    if ((f0 < 0) == (f1 < 0) && f1 != 0) {
+    if ((f0 < 0) == (f1 < 0)) {
       s0 = s1, f0 = f1;
       continue;
     }
@@ -77,13 +77,12 @@ NANOVTT_HD inline float firstRoot(float const c[4], float end) {
   return -1;
 }
 
-struct SurfaceHit {
-  float t = 0;
-  Vec3 local;
-  Vec3 gradient; ///< per unit of local space
-};
+/// Whether a surface may lie in a range of values. One that touches the value from above has none: the zeros
+/// round a field that is dense and positive are no surface.
+NANOVTT_HD inline bool crosses(float low, float high, float iso) { return low < iso && high >= iso; }
 
-/// @param iso The value on the surface. The field was weighed by whether a range holds it.
+/// Between what is below a value and what is not.
+/// @pre The field was weighed by crosses().
 /// @return false when the ray meets none between t0 and t1.
 NANOVTT_HD inline bool hitSurface(FieldView const& field, Ray const& ray, float t0, float t1, float iso,
                                   float& hit) {

@@ -30,8 +30,10 @@ float quantile(std::vector<float> const& sorted, double share) {
 bool isBand(Field const& field) { return field.background() > 0 && field.low() < 0 && field.high() > 0; }
 
 // What was not asked for follows from the field.
-void choose(Field& field, std::string const& gridClass, RenderCommandOptions const& options, RenderOptions& r) {
-  bool const isFog = gridClass == "fog volume";
+void choose(Field const& field, RenderSource const& source, RenderCommandOptions const& options, RenderOptions& r) {
+  // A flat buffer knows no fogs of its own.
+  std::string const& gridClass = source.gridClass;
+  bool const isFog = gridClass == "fog volume" || (gridClass.empty() && source.channel == "density");
   RenderMode const mode =
       options.mode ? *options.mode
       : options.iso ? RenderMode::kIsosurface
@@ -78,7 +80,7 @@ void choose(Field& field, std::string const& gridClass, RenderCommandOptions con
   if (r.mode == Mode::kSurface && !(field.low() <= r.iso && r.iso <= field.high()))
     throw std::invalid_argument(fmt::format("no surface: its values lie in {:.6g} .. {:.6g}, and none is {:.6g}",
                                             field.low(), field.high(), r.iso));
-  if (options.depth >= 0) field.limitDepth(options.depth);
+  r.depth = options.depth;
 }
 
 // name.png, frame 3: name_0003.png
@@ -102,8 +104,12 @@ public:
     }
     m_field.emplace(m_source.grid, FieldOptions{options.component, options.render.threads});
     if (m_field->empty()) throw std::invalid_argument("channel '" + m_source.channel + "' has no active voxel");
-    choose(*m_field, m_source.gridClass, options, m_render);
-    for (Vec3 const& p : m_field->outline())
+    choose(*m_field, m_source, options, m_render);
+    auto const shows = [&](float low, float high) {
+      if (m_render.mode == Mode::kSurface) return low < m_render.iso && high >= m_render.iso;
+      return low != m_field->background() || high != m_field->background();
+    };
+    for (Vec3 const& p : m_field->outline(shows))
       m_outline.push_back(m_source.tileToWorld.point(p.as<double>() + m_field->origin()));
     for (int a = 0; a < 3; ++a) m_margin = std::max(m_margin, 0.5 * m_source.tileToWorld.edge(a));
   }

@@ -131,7 +131,7 @@ PointCloud cloudOf(std::vector<PointSet> const& sets, int heightAxis) {
     for (int a = 0; a < 3; ++a) low[a] = std::min(low[a], p[a]), high[a] = std::max(high[a], p[a]);
   Vec3d const e = high - low;
   double const face = std::max({e.x * e.y, e.y * e.z, e.z * e.x});
-  cloud.radius = face > 0 ? 0.9 * std::sqrt(face / double(cloud.positions.size())) : 0.01 * length(e);
+  cloud.radius = face > 0 ? 1.2 * std::sqrt(face / double(cloud.positions.size())) : 0.01 * length(e);
   return cloud;
 }
 
