@@ -37,6 +37,9 @@ foreach(room IN LISTS rooms)
   target_link_libraries(${target} PRIVATE
     test_support GeometryVolume TBB::tbb Threads::Threads ${CMAKE_DL_LIBS}
     GTest::gmock GTest::gtest GTest::gtest_main)
+  if(room STREQUAL "render")
+    target_link_libraries(${target} PRIVATE GeometryVolumeRender)
+  endif()
   if(room STREQUAL "faults" AND TARGET GeometryVolumeInterop)
     target_link_libraries(${target} PRIVATE GeometryVolumeInterop)
     target_compile_definitions(${target} PRIVATE VLN_TEST_INTEROP)

@@ -6,6 +6,7 @@
 #include <cmath>
 #include <limits>
 #include <map>
+#include <mutex>
 #include <stdexcept>
 #include <string>
 #include <tuple>
@@ -67,6 +68,34 @@ bool liesReady(TileBlock const& b) {
     if (!std::isfinite(b.get<float>(static_cast<std::uint64_t>(n)))) return false;
   return true;
 }
+
+// The box of samples that differ from the background, of the deepest tiles at each place.
+struct SampleBox {
+  std::int64_t low[3] = {INT64_MAX, INT64_MAX, INT64_MAX}, high[3] = {INT64_MIN, INT64_MIN, INT64_MIN};
+
+  bool empty() const { return low[0] > high[0]; }
+  void join(SampleBox const& other) {
+    for (int a = 0; a < 3; ++a) low[a] = std::min(low[a], other.low[a]), high[a] = std::max(high[a], other.high[a]);
+  }
+  void grow(nanovtt::ContainerReader const& tree, TileRef const& tile, Brick const& b, float background) {
+    std::int32_t const step = tile.width() / b.core;
+    bool const isInner = tile.depth < nanovtt::kMaxDepth;
+    auto const children = isInner ? tree.children(tile.number) : nanovtt::ContainerReader::Children();
+    auto const across = static_cast<int>(isInner ? children.across() : 1);
+    for (int k = 0; k < b.core; ++k)
+      for (int j = 0; j < b.core; ++j)
+        for (int i = 0; i < b.core; ++i) {
+          if (*b.at(i, j, k) == background) continue;
+          auto const child = [&](int s) { return s * across / b.core; };
+          if (isInner &&
+              children[static_cast<std::uint32_t>((child(k) * across + child(j)) * across + child(i))] != kNoTile)
+            continue;
+          std::int64_t const p[3] = {tile.corner.x + std::int64_t(i) * step, tile.corner.y + std::int64_t(j) * step,
+                                     tile.corner.z + std::int64_t(k) * step};
+          for (int a = 0; a < 3; ++a) low[a] = std::min(low[a], p[a]), high[a] = std::max(high[a], p[a] + step - 1);
+        }
+  }
+};
 
 } // namespace
 
@@ -131,29 +160,6 @@ Field::Field(GridReader const& grid, FieldOptions const& options)
   m_tiles.resize(count);
   tree.forEachTile([&](TileRef const& t) { m_tiles[t.number] = t; });
 
-  m_isEmpty = false;
-  double lowest[3], highest[3];
-  for (int a = 0; a < 3; ++a) {
-    lowest[a] = grid.tileBox(a), highest[a] = double(grid.tileBox(a + 3)) - 1;
-    if (highest[a] < lowest[a]) m_isEmpty = true;
-  }
-  if (m_isEmpty) std::fill_n(lowest, 3, 0.0), std::fill_n(highest, 3, 0.0);
-  m_view.rootShift = nanovtt::kTileSpaceBits - tree.rootDepth();
-  auto const llc = tree.lowestCorner();
-  double const corner[3] = {double(llc.x), double(llc.y), double(llc.z)};
-  double const rootWidth = std::ldexp(1.0, m_view.rootShift);
-  for (int a = 0; a < 3; ++a) {
-    if (highest[a] - lowest[a] > kWidestBox || rootWidth > kWidestBox)
-      throw std::invalid_argument("its box is wider than " + std::to_string(int(kWidestBox)) + " voxels");
-    // One sample lower than the box, for what is blended into it from below.
-    double const first = std::clamp(std::floor((lowest[a] - 1 - corner[a]) / rootWidth), -1.0, 63.0);
-    m_view.rootBase[a] = static_cast<std::int32_t>(first);
-    m_origin[a] = corner[a] + first * rootWidth;
-    m_activeLow[a] = static_cast<float>(lowest[a] - m_origin[a]);
-    m_activeHigh[a] = static_cast<float>(highest[a] - m_origin[a]);
-    m_view.low[a] = m_activeLow[a] - 1, m_view.high[a] = m_activeHigh[a] + 1;
-  }
-
   // Where each brick lies.
   m_bricks.resize(count);
   std::vector<std::uint8_t> gathered(count);
@@ -185,7 +191,10 @@ Field::Field(GridReader const& grid, FieldOptions const& options)
   std::vector<float> lows(count), highs(count);
   m_means.resize(count);
   Gather const gather{grid, scalar};
+  SampleBox box;
+  std::mutex boxLock;
   forRanges(count, kGrain, options.threads, [&](std::int64_t begin, std::int64_t end) {
+    SampleBox own;
     for (auto n = static_cast<std::uint32_t>(begin); n < static_cast<std::uint32_t>(end); ++n) {
       lows[n] = std::numeric_limits<float>::infinity(), highs[n] = -lows[n];
       if (!m_tiles[n].valid()) continue;
@@ -201,8 +210,26 @@ Field::Field(GridReader const& grid, FieldOptions const& options)
             if (i < b.core && j < b.core && k < b.core) sum += double(v);
           }
       m_means[n] = static_cast<float>(sum / (double(b.core) * b.core * b.core));
+      if (lows[n] != scalar.background() || highs[n] != scalar.background())
+        own.grow(tree, m_tiles[n], b, scalar.background());
     }
+    std::lock_guard const lock(boxLock);
+    box.join(own);
   });
+  // The header's box also counts samples of coarse tiles, which stand for more than what is active.
+  double lowest[3], highest[3];
+  m_isEmpty = false;
+  for (int a = 0; a < 3; ++a) {
+    lowest[a] = grid.tileBox(a), highest[a] = double(grid.tileBox(a + 3)) - 1;
+    if (highest[a] < lowest[a]) m_isEmpty = true;
+  }
+  if (!m_isEmpty && !box.empty())
+    for (int a = 0; a < 3; ++a)
+      lowest[a] = std::max(lowest[a], double(box.low[a])), highest[a] = std::min(highest[a], double(box.high[a]));
+  for (int a = 0; a < 3; ++a) m_isEmpty = m_isEmpty || highest[a] < lowest[a];
+  if (m_isEmpty) std::fill_n(lowest, 3, 0.0), std::fill_n(highest, 3, 0.0);
+  place(lowest, highest);
+
   // Children have larger numbers than their parents.
   std::vector<double> below(count), covered(count);
   for (std::uint32_t n = count; n-- > 0;) {
@@ -230,6 +257,25 @@ Field::Field(GridReader const& grid, FieldOptions const& options)
     b.high = code(std::ceil((double(highs[n]) - double(m_low)) / m_quantum));
     while (b.low > 0 && value(b.low) > lows[n]) --b.low;
     while (b.high < 65535 && value(b.high) < highs[n]) ++b.high;
+  }
+}
+
+void Field::place(double const lowest[3], double const highest[3]) {
+  auto const& tree = m_view.tree;
+  m_view.rootShift = nanovtt::kTileSpaceBits - tree.rootDepth();
+  auto const llc = tree.lowestCorner();
+  double const corner[3] = {double(llc.x), double(llc.y), double(llc.z)};
+  double const rootWidth = std::ldexp(1.0, m_view.rootShift);
+  for (int a = 0; a < 3; ++a) {
+    if (highest[a] - lowest[a] > kWidestBox || rootWidth > kWidestBox)
+      throw std::invalid_argument("its box is wider than " + std::to_string(int(kWidestBox)) + " voxels");
+    // One sample lower than the box, for what is blended into it from below.
+    double const first = std::clamp(std::floor((lowest[a] - 1 - corner[a]) / rootWidth), -1.0, 63.0);
+    m_view.rootBase[a] = static_cast<std::int32_t>(first);
+    m_origin[a] = corner[a] + first * rootWidth;
+    m_activeLow[a] = static_cast<float>(lowest[a] - m_origin[a]);
+    m_activeHigh[a] = static_cast<float>(highest[a] - m_origin[a]);
+    m_view.low[a] = m_activeLow[a] - 1, m_view.high[a] = m_activeHigh[a] + 1;
   }
 }
 

@@ -71,6 +71,7 @@ public:
 
 private:
   struct Gather;
+  void place(double const lowest[3], double const highest[3]);
 
   nanovtt::GridReader m_grid;
   FieldView m_view;
