@@ -1,3 +1,13 @@
+# GeometryVolume::Reader: the reader of flat buffers, headers that depend on nothing. Who uses it links
+# nothing.
+add_library(GeometryVolumeReader INTERFACE)
+add_library(GeometryVolume::Reader ALIAS GeometryVolumeReader)
+set_target_properties(GeometryVolumeReader PROPERTIES EXPORT_NAME Reader)
+target_compile_features(GeometryVolumeReader INTERFACE cxx_std_17)
+target_include_directories(GeometryVolumeReader INTERFACE
+  "$<BUILD_INTERFACE:${PROJECT_SOURCE_DIR}/src>"
+  "$<INSTALL_INTERFACE:${CMAKE_INSTALL_INCLUDEDIR}/GeometryVolume>")
+
 # GeometryVolumeRender: pictures of flat buffers. It stands on the reader's headers alone.
 vln_glob(sources src/Render/*.cpp)
 vln_glob(headers src/Render/*.h)
@@ -5,10 +15,7 @@ add_library(GeometryVolumeRender ${sources} ${headers})
 add_library(GeometryVolume::GeometryVolumeRender ALIAS GeometryVolumeRender)
 vln_target(GeometryVolumeRender)
 target_compile_features(GeometryVolumeRender PUBLIC cxx_std_20)
-target_include_directories(GeometryVolumeRender PUBLIC
-  "$<BUILD_INTERFACE:${PROJECT_SOURCE_DIR}/src>"
-  "$<INSTALL_INTERFACE:${CMAKE_INSTALL_INCLUDEDIR}/GeometryVolume>")
-target_link_libraries(GeometryVolumeRender PRIVATE Threads::Threads)
+target_link_libraries(GeometryVolumeRender PUBLIC GeometryVolumeReader PRIVATE Threads::Threads)
 set_target_properties(GeometryVolumeRender PROPERTIES
   VERSION ${PROJECT_VERSION}
   SOVERSION ${PROJECT_VERSION_MAJOR}.${PROJECT_VERSION_MINOR}

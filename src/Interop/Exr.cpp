@@ -17,7 +17,8 @@ template <class T> void put(std::string& bytes, T const& value) {
   bytes.append(raw, sizeof(T));
 }
 void putName(std::string& bytes, std::string const& name) { bytes.append(name).push_back('\0'); }
-template <class... T> void attribute(std::string& bytes, char const* name, char const* type, T const&... values) {
+template <class... T>
+void attribute(std::string& bytes, char const* name, char const* type, T const&... values) {
   putName(bytes, name), putName(bytes, type);
   std::string content;
   (put(content, values), ...);

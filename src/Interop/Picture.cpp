@@ -26,7 +26,8 @@ void writeRgbaPng(std::string const& path, int width, int height, std::vector<st
   image.flags = PNG_IMAGE_FLAG_FAST;
   png_alloc_size_t size = PNG_IMAGE_PNG_SIZE_MAX(image);
   std::vector<unsigned char> bytes(size);
-  if (!png_image_write_to_memory(&image, bytes.data(), &size, 0, opaque ? rgb.data() : pixels.data(), 0, nullptr))
+  if (!png_image_write_to_memory(&image, bytes.data(), &size, 0, opaque ? rgb.data() : pixels.data(), 0,
+                                 nullptr))
     throw std::runtime_error(std::string("the picture cannot be coded: ") + image.message);
   file.write(bytes.data(), size);
   file.commit();

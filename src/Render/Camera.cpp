@@ -21,7 +21,9 @@ Vec3d turned(Vec3d v, Vec3d axis, double angle) {
 
 // From the right, a little above: the front, one side and the top are seen.
 Vec3d threeQuarters(Vec3d up) {
-  Vec3d const other = std::abs(up.y) > 0.5 ? Vec3d{0, 0, 1} : std::abs(up.z) > 0.5 ? Vec3d{0, -1, 0} : Vec3d{0, 0, 1};
+  Vec3d const other = std::abs(up.y) > 0.5   ? Vec3d{0, 0, 1}
+                      : std::abs(up.z) > 0.5 ? Vec3d{0, -1, 0}
+                                             : Vec3d{0, 0, 1};
   Vec3d const side = normalized(cross(up, other)), front = normalized(cross(side, up));
   return normalized(side * -0.55 + front * -1.0 + up * -0.45);
 }

@@ -75,7 +75,8 @@ struct SampleBox {
 
   bool empty() const { return low[0] > high[0]; }
   void join(SampleBox const& other) {
-    for (int a = 0; a < 3; ++a) low[a] = std::min(low[a], other.low[a]), high[a] = std::max(high[a], other.high[a]);
+    for (int a = 0; a < 3; ++a)
+      low[a] = std::min(low[a], other.low[a]), high[a] = std::max(high[a], other.high[a]);
   }
   void grow(nanovtt::ContainerReader const& tree, TileRef const& tile, Brick const& b, float background) {
     std::int32_t const step = tile.width() / b.core;
@@ -88,11 +89,14 @@ struct SampleBox {
           if (*b.at(i, j, k) == background) continue;
           auto const child = [&](int s) { return s * across / b.core; };
           if (isInner &&
-              children[static_cast<std::uint32_t>((child(k) * across + child(j)) * across + child(i))] != kNoTile)
+              children[static_cast<std::uint32_t>((child(k) * across + child(j)) * across + child(i))] !=
+                  kNoTile)
             continue;
-          std::int64_t const p[3] = {tile.corner.x + std::int64_t(i) * step, tile.corner.y + std::int64_t(j) * step,
+          std::int64_t const p[3] = {tile.corner.x + std::int64_t(i) * step,
+                                     tile.corner.y + std::int64_t(j) * step,
                                      tile.corner.z + std::int64_t(k) * step};
-          for (int a = 0; a < 3; ++a) low[a] = std::min(low[a], p[a]), high[a] = std::max(high[a], p[a] + step - 1);
+          for (int a = 0; a < 3; ++a)
+            low[a] = std::min(low[a], p[a]), high[a] = std::max(high[a], p[a] + step - 1);
         }
   }
 };
@@ -198,8 +202,7 @@ Field::Field(GridReader const& grid, FieldOptions const& options)
     for (auto n = static_cast<std::uint32_t>(begin); n < static_cast<std::uint32_t>(end); ++n) {
       lows[n] = std::numeric_limits<float>::infinity(), highs[n] = -lows[n];
       if (!m_tiles[n].valid()) continue;
-      if (gathered[n])
-        gather(m_tiles[n], grid.block(n), m_beside.data() + (m_bricks[n] & kBrickOffsetMask));
+      if (gathered[n]) gather(m_tiles[n], grid.block(n), m_beside.data() + (m_bricks[n] & kBrickOffsetMask));
       Brick const b = m_view.brick(n);
       double sum = 0;
       for (int k = 0; k <= b.core; ++k)
@@ -225,7 +228,8 @@ Field::Field(GridReader const& grid, FieldOptions const& options)
   }
   if (!m_isEmpty && !box.empty())
     for (int a = 0; a < 3; ++a)
-      lowest[a] = std::max(lowest[a], double(box.low[a])), highest[a] = std::min(highest[a], double(box.high[a]));
+      lowest[a] = std::max(lowest[a], double(box.low[a])),
+      highest[a] = std::min(highest[a], double(box.high[a]));
   for (int a = 0; a < 3; ++a) m_isEmpty = m_isEmpty || highest[a] < lowest[a];
   if (m_isEmpty) std::fill_n(lowest, 3, 0.0), std::fill_n(highest, 3, 0.0);
   place(lowest, highest);
@@ -234,8 +238,7 @@ Field::Field(GridReader const& grid, FieldOptions const& options)
   std::vector<double> below(count), covered(count);
   for (std::uint32_t n = count; n-- > 0;) {
     if (!m_tiles[n].valid()) continue;
-    if (covered[n] > 0)
-      m_means[n] = static_cast<float>(below[n] + (1 - covered[n]) * double(m_means[n]));
+    if (covered[n] > 0) m_means[n] = static_cast<float>(below[n] + (1 - covered[n]) * double(m_means[n]));
     std::uint32_t const parent = tree.parent(n);
     if (parent == kNoTile) continue;
     lows[parent] = std::min(lows[parent], lows[n]), highs[parent] = std::max(highs[parent], highs[n]);
@@ -244,7 +247,8 @@ Field::Field(GridReader const& grid, FieldOptions const& options)
   }
 
   m_low = std::numeric_limits<float>::infinity(), m_high = -m_low;
-  for (std::uint32_t n = 0; n < count; ++n) m_low = std::min(m_low, lows[n]), m_high = std::max(m_high, highs[n]);
+  for (std::uint32_t n = 0; n < count; ++n)
+    m_low = std::min(m_low, lows[n]), m_high = std::max(m_high, highs[n]);
   if (!(m_low <= m_high)) m_low = m_high = 0;
   m_quantum = (double(m_high) - double(m_low)) / 65535;
   m_bounds.resize(count);
@@ -287,28 +291,28 @@ float Field::value(std::uint16_t code) const {
 void Field::weigh(Weight const& weight, int threads) {
   m_weights.assign(m_bounds.size(), 0);
   m_cells.assign(m_bounds.size(), 0);
-  forRanges(static_cast<std::int64_t>(m_bounds.size()), kGrain, threads, [&](std::int64_t begin,
-                                                                             std::int64_t end) {
-    for (auto n = static_cast<std::uint32_t>(begin); n < static_cast<std::uint32_t>(end); ++n) {
-      if (!m_tiles[n].valid()) continue;
-      m_weights[n] = weight(value(m_bounds[n].low), value(m_bounds[n].high));
-      if (!(m_weights[n] > 0)) continue;
-      Brick const b = m_view.brick(n);
-      // Cells of a merged block share bits.
-      int const share = b.core / nanovtt::kTileWidth;
-      for (int c = 0; c < nanovtt::kTileSamples; ++c) {
-        int const i = c % 4 * share, j = c / 4 % 4 * share, k = c / 16 * share;
-        float low = *b.at(i, j, k), high = low;
-        for (int z = k; z <= k + share; ++z)
-          for (int y = j; y <= j + share; ++y)
-            for (int x = i; x <= i + share; ++x) {
-              float const v = *b.at(x, y, z);
-              low = std::min(low, v), high = std::max(high, v);
-            }
-        if (weight(low, high) > 0) m_cells[n] |= std::uint64_t(1) << c;
-      }
-    }
-  });
+  forRanges(static_cast<std::int64_t>(m_bounds.size()), kGrain, threads,
+            [&](std::int64_t begin, std::int64_t end) {
+              for (auto n = static_cast<std::uint32_t>(begin); n < static_cast<std::uint32_t>(end); ++n) {
+                if (!m_tiles[n].valid()) continue;
+                m_weights[n] = weight(value(m_bounds[n].low), value(m_bounds[n].high));
+                if (!(m_weights[n] > 0)) continue;
+                Brick const b = m_view.brick(n);
+                // Cells of a merged block share bits.
+                int const share = b.core / nanovtt::kTileWidth;
+                for (int c = 0; c < nanovtt::kTileSamples; ++c) {
+                  int const i = c % 4 * share, j = c / 4 % 4 * share, k = c / 16 * share;
+                  float low = *b.at(i, j, k), high = low;
+                  for (int z = k; z <= k + share; ++z)
+                    for (int y = j; y <= j + share; ++y)
+                      for (int x = i; x <= i + share; ++x) {
+                        float const v = *b.at(x, y, z);
+                        low = std::min(low, v), high = std::max(high, v);
+                      }
+                  if (weight(low, high) > 0) m_cells[n] |= std::uint64_t(1) << c;
+                }
+              }
+            });
   m_view.weights = m_weights.data();
   m_view.cells = m_cells.data();
 }

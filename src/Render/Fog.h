@@ -44,8 +44,8 @@ struct FogView {
   Vec3 light;      ///< world, unit length, to the light
   Vec3 lightLocal; ///< the same in local space
   Vec3 lightColor, sky, ground;
-  Vec3 worldToLocal[3]; ///< rows
-  Vec3 viewUp;          ///< world; the sky is on that side
+  Vec3 worldToLocal[3];    ///< rows
+  Vec3 viewUp;             ///< world; the sky is on that side
   LightView direct, above; ///< of previews
   float step = 1;          ///< of previews, in world length
   int bounces = 1;
@@ -67,9 +67,9 @@ struct FogView {
 };
 
 struct FogSample {
-  Vec3 color;        ///< multiplied by opacity
+  Vec3 color; ///< multiplied by opacity
   float opacity = 0;
-  float depth = 0;   ///< times opacity
+  float depth = 0; ///< times opacity
 };
 
 /// Share of light that is scattered by that angle, of 1 in all directions together, times 4 pi.

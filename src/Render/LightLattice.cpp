@@ -1,4 +1,4 @@
-#include "Render/LightLattice.h"
+#include "Render/LightLatticeImpl.h"
 
 #include "Render/Threads.h"
 

@@ -36,8 +36,10 @@ Picture renderPoints(PointCloud const& cloud, Camera const& camera, int width, i
     for (int j = y0; j <= y1; ++j)
       for (int i = x0; i <= x1; ++i) {
         double const dx = i + 0.5 - x, dy = j + 0.5 - y;
-        auto const at = static_cast<std::size_t>(j) * static_cast<std::size_t>(wide) + static_cast<std::size_t>(i);
-        if (dx * dx + dy * dy <= r * r && z < depth[at]) depth[at] = z, shown[at] = static_cast<std::uint32_t>(n);
+        auto const at =
+            static_cast<std::size_t>(j) * static_cast<std::size_t>(wide) + static_cast<std::size_t>(i);
+        if (dx * dx + dy * dy <= r * r && z < depth[at])
+          depth[at] = z, shown[at] = static_cast<std::uint32_t>(n);
       }
   }
 
@@ -49,14 +51,15 @@ Picture renderPoints(PointCloud const& cloud, Camera const& camera, int width, i
   constexpr float kShare = 1.0f / (kOver * kOver);
   for (int j = 0; j < tall; ++j)
     for (int i = 0; i < wide; ++i) {
-      auto const at = static_cast<std::size_t>(j) * static_cast<std::size_t>(wide) + static_cast<std::size_t>(i);
+      auto const at =
+          static_cast<std::size_t>(j) * static_cast<std::size_t>(wide) + static_cast<std::size_t>(i);
       if (depth[at] == kNothing) continue;
       float behind = 0;
       for (int side = 0; side < 4; ++side) {
         int const x = i + (side == 0 ? -3 : side == 1 ? 3 : 0), y = j + (side == 2 ? -3 : side == 3 ? 3 : 0);
         if (x < 0 || y < 0 || x >= wide || y >= tall) continue;
-        float const other = depth[static_cast<std::size_t>(y) * static_cast<std::size_t>(wide) +
-                                  static_cast<std::size_t>(x)];
+        float const other =
+            depth[static_cast<std::size_t>(y) * static_cast<std::size_t>(wide) + static_cast<std::size_t>(x)];
         if (other < depth[at]) behind += std::log2(depth[at] / other);
       }
       auto const n = static_cast<std::size_t>(j / kOver) * static_cast<std::size_t>(width) +

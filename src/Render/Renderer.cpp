@@ -2,7 +2,7 @@
 
 #include "Render/Colors.h"
 #include "Render/Fog.h"
-#include "Render/LightLattice.h"
+#include "Render/LightLatticeImpl.h"
 #include "Render/Surface.h"
 #include "Render/Threads.h"
 
@@ -29,7 +29,7 @@ constexpr double kFewestSteps = 320;
 
 /// A camera's ray in local space. Its origin is where it enters the field's box.
 struct Start {
-  Vec3d world;     ///< unit
+  Vec3d world; ///< unit
   Vec3 origin, direction;
   double base = 0; ///< distance from the camera to the origin
   float end = 0;   ///< distance in the box
@@ -41,8 +41,8 @@ struct Scene {
   RenderOptions const& options;
   Affine toWorld; ///< from local space
   Affine toLocal;
-  Vec3d eye;      ///< local
-  Vec3d light;    ///< world, unit
+  Vec3d eye;       ///< local
+  Vec3d light;     ///< world, unit
   double diagonal; ///< of the field's box, world length
 
   bool start(double u, double v, Start& s) const {
@@ -76,17 +76,16 @@ struct Sample {
 };
 
 /// Smallest world length of a voxel's edges.
-double voxelOf(Affine const& m) {
-  return std::min({m.edge(0), m.edge(1), m.edge(2)});
-}
+double voxelOf(Affine const& m) { return std::min({m.edge(0), m.edge(1), m.edge(2)}); }
 
-// --- Surfaces -------------------------------------------------------------------------------------------------
+// --- Surfaces
+// -------------------------------------------------------------------------------------------------
 
 struct SurfaceShader {
   Scene const& scene;
   int occlusionRays;
-  float reach;  ///< of occlusion, world length
-  float lift;   ///< off the surface before other rays start, world length
+  float reach; ///< of occlusion, world length
+  float lift;  ///< off the surface before other rays start, world length
 
   Vec3 local(Vec3 w) const { return scene.toLocal.vector(w.as<double>()).as<float>(); }
 
@@ -103,8 +102,7 @@ struct SurfaceShader {
     if (!hitSurface(scene.field.view(), ray, 0, s.end, scene.options.iso, t)) return out;
     Vec3 const p = ray.at(t);
     // Gradients go from local space to the world by the transposed inverse.
-    Vec3 n = normalized(
-        scene.toLocal.transposed(gradientAt(scene.field.view(), p).as<double>()).as<float>());
+    Vec3 n = normalized(scene.toLocal.transposed(gradientAt(scene.field.view(), p).as<double>()).as<float>());
     Vec3 const view = s.world.as<float>();
     if (dot(n, n) == 0 || dot(n, view) > 0) n = -n;
     if (dot(n, n) == 0) n = -view;
@@ -145,7 +143,8 @@ struct SurfaceShader {
   }
 };
 
-// --- Projections ------------------------------------------------------------------------------------------------
+// --- Projections
+// ------------------------------------------------------------------------------------------------
 
 struct ProjectionShader {
   Scene const& scene;
@@ -185,7 +184,8 @@ struct ProjectionShader {
   }
 };
 
-// --- Fogs -------------------------------------------------------------------------------------------------------
+// --- Fogs
+// -------------------------------------------------------------------------------------------------------
 
 struct FogShader {
   FogView const& fog;
@@ -196,8 +196,8 @@ struct FogShader {
     Random random(pixel, sample);
     float const shift = static_cast<float>(std::fmod(s.base, double(fog.step)));
     Vec3 const world = s.world.as<float>();
-    FogSample const f = isFinal ? traceFog(fog, ray, world, 0, s.end, random)
-                                : marchFog(fog, ray, world, 0, s.end, shift);
+    FogSample const f =
+        isFinal ? traceFog(fog, ray, world, 0, s.end, random) : marchFog(fog, ray, world, 0, s.end, shift);
     Sample out;
     out.color = f.color, out.opacity = f.opacity;
     out.depth = f.depth + static_cast<float>(s.base) * f.opacity;
@@ -215,7 +215,8 @@ double chooseUnit(Scene const& scene, FogView& fog, double voxel) {
   forRanges(kAcross * kAcross, 16, scene.options.threads, [&](std::int64_t begin, std::int64_t end) {
     for (std::int64_t n = begin; n < end; ++n) {
       Start s;
-      if (!scene.start((double(n % kAcross) + 0.5) / kAcross, (double(n / kAcross) + 0.5) / kAcross, s)) continue;
+      if (!scene.start((double(n % kAcross) + 0.5) / kAcross, (double(n / kAcross) + 0.5) / kAcross, s))
+        continue;
       Ray const ray(s.origin, s.direction);
       depths[static_cast<std::size_t>(n)] = opticalDepth(fog, ray, 0, s.end, static_cast<float>(2 * voxel));
     }
@@ -273,17 +274,20 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
   LightLattice direct, above;
   switch (options.mode) {
   case Mode::kSurface:
-    field.weigh([&](float low, float high) { return crosses(low, high, options.iso) ? 1.0f : 0.0f; }, options.threads);
+    field.weigh([&](float low, float high) { return crosses(low, high, options.iso) ? 1.0f : 0.0f; },
+                options.threads);
     break;
   case Mode::kMaximum:
-    field.weigh([&](float low, float high) {
-      return low == high && high == field.background() ? 0 : std::max(high - field.low(), 1e-30f);
-    }, options.threads);
+    field.weigh(
+        [&](float low, float high) {
+          return low == high && high == field.background() ? 0 : std::max(high - field.low(), 1e-30f);
+        },
+        options.threads);
     break;
   case Mode::kMean:
-    field.weigh([&](float low, float high) {
-      return low == high && high == field.background() ? 0.0f : 1.0f;
-    }, options.threads);
+    field.weigh(
+        [&](float low, float high) { return low == high && high == field.background() ? 0.0f : 1.0f; },
+        options.threads);
     break;
   case Mode::kFog:
     field.weigh([&](float low, float high) { return transfer.largestOpacity(low, high); }, options.threads);
@@ -324,7 +328,7 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
   picture.color.resize(count), picture.opacity.resize(count);
   picture.depth.resize(count), picture.normal.resize(count);
   if (!isFog && options.mode != Mode::kSurface) picture.value.resize(count);
-  int const samples = options.samples > 0 ? options.samples
+  int const samples = options.samples > 0              ? options.samples
                       : options.mode == Mode::kSurface ? (isFinal ? 64 : 4)
                       : isFog                          ? (isFinal ? 64 : 1)
                                                        : (isFinal ? 16 : 1);
@@ -367,7 +371,7 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
     if (options.mode == Mode::kSurface) {
       int const rays = options.occlusionRays >= 0 ? options.occlusionRays : 2;
       pass(done, SurfaceShader{scene, rays, static_cast<float>(0.15 * scene.diagonal),
-                                       static_cast<float>(0.5 * voxel)});
+                               static_cast<float>(0.5 * voxel)});
     } else if (isFog) {
       pass(done, FogShader{fog, isFinal});
     } else {
@@ -392,8 +396,10 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
       picture.low = std::numeric_limits<float>::max(), picture.high = -picture.low;
       for (std::size_t n = 0; n < count; ++n)
         if (picture.opacity[n] > 0)
-          picture.low = std::min(picture.low, picture.value[n]), picture.high = std::max(picture.high, picture.value[n]);
-      if (!(picture.low < picture.high)) picture.low = options.transfer.low, picture.high = options.transfer.high;
+          picture.low = std::min(picture.low, picture.value[n]),
+          picture.high = std::max(picture.high, picture.value[n]);
+      if (!(picture.low < picture.high))
+        picture.low = options.transfer.low, picture.high = options.transfer.high;
       TransferOptions own = options.transfer;
       own.low = picture.low, own.high = picture.high;
       if (own.log) own.low = picture.low = std::max(picture.low, picture.high * 1e-4f);

@@ -22,17 +22,17 @@ struct RenderOptions {
   int width = 1024, height = 1024;
   Mode mode = Mode::kFog;
   Quality quality = Quality::kPreview;
-  float iso = 0;             ///< of kSurface
-  int samples = 0;           ///< for each pixel; 0: as the quality asks
-  double timeLimit = 0;      ///< seconds, after which no further sample of the pixels is begun; 0: none
-  TransferOptions transfer;  ///< of fogs and projections
-  bool colored = false;      ///< fogs take their colours from the map; else they are white
-  double opacityUnit = 0;    ///< world length over which opacity 1 lets 1/e pass; 0: chosen from the field
-  Vec3d light{0, 0, 0};      ///< world direction to the light; zero: beside the camera
-  double anisotropy = 0.3;   ///< g of the phase function
+  float iso = 0;            ///< of kSurface
+  int samples = 0;          ///< for each pixel; 0: as the quality asks
+  double timeLimit = 0;     ///< seconds, after which no further sample of the pixels is begun; 0: none
+  TransferOptions transfer; ///< of fogs and projections
+  bool colored = false;     ///< fogs take their colours from the map; else they are white
+  double opacityUnit = 0;   ///< world length over which opacity 1 lets 1/e pass; 0: chosen from the field
+  Vec3d light{0, 0, 0};     ///< world direction to the light; zero: beside the camera
+  double anisotropy = 0.3;  ///< g of the phase function
   double albedo = 0.97;
-  int bounces = 12;          ///< of final fogs
-  int occlusionRays = -1;    ///< of surfaces, for each sample; -1: as the quality asks
+  int bounces = 12;              ///< of final fogs
+  int occlusionRays = -1;        ///< of surfaces, for each sample; -1: as the quality asks
   bool rangeFromPicture = false; ///< of projections: colours span the values drawn
   int depth = -1;                ///< of the deepest tiles drawn; -1: where samples are as wide as pixels
   int threads = 0;
@@ -47,11 +47,11 @@ struct Picture {
   std::vector<Vec3> normal;   ///< of surfaces, in the world; zero elsewhere
   std::vector<float> value;   ///< of projections
 
-  int samples = 0;            ///< of each pixel
-  double opacityUnit = 0;     ///< that was used
-  float low = 0, high = 0;    ///< range of the colours that was used
-  double seconds = 0;         ///< of the rays alone
-  std::int64_t rays = 0;      ///< from the camera
+  int samples = 0;         ///< of each pixel
+  double opacityUnit = 0;  ///< that was used
+  float low = 0, high = 0; ///< range of the colours that was used
+  double seconds = 0;      ///< of the rays alone
+  std::int64_t rays = 0;   ///< from the camera
 };
 
 /// @param tileToWorld The place in the world of a sample, from its tile-space position.

@@ -26,8 +26,8 @@ NANOVTT_HD inline void cubicAlong(float const* p, int stride, Vec3 o, Vec3 d, fl
   c[3] = k7 * dxy * d.z;
 }
 
-/// The first place in [0, end] where c[0] + ... + c[3] s^3 goes from below 0 to not below it, or back; below 0
-/// when there is none.
+/// The first place in [0, end] where c[0] + ... + c[3] s^3 goes from below 0 to not below it, or back; below
+/// 0 when there is none.
 /// @formula Between the extrema, where the derivative's roots are, the cubic is monotonic; there regula falsi
 /// with the Illinois rule, to a part in a million of `end`.
 /// @source G. Marmitt and others, "Fast and Accurate Ray-Voxel Intersection Techniques for Iso-Surface Ray
@@ -142,10 +142,9 @@ NANOVTT_HD inline bool hitSurface(FieldView const& field, Ray const& ray, float 
 NANOVTT_HD inline Vec3 gradientAt(FieldView const& field, Vec3 p) {
   FieldPath path;
   path.value(field, p);
-  float const h = path.height == 0
-                      ? 1.0f
-                      : static_cast<float>(1 << FieldPath::shiftOf(path.top().depth)) /
-                            static_cast<float>(field.brick(path.top().tile).core);
+  float const h = path.height == 0 ? 1.0f
+                                   : static_cast<float>(1 << FieldPath::shiftOf(path.top().depth)) /
+                                         static_cast<float>(field.brick(path.top().tile).core);
   Vec3 g;
   for (int a = 0; a < 3; ++a) {
     Vec3 q = p;

@@ -94,14 +94,16 @@ Transfer::Transfer(TransferOptions const& options) {
                                          [&](Named const& n) { return options.opacity == n.name; });
   bool const isNamed = named != std::end(kShapes);
   Points const points = isNamed ? Points() : pointsOf(options.opacity);
-  float const farthest = std::max(std::abs(options.low - options.from), std::abs(options.high - options.from));
+  float const farthest =
+      std::max(std::abs(options.low - options.from), std::abs(options.high - options.from));
   for (int n = 0; n < kTransferSize; ++n) {
     float const t = static_cast<float>(n) / (kTransferSize - 1);
     float const in = m_view.low + t / m_view.scale, value = options.log ? std::exp(in) : in;
     m_view.color[n] = colors[static_cast<std::size_t>(n)];
-    m_view.opacity[n] = !isNamed           ? between(points, value)
-                        : options.awayFrom ? named->shape(std::min(1.0f, std::abs(value - options.from) / farthest))
-                                           : named->shape(t);
+    m_view.opacity[n] = !isNamed ? between(points, value)
+                        : options.awayFrom
+                            ? named->shape(std::min(1.0f, std::abs(value - options.from) / farthest))
+                            : named->shape(t);
   }
   std::copy_n(m_view.opacity, kTransferSize, m_largest[0].begin());
   for (std::size_t n = 1; n < m_largest.size(); ++n)

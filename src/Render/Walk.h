@@ -102,9 +102,9 @@ public:
             shift = FieldPath::shiftOf(depth);
             if (depth == top.depth + 1) {
               int const half = tileShift - 1;
-              matters = m_field.cells[top.tile] &
-                        cellsIn(m_cell[0] >> half << 1 & 2, m_cell[1] >> half << 1 & 2,
-                                m_cell[2] >> half << 1 & 2, 2);
+              matters =
+                  m_field.cells[top.tile] & cellsIn(m_cell[0] >> half << 1 & 2, m_cell[1] >> half << 1 & 2,
+                                                    m_cell[2] >> half << 1 & 2, 2);
             }
             break;
           }
@@ -142,8 +142,8 @@ private:
       low[a] = m_cell[a] >> shift << shift;
       float const d = m_ray.direction[a];
       if (d == 0) continue;
-      float const out = (static_cast<float>(d > 0 ? low[a] + width : low[a]) - m_ray.origin[a]) *
-                        m_ray.inverse[a];
+      float const out =
+          (static_cast<float>(d > 0 ? low[a] + width : low[a]) - m_ray.origin[a]) * m_ray.inverse[a];
       if (out < t) t = out, axis = a;
     }
     if (t < m_t) t = m_t; // by rounding

@@ -1,6 +1,6 @@
 // What rays need beside the buffer: bricks, bounds, weights, and the walk that skips by them.
-#include "RenderCase.h"
 #include "Render/Walk.h"
+#include "RenderCase.h"
 
 #include <random>
 
@@ -22,7 +22,8 @@ FlatCase const kCases[] = {{0, false, false, false}, {1, false, false, false}, {
 TEST(Field, RequirementReadsWhatTheCursorReads) {
   for (bool isMixed : {false, true})
     for (FlatCase const& flat : kCases) {
-      RenderCase const volume(wave, -24, 40, flat, 0.125f, isMixed ? checkered : std::function<bool(int, int, int)>());
+      RenderCase const volume(wave, -24, 40, flat, 0.125f,
+                              isMixed ? checkered : std::function<bool(int, int, int)>());
       Field field(volume.grid());
       nanovtt::GridCursor cursor(volume.grid());
       FieldPath path;
@@ -32,8 +33,8 @@ TEST(Field, RequirementReadsWhatTheCursorReads) {
         Vec3 const p{float(place(random)) / 64, float(place(random)) / 64, float(place(random)) / 64};
         float const got = path.value(field.view(), (p.as<double>() - field.origin()).as<float>());
         ASSERT_EQ(got, cursor.trilinear(p.x, p.y, p.z))
-            << p.x << " " << p.y << " " << p.z << " halo " << flat.halo << " mixed " << isMixed << " coalesced "
-            << flat.coalesce << " textures " << flat.textures << " codes " << flat.fp8;
+            << p.x << " " << p.y << " " << p.z << " halo " << flat.halo << " mixed " << isMixed
+            << " coalesced " << flat.coalesce << " textures " << flat.textures << " codes " << flat.fp8;
       }
     }
 }
@@ -72,8 +73,8 @@ TEST(Field, RequirementBoundsAreNarrow) {
     for (int k = 0; k <= 4; ++k)
       for (int j = 0; j <= 4; ++j)
         for (int i = 0; i <= 4; ++i) {
-          auto const v = static_cast<float>(
-              grid.valueAt(tile.corner.x + i, tile.corner.y + j, tile.corner.z + k));
+          auto const v =
+              static_cast<float>(grid.valueAt(tile.corner.x + i, tile.corner.y + j, tile.corner.z + k));
           low = std::min(low, v), high = std::max(high, v);
         }
     TileBounds const b = field.bounds(tile.number);
@@ -90,8 +91,8 @@ TEST(Field, RequirementMeansAreThoseOfTheFinest) {
   Field field(volume.grid());
   auto const grid = volume.grid();
   grid.container().forEachTile([&](nanovtt::TileRef const& tile) {
-    bool const isCovered = tile.corner.x >= 0 && tile.corner.y >= 0 && tile.corner.z >= 0 && tile.corner.x < 64 &&
-                           tile.corner.y < 64 && tile.corner.z < 64;
+    bool const isCovered = tile.corner.x >= 0 && tile.corner.y >= 0 && tile.corner.z >= 0 &&
+                           tile.corner.x < 64 && tile.corner.y < 64 && tile.corner.z < 64;
     if (tile.depth != 26 || !isCovered) return; // the border's are covered in part
     double sum = 0;
     for (int k = 0; k < 16; ++k)
@@ -127,9 +128,7 @@ TEST(Walk, RequirementSkipsWhatDoesNotMatterAndNothingElse) {
       pieces += static_cast<std::int64_t>(got.size());
       for (std::size_t k = 0; k < got.size(); ++k) {
         ASSERT_LT(got[k].t0, got[k].t1);
-        if (k > 0) {
-          ASSERT_GE(got[k].t0, got[k - 1].t1);
-        }
+        if (k > 0) { ASSERT_GE(got[k].t0, got[k - 1].t1); }
         EXPECT_GT(got[k].weight, 0);
       }
       FieldPath path;
@@ -139,9 +138,7 @@ TEST(Walk, RequirementSkipsWhatDoesNotMatterAndNothingElse) {
         float const v = path.value(view, p);
         while (at < got.size() && got[at].t1 < t) ++at;
         bool const covered = at < got.size() && got[at].t0 <= t;
-        if (v > 0.70001f) {
-          ASSERT_TRUE(covered) << "ray " << n << " at " << t << " value " << v;
-        }
+        if (v > 0.70001f) { ASSERT_TRUE(covered) << "ray " << n << " at " << t << " value " << v; }
         if (covered) {
           ASSERT_NEAR(trilinear(got[at].brick, got[at].samples(p)), v, 1e-3f) << "ray " << n << " at " << t;
         }

@@ -1,6 +1,6 @@
 // Fogs and projections against closed forms.
-#include "RenderCase.h"
 #include "Render/Fog.h"
+#include "RenderCase.h"
 
 #include <random>
 
@@ -34,9 +34,7 @@ struct Box {
     fog.viewUp = {0, 1, 0};
     fog.light = fog.lightLocal = {0, 1, 0};
   }
-  Ray axisRay() const {
-    return Ray((Vec3d{0.3, 0.2, 100} - field.origin()).as<float>(), {0, 0, -1});
-  }
+  Ray axisRay() const { return Ray((Vec3d{0.3, 0.2, 100} - field.origin()).as<float>(), {0, 0, -1}); }
 };
 
 // requirement: samples -16..15 of 1 blend to 0 over one unit on each side, so the depth is 32 tenths
@@ -45,8 +43,8 @@ TEST(Fog, RequirementOpticalDepthOfABox) {
   EXPECT_NEAR(opticalDepth(box.fog, box.axisRay(), 0, 300, 0.05f), 3.2, 0.01);
   Ray const slanted((Vec3d{50, 0, 50} - box.field.origin()).as<float>(),
                     Vec3{-std::sqrt(0.5f), 0, -std::sqrt(0.5f)});
-  EXPECT_NEAR(opticalDepth(box.fog, slanted, 0, 300, 0.05f), 0.1 * 31 * std::sqrt(2.0) + 0.1 * 2 * std::sqrt(2.0) / 3,
-              0.02);
+  EXPECT_NEAR(opticalDepth(box.fog, slanted, 0, 300, 0.05f),
+              0.1 * 31 * std::sqrt(2.0) + 0.1 * 2 * std::sqrt(2.0) / 3, 0.02);
 }
 
 // requirement: both trackings are free of bias
@@ -191,7 +189,8 @@ TEST(Fog, RequirementSameForAnyNumberOfThreads) {
 // requirement
 TEST(Transfer, RequirementLargestOpacityIsABound) {
   TransferOptions options = unit();
-  for (std::string const opacity : {"linear", "linear_r", "sigmoid", "geom", "geom_r", "constant", "0:0,0.3:1,0.4:0.1,1:0.5"})
+  for (std::string const opacity :
+       {"linear", "linear_r", "sigmoid", "geom", "geom_r", "constant", "0:0,0.3:1,0.4:0.1,1:0.5"})
     for (bool isLog : {false, true}) {
       options.opacity = opacity, options.log = isLog, options.low = isLog ? 0.01f : 0.0f;
       Transfer const transfer(options);
@@ -203,7 +202,8 @@ TEST(Transfer, RequirementLargestOpacityIsABound) {
         float const bound = transfer.largestOpacity(a, b);
         for (int k = 0; k <= 20; ++k) {
           float const v = a + (b - a) * static_cast<float>(k) / 20;
-          ASSERT_LE(transfer.view().opacityAt(transfer.view().place(v)), bound + 1e-6f) << opacity << " " << v;
+          ASSERT_LE(transfer.view().opacityAt(transfer.view().place(v)), bound + 1e-6f)
+              << opacity << " " << v;
         }
       }
     }
@@ -220,7 +220,8 @@ TEST(Transfer, NegativeOptionsThatAreNone) {
   refused([](auto& o) { o.high = NAN; });
   refused([](auto& o) { o.log = true; });
   refused([](auto& o) { o.colors = "rainbow"; });
-  for (std::string const opacity : {"", "lin", "1", "0:0,", "0:0,0.5", "0:0,x:1", "0:0,1:2", "1:0,0:1", "0:nan"})
+  for (std::string const opacity :
+       {"", "lin", "1", "0:0,", "0:0,0.5", "0:0,x:1", "0:0,1:2", "1:0,0:1", "0:nan"})
     refused([&](auto& o) { o.opacity = opacity; });
 }
 

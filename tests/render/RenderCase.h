@@ -31,7 +31,8 @@ public:
     using namespace TileTree3D;
     using Velorn::Math::int3;
     int const first = low - 8, end = high + 8; // a shell of background, as files have it
-    auto object = Command::createVoxelVLN<Shape>("voxel_tile_tree", "voxel_component", 1.0f, kVoxelOffsetCorner);
+    auto object =
+        Command::createVoxelVLN<Shape>("voxel_tile_tree", "voxel_component", 1.0f, kVoxelOffsetCorner);
     auto tree = object->template extractComponent<Container<Shape>>("voxel_tile_tree");
     auto accessor = tree->tileAccessor();
     accessor.addTiles(int3{first, first, first}, int3{end - 1, end - 1, end - 1}, 24);
@@ -46,15 +47,16 @@ public:
     }
     auto topology = object->template extractComponent<VoxelTopology<Shape>>("voxel_component");
     topology->update(*tree);
-    auto field = Command::createChannel<float, 2, 4, 4, 0, 0>("f", *topology, background, kInitializeDefaultValue,
-                                                              0, Shape::kMaxDepth);
+    auto field = Command::createChannel<float, 2, 4, 4, 0, 0>("f", *topology, background,
+                                                              kInitializeDefaultValue, 0, Shape::kMaxDepth);
     for (int d = 0; d <= Shape::kMaxDepth; ++d)
       for (std::int64_t n = 0; n < tree->tileCount(d); ++n) {
         auto const& tile = std::as_const(*tree).tile(n, d);
         auto data = field->tileData(tile.treeIndex());
         for (int s = 0; s < 64; ++s) {
           auto const p = tile.childDataTIJK(s % 4, s / 4 % 4, s / 16);
-          bool const inside = p.x >= low && p.y >= low && p.z >= low && p.x < high && p.y < high && p.z < high;
+          bool const inside =
+              p.x >= low && p.y >= low && p.z >= low && p.x < high && p.y < high && p.z < high;
           data(s) = inside ? f(p.x, p.y, p.z) : background;
         }
       }
@@ -65,8 +67,8 @@ public:
     auto const convert = [&]<class Build>(Build*) {
       return nanovtt::vttToNanoVTT<Buffer, Build, nanovdb::AbsDiff, true>(
           *object, "f", nanovdb::StatsMode(0), nanovdb::ChecksumMode(0), 0, -1.0f, false, flat.halo,
-          Shape::kMaxDepth - 24, 0, false, flat.coalesce, false, 1, flat.textures, false, 0.0f, false, false, nullptr,
-          nullptr, nullptr, pool);
+          Shape::kMaxDepth - 24, 0, false, flat.coalesce, false, 1, flat.textures, false, 0.0f, false, false,
+          nullptr, nullptr, nullptr, pool);
     };
     m_flat = flat.fp8 ? convert(static_cast<nanovdb::Fp8*>(nullptr)) : convert(static_cast<void*>(nullptr));
   }

@@ -1,6 +1,6 @@
 // Surfaces against closed forms.
-#include "RenderCase.h"
 #include "Render/Surface.h"
+#include "RenderCase.h"
 
 #include <random>
 
@@ -29,7 +29,8 @@ TEST(Cubic, RequirementFindsTheFirstRoot) {
     double expected = -1;
     constexpr int kSteps = 4000;
     for (int k = 1; k <= kSteps && expected < 0; ++k)
-      if ((direct(double(k - 1) / kSteps) < 0) != (direct(double(k) / kSteps) < 0)) expected = (k - 0.5) / kSteps;
+      if ((direct(double(k - 1) / kSteps) < 0) != (direct(double(k) / kSteps) < 0))
+        expected = (k - 0.5) / kSteps;
     float const got = firstRoot(c, 1);
     // Two crossings within a step are seen by the formula alone.
     if (expected < 0 && got >= 0) {
@@ -51,7 +52,8 @@ TEST(Surface, RequirementSphereIsWhereItIs) {
   // In the world a sphere of radius 20 about the origin, in the grid an ellipsoid.
   Affine const transforms[] = {
       Affine{},
-      Affine{{{std::cos(turn), 0, 2 * std::sin(turn)}, {0, 0.8, 0}, {-std::sin(turn), 0, 2 * std::cos(turn)}}, {}}};
+      Affine{{{std::cos(turn), 0, 2 * std::sin(turn)}, {0, 0.8, 0}, {-std::sin(turn), 0, 2 * std::cos(turn)}},
+             {}}};
   for (Affine const& toWorld : transforms) {
     RenderCase const volume(
         [&](double x, double y, double z) {
@@ -71,12 +73,11 @@ TEST(Surface, RequirementSphereIsWhereItIs) {
       for (int x = 0; x < 101; ++x) {
         auto const n = static_cast<std::size_t>(y * 101 + x);
         Vec3d const d = camera.ray((x + 0.5) / 101, (y + 0.5) / 101);
-        double const b = dot(camera.position, d), c = distance * distance - kRadius * kRadius, root = b * b - c;
+        double const b = dot(camera.position, d), c = distance * distance - kRadius * kRadius,
+                     root = b * b - c;
         // The blend of samples of a distance is nearer to the centre than the sphere by at most h^2 / (4 r).
         bool const nearEdge = std::abs(std::sqrt(distance * distance - b * b) - kRadius) < 0.15;
-        if (!nearEdge) {
-          ASSERT_EQ(picture.opacity[n], root > 0 ? 1 : 0) << x << " " << y;
-        }
+        if (!nearEdge) { ASSERT_EQ(picture.opacity[n], root > 0 ? 1 : 0) << x << " " << y; }
         if (!(root > 0) || nearEdge) continue;
         ++hits;
         double const t = -b - std::sqrt(root);

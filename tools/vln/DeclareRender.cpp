@@ -41,17 +41,18 @@ std::optional<Vec3d> vectorOf(std::string const& text) {
   return Vec3d{v[0], v[1], v[2]};
 }
 
-template <class Set> void addVector(CLI::App& self, char const* name, char const* help, bool isDirection, Set set) {
-  self.add_option_function<std::string>(name,
-                                        [=](std::string const& text) {
-                                          auto const v = vectorOf(text);
-                                          if (!v)
-                                            throw CLI::ValidationError(name, text + " is no vector, such as 1,-2,0.5");
-                                          if (isDirection && !(VLN::Render::length(*v) > 0))
-                                            throw CLI::ValidationError(name, text + " has no length");
-                                          set(*v);
-                                        },
-                                        help)
+template <class Set>
+void addVector(CLI::App& self, char const* name, char const* help, bool isDirection, Set set) {
+  self.add_option_function<std::string>(
+          name,
+          [=](std::string const& text) {
+            auto const v = vectorOf(text);
+            if (!v) throw CLI::ValidationError(name, text + " is no vector, such as 1,-2,0.5");
+            if (isDirection && !(VLN::Render::length(*v) > 0))
+              throw CLI::ValidationError(name, text + " has no length");
+            set(*v);
+          },
+          help)
       ->type_name(isDirection ? "X,Y,Z|x|-x|y|..." : "X,Y,Z");
 }
 
@@ -74,7 +75,8 @@ void addCamera(CLI::App& self, VLN::Render::CameraOptions& c) {
       ->check(CLI::Range(1e-3, 1e6))
       ->capture_default_str()
       ->type_name("F");
-  finite(self.add_option("--camera-azimuth-angle", c.azimuth, "Degrees that it then turns about the up direction"))
+  finite(self.add_option("--camera-azimuth-angle", c.azimuth,
+                         "Degrees that it then turns about the up direction"))
       ->type_name("DEGREES");
   finite(self.add_option("--camera-elevation-angle", c.elevation, "Degrees that it then goes up"))
       ->type_name("DEGREES");
@@ -88,10 +90,12 @@ void declareRender(CLI::App& self) {
   auto const options = std::make_shared<RenderCommandOptions>();
   auto& o = *options;
   self.add_option("FILE", o.file, "A .vdb, .nvtt or .ply file")->required();
-  self.add_option("-o,--output", o.output,
-                  "The picture, .png, or .exr with depth and normals (default: the name of FILE with .png, here)")
+  self.add_option(
+          "-o,--output", o.output,
+          "The picture, .png, or .exr with depth and normals (default: the name of FILE with .png, here)")
       ->type_name("OUT");
-  self.add_option("--channel", o.channel, "Name of the channel, as info tells it (default: density, or the first)")
+  self.add_option("--channel", o.channel,
+                  "Name of the channel, as info tells it (default: density, or the first)")
       ->type_name("NAME");
   self.add_option_function<std::string>(
           "--component", [&o](std::string const& c) { o.component = c == "length" ? -1 : c[0] - 'x'; },
@@ -103,11 +107,13 @@ void declareRender(CLI::App& self) {
                                                        {"mip", RenderMode::kMaximum},
                                                        {"mean", RenderMode::kMean},
                                                        {"isosurface", RenderMode::kIsosurface}};
-  self.add_option("--mode", o.mode, "What is drawn (default: fog or surface, as the channel's class and values say)")
+  self.add_option("--mode", o.mode,
+                  "What is drawn (default: fog or surface, as the channel's class and values say)")
       ->transform(CLI::CheckedTransformer(modes, CLI::ignore_case))
       ->type_name("fog|surface|mip|mean|isosurface");
   finite(self.add_option("--iso", o.iso, "Value on the surface"))->type_name("V");
-  static std::map<std::string, Quality> const qualities{{"preview", Quality::kPreview}, {"final", Quality::kFinal}};
+  static std::map<std::string, Quality> const qualities{{"preview", Quality::kPreview},
+                                                        {"final", Quality::kFinal}};
   self.add_option("--quality", o.render.quality, "A quick picture, or one without bias")
       ->transform(CLI::CheckedTransformer(qualities, CLI::ignore_case))
       ->default_str("preview")
@@ -115,7 +121,8 @@ void declareRender(CLI::App& self) {
   self.add_option("--spp", o.render.samples, "Samples for each pixel (default: by mode and quality)")
       ->check(CLI::Range(1, 1 << 20))
       ->type_name("N");
-  finite(self.add_option("--time-limit", o.render.timeLimit, "Seconds after which no further sample is begun"))
+  finite(
+      self.add_option("--time-limit", o.render.timeLimit, "Seconds after which no further sample is begun"))
       ->check(CLI::Range(1e-3, 1e9))
       ->type_name("S");
   self.add_option("--cmap", o.colors, "Colours (default: viridis; fogs of density are white)")
@@ -125,7 +132,8 @@ void declareRender(CLI::App& self) {
           "--clim",
           [&o](std::string const& text) {
             auto const v = numbers(text, 2);
-            if (v.empty() || !(v[0] < v[1])) throw CLI::ValidationError("--clim", text + " is no range, such as 0,1.5");
+            if (v.empty() || !(v[0] < v[1]))
+              throw CLI::ValidationError("--clim", text + " is no range, such as 0,1.5");
             o.range = {v[0], v[1]};
           },
           "Values of the first and the last colour (default: what 99 of 100 values lie in)")
@@ -135,8 +143,9 @@ void declareRender(CLI::App& self) {
                   "linear, linear_r, sigmoid, geom, geom_r, constant, or values with opacities")
       ->capture_default_str()
       ->type_name("NAME|V:A,V:A,...");
-  finite(self.add_option("--opacity-unit", o.render.opacityUnit,
-                         "World length over which opacity 1 lets 1/e of the light pass (default: by the field)"))
+  finite(
+      self.add_option("--opacity-unit", o.render.opacityUnit,
+                      "World length over which opacity 1 lets 1/e of the light pass (default: by the field)"))
       ->check(CLI::Range(1e-30, 1e30))
       ->type_name("LENGTH");
   addVector(self, "--light", "Direction to the light (default: above the camera, to the left)", true,
@@ -153,7 +162,8 @@ void declareRender(CLI::App& self) {
               ok = second.ec == std::errc() && second.ptr == end;
             }
             if (!ok || w < 1 || h < 1 || w > 16384 || h > 16384)
-              throw CLI::ValidationError("--size", text + " is no size of 1x1 to 16384x16384, such as 1920x1080");
+              throw CLI::ValidationError("--size",
+                                         text + " is no size of 1x1 to 16384x16384, such as 1920x1080");
             o.render.width = w, o.render.height = h;
           },
           "Pixels")

@@ -30,12 +30,13 @@ float quantile(std::vector<float> const& sorted, double share) {
 bool isBand(Field const& field) { return field.background() > 0 && field.low() < 0 && field.high() > 0; }
 
 // What was not asked for follows from the field.
-void choose(Field const& field, RenderSource const& source, RenderCommandOptions const& options, RenderOptions& r) {
+void choose(Field const& field, RenderSource const& source, RenderCommandOptions const& options,
+            RenderOptions& r) {
   // A flat buffer knows no fogs of its own.
   std::string const& gridClass = source.gridClass;
   bool const isFog = gridClass == "fog volume" || (gridClass.empty() && source.channel == "density");
   RenderMode const mode =
-      options.mode ? *options.mode
+      options.mode  ? *options.mode
       : options.iso ? RenderMode::kIsosurface
       : !isFog && (isBand(field) || (gridClass == "level set" && field.low() < 0 && field.high() > 0))
           ? RenderMode::kSurface
@@ -78,8 +79,9 @@ void choose(Field const& field, RenderSource const& source, RenderCommandOptions
     break;
   }
   if (r.mode == Mode::kSurface && !(field.low() <= r.iso && r.iso <= field.high()))
-    throw std::invalid_argument(fmt::format("no surface: its values lie in {:.6g} .. {:.6g}, and none is {:.6g}",
-                                            field.low(), field.high(), r.iso));
+    throw std::invalid_argument(
+        fmt::format("no surface: its values lie in {:.6g} .. {:.6g}, and none is {:.6g}", field.low(),
+                    field.high(), r.iso));
   r.depth = options.depth;
 }
 
@@ -87,7 +89,8 @@ void choose(Field const& field, RenderSource const& source, RenderCommandOptions
 std::string frameName(std::string const& path, int frame, int frames) {
   if (frames == 0) return path;
   std::filesystem::path const p(path);
-  return (p.parent_path() / fmt::format("{}_{:04}{}", p.stem().string(), frame, p.extension().string())).string();
+  return (p.parent_path() / fmt::format("{}_{:04}{}", p.stem().string(), frame, p.extension().string()))
+      .string();
 }
 
 class Drawing {
@@ -103,7 +106,8 @@ public:
       return;
     }
     m_field.emplace(m_source.grid, FieldOptions{options.component, options.render.threads});
-    if (m_field->empty()) throw std::invalid_argument("channel '" + m_source.channel + "' has no active voxel");
+    if (m_field->empty())
+      throw std::invalid_argument("channel '" + m_source.channel + "' has no active voxel");
     choose(*m_field, m_source, options, m_render);
     auto const shows = [&](float low, float high) {
       if (m_render.mode == Mode::kSurface) return low < m_render.iso && high >= m_render.iso;
@@ -128,9 +132,10 @@ public:
     if (m_source.points) {
       frame.picture = renderPoints(*m_source.points, frame.camera, m_render.width, m_render.height);
     } else {
-      frame.picture = VLN::Render::render(*m_field, m_source.tileToWorld, frame.camera, m_render, [&](double done) {
-        if (m_progress) m_progress("drawing", from + (to - from) * done);
-      });
+      frame.picture =
+          VLN::Render::render(*m_field, m_source.tileToWorld, frame.camera, m_render, [&](double done) {
+            if (m_progress) m_progress("drawing", from + (to - from) * done);
+          });
       // What was chosen for the first frame holds for all.
       m_render.opacityUnit = frame.options.opacityUnit = frame.picture.opacityUnit;
       frame.hasColors = m_render.mode != Mode::kSurface && (m_render.mode != Mode::kFog || m_render.colored);
@@ -178,11 +183,12 @@ void render(RenderCommandOptions const& options) {
         if (n > 0) continue;
         if (!options.parameters.empty()) writeParameters(options.parameters, path, frame, options);
         summary = fmt::format("{}: {}, {} x {} pixels, {:.2f} s\n", path,
-                              frame.channel.empty() ? "points" : oneLine(frame.channel, 60), frame.picture.width,
-                              frame.picture.height, frame.picture.seconds);
+                              frame.channel.empty() ? "points" : oneLine(frame.channel, 60),
+                              frame.picture.width, frame.picture.height, frame.picture.seconds);
         if (frame.options.mode == Mode::kFog && !frame.channel.empty())
-          summary += fmt::format("fog: --clim {:.6g},{:.6g} --opacity-unit {:.6g}\n", frame.options.transfer.low,
-                                 frame.options.transfer.high, frame.picture.opacityUnit);
+          summary +=
+              fmt::format("fog: --clim {:.6g},{:.6g} --opacity-unit {:.6g}\n", frame.options.transfer.low,
+                          frame.options.transfer.high, frame.picture.opacityUnit);
         else if (frame.hasColors)
           summary += fmt::format("colours: --clim {:.6g},{:.6g}\n", frame.picture.low, frame.picture.high);
         summary += "camera: " + cameraText(frame.camera) + "\n";

@@ -14,7 +14,7 @@ enum class RenderMode { kFog, kSurface, kMaximum, kMean, kIsosurface };
 
 struct RenderCommandOptions {
   std::string file;
-  std::string output; ///< empty: the name of the file, with .png, in the working folder
+  std::string output;     ///< empty: the name of the file, with .png, in the working folder
   std::string parameters; ///< a .json file for all parameters; empty for none
   std::string channel;
   int component = -1;

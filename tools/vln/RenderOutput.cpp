@@ -35,7 +35,8 @@ Background backgroundOf(std::string const& text) {
   std::uint32_t rgb = 0;
   char const* const end = text.data() + text.size();
   if (text.size() == 7 && text[0] == '#')
-    if (auto const [at, error] = std::from_chars(text.data() + 1, end, rgb, 16); error == std::errc() && at == end)
+    if (auto const [at, error] = std::from_chars(text.data() + 1, end, rgb, 16);
+        error == std::errc() && at == end)
       return {rgb, false};
   throw std::invalid_argument("'" + text + "' is no background: neutral, none, white, black or #rrggbb");
 }
@@ -52,7 +53,8 @@ public:
   int scale() const { return m_scale; }
   void dot(int x, int y, Rgb c) {
     if (x < 0 || y < 0 || x >= m_width || y >= m_height) return;
-    auto const at = 4 * (static_cast<std::size_t>(y) * static_cast<std::size_t>(m_width) + static_cast<std::size_t>(x));
+    auto const at =
+        4 * (static_cast<std::size_t>(y) * static_cast<std::size_t>(m_width) + static_cast<std::size_t>(x));
     m_bytes[at] = c.r, m_bytes[at + 1] = c.g, m_bytes[at + 2] = c.b, m_bytes[at + 3] = 255;
   }
   void box(int x, int y, int width, int height, Rgb c) {
@@ -91,8 +93,9 @@ public:
     }
     for (int n = 0; n <= 4; ++n) {
       double const t = n / 4.0;
-      double const v = options.log ? double(options.low) * std::pow(double(options.high) / double(options.low), t)
-                                   : double(options.low) + (double(options.high) - double(options.low)) * t;
+      double const v = options.log
+                           ? double(options.low) * std::pow(double(options.high) / double(options.low), t)
+                           : double(options.low) + (double(options.high) - double(options.low)) * t;
       int const y = top + static_cast<int>(std::lround((1 - t) * (height - 1)));
       box(x + width, y, 3 * m_scale, m_scale, {255, 255, 255});
       text(x + width + 5 * m_scale, y - Image::textHeight(m_scale) / 2, fmt::format("{:.4g}", v));
@@ -107,8 +110,8 @@ public:
     for (int a : order) {
       double const dx = camera.right[a], dy = -camera.up[a];
       line(x, y, x + size * dx, y + size * dy, colors[a]);
-      text(static_cast<int>(x + 1.25 * size * dx) - 2 * m_scale, static_cast<int>(y + 1.25 * size * dy) - 3 * m_scale,
-           std::string(1, "XYZ"[a]), colors[a]);
+      text(static_cast<int>(x + 1.25 * size * dx) - 2 * m_scale,
+           static_cast<int>(y + 1.25 * size * dy) - 3 * m_scale, std::string(1, "XYZ"[a]), colors[a]);
     }
   }
 
@@ -127,17 +130,19 @@ void writeLight(std::string const& path, Picture const& p) {
       parts[a].push_back(p.color[n][a]);
       parts[3 + a].push_back(p.normal[n][a]);
     }
-  std::vector<ExrChannel> channels{{"R", &parts[0]},   {"G", &parts[1]},   {"B", &parts[2]}, {"A", &p.opacity},
-                                   {"N.X", &parts[3]}, {"N.Y", &parts[4]}, {"N.Z", &parts[5]}, {"Z", &p.depth}};
+  std::vector<ExrChannel> channels{{"R", &parts[0]},   {"G", &parts[1]},   {"B", &parts[2]},
+                                   {"A", &p.opacity},  {"N.X", &parts[3]}, {"N.Y", &parts[4]},
+                                   {"N.Z", &parts[5]}, {"Z", &p.depth}};
   writeExr(path, p.width, p.height, channels);
 }
 
 } // namespace
 
 std::string cameraText(Camera const& camera) {
-  return fmt::format("--camera-position {} --camera-focal-point {} --camera-view-up {} --camera-view-angle {:.9g}",
-                     vectorText(camera.position), vectorText(camera.focalPoint), vectorText(camera.viewUp),
-                     camera.viewAngle);
+  return fmt::format(
+      "--camera-position {} --camera-focal-point {} --camera-view-up {} --camera-view-angle {:.9g}",
+      vectorText(camera.position), vectorText(camera.focalPoint), vectorText(camera.viewUp),
+      camera.viewAngle);
 }
 
 void checkBackground(std::string const& background) { backgroundOf(background); }

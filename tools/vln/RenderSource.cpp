@@ -114,7 +114,8 @@ PointCloud cloudOf(std::vector<PointSet> const& sets, int heightAxis) {
     }
     if (colors.empty() && set.size() > 0) {
       std::vector<double> heights;
-      for (std::size_t n = first; n < cloud.positions.size(); ++n) heights.push_back(cloud.positions[n][heightAxis]);
+      for (std::size_t n = first; n < cloud.positions.size(); ++n)
+        heights.push_back(cloud.positions[n][heightAxis]);
       std::vector<double> sorted = heights;
       std::sort(sorted.begin(), sorted.end());
       double const low = sorted[sorted.size() / 200], high = sorted[sorted.size() - 1 - sorted.size() / 200];
@@ -176,7 +177,8 @@ RenderSource renderSource(std::string const& file, std::string const& channel, V
       std::vector<PointSet> sets;
       for (auto const& points : content.points)
         if (auto set = pointSetOf(points); set.size() > 0) sets.push_back(std::move(set));
-      if (sets.empty()) throw FileError(file, "has neither a channel with active voxels that can be drawn nor points");
+      if (sets.empty())
+        throw FileError(file, "has neither a channel with active voxels that can be drawn nor points");
       source.points = cloudOf(sets, 1);
       return source;
     }
@@ -189,7 +191,8 @@ RenderSource renderSource(std::string const& file, std::string const& channel, V
   source.gridClass = details[static_cast<std::size_t>(&info - volume.channels.data())].gridClass;
   auto const flat = flatChannels(*volume.object, "*");
   if (std::find(flat.begin(), flat.end(), source.channel) == flat.end())
-    throw FileError(file, "channel '" + oneLine(source.channel, 60) + "' is of a type that cannot be drawn: " + info.type);
+    throw FileError(file, "channel '" + oneLine(source.channel, 60) +
+                              "' is of a type that cannot be drawn: " + info.type);
   FlattenOptions options;
   options.channels = source.channel;
   options.haloFraction = 1;
