@@ -20,3 +20,5 @@ set_target_properties(GeometryVolumeRender PROPERTIES
   VERSION ${PROJECT_VERSION}
   SOVERSION ${PROJECT_VERSION_MAJOR}.${PROJECT_VERSION_MINOR}
   INSTALL_RPATH "$ORIGIN")
+# The loops over rays: half again as fast as at -O2, where loops over three axes stay loops.
+set_source_files_properties(src/Render/Renderer.cpp PROPERTIES COMPILE_OPTIONS "$<$<CONFIG:Release,RelWithDebInfo>:-O3>")

@@ -271,12 +271,9 @@ void Field::place(double const lowest[3], double const highest[3]) {
   double const corner[3] = {double(llc.x), double(llc.y), double(llc.z)};
   double const rootWidth = std::ldexp(1.0, m_view.rootShift);
   for (int a = 0; a < 3; ++a) {
-    if (highest[a] - lowest[a] > kWidestBox || rootWidth > kWidestBox)
+    if (highest[a] - lowest[a] > kWidestBox || highest[a] - corner[a] > 16 * kWidestBox || rootWidth > kWidestBox)
       throw std::invalid_argument("its box is wider than " + std::to_string(int(kWidestBox)) + " voxels");
-    // One sample lower than the box, for what is blended into it from below.
-    double const first = std::clamp(std::floor((lowest[a] - 1 - corner[a]) / rootWidth), -1.0, 63.0);
-    m_view.rootBase[a] = static_cast<std::int32_t>(first);
-    m_origin[a] = corner[a] + first * rootWidth;
+    m_origin[a] = corner[a];
     m_activeLow[a] = static_cast<float>(lowest[a] - m_origin[a]);
     m_activeHigh[a] = static_cast<float>(highest[a] - m_origin[a]);
     m_view.low[a] = m_activeLow[a] - 1, m_view.high[a] = m_activeHigh[a] + 1;
@@ -313,6 +310,18 @@ void Field::weigh(Weight const& weight, int threads) {
                 }
               }
             });
+  m_rootWeights.assign(static_cast<std::size_t>(FieldView::rootWeightsAt(7)), 0);
+  for (std::uint32_t slot = 0; slot < nanovtt::kMaxRoots; ++slot) {
+    std::uint32_t const root = m_view.tree.root(slot);
+    if (root == kNoTile || !(m_weights[root] > 0)) continue;
+    for (int level = 1; level <= 6; ++level) {
+      int const bits = 6 - level;
+      auto const block = (slot / 4096 >> level << bits | slot / 64 % 64 >> level) << bits | slot % 64 >> level;
+      float& most = m_rootWeights[static_cast<std::size_t>(FieldView::rootWeightsAt(level)) + block];
+      most = std::max(most, m_weights[root]);
+    }
+  }
+  m_view.rootWeights = m_rootWeights.data();
   m_view.weights = m_weights.data();
   m_view.cells = m_cells.data();
 }

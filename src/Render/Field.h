@@ -85,7 +85,7 @@ private:
   std::vector<float> m_beside;
   std::vector<TileBounds> m_bounds;
   std::vector<float> m_means;
-  std::vector<float> m_weights;
+  std::vector<float> m_weights, m_rootWeights;
   std::vector<std::uint64_t> m_cells;
 };
 

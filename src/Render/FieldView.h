@@ -5,8 +5,7 @@
 //               ──> weight  0 where nothing in the tile, or below it, matters to the picture
 //               ──> cells   a bit for each of the 4 x 4 x 4 cells between its samples: whether it matters
 //
-// Positions are local: tile space less `origin`, which lies on the lattice of the roots near the grid's box,
-// so that floats are fine enough. A ray walks tiles by Walk.h, single places are read by FieldPath here.
+// Positions are local: counted from the lowest corner of the roots, so that floats are fine enough. A ray walks tiles by Walk.h, single places are read by FieldPath here.
 #pragma once
 
 #include "Reader/NanoVTTReader.h"
@@ -36,8 +35,8 @@ struct FieldView {
   std::uint64_t const* bricks = nullptr;
   float const* weights = nullptr;
   std::uint64_t const* cells = nullptr;
-  std::int32_t rootBase[3] = {0, 0, 0}; ///< root slot of local (0, 0, 0), which may lie beside the table
-  int rootShift = 0;                    ///< log2 of the width of a root
+  float const* rootWeights = nullptr; ///< the largest of blocks of roots: see rootWeight()
+  int rootShift = 0;                  ///< log2 of the width of a root
   int maxDepth = nanovtt::kMaxDepth;
   Vec3 low, high;       ///< local box of the samples, one more on each side: nothing lies outside
   float background = 0; ///< where there is no tile
@@ -47,15 +46,31 @@ struct FieldView {
     int const core = nanovtt::kTileWidth << (e >> kBrickLevelsShift & 7);
     return {(e & kBrickBeside ? beside : inBuffer) + (e & kBrickOffsetMask), core, core + 1};
   }
+  /// The largest weight of a block of roots 2^level wide on each axis, level 1 to 6.
+  /// @pre The position lies in the table.
+  NANOVTT_HD float rootWeight(int level, std::int32_t x, std::int32_t y, std::int32_t z) const {
+    int const down = rootShift + level, bits = 6 - level;
+    return rootWeights[rootWeightsAt(level) + ((z >> down << bits | y >> down) << bits | x >> down)];
+  }
+  /// Where the weights of a level begin: those of level 1 first.
+  NANOVTT_HD static constexpr int rootWeightsAt(int level) {
+    // 32^3 + 16^3 + ..., a geometric series
+    return ((1 << 18) - (1 << 3 * (7 - level))) / 7;
+  }
   /// The root that holds a local position.
   NANOVTT_HD std::uint32_t root(std::int32_t x, std::int32_t y, std::int32_t z) const {
-    auto const i = static_cast<std::uint32_t>(rootBase[0] + (x >> rootShift)),
-               j = static_cast<std::uint32_t>(rootBase[1] + (y >> rootShift)),
-               k = static_cast<std::uint32_t>(rootBase[2] + (z >> rootShift));
+    auto const i = static_cast<std::uint32_t>(x >> rootShift), j = static_cast<std::uint32_t>(y >> rootShift),
+               k = static_cast<std::uint32_t>(z >> rootShift);
     if ((i | j | k) >= nanovtt::kRootTableWidth) return nanovtt::kNoTile;
     return tree.root((k * 64 + j) * 64 + i);
   }
 };
+
+/// @pre The result fits. @cost Less than std::floor, which is a call on plain x86-64.
+NANOVTT_HD inline std::int32_t floorOf(float v) {
+  auto const cut = static_cast<std::int32_t>(v);
+  return cut - (static_cast<float>(cut) > v);
+}
 
 NANOVTT_HD inline float lerp(float a, float b, float f) { return (b - a) * f + a; }
 
@@ -137,8 +152,7 @@ struct FieldPath {
     if (!(p.x > f.low.x && p.y > f.low.y && p.z > f.low.z && p.x < f.high.x && p.y < f.high.y &&
           p.z < f.high.z))
       return f.background;
-    auto const x = static_cast<std::int32_t>(std::floor(p.x)), y = static_cast<std::int32_t>(std::floor(p.y)),
-               z = static_cast<std::int32_t>(std::floor(p.z));
+    std::int32_t const x = floorOf(p.x), y = floorOf(p.y), z = floorOf(p.z);
     if (!moveTo(f, x, y, z)) return f.background;
     Brick const b = f.brick(top().tile);
     int const shift = shiftOf(top().depth);

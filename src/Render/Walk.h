@@ -83,8 +83,12 @@ public:
       int shift = m_field.rootShift; // of the region that is alike
       bool matters = false;
       if (m_path.height == 0) {
-        std::uint32_t const root = m_field.root(m_cell[0], m_cell[1], m_cell[2]);
-        if (root != nanovtt::kNoTile) m_path.push(m_field, root, nanovtt::kTileSpaceBits - shift);
+        int const empty = emptyLevel(above);
+        shift += empty;
+        if (empty == 0) {
+          std::uint32_t const root = m_field.root(m_cell[0], m_cell[1], m_cell[2]);
+          if (root != nanovtt::kNoTile) m_path.push(m_field, root, nanovtt::kTileSpaceBits - shift);
+        }
       }
       if (m_path.height != 0) {
         for (;;) {
@@ -132,6 +136,20 @@ public:
   }
 
 private:
+  /// log2 of the width, in roots, of the largest block about the cell in which nothing matters; 0 when the root
+  /// itself is to be looked at.
+  NANOVTT_HD int emptyLevel(float above) const {
+    std::int32_t const x = m_cell[0], y = m_cell[1], z = m_cell[2];
+    if (static_cast<std::uint32_t>(x | y | z) >> m_field.rootShift >= nanovtt::kRootTableWidth) return 0;
+    int level = 3;
+    if (m_field.rootWeight(level, x, y, z) > above) {
+      for (--level; level > 0; --level)
+        if (!(m_field.rootWeight(level, x, y, z) > above)) break;
+      return level;
+    }
+    while (level < 6 && !(m_field.rootWeight(level + 1, x, y, z) > above)) ++level;
+    return level;
+  }
   /// Goes on behind the region of that width round the cell. @return true at the end.
   NANOVTT_HD bool leave(int shift, Segment& s) {
     float t = m_end;
@@ -151,13 +169,11 @@ private:
     m_t = t;
     if (axis < 0) return true;
     for (int a = 0; a < 3; ++a) {
-      if (a == axis) {
-        m_cell[a] = m_ray.direction[a] > 0 ? low[a] + width : low[a] - 1;
-        continue;
-      }
-      float const v = std::floor(m_ray.origin[a] + m_ray.direction[a] * t);
-      float const first = static_cast<float>(low[a]), last = static_cast<float>(low[a] + width - 1);
-      m_cell[a] = static_cast<std::int32_t>(v < first ? first : v > last ? last : v);
+      std::int32_t const v = floorOf(m_ray.origin[a] + m_ray.direction[a] * t), last = low[a] + width - 1;
+      m_cell[a] = a == axis     ? (m_ray.direction[a] > 0 ? low[a] + width : low[a] - 1)
+                  : v < low[a]  ? low[a]
+                  : v > last    ? last
+                                : v;
     }
     return false;
   }
@@ -165,7 +181,7 @@ private:
   FieldView const& m_field;
   Ray const& m_ray;
   FieldPath m_path;
-  std::int32_t m_cell[3];
+  std::int32_t m_cell[3] = {0, 0, 0};
   float m_t, m_end;
   bool m_inside;
 };
