@@ -11,7 +11,7 @@ foreach(source IN LISTS sources)
   target_include_directories(${target} PRIVATE "${PROJECT_SOURCE_DIR}/bench")
   target_compile_definitions(${target} PRIVATE "VLN_BENCH_DATA_DIR=\"${vln_test_data}\"")
   target_link_libraries(${target} PRIVATE
-    GeometryVolume TBB::tbb benchmark::benchmark benchmark::benchmark_main)
+    GeometryVolume GeometryVolumeRender TBB::tbb benchmark::benchmark benchmark::benchmark_main)
   if(TARGET GeometryVolumeInterop)
     target_link_libraries(${target} PRIVATE GeometryVolumeInterop)
   endif()

@@ -23,7 +23,6 @@ void writeRgbaPng(std::string const& path, int width, int height, std::vector<st
   image.width = static_cast<png_uint_32>(width);
   image.height = static_cast<png_uint_32>(height);
   image.format = opaque ? PNG_FORMAT_RGB : PNG_FORMAT_RGBA;
-  image.flags = PNG_IMAGE_FLAG_FAST;
   png_alloc_size_t size = PNG_IMAGE_PNG_SIZE_MAX(image);
   std::vector<unsigned char> bytes(size);
   if (!png_image_write_to_memory(&image, bytes.data(), &size, 0, opaque ? rgb.data() : pixels.data(), 0,
