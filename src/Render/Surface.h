@@ -93,20 +93,19 @@ NANOVTT_HD inline bool hitSurface(FieldView const& field, Ray const& ray, float 
     std::uint64_t const cells = field.cells[s.tile];
     int const last = s.brick.core - 1;
     Vec3 const u = s.samples(ray.at(s.t0));
-    int cell[3];
+    float const width = 1 / s.scale; // of a cell
+    int cell[3], way[3];
     float next[3], step[3];
-    int way[3];
     Vec3 const o = s.samples(ray.origin);
     for (int a = 0; a < 3; ++a) {
       int const n = static_cast<int>(u[a]);
       cell[a] = u[a] < 0 ? 0 : n > last ? last : n;
-      way[a] = d[a] > 0 ? 1 : -1;
-      if (d[a] == 0) {
-        next[a] = 3.4e38f, step[a] = 0;
-        continue;
-      }
-      step[a] = 1 / (d[a] > 0 ? d[a] : -d[a]);
-      next[a] = (static_cast<float>(cell[a] + (d[a] > 0)) - o[a]) / d[a];
+      bool const rises = d[a] > 0;
+      way[a] = rises ? 1 : -1;
+      step[a] = (rises ? width : -width) * ray.inverse[a];
+      next[a] = d[a] == 0 ? 3.4e38f
+                          : (s.corner[a] + static_cast<float>(cell[a] + rises) * width - ray.origin[a]) *
+                                ray.inverse[a];
     }
     float t = s.t0;
     for (;;) {

@@ -70,8 +70,8 @@ public:
     if (!m_inside) return;
     Vec3 const p = ray.at(t0);
     for (int a = 0; a < 3; ++a) {
-      float const v = std::floor(p[a]), low = std::floor(field.low[a]), high = std::ceil(field.high[a]) - 1;
-      m_cell[a] = static_cast<std::int32_t>(v < low ? low : v > high ? high : v);
+      std::int32_t const v = floorOf(p[a]), low = floorOf(field.low[a]), high = -floorOf(-field.high[a]) - 1;
+      m_cell[a] = v < low ? low : v > high ? high : v;
     }
   }
 
