@@ -57,7 +57,7 @@ struct Data {
       toWorld.rows[a] = {row[0], row[1], row[2]}, toWorld.shift[a] = row[3];
     }
     std::vector<Vec3d> outline;
-    for (Vec3 const& p : field->outline([&](float low, float high) { return low != high; }))
+    for (Vec3 const &p : field->outline([&](float low, float high) { return low != high; }))
       outline.push_back(toWorld.point(p.as<double>() + field->origin()));
     camera = Camera({}, outline, 0, 1);
   }
@@ -127,7 +127,8 @@ void levelSetNano(benchmark::State& state) {
   for (auto _ : state) {
     hits = 0;
     data.forRays([&](Vec3d const& d) {
-      nanovdb::Ray<float> const world({float(p.x), float(p.y), float(p.z)}, {float(d.x), float(d.y), float(d.z)});
+      nanovdb::Ray<float> const world({float(p.x), float(p.y), float(p.z)},
+                                      {float(d.x), float(d.y), float(d.z)});
       auto ray = world.worldToIndexF(*grid);
       nanovdb::Coord cell;
       float value, t;
@@ -136,7 +137,9 @@ void levelSetNano(benchmark::State& state) {
   }
   finish(state, hits);
 }
-BENCHMARK(levelSetNano)->Name("level set/NanoVDB ZeroCrossing (voxel, not root)")->Unit(benchmark::kMillisecond);
+BENCHMARK(levelSetNano)
+    ->Name("level set/NanoVDB ZeroCrossing (voxel, not root)")
+    ->Unit(benchmark::kMillisecond);
 
 void fogOurs(benchmark::State& state) {
   static Data data("smoke.vdb");

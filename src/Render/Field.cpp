@@ -271,7 +271,8 @@ void Field::place(double const lowest[3], double const highest[3]) {
   double const corner[3] = {double(llc.x), double(llc.y), double(llc.z)};
   double const rootWidth = std::ldexp(1.0, m_view.rootShift);
   for (int a = 0; a < 3; ++a) {
-    if (highest[a] - lowest[a] > kWidestBox || highest[a] - corner[a] > 16 * kWidestBox || rootWidth > kWidestBox)
+    if (highest[a] - lowest[a] > kWidestBox || highest[a] - corner[a] > 16 * kWidestBox ||
+        rootWidth > kWidestBox)
       throw std::invalid_argument("its box is wider than " + std::to_string(int(kWidestBox)) + " voxels");
     m_origin[a] = corner[a];
     m_activeLow[a] = static_cast<float>(lowest[a] - m_origin[a]);
@@ -316,7 +317,8 @@ void Field::weigh(Weight const& weight, int threads) {
     if (root == kNoTile || !(m_weights[root] > 0)) continue;
     for (int level = 1; level <= 6; ++level) {
       int const bits = 6 - level;
-      auto const block = (slot / 4096 >> level << bits | slot / 64 % 64 >> level) << bits | slot % 64 >> level;
+      auto const block =
+          (slot / 4096 >> level << bits | slot / 64 % 64 >> level) << bits | slot % 64 >> level;
       float& most = m_rootWeights[static_cast<std::size_t>(FieldView::rootWeightsAt(level)) + block];
       most = std::max(most, m_weights[root]);
     }

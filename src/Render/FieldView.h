@@ -5,7 +5,8 @@
 //               ──> weight  0 where nothing in the tile, or below it, matters to the picture
 //               ──> cells   a bit for each of the 4 x 4 x 4 cells between its samples: whether it matters
 //
-// Positions are local: counted from the lowest corner of the roots, so that floats are fine enough. A ray walks tiles by Walk.h, single places are read by FieldPath here.
+// Positions are local: counted from the lowest corner of the roots, so that floats are fine enough. A ray
+// walks tiles by Walk.h, single places are read by FieldPath here.
 #pragma once
 
 #include "Reader/NanoVTTReader.h"

@@ -136,8 +136,8 @@ public:
   }
 
 private:
-  /// log2 of the width, in roots, of the largest block about the cell in which nothing matters; 0 when the root
-  /// itself is to be looked at.
+  /// log2 of the width, in roots, of the largest block about the cell in which nothing matters; 0 when the
+  /// root itself is to be looked at.
   NANOVTT_HD int emptyLevel(float above) const {
     std::int32_t const x = m_cell[0], y = m_cell[1], z = m_cell[2];
     if (static_cast<std::uint32_t>(x | y | z) >> m_field.rootShift >= nanovtt::kRootTableWidth) return 0;
@@ -170,10 +170,10 @@ private:
     if (axis < 0) return true;
     for (int a = 0; a < 3; ++a) {
       std::int32_t const v = floorOf(m_ray.origin[a] + m_ray.direction[a] * t), last = low[a] + width - 1;
-      m_cell[a] = a == axis     ? (m_ray.direction[a] > 0 ? low[a] + width : low[a] - 1)
-                  : v < low[a]  ? low[a]
-                  : v > last    ? last
-                                : v;
+      m_cell[a] = a == axis    ? (m_ray.direction[a] > 0 ? low[a] + width : low[a] - 1)
+                  : v < low[a] ? low[a]
+                  : v > last   ? last
+                               : v;
     }
     return false;
   }
