@@ -4,7 +4,8 @@
 
 using namespace VLN::Render;
 
-__global__ void surfaceHits(FieldView field, Vec3 origin, Vec3 const* directions, float iso, float* t, int n) {
+__global__ void surfaceHits(FieldView field, Vec3 origin, Vec3 const* directions, float iso, float* t,
+                            int n) {
   int const i = static_cast<int>(blockIdx.x * blockDim.x + threadIdx.x);
   if (i >= n) return;
   Ray const ray(origin, directions[i]);
