@@ -1,7 +1,12 @@
-# One program for each source of examples/, run by ctest under the label "examples".
-vln_glob(sources examples/*.cpp)
+# One program for each source of examples/ and examples/parts/, run by ctest under the label "examples".
+vln_glob(sources examples/*.cpp examples/parts/*.cpp)
 foreach(source IN LISTS sources)
   get_filename_component(name "${source}" NAME_WE)
+  file(STRINGS "${source}" uses_interop REGEX "#include \"Interop/" LIMIT_COUNT 1)
+  if(uses_interop AND NOT TARGET GeometryVolumeInterop)
+    message(STATUS "No example ${name}: it needs VLN_BUILD_INTEROP")
+    continue()
+  endif()
   set(target example_${name})
   add_executable(${target} "${source}")
   vln_target(${target})

@@ -70,6 +70,7 @@ step configure cmake --preset fuzz -DCMAKE_CXX_COMPILER="$clang" >"$folder/confi
 step build cmake --build build/fuzz -j "$jobs" --target "fuzz_$target" >"$folder/build.log"
 FUZZ_SEEDS=$folder/seeds "build/release/bin/test_$room" --gtest_filter="${seeds#*:}.*Seeds*" >"$folder/seeds.log"
 cd "$folder"
+export LSAN_OPTIONS="suppressions=$root/fuzz/lsan.supp:print_suppressions=0${LSAN_OPTIONS:+:$LSAN_OPTIONS}"
 # shellcheck disable=SC2086
 exec "$root/build/fuzz/bin/fuzz_$target" ${runs:+-runs="$runs"} ${seconds:+-max_total_time="$seconds"} $options \
   -timeout=60 -rss_limit_mb=3000 -print_final_stats=1 -verbosity=0 \

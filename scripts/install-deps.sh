@@ -1,6 +1,6 @@
 #!/bin/sh
-# Installs the Debian packages that the build, the tests and the checks need. Asks nothing; when
-# all is there it does nothing and calls no network.
+# install-deps.sh [--checks]: installs the Debian packages that the build and the tests need, with --checks those
+# of scripts/check.sh too. Asks nothing; when all is there it does nothing and calls no network.
 set -eu
 
 packages="
@@ -9,8 +9,12 @@ packages="
   libopenvdb-dev libopenvdb-tools libboost-iostreams-dev libimath-dev
   libcli11-dev nlohmann-json3-dev libpng-dev libfmt-dev
   libgtest-dev libgmock-dev libbenchmark-dev
-  clang-format-14
 "
+case ${1:-} in
+  '') ;;
+  --checks) packages="$packages clang-format-14 clang-tidy-14" ;;
+  *) echo "install-deps: unknown option '$1'" >&2 && exit 2 ;;
+esac
 
 if ! command -v dpkg-query >/dev/null 2>&1; then
   echo "install-deps: this is not a Debian system; install the counterparts of:" >&2

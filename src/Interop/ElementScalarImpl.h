@@ -22,16 +22,9 @@ template <class T> typename ScalarOf<T>::type componentOf(T const& value, int c)
 
 } // namespace VLN::Interop
 
-/// Expands X(type, name) for each element type that a file of any format brings, as far as this build has it.
+/// Expands X(type, name) for each element type that a file of any format brings, as far as this build has it:
+/// what flat buffers hold, and of .vdb files masks (as bytes) and vectors of integers.
 #define VLN_FOR_EACH_FILE_ELEMENT_TYPE(X)                                                                    \
-  VLN_ELEMENT_FLOAT(X)                                                                                       \
-  VLN_ELEMENT_DOUBLE(X)                                                                                      \
+  VLN_FOR_EACH_FLAT_ELEMENT_TYPE(X)                                                                          \
   VLN_ELEMENT_UINT8(X)                                                                                       \
-  VLN_ELEMENT_INT16(X)                                                                                       \
-  VLN_ELEMENT_INT32(X)                                                                                       \
-  VLN_ELEMENT_UINT32(X)                                                                                      \
-  VLN_ELEMENT_INT64(X)                                                                                       \
-  VLN_ELEMENT_FLOAT3(X)                                                                                      \
-  VLN_ELEMENT_FLOAT4(X)                                                                                      \
-  VLN_ELEMENT_DOUBLE3(X)                                                                                     \
   VLN_ELEMENT_INT3(X)

@@ -7,6 +7,7 @@
 #include <algorithm>
 #include <cctype>
 #include <filesystem>
+#include <vector>
 
 namespace VLN::Interop {
 
@@ -15,12 +16,50 @@ namespace {
 struct Row {
   FileFormat format;
   char const* suffix;
+  FileContent read, written; ///< any number of bits
 };
+// By suffix: the order of lists.
 constexpr Row kTable[] = {
-    {FileFormat::kVdb, ".vdb"},   {FileFormat::kNvtt, ".nvtt"}, {FileFormat::kPly, ".ply"},
-    {FileFormat::kObj, ".obj"},   {FileFormat::kPng, ".png"},   {FileFormat::kCsv, ".csv"},
-    {FileFormat::kJson, ".json"}, {FileFormat::kExr, ".exr"},
+    {FileFormat::kCsv, ".csv", {}, FileContent::kValues},
+    {FileFormat::kExr, ".exr", {}, FileContent::kRenderings},
+    {FileFormat::kJson, ".json", {}, FileContent::kParameters},
+    {FileFormat::kNvtt, ".nvtt", FileContent::kVolumes | FileContent::kFlatBuffers,
+     FileContent::kVolumes | FileContent::kFlatBuffers},
+    {FileFormat::kObj, ".obj", {}, FileContent::kBoxes | FileContent::kPoints},
+    {FileFormat::kPly, ".ply", FileContent::kPoints, FileContent::kPoints},
+    {FileFormat::kPng, ".png", {}, FileContent::kPictures | FileContent::kRenderings},
+    {FileFormat::kVdb, ".vdb", FileContent::kVolumes | FileContent::kGrids | FileContent::kPoints,
+     FileContent::kVolumes | FileContent::kGrids | FileContent::kPoints},
 };
+
+Row const* rowOf(FileFormat format) {
+  for (Row const& row : kTable)
+    if (row.format == format) return &row;
+  return nullptr;
+}
+
+char const* nameOf(FileContent content) {
+  switch (content) {
+  case FileContent::kVolumes:
+    return "volumes";
+  case FileContent::kGrids:
+    return "grids";
+  case FileContent::kFlatBuffers:
+    return "flat buffers";
+  case FileContent::kPoints:
+    return "points";
+  case FileContent::kBoxes:
+    return "boxes";
+  case FileContent::kPictures:
+  case FileContent::kRenderings:
+    return "pictures";
+  case FileContent::kParameters:
+    return "parameters";
+  case FileContent::kValues:
+    return "values";
+  }
+  return "";
+}
 
 std::string lowerSuffix(std::string const& path) {
   std::string suffix = std::filesystem::path(path).extension().string();
@@ -29,14 +68,16 @@ std::string lowerSuffix(std::string const& path) {
   return suffix;
 }
 
-// "as .obj, .ply or .vdb".
-std::string listOf(std::initializer_list<FileFormat> formats) {
+std::vector<char const*> suffixes(FileContent content, FileContent Row::*set) {
+  std::vector<char const*> list;
+  for (Row const& row : kTable)
+    if (row.*set & content) list.push_back(row.suffix);
+  return list;
+}
+std::string listOf(std::vector<char const*> const& suffixes) {
   std::string list;
-  std::size_t left = formats.size();
-  for (FileFormat const format : formats) {
-    list += suffixOf(format);
-    if (--left > 0) list += left == 1 ? " or " : ", ";
-  }
+  for (std::size_t n = 0; n < suffixes.size(); ++n)
+    list += (n == 0 ? "" : n + 1 == suffixes.size() ? " or " : ", ") + std::string(suffixes[n]);
   return list;
 }
 
@@ -50,20 +91,30 @@ FileFormat formatOf(std::string const& path) {
 }
 
 char const* suffixOf(FileFormat format) {
-  for (Row const& row : kTable)
-    if (row.format == format) return row.suffix;
-  return "";
+  Row const* const row = rowOf(format);
+  return row ? row->suffix : "";
 }
 
-FileFormat checkOutputAs(std::string const& path, char const* what,
-                         std::initializer_list<FileFormat> formats) {
+bool isRead(FileFormat format, FileContent content) {
+  Row const* const row = rowOf(format);
+  return row && row->read & content;
+}
+bool isWritten(FileFormat format, FileContent content) {
+  Row const* const row = rowOf(format);
+  return row && row->written & content;
+}
+std::string suffixesRead(FileContent content) { return listOf(suffixes(content, &Row::read)); }
+std::string suffixesWritten(FileContent content) { return listOf(suffixes(content, &Row::written)); }
+
+FileFormat checkOutputFor(FileContent content, std::string const& path) {
   FileFormat const format = formatOf(path);
-  bool const fits = std::find(formats.begin(), formats.end(), format) != formats.end();
-  bool const only = formats.size() == 1;
+  bool const fits = isWritten(format, content);
+  auto const possible = suffixes(content, &Row::written);
+  bool const only = possible.size() == 1;
   if (!fits && !(only && (lowerSuffix(path).empty() || findOutputTarget(path).straight)))
-    throw FileError(path, std::string(what) + " are written as " + listOf(formats));
+    throw FileError(path, std::string(nameOf(content)) + " are written as " + listOf(possible));
   checkOutput(path);
-  return fits ? format : *formats.begin();
+  return fits ? format : formatOf(std::string("a") + possible.front());
 }
 
 } // namespace VLN::Interop

@@ -1,26 +1,48 @@
-// FileFormat: which suffix stands for which format. A new format is a line in FileFormat.cpp.
+// The formats of files: which suffix stands for which, and what may be read from it and written to it. A new
+// format is a row of the table in FileFormat.cpp; help texts and messages follow from it.
 #pragma once
 
 #include "GeometryVolume/core/Export.h"
 
-#include <initializer_list>
 #include <string>
 
 namespace VLN::Interop {
 
 enum class FileFormat { kUnknown, kVdb, kNvtt, kPly, kObj, kPng, kCsv, kJson, kExr };
 
+/// What a file holds, as messages call it.
+enum class FileContent : unsigned {
+  kVolumes = 1,      ///< "volumes": trees with channels
+  kGrids = 2,        ///< "grids": what is read and written again without loss
+  kFlatBuffers = 4,  ///< "flat buffers"
+  kPoints = 8,       ///< "points"
+  kBoxes = 16,       ///< "boxes"
+  kPictures = 32,    ///< "pictures"
+  kValues = 64,      ///< "values": tables
+  kRenderings = 128, ///< "pictures" with opacity and depth
+  kParameters = 256, ///< "parameters" of a picture
+};
+constexpr FileContent operator|(FileContent a, FileContent b) {
+  return FileContent(unsigned(a) | unsigned(b));
+}
+constexpr bool operator&(FileContent a, FileContent b) { return (unsigned(a) & unsigned(b)) != 0; }
+
 /// As the suffix of the name tells, whatever its case.
 VLN_API FileFormat formatOf(std::string const& path);
 /// ".vdb"; empty for kUnknown.
 VLN_API char const* suffixOf(FileFormat format);
 
-/// Tells whether a file of that name could be written in one of these formats, before the work that leads to
-/// it. Pipes and devices, and with a single format names without a suffix, pass.
-/// @param what Is written, for the message: "points".
+VLN_API bool isRead(FileFormat format, FileContent content);
+VLN_API bool isWritten(FileFormat format, FileContent content);
+/// ".obj, .ply or .vdb": the formats that such content, or any of several, is read from or written
+/// to.
+VLN_API std::string suffixesRead(FileContent content);
+VLN_API std::string suffixesWritten(FileContent content);
+
+/// Tells whether content could be written to a file of that name, before the work that leads to it. Pipes and
+/// devices, and for content of a single format names without a suffix, pass.
 /// @return The format.
 /// @error FileError for a suffix that stands for no format of these, and as checkOutput().
-VLN_API FileFormat checkOutputAs(std::string const& path, char const* what,
-                                 std::initializer_list<FileFormat> formats);
+VLN_API FileFormat checkOutputFor(FileContent content, std::string const& path);
 
 } // namespace VLN::Interop

@@ -58,7 +58,7 @@ public:
     VdbImport content;
     content.file = m_path;
     for (std::uint32_t n = 0; n < m_reader.gridCount(); ++n) {
-      tell("filling the channels", 0.2 + 0.8 * n / m_reader.gridCount());
+      report("filling the channels", 0.2 + 0.8 * n / m_reader.gridCount());
       auto const grid = m_reader.grid(n);
       std::string name = grid.name();
       if (name.empty()) name = "unnamed";
@@ -81,17 +81,17 @@ public:
     object->putComponent(std::move(m_tree));
     volume.object = std::move(object);
     content.volumes.push_back(std::move(volume));
-    tell("done", 1);
+    report("done", 1);
     return content;
   }
 
 private:
-  void tell(char const* stage, double done) const {
+  void report(char const* stage, double done) const {
     if (m_progress) m_progress(stage, done);
   }
 
   void collectTiles(std::uint64_t memoryBytes) {
-    tell("reading the tiles", 0);
+    report("reading the tiles", 0);
     std::uint64_t bytes = 0;
     std::uint64_t perTile = 160;
     for (std::uint32_t n = 0; n < m_reader.gridCount(); ++n)
@@ -117,39 +117,19 @@ private:
 
   Ostil::Ptr<TileTree3D::ChannelBase> makeChannel(nanovtt::GridReader const& grid, VdbChannel& info) const {
     switch (grid.type()) {
-    case GridType::kFloat:
     case GridType::kFp4:
     case GridType::kFp8:
     case GridType::kFp16:
     case GridType::kFpN:
-      return fill<float>(grid, "float", info);
-#if VLN_HAS_ELEMENT_DOUBLE
-    case GridType::kDouble:
-      return fill<double>(grid, "double", info);
-#endif
-#if VLN_HAS_ELEMENT_INT16
-    case GridType::kInt16:
-      return fill<short>(grid, "int16", info);
-#endif
-    case GridType::kInt32:
-      return fill<int>(grid, "int32", info);
-    case GridType::kInt64:
-      return fill<std::int64_t>(grid, "int64", info);
-    case GridType::kFloat3:
-      return fill<Velorn::Math::float3>(grid, "vec3s", info);
-    case GridType::kDouble3:
-      return fill<Velorn::Math::double3>(grid, "vec3d", info);
-#if VLN_HAS_ELEMENT_UINT32
-    case GridType::kUInt32:
-      return fill<unsigned>(grid, "uint32", info);
-#endif
-#if VLN_HAS_ELEMENT_FLOAT4
-    case GridType::kFloat4:
-      return fill<Velorn::Math::float4>(grid, "vec4s", info);
-#endif
+      return fill<float>(grid, info);
     default:
-      return nullptr;
+      break;
     }
+#define VLN_TRY_TYPE(type_, name_)                                                                           \
+  if (grid.type() == GridType(TileTree3D::kElementType<type_>.flatId)) return fill<type_>(grid, info);
+    VLN_FOR_EACH_FLAT_ELEMENT_TYPE(VLN_TRY_TYPE)
+#undef VLN_TRY_TYPE
+    return nullptr;
   }
 
   template <class T> static T sampleOf(nanovtt::TileBlock const& block, std::uint64_t n) {
@@ -160,8 +140,7 @@ private:
   }
 
   template <class T>
-  Ostil::Ptr<TileTree3D::ChannelBase> fill(nanovtt::GridReader const& grid, char const* type,
-                                           VdbChannel& info) const {
+  Ostil::Ptr<TileTree3D::ChannelBase> fill(nanovtt::GridReader const& grid, VdbChannel& info) const {
     using ChannelT = TileTree3D::Channel<Traits, T, 4, 0>;
     T const background = sampleOf<T>(grid.defaultValue(), 0);
     auto channel = Ostil::makePtr<ChannelT>(info.name, &background, TileTree3D::kInitializeNone, false, true,
@@ -187,7 +166,8 @@ private:
                     }
                   },
                   {.grain = 256});
-    info.type = type;
+    auto const& known = TileTree3D::kElementType<T>;
+    info.type = *known.vdbType ? known.vdbType : known.name;
     describe(*channel, info);
     return channel;
   }

@@ -31,28 +31,10 @@ template <class T> char const* plyType() {
 
 /// Every element type, whether this build has channels of it or not.
 template <class Body> void withAnyElementType(std::string const& name, Body&& body) {
-  using namespace Velorn::Math;
-  auto const attempt = [&]<class T>(char const* typeName) {
-    if (name == typeName) body.template operator()<T>();
-  };
-  attempt.template operator()<signed char>("int8");
-  attempt.template operator()<unsigned char>("uint8");
-  attempt.template operator()<short>("int16");
-  attempt.template operator()<unsigned short>("uint16");
-  attempt.template operator()<int>("int32");
-  attempt.template operator()<unsigned int>("uint32");
-  attempt.template operator()<std::int64_t>("int64");
-  attempt.template operator()<std::uint64_t>("uint64");
-  attempt.template operator()<float>("float");
-  attempt.template operator()<double>("double");
-  attempt.template operator()<float2>("float2");
-  attempt.template operator()<float3>("float3");
-  attempt.template operator()<float4>("float4");
-  attempt.template operator()<double3>("double3");
-  attempt.template operator()<int3>("int3");
-  attempt.template operator()<float3x3>("float3x3");
-  attempt.template operator()<float4x2>("float4x2");
-  attempt.template operator()<float4x4>("float4x4");
+#define VLN_TRY_TYPE(type, typeName, ...)                                                                    \
+  if (name == #typeName) return body.template operator()<type>();
+  VLN_FOR_EACH_KNOWN_ELEMENT_TYPE(VLN_TRY_TYPE)
+#undef VLN_TRY_TYPE
 }
 
 void addColumns(PointAttribute const& attribute, std::string& header, std::vector<Column>& columns) {

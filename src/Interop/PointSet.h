@@ -5,9 +5,12 @@
 #include "GeometryVolume/core/Export.h"
 #include "Velorn/Math.h"
 
+#include <algorithm>
+#include <cmath>
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
+#include <limits>
 #include <string>
 #include <vector>
 
@@ -42,10 +45,16 @@ struct PointSet {
   std::vector<PointAttribute> attributes;
 
   std::size_t size() const { return positions.size(); }
+  /// @edges A finite position is somewhere in world space too: at the end of what a double holds, not beyond.
   Velorn::Math::double3 world(std::size_t point) const {
     auto const& p = positions[point];
-    return {origin.x + voxelSize * double(p.x), origin.y + voxelSize * double(p.y),
-            origin.z + voxelSize * double(p.z)};
+    Velorn::Math::double3 w;
+    for (int a = 0; a < 3; ++a) {
+      constexpr double kEnd = std::numeric_limits<double>::max();
+      w[a] = origin[a] + voxelSize * double(p[a]);
+      if (std::isfinite(p[a])) w[a] = std::clamp(w[a], -kEnd, kEnd);
+    }
+    return w;
   }
 };
 

@@ -1,9 +1,10 @@
 #include "Interop/PointVolume.h"
+#include "Interop/FreeNameImpl.h"
 
 #include "GeometryVolume/channels/ElementReTile.h"
 #include "GeometryVolume/core/Numeric.h"
 #include "GeometryVolume/core/Parallel.h"
-#include "GeometryVolume/core/TakenComponent.h"
+#include "GeometryVolume/core/ScopedExtraction.h"
 #include "GeometryVolume/tiletree/Morton.h"
 #include "GeometryVolume/topology/Command.h"
 
@@ -103,13 +104,6 @@ void fillTiles(TileTree3D::Channel<PointTraits, T, 4, 0>& channel, std::vector<T
               {.grain = 64});
 }
 
-std::string freeName(std::string const& wanted, std::set<std::string>& taken) {
-  std::string const base = wanted.empty() ? "unnamed" : wanted;
-  std::string name = base;
-  for (int n = 2; !taken.insert(name).second; ++n) name = base + "_" + std::to_string(n);
-  return name;
-}
-
 } // namespace
 
 PointVolume buildPointVolume(PointSet const& points) {
@@ -178,9 +172,9 @@ PointSet pointSetOf(PointVolume const& volume) {
 AdvectStatistics advect(PointVolume& volume, Velorn::Math::double3 const& velocity) {
   Object& object = *volume.object;
   // They come back whatever is thrown.
-  VLN::Internal::TakenComponent<PointContainer> const takenTree(object, kPointContainerName);
-  VLN::Internal::TakenComponent<PointTopology> const takenTopology(object, kPointTopologyName);
-  VLN::Internal::TakenComponent<PositionChannel> const takenPositions(object, kPositionsName);
+  VLN::Internal::ScopedExtraction<PointContainer> const takenTree(object, kPointContainerName);
+  VLN::Internal::ScopedExtraction<PointTopology> const takenTopology(object, kPointTopologyName);
+  VLN::Internal::ScopedExtraction<PositionChannel> const takenPositions(object, kPositionsName);
   auto* const tree = &*takenTree;
   auto* const topology = &*takenTopology;
   auto* const positions = &*takenPositions;

@@ -261,12 +261,12 @@ bool hasRootsBelow(Container const& tree, int depth) {
 }
 
 // A volume with tiles from some depth on above the roots that it had, which hold their children's values.
-struct Raised {
+struct CoarsenedVolume {
   Container tree;
   Topology topology;
   FloatChannel channel;
 
-  Raised(Container const& from, Topology const& offsets, FloatChannel const& values, int depth)
+  CoarsenedVolume(Container const& from, Topology const& offsets, FloatChannel const& values, int depth)
       : tree(from)
       , topology("", offsets.offsetType())
       , channel("", &values.defaultValue(), TileTree3D::kInitializeDefaultValue, true, true, depth,
@@ -396,8 +396,8 @@ Slice drawSlice(VdbVolume const& volume, std::string const& name, SliceOptions c
   } else if (!floats) {
     samples = blendedSamples(plane, *container, *values, options.component);
   } else if (hasRootsBelow(*container, depth)) {
-    Raised const raised(*container, *topology, *floats, depth);
-    samples = draw({raised.tree, raised.topology, raised.channel});
+    CoarsenedVolume const coarsened(*container, *topology, *floats, depth);
+    samples = draw({coarsened.tree, coarsened.topology, coarsened.channel});
   } else {
     samples = draw({*container, *topology, *floats});
   }

@@ -18,8 +18,8 @@ void grow(IndexBox& box, IndexBox const& other) {
 }
 
 void sortCorners(std::vector<int3>& corners) {
-  if (!std::is_sorted(corners.begin(), corners.end(), MortonOrder()))
-    std::sort(corners.begin(), corners.end(), MortonOrder());
+  if (!std::is_sorted(corners.begin(), corners.end(), TileTree3D::MortonOrder()))
+    std::sort(corners.begin(), corners.end(), TileTree3D::MortonOrder());
 }
 
 } // namespace
@@ -86,7 +86,7 @@ int cheapestRootDepth(std::vector<int3> leaves, std::vector<int3> tiles, int dee
     raise(tiles, depth);
     roots.clear();
     std::set_union(leaves.begin(), leaves.end(), tiles.begin(), tiles.end(), std::back_inserter(roots),
-                   MortonOrder());
+                   TileTree3D::MortonOrder());
     if (below + roots.size() < least) least = below + roots.size(), best = depth;
     below += leaves.size();
     if (below >= least) break;
@@ -96,12 +96,12 @@ int cheapestRootDepth(std::vector<int3> leaves, std::vector<int3> tiles, int dee
 
 void joinSorted(std::vector<int3>& corners, std::size_t known, std::vector<int3> others) {
   auto const begin = corners.begin(), middle = begin + static_cast<std::ptrdiff_t>(known);
-  std::inplace_merge(begin, middle, corners.end(), MortonOrder());
+  std::inplace_merge(begin, middle, corners.end(), TileTree3D::MortonOrder());
   if (others.empty()) return;
   sortCorners(others);
   auto const count = static_cast<std::ptrdiff_t>(corners.size());
   corners.insert(corners.end(), others.begin(), others.end());
-  std::inplace_merge(corners.begin(), corners.begin() + count, corners.end(), MortonOrder());
+  std::inplace_merge(corners.begin(), corners.begin() + count, corners.end(), TileTree3D::MortonOrder());
 }
 
 void completeCorners(TileCorners& corners, int rootDepth) {
@@ -113,7 +113,7 @@ void completeCorners(TileCorners& corners, int rootDepth) {
     if (!parents.empty()) {
       all.clear();
       std::set_union(at(depth).begin(), at(depth).end(), parents.begin(), parents.end(),
-                     std::back_inserter(all), MortonOrder());
+                     std::back_inserter(all), TileTree3D::MortonOrder());
       at(depth).swap(all);
     }
     at(depth).erase(std::unique(at(depth).begin(), at(depth).end()), at(depth).end());

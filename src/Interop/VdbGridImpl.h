@@ -4,6 +4,7 @@
 #include "GeometryVolume/channels/Channel.h"
 #include "GeometryVolume/core/FunctionRef.h"
 #include "GeometryVolume/tiletree/Container.h"
+#include "GeometryVolume/tiletree/Morton.h"
 #include "GeometryVolume/topology/VoxelTopology.h"
 #include "Interop/VdbImport.h"
 #include "Interop/VdbRecord.h"
@@ -112,22 +113,7 @@ int rootDepth(std::vector<GridSummary> const& grids);
 /// wide tiles, shallow ones stand above more ancestors.
 int cheapestRootDepth(std::vector<Velorn::Math::int3> leaves, std::vector<Velorn::Math::int3> tiles,
                       int deepest);
-/// Whether a comes before b along the Z-shaped curve: the axis whose coordinates differ in the highest bit
-/// decides.
-inline bool mortonLess(Velorn::Math::int3 const& a, Velorn::Math::int3 const& b) {
-  std::uint32_t highest = 0;
-  int axis = 0;
-  for (int n = 0; n < 3; ++n) {
-    auto const differ = static_cast<std::uint32_t>(a[n]) ^ static_cast<std::uint32_t>(b[n]);
-    if (highest < differ && highest < (highest ^ differ)) highest = differ, axis = n;
-  }
-  return a[axis] < b[axis];
-}
-/// For algorithms, which do not see through a pointer to a function.
-struct MortonOrder {
-  bool operator()(Velorn::Math::int3 const& a, Velorn::Math::int3 const& b) const { return mortonLess(a, b); }
-};
-/// Brings into order along that curve: corners whose first `known` and whose others are each so, and more.
+/// Brings into Morton order: corners whose first `known` and whose others are each so, and more.
 void joinSorted(std::vector<Velorn::Math::int3>& corners, std::size_t known,
                 std::vector<Velorn::Math::int3> others);
 /// Joins extents and counts; neither has a range yet.

@@ -180,7 +180,7 @@ private:
     std::vector<std::uint64_t> order(leaves.size());
     std::iota(order.begin(), order.end(), std::uint64_t(0));
     parallelSortPositions(order.data(), std::int64_t(order.size()), [&](std::uint64_t a, std::uint64_t b) {
-      return mortonLess(toInt3(leaves[a]->origin()), toInt3(leaves[b]->origin()));
+      return TileTree3D::mortonLess(toInt3(leaves[a]->origin()), toInt3(leaves[b]->origin()));
     });
     m_leaves.reserve(leaves.size());
     for (std::uint64_t const n : order) m_leaves.push_back(leaves[n]);
@@ -377,8 +377,7 @@ private:
   /// @param x, y, z The block, counted from the first of the place that `places` lie round.
   static void collectUnlessUniform(Places& places, int3 const& corner, int x, int y, int z,
                                    std::vector<int3>& out) {
-    if (VdbTraits::inDomain(corner.x, corner.y, corner.z) && !places.isUniform(x, y, z))
-      out.push_back(corner);
+    if (VdbTraits::inDomain(corner) && !places.isUniform(x, y, z)) out.push_back(corner);
   }
 
   template <class C, class T>

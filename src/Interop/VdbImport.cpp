@@ -7,6 +7,7 @@
 #include "GeometryVolume/topology/VoxelTopology.h"
 #include "GeometryVolume/utils/ChannelParser.h"
 #include "Interop/FileError.h"
+#include "Interop/FreeNameImpl.h"
 #include "Interop/IndexToWorldImpl.h"
 #include "Interop/VdbImportImpl.h"
 #include "Interop/VdbMaskImpl.h"
@@ -36,7 +37,7 @@ struct Group {
 // Shares of the whole work, for the progress: measured on large files.
 constexpr double kReadDone = 0.4, kTreeDone = 0.6;
 
-void tell(Progress const& progress, char const* stage, double done) {
+void report(Progress const& progress, char const* stage, double done) {
   if (progress) progress(stage, done);
 }
 
@@ -80,14 +81,6 @@ std::vector<Group> groupByTransform(VdbFile const& file, std::vector<SkippedGrid
     group->grids.push_back(std::move(source));
   }
   return groups;
-}
-
-// A name for each grid's channel that no other component of the object has.
-std::string freeName(std::string const& wanted, std::set<std::string>& taken) {
-  std::string const base = wanted.empty() ? "unnamed" : wanted;
-  std::string name = base;
-  for (int n = 2; !taken.insert(name).second; ++n) name = base + "_" + std::to_string(n);
-  return name;
 }
 
 void addTiles(Container& container, TileCorners const& corners) {
@@ -137,7 +130,7 @@ std::string metadataBytes(openvdb::MetaMap const& metadata) {
 // `memoryLeft` falls by what the volume takes.
 VdbVolume buildVolume(VdbFile const& file, Group const& group, std::uint64_t& memoryLeft,
                       Progress const& progress, double from, double to) {
-  tell(progress, "building the tree", from);
+  report(progress, "building the tree", from);
   std::vector<int3> leaves, wideTiles;
   for (auto const& grid : group.grids) grid->collectStored(leaves, wideTiles);
   int const root = cheapestRootDepth(std::move(leaves), std::move(wideTiles), rootDepth(group.summaries));
@@ -181,7 +174,7 @@ VdbVolume buildVolume(VdbFile const& file, Group const& group, std::uint64_t& me
     std::string const& name = names[n];
     object->addComponent(source.makeChannel(name, *container, *topology, [&](std::int64_t tiles) {
       filled += double(tiles);
-      tell(progress, "filling the channels", from + (to - from) * filled / tilesToFill);
+      report(progress, "filling the channels", from + (to - from) * filled / tilesToFill);
     }));
     VdbGridRecord record{name, group.types[n], source.activeRule(), "", metadataBytes(grid)};
     if (record.rule == VdbActiveRule::kChannel) {
@@ -238,7 +231,7 @@ VdbImport importGrids(VdbFile const& file, Progress const& progress) {
   result.file = file.path;
   result.skipped = file.skipped;
   if (file.metadata) result.metadata = metadataBytes(*file.metadata);
-  tell(progress, "looking through the grids", kReadDone);
+  report(progress, "looking through the grids", kReadDone);
   auto groups = groupByTransform(file, result.skipped);
   for (Group& group : groups)
     for (auto const& grid : group.grids) group.summaries.push_back(grid->summarize());
@@ -249,12 +242,12 @@ VdbImport importGrids(VdbFile const& file, Progress const& progress) {
                                          kTreeDone + share * double(n + 1)));
   }
   result.points = importPointGrids(file, result.skipped);
-  tell(progress, "done", 1);
+  report(progress, "done", 1);
   return result;
 }
 
 VdbImport importVdb(std::string const& path, VdbReadLimits const& limits, Progress const& progress) {
-  tell(progress, "reading", 0);
+  report(progress, "reading", 0);
   VdbFile file = readVdbFile(path, limits);
   if (!limits.channels.empty()) {
     Utils::ChannelParser filter;

@@ -173,12 +173,13 @@ template <class V, class T> void copyBlock(V const* block, T* samples) {
     for (int j = 0; j < kBlockWidth; ++j) {
       Row r[4];
       for (int i = 0; i < kBlockWidth; ++i) std::memcpy(&r[i], block + 64 * i + 8 * j, sizeof(Row));
-      Row const a = __builtin_shuffle(r[0], r[1], Row{0, 4, 1, 5}), // k 0, 1 of i 0, 1
-          b = __builtin_shuffle(r[2], r[3], Row{0, 4, 1, 5}),       // of i 2, 3
-          c = __builtin_shuffle(r[0], r[1], Row{2, 6, 3, 7}),       // k 2, 3
-          d = __builtin_shuffle(r[2], r[3], Row{2, 6, 3, 7});
-      Row const out[4] = {__builtin_shuffle(a, b, Row{0, 1, 4, 5}), __builtin_shuffle(a, b, Row{2, 3, 6, 7}),
-                          __builtin_shuffle(c, d, Row{0, 1, 4, 5}), __builtin_shuffle(c, d, Row{2, 3, 6, 7})};
+      Row const a = __builtin_shufflevector(r[0], r[1], 0, 4, 1, 5), // k 0, 1 of i 0, 1
+          b = __builtin_shufflevector(r[2], r[3], 0, 4, 1, 5),       // of i 2, 3
+          c = __builtin_shufflevector(r[0], r[1], 2, 6, 3, 7),       // k 2, 3
+          d = __builtin_shufflevector(r[2], r[3], 2, 6, 3, 7);
+      Row const out[4] = {
+          __builtin_shufflevector(a, b, 0, 1, 4, 5), __builtin_shufflevector(a, b, 2, 3, 6, 7),
+          __builtin_shufflevector(c, d, 0, 1, 4, 5), __builtin_shufflevector(c, d, 2, 3, 6, 7)};
       for (int k = 0; k < kBlockWidth; ++k) std::memcpy(samples + 16 * k + 4 * j, &out[k], sizeof(Row));
     }
   } else {
@@ -242,7 +243,7 @@ public:
   /// The place x, y, z leaves away, each -1, 0 or 1.
   LeafPlace<TreeT> const& at(int x, int y, int z) {
     auto const n = static_cast<std::size_t>(9 * (x + 1) + 3 * (y + 1) + z + 1);
-    LeafPlace<TreeT>& place = m_places[n];
+    LeafPlace<TreeT>& place = m_lookupTable[n];
     if (!m_known[n]) {
       m_known[n] = true;
       place.lookUp(m_grid, m_origin.offsetBy(kLeafWidth * x, kLeafWidth * y, kLeafWidth * z));
@@ -272,7 +273,7 @@ private:
 
   Accessor& m_grid;
   Coord m_origin;
-  LeafPlace<TreeT> m_places[27];
+  LeafPlace<TreeT> m_lookupTable[27];
   bool m_known[27] = {};
 };
 

@@ -21,15 +21,12 @@ namespace {
 using TileTree3D::ChannelBase;
 using TileTree3D::Volume;
 
-/// As OpenVDB names the type; empty for one that it does not have.
+/// As OpenVDB names the type of a grid that keeps all values; empty where it has none.
 std::string vdbTypeOf(std::type_index type) {
-  using namespace Velorn::Math;
-  std::pair<std::type_index, char const*> const table[] = {
-      {typeid(float), "float"},        {typeid(double), "double"}, {typeid(int), "int32"},
-      {typeid(std::int64_t), "int64"}, {typeid(float3), "vec3s"},  {typeid(double3), "vec3d"},
-      {typeid(int3), "vec3i"}};
-  for (auto const& [known, name] : table)
-    if (type == known) return name;
+#define VLN_TRY_TYPE(known, name, pool, flat, vdb)                                                           \
+  if (type == typeid(known)) return vdb;
+  VLN_FOR_EACH_KNOWN_ELEMENT_TYPE(VLN_TRY_TYPE)
+#undef VLN_TRY_TYPE
   return {};
 }
 
@@ -89,7 +86,7 @@ Volume load(std::string const& path) {
 }
 
 void save(Volume const& volume, std::string const& path) {
-  FileFormat const format = checkOutputAs(path, "volumes", {FileFormat::kVdb, FileFormat::kNvtt});
+  FileFormat const format = checkOutputFor(FileContent::kVolumes, path);
   if (format == FileFormat::kNvtt) {
     auto const flat = flattenVolume(volume.object(), {});
     writeNvtt(path, {.buffer = flat.buffer.data(), .bufferLength = flat.buffer.size()});

@@ -179,7 +179,7 @@ public:
   /// An element of the form with modes; nothing where it stays as it was. `own` reads the target's core.
   template <class Own>
   std::optional<T> moded(TileType const& tile, int i, int j, int k, Request const& r, Own const& own) const {
-    if (r.mode < 0 || r.mode > 5) return {};
+    if (r.mode < 0 || r.mode >= VLN::TileTree3D::kHaloModeCount) return {};
     auto const scaled = [&](T const& v) { return r.scale == 1.0f ? v : Elements::scaled(v, Blend(r.scale)); };
     int const si = step(i), sj = step(j), sk = step(k);
     int const moved = std::abs(si) + std::abs(sj) + std::abs(sk);

@@ -136,7 +136,7 @@ TYPED_TEST(HaloModesTest, PassEqualsTheModel) {
   for (std::uint32_t seed = 1; seed <= 4; ++seed) {
     HaloForest<TypeParam> forest(seed, 10);
     int const low = forest.forest.pick(0, TypeParam::kMaxDepth);
-    for (int mode = -1; mode <= 6; ++mode) {
+    for (int mode = -1; mode <= kHaloModeCount; ++mode) {
       SCOPED_TRACE("seed " + std::to_string(seed) + ", mode " + std::to_string(mode));
       int const from = seed % 2 ? 0 : low;
       expectModeModel<TypeParam, float, 0, 1>(forest.tree(), from, TypeParam::kMaxDepth, mode, seed);
@@ -193,11 +193,11 @@ TYPED_TEST(HaloModesTest, MasksLeaveRegionsAlone) {
   EXPECT_EQ(haloSkip(neighborDirection(1, 0, 0)), 1 << 25);
 }
 
-// boundary: a mode out of 0..5 fills nothing, the core neither
+// boundary: a number that is no mode fills nothing, the core neither
 TYPED_TEST(HaloModesTest, UnknownModesFillNothing) {
   OneTile<TypeParam> one;
   auto const source = channelOn<typename OneTile<TypeParam>::Source>(one.tree, 1.0f);
-  for (int const mode : {-1, 6, 7, 1 << 30})
+  for (int const mode : {-1, int(kHaloModeCount), kHaloModeCount + 1, 1 << 30})
     for (float v : one.fill(source, mode, 7)) ASSERT_EQ(v, 99.0f);
 }
 
@@ -254,7 +254,7 @@ TYPED_TEST(HaloModesTest, WholeDomain) {
   auto source = channelOn<Source>(tree, 5.0f);
   fillRandom(source, tree, 2);
   auto accessor = std::as_const(tree).tileAccessor();
-  for (int mode = 0; mode <= 5; ++mode) {
+  for (int mode = 0; mode < kHaloModeCount; ++mode) {
     using Data = TileData<float, Traits::kTDW, 2>;
     Data data(Data::kSize, 99.0f);
     setHaloTile<Traits, float, 0, 2, 0, 0>(at, source, static_cast<HaloMode>(mode), kHaloAll, accessor, data,

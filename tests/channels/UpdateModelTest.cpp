@@ -200,8 +200,7 @@ private:
       // Go on with the copy, whose flags have their defaults once it stands alone.
       other.swap(m_channel);
       m_channel->cloneData();
-      m_model.construct = m_channel->callElementConstructor();
-      m_model.empty = m_channel->getData()->allocateEmptyTileData();
+      takeDefaultFlags();
     }
     if (m_copies.size() < 3)
       m_copies.emplace_back(std::move(other), m_model);
@@ -210,8 +209,7 @@ private:
     if (assigned) {
       // The next write of this channel gives it flags of its own.
       m_channel->cloneData();
-      m_model.construct = m_channel->callElementConstructor();
-      m_model.empty = m_channel->getData()->allocateEmptyTileData();
+      takeDefaultFlags();
     }
     return assigned ? "assign" : "copy";
   }
@@ -235,7 +233,6 @@ private:
   }
   std::string writeSome() {
     m_channel->cloneData();
-    syncFlags();
     for (auto& [d, list] : m_model.tiles)
       for (std::size_t i = 0; i < list.size(); ++i)
         for (std::size_t n = 0; n < list[i].size(); ++n)
@@ -244,7 +241,6 @@ private:
   }
   void writeUnwritten() {
     m_channel->cloneData();
-    syncFlags();
     for (auto& [d, list] : m_model.tiles)
       for (std::size_t i = 0; i < list.size(); ++i)
         for (std::size_t n = 0; n < list[i].size(); ++n)
@@ -255,9 +251,11 @@ private:
     m_model.tiles[d][i][n] = v;
     (*m_channel)[ElementTreeIndex(std::int64_t(i), d, int(n))] = v;
   }
-  void syncFlags() {
-    m_model.construct = m_channel->callElementConstructor();
-    m_model.empty = m_channel->getData()->allocateEmptyTileData();
+  void takeDefaultFlags() {
+    m_model.construct = true;
+    m_model.empty = false;
+    EXPECT_TRUE(m_channel->callElementConstructor());
+    EXPECT_FALSE(m_channel->getData()->allocateEmptyTileData());
   }
   void takeCounts() {
     for (auto const& [d, list] : m_model.tiles)

@@ -8,6 +8,7 @@
 #include <algorithm>
 #include <cmath>
 #include <cstring>
+#include <limits>
 #include <random>
 
 using namespace VLN::Interop;
@@ -148,6 +149,20 @@ TEST(Ply, PointsNextToZeroStaySomewhere) {
   EXPECT_GT(set.voxelSize, 0);
   EXPECT_TRUE(std::isfinite(1 / set.voxelSize));
   for (auto const& p : set.positions) EXPECT_TRUE(std::isfinite(p.x) && std::isfinite(p.y)) << p.x;
+}
+
+// regression: a point that a float puts a little further out than the largest double was written as infinite
+TEST(Ply, RegressionPointsAtTheEndOfDoublesStaySomewhere) {
+  constexpr int kPoints = 200;
+  std::string content =
+      header("binary_little_endian", "element vertex " + std::to_string(kPoints) +
+                                         "\nproperty double x\nproperty double y\nproperty double z\n");
+  for (int n = 0; n < kPoints; ++n)
+    content += bytesOf(0.0) + bytesOf(n == 0 ? 0.0 : std::numeric_limits<double>::max() * (1 - 1e-9 * n)) +
+               bytesOf(0.0);
+  auto const set = parse(content, {});
+  ASSERT_EQ(set.size(), std::size_t(kPoints));
+  for (std::size_t n = 0; n < set.size(); ++n) EXPECT_TRUE(std::isfinite(set.world(n).y)) << n;
 }
 
 TEST(Ply, WhatIsWrittenReadsBackExactly) {

@@ -8,6 +8,7 @@
 
 #include <gtest/gtest.h>
 
+#include <cmath>
 #include <limits>
 #include <utility>
 #include <vector>
@@ -327,10 +328,16 @@ TYPED_TEST(ContainerOf, VoxelSizeZeroStoresAnInverseOfOne) {
 
 // requirement
 TYPED_TEST(ContainerOf, DiagonalsScaleWithTheVoxelSize) {
-  using T = TypeParam;
-  Container<T> const tree("t", 0.5f);
-  for (int d : {0, 3, T::kMaxDepth})
-    EXPECT_EQ(tree.worldSpaceTileVoxelDiagonal(d), static_cast<float>(T::width(d)) * 0.5f * 1.732051f);
+  Container<TypeParam> const tree("t", 0.5f);
+  // Half a world unit for each of 2^30, 2^27 and 4 units of tile space, or of 5^13, 5^10 and 5.
+  bool const powerOfTwo = TypeParam::kTW == 2;
+  std::pair<int, double> const widths[] = {{0, powerOfTwo ? 1073741824 : 1220703125},
+                                           {3, powerOfTwo ? 134217728 : 9765625},
+                                           {TypeParam::kMaxDepth, powerOfTwo ? 4 : 5}};
+  for (auto const& [depth, width] : widths) {
+    double const expected = std::sqrt(3.0) * 0.5 * width;
+    EXPECT_NEAR(tree.worldSpaceTileVoxelDiagonal(depth), expected, 2e-7 * expected) << depth;
+  }
 }
 
 // boundary

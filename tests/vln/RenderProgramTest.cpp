@@ -303,7 +303,7 @@ TEST_F(RenderProgramTest, NegativeWhatCannotBeDrawn) {
   refused({"--cmap", "rainbow"}, "--cmap");
   refused({"--mode", "xray"}, "--mode");
   expectFailure(vln({"render", file, "-o", m_folder / "p.jpg"}),
-                m_folder / "p.jpg" + std::string(": pictures are written as .png or .exr"));
+                m_folder / "p.jpg" + std::string(": pictures are written as .exr or .png"));
   EXPECT_EQ(vln({"render", m_folder / "nothing.vdb", "-o", out}).code, 1);
 }
 

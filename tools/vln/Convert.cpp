@@ -34,7 +34,7 @@ void checkWhole(VdbImport const& content) {
 } // namespace
 
 void convert(ConvertOptions const& options) {
-  checkOutputAs(options.output, "grids", {FileFormat::kVdb});
+  checkOutputFor(FileContent::kGrids, options.output);
   VdbImport content;
   std::size_t written = 0;
   {

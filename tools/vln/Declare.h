@@ -1,6 +1,7 @@
 // The options of the commands, and what their declarations share.
 #pragma once
 
+#include "Interop/FileFormat.h"
 #include "Interop/VdbFile.h"
 
 namespace CLI {
@@ -25,6 +26,9 @@ void declareAdvect(CLI::App& self);
 void declareCompletions(CLI::App& self);
 void declareManual(CLI::App& self);
 
+/// "A .nvtt or .vdb file": of the formats that such content is read from, or "to write".
+std::string inputFile(VLN::Interop::FileContent content);
+std::string outputFile(VLN::Interop::FileContent content);
 /// Refuses what is no finite number, for options that take doubles.
 CLI::Option* finite(CLI::Option* option);
 void addChannelFilter(CLI::App& self, VLN::Interop::VdbReadLimits& limits);

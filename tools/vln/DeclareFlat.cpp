@@ -8,13 +8,15 @@
 
 namespace Vln {
 
+using VLN::Interop::FileContent;
+
 void declareFlatten(CLI::App& self) {
   using VLN::Interop::Quantisation;
   auto const options = std::make_shared<FlattenOptions>();
   auto& o = *options;
   auto& f = o.flat;
-  self.add_option("IN", o.file, "A .vdb or .nvtt file")->required()->type_name("IN");
-  self.add_option("OUT", o.output, "The .nvtt file to write")->required()->type_name("OUT.nvtt");
+  self.add_option("IN", o.file, inputFile(FileContent::kVolumes))->required()->type_name("IN");
+  self.add_option("OUT", o.output, outputFile(FileContent::kFlatBuffers))->required()->type_name("OUT.nvtt");
   self.add_option("--channels", f.channels, "Channels by name, such as \"density temp* !temp_old\"")
       ->capture_default_str()
       ->type_name("FILTER");
@@ -72,7 +74,7 @@ void declareFlatten(CLI::App& self) {
 
 void declareValidate(CLI::App& self) {
   auto const options = std::make_shared<ValidateOptions>();
-  self.add_option("FILE", options->file, "A .nvtt file")->required();
+  self.add_option("FILE", options->file, inputFile(FileContent::kFlatBuffers))->required();
   self.callback([options] { validate(*options); });
 }
 

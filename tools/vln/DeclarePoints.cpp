@@ -7,6 +7,8 @@
 
 namespace Vln {
 
+using VLN::Interop::FileContent;
+
 namespace {
 
 void addPointsInput(CLI::App& self, PointsInput& o) {
@@ -30,9 +32,7 @@ void declarePoints(CLI::App& self) {
   auto const options = std::make_shared<PointsOptions>();
   auto& o = *options;
   addPointsInput(self, o.input);
-  self.add_option("-o,--output", o.output, "The file to write: .obj, .ply or .vdb")
-      ->required()
-      ->type_name("OUT");
+  self.add_option("-o,--output", o.output, outputFile(FileContent::kPoints))->required()->type_name("OUT");
   finite(self.add_option("--size", o.size,
                          "Half-width of the cubes of an .obj file (default: a quarter of a voxel)"))
       ->check(CLI::PositiveNumber)
@@ -66,7 +66,9 @@ void declareAdvect(CLI::App& self) {
       ->check(CLI::Range(0, 1000000))
       ->capture_default_str()
       ->type_name("N");
-  self.add_option("-o,--output", o.output, "Write the moved points: .obj, .ply or .vdb")->type_name("OUT");
+  self.add_option("-o,--output", o.output,
+                  "Write the moved points: " + VLN::Interop::suffixesWritten(FileContent::kPoints))
+      ->type_name("OUT");
   self.add_flag("--json", o.json, "One JSON object instead of text");
   self.callback([options] { advect(*options); });
 }

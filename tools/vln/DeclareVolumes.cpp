@@ -9,6 +9,8 @@
 
 namespace Vln {
 
+using VLN::Interop::FileContent;
+
 CLI::Option* finite(CLI::Option* option) {
   return option->check(CLI::Validator(
       [](std::string& text) {
@@ -17,6 +19,11 @@ CLI::Option* finite(CLI::Option* option) {
         return number && !std::isfinite(value) ? text + " is not a finite number" : std::string();
       },
       ""));
+}
+
+std::string inputFile(FileContent content) { return "A " + VLN::Interop::suffixesRead(content) + " file"; }
+std::string outputFile(FileContent content) {
+  return "The " + VLN::Interop::suffixesWritten(content) + " file to write";
 }
 
 void addMemoryLimit(CLI::App& self, VLN::Interop::VdbReadLimits& limits) {
@@ -36,7 +43,9 @@ void addChannelFilter(CLI::App& self, VLN::Interop::VdbReadLimits& limits) {
 void declareInfo(CLI::App& self) {
   auto const options = std::make_shared<InfoOptions>();
   auto& o = *options;
-  self.add_option("FILE", o.files, "Files, .vdb, .nvtt or .ply")->required();
+  self.add_option("FILE", o.files,
+                  "Files, " + VLN::Interop::suffixesRead(FileContent::kVolumes | FileContent::kPoints))
+      ->required();
   auto* json = self.add_flag("--json", o.json, "One JSON object instead of tables");
   self.add_flag("--memory", o.memory, "Also what accounts for memory: objects, their data, and the pools")
       ->excludes(json);
@@ -49,7 +58,7 @@ void declareInfo(CLI::App& self) {
 void declareSlice(CLI::App& self) {
   auto const options = std::make_shared<SliceOptions>();
   auto& o = *options;
-  self.add_option("FILE", o.file, "A .vdb or .nvtt file")->required();
+  self.add_option("FILE", o.file, inputFile(FileContent::kVolumes))->required();
   self.add_option("--channel", o.channel, "Name of the channel, as info tells it")
       ->required()
       ->type_name("NAME");
@@ -105,7 +114,9 @@ void declareSlice(CLI::App& self) {
   self.add_flag("--index-space", o.plane.indexSpace,
                 "Draw along the grid's own axes, every voxel a square; --at is an index then");
   self.add_flag("!--no-title", o.title, "Leave the line with file, channel and plane out");
-  self.add_option("-o,--output", o.output, "The PNG file to write")->required()->type_name("OUT.png");
+  self.add_option("-o,--output", o.output, outputFile(FileContent::kPictures))
+      ->required()
+      ->type_name("OUT.png");
   addMemoryLimit(self, o.limits);
   self.callback([options] { slice(*options); });
 }
@@ -113,8 +124,8 @@ void declareSlice(CLI::App& self) {
 void declareConvert(CLI::App& self) {
   auto const options = std::make_shared<ConvertOptions>();
   auto& o = *options;
-  self.add_option("IN", o.file, "A .vdb file")->required()->type_name("IN.vdb");
-  self.add_option("OUT", o.output, "The .vdb file to write")->required()->type_name("OUT.vdb");
+  self.add_option("IN", o.file, inputFile(FileContent::kGrids))->required()->type_name("IN.vdb");
+  self.add_option("OUT", o.output, outputFile(FileContent::kGrids))->required()->type_name("OUT.vdb");
   addChannelFilter(self, o.limits);
   self.add_flag("--strict", o.strict, "Write nothing where anything of the file would be left out");
   addMemoryLimit(self, o.limits);
@@ -124,7 +135,7 @@ void declareConvert(CLI::App& self) {
 void declareProbe(CLI::App& self) {
   auto const options = std::make_shared<ProbeOptions>();
   auto& o = *options;
-  self.add_option("FILE", o.file, "A .vdb or .nvtt file")->required();
+  self.add_option("FILE", o.file, inputFile(FileContent::kVolumes))->required();
   self.add_option("X Y Z", o.positions,
                   "World positions, three numbers each; - reads them from standard input")
       ->type_name("...");
@@ -146,7 +157,7 @@ void declareMake(CLI::App& self) {
       ->required()
       ->check(CLI::IsMember({"cloud", "torus"}))
       ->type_name("cloud|torus");
-  self.add_option("OUT", o.output, "The .vdb file to write")->required()->type_name("OUT.vdb");
+  self.add_option("OUT", o.output, outputFile(FileContent::kGrids))->required()->type_name("OUT.vdb");
   self.add_option("--voxels", o.voxels, "About how many active voxels")
       ->check(CLI::Range(VLN::Interop::kFewestMadeVoxels, VLN::Interop::kMostMadeVoxels))
       ->capture_default_str()
@@ -157,7 +168,7 @@ void declareMake(CLI::App& self) {
 void declareChurn(CLI::App& self) {
   auto const options = std::make_shared<ChurnOptions>();
   auto& o = *options;
-  self.add_option("FILE", o.file, "A .vdb file")->required();
+  self.add_option("FILE", o.file, inputFile(FileContent::kGrids))->required();
   self.add_option("--limit", o.limitBytes,
                   "Resident memory that the pools hold the process to, such as 512MB (1 KB is 1024 bytes)")
       ->required()

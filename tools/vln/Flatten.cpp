@@ -77,7 +77,7 @@ void report(VdbVolume const& volume, FlatVolume const& flat, bool quantised) {
 } // namespace
 
 void flatten(FlattenOptions const& options) {
-  checkOutputAs(options.output, "flat buffers", {FileFormat::kNvtt});
+  checkOutputFor(FileContent::kFlatBuffers, options.output);
   VdbImport content;
   FlatVolume flat;
   VdbVolume const* volume = nullptr;

@@ -6,7 +6,7 @@
 namespace Vln {
 
 void make(MakeOptions const& options) {
-  VLN::Interop::checkOutputAs(options.output, "grids", {VLN::Interop::FileFormat::kVdb});
+  VLN::Interop::checkOutputFor(VLN::Interop::FileContent::kGrids, options.output);
   ProgressBar bar;
   if (options.shape == "cloud")
     VLN::Interop::makeCloud(options.output, options.voxels, bar.progress());

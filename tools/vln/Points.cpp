@@ -74,7 +74,7 @@ void points(PointsOptions const& options) {
 }
 
 void tiles(TilesOptions const& options) {
-  checkOutputAs(options.output, "boxes", {FileFormat::kObj});
+  checkOutputFor(FileContent::kBoxes, options.output);
   std::int64_t count = 0;
   {
     ProgressBar bar;

@@ -52,9 +52,7 @@ void noteLosses(std::string const& file, PointVolume const& volume) {
     std::cerr << fmt::format("vln: {}: note: {}\n", file, losses);
 }
 
-void checkPointsOutput(std::string const& path) {
-  checkOutputAs(path, "points", {FileFormat::kObj, FileFormat::kPly, FileFormat::kVdb});
-}
+void checkPointsOutput(std::string const& path) { checkOutputFor(FileContent::kPoints, path); }
 
 void writePoints(std::string const& path, PointVolume const& volume, double size) {
   switch (formatOf(path)) {

@@ -181,7 +181,7 @@ void probe(ProbeOptions const& options) {
   // Of a file all lines are looked at before the first value is printed.
   if (lines && !lines->streams())
     while (lines->next(points)) {}
-  if (!options.output.empty()) checkOutputAs(options.output, "values", {FileFormat::kCsv});
+  if (!options.output.empty()) checkOutputFor(FileContent::kValues, options.output);
   VdbImport content;
   {
     ProgressBar bar;

@@ -163,8 +163,8 @@ private:
 void render(RenderCommandOptions const& options) {
   std::string const output =
       options.output.empty() ? std::filesystem::path(options.file).stem().string() + ".png" : options.output;
-  checkOutputAs(output, "pictures", {FileFormat::kPng, FileFormat::kExr});
-  if (!options.parameters.empty()) checkOutputAs(options.parameters, "parameters", {FileFormat::kJson});
+  checkOutputFor(FileContent::kRenderings, output);
+  if (!options.parameters.empty()) checkOutputFor(FileContent::kParameters, options.parameters);
   checkBackground(options.background);
   TransferOptions early; // what is wrong with the opacity is told before the file is read
   early.opacity = options.render.transfer.opacity;

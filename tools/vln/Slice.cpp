@@ -17,7 +17,7 @@ namespace Vln {
 using namespace VLN::Interop;
 
 void slice(SliceOptions const& options) {
-  checkOutputAs(options.output, "pictures", {FileFormat::kPng});
+  checkOutputFor(FileContent::kPictures, options.output);
   std::string summary;
   {
     ProgressBar bar;

@@ -11,6 +11,7 @@
 // elements in every tile.
 #pragma once
 
+#include "GeometryVolume/channels/ChannelLayouts.h"
 #include "GeometryVolume/channels/ElementIterator.h"
 #include "GeometryVolume/channels/TileData.h"
 #include "GeometryVolume/channels/TypedChannel.h"
@@ -34,7 +35,7 @@ public:
   static constexpr int kHalo = H;
   static constexpr int kSize = ConstTile::kSize;
   static constexpr ChannelLayout kLayout{E, H, kExtended, TraitsT::kTileDataWidth, kSize, TraitsT::kMaxDepth};
-  static_assert((kExtended == 0 && H >= 0 && H <= 2) || (kExtended == 1 && H == 0), "no such channel");
+  static_assert(isLayout(kExtended, H), "no such channel");
 
   /// What channels that were assigned to each other share.
   class Data : public ChannelData<T> {
@@ -143,14 +144,3 @@ private:
 };
 
 } // namespace VLN::TileTree3D
-
-/// Expands X(traits, type, E, H) for the eight channel classes of an element type.
-#define VLN_FOR_EACH_CHANNEL_OF(type, X)                                                                     \
-  X(::VLN::TileTree3D::PowerOfTwoTraits, type, 4, 0)                                                         \
-  X(::VLN::TileTree3D::PowerOfTwoTraits, type, 4, 1)                                                         \
-  X(::VLN::TileTree3D::PowerOfTwoTraits, type, 4, 2)                                                         \
-  X(::VLN::TileTree3D::PowerOfTwoTraits, type, 5, 0)                                                         \
-  X(::VLN::TileTree3D::OddTraits, type, 5, 0)                                                                \
-  X(::VLN::TileTree3D::OddTraits, type, 5, 1)                                                                \
-  X(::VLN::TileTree3D::OddTraits, type, 5, 2)                                                                \
-  X(::VLN::TileTree3D::OddTraits, type, 6, 0)

@@ -37,7 +37,7 @@ public:
   /// depth: one load more. Elsewhere a lookup in the tree.
   value_type const& value(int i, int j, int k) const {
     if (!inBlock(i, j, k)) [[unlikely]]
-      moveTo(i, j, k);
+      setBlock(i, j, k);
     std::size_t const x = within(i, m_corner.x), y = within(j, m_corner.y), z = within(k, m_corner.z);
     constexpr std::size_t w = TraitsT::kTDW, slots = TraitsT::kTW;
     // Sums of whole tile widths before the division: powers of two need one shift then.
@@ -70,11 +70,10 @@ private:
       return within(i, m_corner.x) < kBlockWidth && within(j, m_corner.y) < kBlockWidth &&
              within(k, m_corner.z) < kBlockWidth;
   }
-  void moveTo(int i, int j, int k) const {
+  void setBlock(int i, int j, int k) const {
     m_block = m_tables->block(i, j, k);
     // Out of the domain, too, the corner is less than a block away, and the block is the empty one.
-    m_corner = {TraitsT::align(i, Tables::kBlockDepth), TraitsT::align(j, Tables::kBlockDepth),
-                TraitsT::align(k, Tables::kBlockDepth)};
+    m_corner = TraitsT::align(int3{i, j, k}, Tables::kBlockDepth);
   }
   /// Null for a tile that the channel lacks, or that has fewer elements than a whole one.
   static value_type const* elements(ChannelT const& channel, TreeIndex const& at) {

@@ -28,6 +28,12 @@ struct ChannelLayout {
 
   /// Whether every tile holds `size` elements. Else each tile follows the counts of the tree component.
   constexpr bool fixedSize() const { return halo > 0 || extended > 0; }
+  /// Elements along a tile, halo included.
+  constexpr int width() const { return core + 2 * halo; }
+  /// Flat index of a coordinate in a tile; the core begins at (0,0,0).
+  constexpr int element(int i, int j, int k) const {
+    return (i + halo) + width() * ((j + halo) + width() * (k + halo));
+  }
   bool operator==(ChannelLayout const&) const = default;
 };
 

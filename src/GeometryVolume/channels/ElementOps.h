@@ -47,7 +47,7 @@ struct ElementOps {
 };
 
 /// A channel's tiles, with the element type erased.
-struct ErasedTiles {
+struct UntypedTiles {
   ElementOps const* ops = nullptr;
   void const* arrays = nullptr; ///< TileArrays of the element type
   void const* defaultValue = nullptr;

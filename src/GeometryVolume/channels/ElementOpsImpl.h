@@ -4,7 +4,7 @@
 #include "GeometryVolume/channels/ChannelData.h"
 #include "GeometryVolume/channels/ElementOps.h"
 #include "GeometryVolume/channels/ElementTraits.h"
-#include "GeometryVolume/core/FourLanes.h"
+#include "GeometryVolume/core/SimdLanes.h"
 
 #include <algorithm>
 #include <cstring>
@@ -156,6 +156,9 @@ template <class T> struct TypedElementOps {
   }
 
   static ElementOps const& get() {
+    static_assert(std::find(kHaloElementSizes.begin(), kHaloElementSizes.end(), sizeof(T)) !=
+                      kHaloElementSizes.end(),
+                  "elements of a new size: add it to kHaloElementSizes");
     static ElementOps const ops{
         sizeof(T), &haloKernels(sizeof(T)), elements, elementsOf, blendParent, blendCorners, scale, broadcast,
         distance};

@@ -111,7 +111,7 @@ void collectTiles(Container<TraitsT>& scratch, typename Container<TraitsT>::Tile
     list.resize(static_cast<std::uint64_t>(std::unique(list.begin(), list.end()) - list.begin()));
     auto& above = corners[static_cast<std::size_t>(d - 1)];
     for (int3 const& p : list) {
-      int3 const corner{TraitsT::align(p.x, d - 1), TraitsT::align(p.y, d - 1), TraitsT::align(p.z, d - 1)};
+      int3 const corner = TraitsT::align(p, d - 1);
       if (above.empty() || above.back() != corner) above.append(corner);
     }
   }
@@ -202,9 +202,9 @@ TileIndexLists tilesWithoutPoints(Container<TraitsT> const& tree, PositionsOf<Tr
 }
 
 /// Takes a component that lies in the object out of it for as long as this lives.
-class SetAside {
+class ScopedAbsence {
 public:
-  SetAside(VLN::Component const& component, VLN::Object& object)
+  ScopedAbsence(VLN::Component const& component, VLN::Object& object)
       : m_object(object) {
     for (auto const& name : object.componentRange()) {
       m_component = object.component(name);
@@ -216,11 +216,11 @@ public:
     }
     m_component = nullptr;
   }
-  ~SetAside() {
+  ~ScopedAbsence() {
     if (m_component) m_object.setProperty(m_name, Ostil::Any(std::move(m_component)));
   }
-  SetAside(SetAside const&) = delete;
-  SetAside& operator=(SetAside const&) = delete;
+  ScopedAbsence(ScopedAbsence const&) = delete;
+  ScopedAbsence& operator=(ScopedAbsence const&) = delete;
 
 private:
   VLN::Object& m_object;
@@ -234,7 +234,7 @@ template <class TraitsT>
 void channelElementReTile(Container<TraitsT>& tree, PointTopology<TraitsT>& topology,
                           PositionsOf<TraitsT>& positions, VLN::Object& object, bool prune,
                           TreeChanged changed) {
-  SetAside const aside(positions, object);
+  ScopedAbsence const aside(positions, object);
   Container<TraitsT> const& reading = tree;
   PositionsOf<TraitsT> const& points = positions;
 

@@ -15,6 +15,7 @@
 #pragma once
 
 #include "GeometryVolume/channels/Channel.h"
+#include "GeometryVolume/channels/HaloLayouts.h"
 #include "GeometryVolume/channels/HaloTypes.h"
 #include "GeometryVolume/tiletree/Container.h"
 #include "GeometryVolume/topology/VoxelOffsetType.h"
@@ -26,22 +27,6 @@ template <class TraitsT, class T, int Extended, int Halo>
 using HaloChannel = Channel<TraitsT, T, TraitsT::kTDW + Extended, Halo>;
 template <class TraitsT, class T, int Extended, int Halo>
 using HaloTile = TileData<T, TraitsT::kTDW + Extended, Halo>;
-
-constexpr int haloKey(int a, int b, int c, int d) { return ((a * 10 + b) * 10 + c) * 10 + d; }
-/// (source extended, source halo, target extended, target halo) of the plain forms.
-constexpr bool isPlainHalo(int a, int b, int c, int d) {
-  int const key = haloKey(a, b, c, d);
-  return key == 0 || key == 1 || key == 10 || key == 110 || key == 1010;
-}
-constexpr bool isTileHalo(int a, int b, int c, int d) {
-  return isPlainHalo(a, b, c, d) || haloKey(a, b, c, d) == 111;
-}
-/// (source halo, target halo, source extended, target extended) of the form by index.
-constexpr bool isIndexHalo(int a, int b, int c, int d) {
-  int const key = haloKey(a, b, c, d);
-  return key == 1 || key == 11 || key == 100 || key == 101 || key == 110 || key == 111 || key == 200 ||
-         key == 1100;
-}
 } // namespace Internal
 
 /// Fills the tiles of `dst`: the core from the same tile of `src`; each region from the neighbour of the same
@@ -56,18 +41,20 @@ constexpr bool isIndexHalo(int a, int b, int c, int d) {
 /// the target's tiles may be filled then; the call can be repeated.
 /// @cost Parallel over the tiles of one depth at a time, coarse to fine.
 template <class TraitsT, class T, int SourceExtended, int SourceHalo, int TargetExtended, int TargetHalo>
-requires(Internal::isPlainHalo(SourceExtended, SourceHalo, TargetExtended, TargetHalo)) void computeHalo(
-    Internal::HaloChannel<TraitsT, T, SourceExtended, SourceHalo> const& src, Container<TraitsT> const& tree,
-    Internal::HaloChannel<TraitsT, T, TargetExtended, TargetHalo>& dst, int firstDepth, int lastDepth);
+requires PlainHaloLayouts<SourceExtended, SourceHalo, TargetExtended, TargetHalo>
+void computeHalo(Internal::HaloChannel<TraitsT, T, SourceExtended, SourceHalo> const& src,
+                 Container<TraitsT> const& tree,
+                 Internal::HaloChannel<TraitsT, T, TargetExtended, TargetHalo>& dst, int firstDepth,
+                 int lastDepth);
 
 /// Fills what `type` names of each tile of `dst`, and leaves all other bytes alone. A region without a
 /// neighbour of the same depth takes what `mode` says; without any tile there, or with one above the source's
 /// depths, the source's default value.
 /// @pre E = W with (SourceHalo, TargetHalo) one of (0,1), (0,2), (1,1).
-/// @edges A mode outside 0..5 fills nothing. A scale of exactly 1 multiplies nothing.
+/// @edges A number that is no mode fills nothing. A scale of exactly 1 multiplies nothing.
 /// @error As the form above.
 template <class TraitsT, class T, int E, int SourceHalo, int TargetHalo>
-requires(E == TraitsT::kTDW && TargetHalo >= 1 && SourceHalo + TargetHalo <= 2) void computeHalo(
+requires(E == TraitsT::kTDW && ModeHaloLayouts<SourceHalo, TargetHalo>) void computeHalo(
     HaloMode mode, HaloType type, int firstDepth, int lastDepth,
     Channel<TraitsT, T, E, SourceHalo> const& src, Container<TraitsT> const& tree,
     Channel<TraitsT, T, E, TargetHalo>& dst, float scale, VoxelOffsetType offsetType, float constant);
@@ -77,20 +64,22 @@ requires(E == TraitsT::kTDW && TargetHalo >= 1 && SourceHalo + TargetHalo <= 2) 
 /// @param parent The tile's parent, or null; `parentData` is its finished tile in the target's layout.
 /// @pre `dst` holds a whole tile. (0,1)->(1,1) exists beside the layouts of computeHalo().
 template <class TraitsT, class T, int SourceExtended, int SourceHalo, int TargetExtended, int TargetHalo>
-requires(Internal::isTileHalo(SourceExtended, SourceHalo, TargetExtended, TargetHalo)) void setHaloTile(
-    typename Container<TraitsT>::TileType const& tile, typename Container<TraitsT>::TileType const* parent,
-    Internal::HaloChannel<TraitsT, T, SourceExtended, SourceHalo> const& src,
-    Internal::HaloTile<TraitsT, T, TargetExtended, TargetHalo>& dst, HaloMode mode,
-    typename Container<TraitsT>::ConstTileAccessor& accessor,
-    Internal::HaloTile<TraitsT, T, TargetExtended, TargetHalo>& parentData);
+requires TileHaloLayouts<SourceExtended, SourceHalo, TargetExtended, TargetHalo>
+void setHaloTile(typename Container<TraitsT>::TileType const& tile,
+                 typename Container<TraitsT>::TileType const* parent,
+                 Internal::HaloChannel<TraitsT, T, SourceExtended, SourceHalo> const& src,
+                 Internal::HaloTile<TraitsT, T, TargetExtended, TargetHalo>& dst, HaloMode mode,
+                 typename Container<TraitsT>::ConstTileAccessor& accessor,
+                 Internal::HaloTile<TraitsT, T, TargetExtended, TargetHalo>& parentData);
 
 /// One tile of the form with modes. Tiles deeper than the source are sampled linearly, their core too. Note
 /// the order of the last arguments, which is not that of computeHalo().
 template <class TraitsT, class T, int SourceHalo, int TargetHalo, int SourceExtended, int TargetExtended>
-requires(Internal::isIndexHalo(SourceHalo, TargetHalo, SourceExtended, TargetExtended)) void setHaloTile(
-    TreeIndex const& index, Internal::HaloChannel<TraitsT, T, SourceExtended, SourceHalo> const& src,
-    HaloMode mode, HaloType type, typename Container<TraitsT>::ConstTileAccessor& accessor,
-    Internal::HaloTile<TraitsT, T, TargetExtended, TargetHalo>& dst, float constant, float scale,
-    VoxelOffsetType offsetType);
+requires IndexHaloLayouts<SourceHalo, TargetHalo, SourceExtended, TargetExtended>
+void setHaloTile(TreeIndex const& index,
+                 Internal::HaloChannel<TraitsT, T, SourceExtended, SourceHalo> const& src, HaloMode mode,
+                 HaloType type, typename Container<TraitsT>::ConstTileAccessor& accessor,
+                 Internal::HaloTile<TraitsT, T, TargetExtended, TargetHalo>& dst, float constant, float scale,
+                 VoxelOffsetType offsetType);
 
 } // namespace VLN::TileTree3D

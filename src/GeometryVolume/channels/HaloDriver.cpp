@@ -6,7 +6,7 @@
 namespace VLN::TileTree3D::Internal {
 
 template <class TraitsT>
-TreeIndex HaloDriver<TraitsT>::searchBeside(TileType const& tile, NeighborDirection direction) const {
+TreeIndex HaloDriver<TraitsT>::searchNeighbor(TileType const& tile, NeighborDirection direction) const {
   int3 const step = neighborOffset(direction);
   std::int64_t const w = TraitsT::width(tile.depth());
   std::int64_t const i = tile.ti() + step.x * w, j = tile.tj() + step.y * w, k = tile.tk() + step.z * w;
@@ -20,37 +20,39 @@ TreeIndex HaloDriver<TraitsT>::searchBeside(TileType const& tile, NeighborDirect
 
 // One number: three that return as one record are stored and loaded in different pieces, which waits for all
 // earlier stores.
-template <class TraitsT> int HaloDriver<TraitsT>::placeInParent(TileType const& tile) {
+template <class TraitsT> int HaloDriver<TraitsT>::slotInParentBlock(TileType const& tile) {
   int const d = tile.depth();
-  if (d == 0) return place({0, 0, 0});
+  if (d == 0) return blockSlot({0, 0, 0});
   auto const slot = [d](int c) {
     std::uint32_t const u = TraitsT::offset(c);
     return static_cast<int>(TraitsT::quotient(u, d) - TraitsT::kTW * TraitsT::quotient(u, d - 1));
   };
-  return place({slot(tile.ti()), slot(tile.tj()), slot(tile.tk())});
+  return blockSlot({slot(tile.ti()), slot(tile.tj()), slot(tile.tk())});
 }
 
-template <class TraitsT> void HaloDriver<TraitsT>::moveTo(TileType const& tile) {
-  m_level = tile.isRoot() ? nullptr : &levelOf(tile.parentTreeIndex());
-  m_place = placeInParent(tile);
-}
-
-template <class TraitsT> void HaloDriver<TraitsT>::learn(Level& level, NeighborDirection step) {
-  auto const& tile = m_accessor.tile(level.tile);
-  TreeIndex found = level.tile;
-  if (step != kNeighborSelf) {
-    int const n = placeInParent(tile) + place(neighborOffset(step)) - place({0, 0, 0});
-    found =
-        tile.isRoot() ? searchBeside(tile, step) : childAt(levelOf(tile.parentTreeIndex()), n, tile, step);
-  }
-  auto const* children = found.depth == tile.depth() ? m_accessor.tile(found).children() : nullptr;
-  level.around[static_cast<std::size_t>(step)] = {
-      found.index, children ? children : kNoChildren<TraitsT::kTileSize>.data(), found.depth};
-  level.known |= 1u << step;
+template <class TraitsT> void HaloDriver<TraitsT>::setTile(TileType const& tile) {
+  m_parentCache = tile.isRoot() ? nullptr : &cacheOf(tile.parentTreeIndex());
+  m_blockSlot = slotInParentBlock(tile);
 }
 
 template <class TraitsT>
-auto HaloDriver<TraitsT>::withData(TileType const* tile, void const*& elements) const -> TileType const* {
+void HaloDriver<TraitsT>::findNeighbor(NeighborCache& cache, NeighborDirection step) {
+  auto const& tile = m_accessor.tile(cache.tile);
+  TreeIndex found = cache.tile;
+  if (step != kNeighborSelf) {
+    int const n = slotInParentBlock(tile) + blockSlot(neighborOffset(step)) - blockSlot({0, 0, 0});
+    found =
+        tile.isRoot() ? searchNeighbor(tile, step) : childAt(cacheOf(tile.parentTreeIndex()), n, tile, step);
+  }
+  auto const* children = found.depth == tile.depth() ? m_accessor.tile(found).children() : nullptr;
+  cache.around[static_cast<std::size_t>(step)] = {
+      found.index, children ? children : kNoChildren<TraitsT::kTileSize>.data(), found.depth};
+  cache.known |= 1u << step;
+}
+
+template <class TraitsT>
+auto HaloDriver<TraitsT>::ancestorWithData(TileType const* tile, void const*& elements) const
+    -> TileType const* {
   while (tile->valid() && tile->depth() >= m_source.minDepth) {
     elements = m_source.elements(tile->treeIndex());
     if (elements) return tile;
@@ -84,8 +86,8 @@ template <class TraitsT> void HaloDriver<TraitsT>::replicate(HaloBox const& box,
 template <class TraitsT>
 void HaloDriver<TraitsT>::blend(HaloBox const& box, HaloTarget<TraitsT> const& target,
                                 void const* parent) const {
-  int const slot[3] = {m_place % kAcross - 1, m_place / kAcross % kAcross - 1,
-                       m_place / (kAcross * kAcross) - 1};
+  int const slot[3] = {m_blockSlot % kAcross - 1, m_blockSlot / kAcross % kAcross - 1,
+                       m_blockSlot / (kAcross * kAcross) - 1};
   auto const axis = [&](std::size_t a) {
     auto const child = static_cast<std::size_t>(slot[a]);
     return &m_table.parentAxis[child][static_cast<std::size_t>(box.low[a] + m_table.halo)];
@@ -125,10 +127,10 @@ void HaloDriver<TraitsT>::sample(HaloBox const& box, TileType const& tile, void*
 }
 
 template <class TraitsT>
-std::uint32_t HaloDriver<TraitsT>::findBeside(TileType const& tile, std::array<void const*, 26>& found) {
+std::uint32_t HaloDriver<TraitsT>::findNeighbors(TileType const& tile, std::array<void const*, 26>& found) {
   std::array<std::int64_t, 26> indices;
   auto const count = static_cast<std::size_t>(m_table.regionCount);
-  for (std::size_t n = 0; n < count; ++n) indices[n] = indexBeside(tile, m_table.regions[n]);
+  for (std::size_t n = 0; n < count; ++n) indices[n] = neighborIndex(tile, m_table.regions[n]);
   m_source.elements(tile.depth(), indices.data(), m_table.regionCount, found.data());
   std::uint32_t missing = 0;
   for (std::size_t n = 0; n < count; ++n) missing |= std::uint32_t(!found[n]) << n;
@@ -136,8 +138,8 @@ std::uint32_t HaloDriver<TraitsT>::findBeside(TileType const& tile, std::array<v
 }
 
 template <class TraitsT>
-void HaloDriver<TraitsT>::moveWhole(void* target, void const* own,
-                                    std::array<void const*, 26> const& found) const {
+void HaloDriver<TraitsT>::copyWholeTile(void* target, void const* own,
+                                        std::array<void const*, 26> const& found) const {
   TileMove move;
   move.target = target;
   move.sourceWidth = m_table.sourceWidth, move.offsets = m_table.offsets.data();
@@ -160,11 +162,11 @@ template <class TraitsT> void HaloDriver<TraitsT>::fill(HaloTarget<TraitsT> cons
   }
   if (m_table.regionCount == 0) return;
 
-  moveTo(tile);
+  setTile(tile);
   std::array<void const*, 26> found;
-  std::uint32_t missing = findBeside(tile, found);
+  std::uint32_t missing = findNeighbors(tile, found);
   if (whole) {
-    moveWhole(target.elements, own, found);
+    copyWholeTile(target.elements, own, found);
   } else {
     for (std::size_t n = 0; n < static_cast<std::size_t>(m_table.regionCount); ++n)
       if (found[n]) copy(m_table.regions[n], target.elements, found[n]);
@@ -186,8 +188,8 @@ template <class TraitsT> void HaloDriver<TraitsT>::fill(HaloTarget<TraitsT> cons
 template <class TraitsT>
 void HaloDriver<TraitsT>::fillRegion(HaloRegion const& region, TileType const& tile, void* target,
                                      HaloFill const& fill, HaloSampler<TraitsT>& sampler) {
-  TreeIndex const there = beside(tile, region);
-  if (void const* const source = elementsBeside(tile, there)) return copy(region, target, source);
+  TreeIndex const there = neighbor(tile, region);
+  if (void const* const source = neighborElements(tile, there)) return copy(region, target, source);
   if (!there.valid() || there.depth < m_source.minDepth || fill.mode == kHaloModeDefault)
     return set(region, target, m_source.defaultValue);
   switch (fill.mode) {
@@ -198,14 +200,14 @@ void HaloDriver<TraitsT>::fillRegion(HaloRegion const& region, TileType const& t
     return replicate(region, target);
   case kHaloModeNearestCoarse: {
     void const* elements = nullptr;
-    TileType const* const coarse = withData(&m_accessor.tile(there), elements);
+    TileType const* const coarse = ancestorWithData(&m_accessor.tile(there), elements);
     if (coarse) return nearest(region, tile, target, *coarse, elements);
     return set(region, target, m_source.defaultValue);
   }
   case kHaloModeLinearCoarse:
     return sample(region, tile, target, fill.scale, sampler);
   case kHaloModeConstant: {
-    alignas(16) std::byte value[64];
+    alignas(16) std::byte value[kLargestElement];
     m_source.ops->broadcast(fill.constant, value);
     return set(region, target, value);
   }
@@ -217,14 +219,14 @@ void HaloDriver<TraitsT>::fillRegion(HaloRegion const& region, TileType const& t
 template <class TraitsT>
 void HaloDriver<TraitsT>::fill(TileType const& tile, void* target, HaloFill const& fill,
                                HaloSampler<TraitsT>& sampler) {
-  if (fill.mode < kHaloModeDeepOnly || fill.mode > kHaloModeConstant) return;
+  if (!isHaloMode(fill.mode)) return;
   if (fill.type == kHaloAll && fill.mode != kHaloModeDeepOnly && m_table.kind != kHaloTileOther) {
     // Every region is written, so what has no tile beside may hold other bytes for a moment.
     if (void const* const own = m_source.elements(tile.treeIndex())) {
-      moveTo(tile);
+      setTile(tile);
       std::array<void const*, 26> found;
-      std::uint32_t missing = findBeside(tile, found);
-      moveWhole(target, own, found);
+      std::uint32_t missing = findNeighbors(tile, found);
+      copyWholeTile(target, own, found);
       for (; missing; missing &= missing - 1)
         fillRegion(m_table.regions[static_cast<std::size_t>(std::countr_zero(missing))], tile, target, fill,
                    sampler);
@@ -239,7 +241,7 @@ void HaloDriver<TraitsT>::fill(TileType const& tile, void* target, HaloFill cons
     else
       set(m_table.core, target, m_source.defaultValue);
   }
-  moveTo(tile);
+  setTile(tile);
   for (int n = 0; n < m_table.regionCount; ++n) {
     HaloRegion const& region = m_table.regions[static_cast<std::size_t>(n)];
     if (!(fill.type & (region.face ? kHaloFaces : kHaloEdges)) || fill.type & haloSkip(region.direction))

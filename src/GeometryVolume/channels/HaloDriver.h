@@ -23,7 +23,7 @@ template <class TraitsT> struct HaloTarget {
   void* elements;
   TileType const* parent = nullptr;
   void const* parentElements = nullptr;
-  ErasedTiles const* tiles = nullptr; ///< in place of parentElements: the target's tiles
+  UntypedTiles const* tiles = nullptr; ///< in place of parentElements: the target's tiles
 
   void const* parentData() const {
     if (!parent || !tiles) return parent ? parentElements : nullptr;
@@ -37,7 +37,7 @@ public:
   using Accessor = ConstTileAccessorOf<TraitsT>;
   using TileType = typename Accessor::TileType;
 
-  HaloDriver(ErasedTiles const& source, HaloTable const& table, Accessor const& accessor)
+  HaloDriver(UntypedTiles const& source, HaloTable const& table, Accessor const& accessor)
       : m_source(source)
       , m_table(table)
       , m_accessor(accessor) {}
@@ -51,7 +51,7 @@ public:
 private:
   /// A tile or none, as TreeIndex, and its child table; one without children where it has none. Without
   /// initial values, so that a driver for one tile need not write a table of them.
-  struct Holder {
+  struct OwnerTile {
     std::int64_t index;
     std::int64_t const* children;
     std::int32_t depth;
@@ -59,70 +59,70 @@ private:
     TreeIndex at() const { return {index, depth}; }
   };
   /// Makes `tile` the one whose neighbours are asked for.
-  void moveTo(TileType const& tile);
+  void setTile(TileType const& tile);
   /// The tile beside, at its depth or the deepest one above.
-  /// @pre moveTo(tile).
-  TreeIndex beside(TileType const& tile, HaloRegion const& region) {
-    return m_level ? childAt(*m_level, m_place + region.place, tile, region.direction)
-                   : searchBeside(tile, region.direction);
+  /// @pre setTile(tile).
+  TreeIndex neighbor(TileType const& tile, HaloRegion const& region) {
+    return m_parentCache ? childAt(*m_parentCache, m_blockSlot + region.blockSlot, tile, region.direction)
+                         : searchNeighbor(tile, region.direction);
   }
   /// The source's elements of a tile at the depth of `tile`.
-  void const* elementsBeside(TileType const& tile, TreeIndex const& at) const {
+  void const* neighborElements(TileType const& tile, TreeIndex const& at) const {
     return m_source.elements({at.depth == tile.depth() ? at.index : -1, tile.depth()});
   }
   /// What lies round one tile, as far as it was asked for.
-  struct Level {
+  struct NeighborCache {
     TreeIndex tile;
     std::uint32_t known = 0;
-    std::array<Holder, kNeighborCount> around;
+    std::array<OwnerTile, kNeighborCount> around;
   };
-  Level& levelOf(TreeIndex const& at) {
-    Level& level = m_levels[static_cast<std::size_t>(at.depth)];
-    if (level.tile != at) level.tile = at, level.known = 0;
-    return level;
+  NeighborCache& cacheOf(TreeIndex const& at) {
+    NeighborCache& cache = m_caches[static_cast<std::size_t>(at.depth)];
+    if (cache.tile != at) cache.tile = at, cache.known = 0;
+    return cache;
   }
-  /// Finds the tile beside that of the level through its parent, and so through all its ancestors if need be.
-  void learn(Level& level, NeighborDirection step);
-  /// The tile that holds a place of the block of a tile's children and those round them, and the place's
-  /// slot.
-  Holder const& holderOf(Level& level, PlaceHolder const& in) {
-    if (!(level.known >> in.direction & 1)) learn(level, in.direction);
-    return level.around[static_cast<std::size_t>(in.direction)];
+  /// Finds the tile beside that of the cache through its parent, and so through all its ancestors if need be.
+  void findNeighbor(NeighborCache& cache, NeighborDirection step);
+  /// The tile that owns a slot of the block: of the cached tile's children and those round them.
+  OwnerTile const& ownerOf(NeighborCache& cache, NeighborSlot const& in) {
+    if (!(cache.known >> in.direction & 1)) findNeighbor(cache, in.direction);
+    return cache.around[static_cast<std::size_t>(in.direction)];
   }
-  static PlaceHolder const& placeHolder(int place) {
-    return kPlaceHolders<TraitsT::kTW>[static_cast<std::size_t>(place)];
+  static NeighborSlot const& neighborSlot(int blockSlot) {
+    return kNeighborSlots<TraitsT::kTW>[static_cast<std::size_t>(blockSlot)];
   }
-  /// What lies at a place of that block, one step from the child `tile`.
-  TreeIndex childAt(Level& level, int place, TileType const& tile, NeighborDirection step) {
-    PlaceHolder const& in = placeHolder(place);
-    Holder const& holder = holderOf(level, in);
-    if (holder.depth < 0) return beyond(tile, step);
-    std::int64_t const child = holder.children[in.slot];
-    return child >= 0 ? TreeIndex{child, tile.depth()} : holder.at();
+  /// What lies at a slot of that block, one step from the child `tile`.
+  TreeIndex childAt(NeighborCache& cache, int blockSlot, TileType const& tile, NeighborDirection step) {
+    NeighborSlot const& in = neighborSlot(blockSlot);
+    OwnerTile const& owner = ownerOf(cache, in);
+    if (owner.depth < 0) return neighborBeyondParent(tile, step);
+    std::int64_t const child = owner.children[in.slot];
+    return child >= 0 ? TreeIndex{child, tile.depth()} : owner.at();
   }
   /// What lies beside a tile where no tile lies beside its parent: maybe a root of the tile's own depth.
-  TreeIndex beyond(TileType const& tile, NeighborDirection step) const {
-    return m_accessor.container()->rootCount(tile.depth()) > 0 ? searchBeside(tile, step) : TreeIndex{};
+  TreeIndex neighborBeyondParent(TileType const& tile, NeighborDirection step) const {
+    return m_accessor.container()->rootCount(tile.depth()) > 0 ? searchNeighbor(tile, step) : TreeIndex{};
   }
   /// Index of the tile of the same depth beside, -1 without one.
-  /// @pre moveTo(tile).
-  std::int64_t indexBeside(TileType const& tile, HaloRegion const& region) {
-    PlaceHolder const& in = placeHolder(m_place + region.place);
-    Holder const* const holder = m_level ? &holderOf(*m_level, in) : nullptr;
-    if (holder && holder->depth >= 0) return holder->children[in.slot];
-    TreeIndex const at = holder ? beyond(tile, region.direction) : searchBeside(tile, region.direction);
+  /// @pre setTile(tile).
+  std::int64_t neighborIndex(TileType const& tile, HaloRegion const& region) {
+    NeighborSlot const& in = neighborSlot(m_blockSlot + region.blockSlot);
+    OwnerTile const* const owner = m_parentCache ? &ownerOf(*m_parentCache, in) : nullptr;
+    if (owner && owner->depth >= 0) return owner->children[in.slot];
+    TreeIndex const at =
+        owner ? neighborBeyondParent(tile, region.direction) : searchNeighbor(tile, region.direction);
     return at.depth == tile.depth() ? at.index : -1;
   }
-  /// indexBeside() or beside() by a search from the accessor's last tile.
-  TreeIndex searchBeside(TileType const& tile, NeighborDirection step) const;
+  /// neighborIndex() or neighbor() by a search from the accessor's last tile.
+  TreeIndex searchNeighbor(TileType const& tile, NeighborDirection step) const;
   /// The source's elements of the tiles of the same depth beside, by region; null where there are none.
-  /// @pre moveTo(tile).
+  /// @pre setTile(tile).
   /// @return Bits of the regions without.
-  std::uint32_t findBeside(TileType const& tile, std::array<void const*, 26>& found);
+  std::uint32_t findNeighbors(TileType const& tile, std::array<void const*, 26>& found);
   /// Core and regions in one go. A region without a tile beside takes any bytes of the tile's own.
-  void moveWhole(void* target, void const* own, std::array<void const*, 26> const& found) const;
+  void copyWholeTile(void* target, void const* own, std::array<void const*, 26> const& found) const;
   /// The tile itself, or its deepest ancestor whose data the source holds.
-  TileType const* withData(TileType const* tile, void const*& elements) const;
+  TileType const* ancestorWithData(TileType const* tile, void const*& elements) const;
 
   void* at(void* elements, int flat) const {
     return static_cast<std::byte*>(elements) + flat * static_cast<std::ptrdiff_t>(m_source.ops->size);
@@ -141,25 +141,25 @@ private:
   void fillRegion(HaloRegion const& region, TileType const& tile, void* target, HaloFill const& fill,
                   HaloSampler<TraitsT>& sampler);
 
-  ErasedTiles const& m_source;
+  UntypedTiles const& m_source;
   HaloTable const& m_table;
   Accessor const& m_accessor;
 
   static constexpr int kAcross = TraitsT::kTW + 2;
-  static int place(int3 const& slot) {
+  static int blockSlot(int3 const& slot) {
     return (slot.x + 1) + kAcross * ((slot.y + 1) + kAcross * (slot.z + 1));
   }
-  static int placeInParent(TileType const& tile);
+  static int slotInParentBlock(TileType const& tile);
 
-  Level* m_level = nullptr;       ///< of the tile's parent; null for a root
-  int m_place = place({0, 0, 0}); ///< of the tile among the parent's children and those round them
+  NeighborCache* m_parentCache = nullptr; ///< of the tile's parent; null for a root
+  int m_blockSlot = blockSlot({0, 0, 0}); ///< of the tile among the parent's children and those round them
   // One for each depth. The coarser, the more seldom it changes.
-  std::array<Level, static_cast<std::size_t>(TraitsT::kDepths)> m_levels;
+  std::array<NeighborCache, static_cast<std::size_t>(TraitsT::kDepths)> m_caches;
 };
 
 /// A pass over the tiles of a range of depths, coarse to fine.
 struct HaloPass {
-  ErasedTiles source, target;
+  UntypedTiles source, target;
   HaloTable const* table;
   int firstDepth, lastDepth; ///< -1: as far as both channels reach
 };

@@ -1,8 +1,10 @@
 #include "GeometryVolume/channels/HaloKernels.h"
 
+#include <algorithm>
 #include <cassert>
 #include <cstring>
 #include <type_traits>
+#include <utility>
 
 namespace VLN::TileTree3D::Internal {
 
@@ -115,33 +117,18 @@ constexpr HaloKernels kKernels{copyBox<Size>,
                                {copyTile<Size, 4, 0, 1>, copyTile<Size, 4, 1, 1>},
                                {copyTile<Size, 5, 0, 1>, copyTile<Size, 5, 1, 1>}};
 
+template <std::size_t... N>
+constexpr std::array<HaloKernels, sizeof...(N)> makeKernels(std::index_sequence<N...>) {
+  return {kKernels<kHaloElementSizes[N]>...};
+}
+constexpr auto kTable = makeKernels(std::make_index_sequence<kHaloElementSizes.size()>());
+
 } // namespace
 
 HaloKernels const& haloKernels(std::size_t elementSize) {
-  switch (elementSize) {
-  case 1:
-    return kKernels<1>;
-  case 2:
-    return kKernels<2>;
-  case 4:
-    return kKernels<4>;
-  case 8:
-    return kKernels<8>;
-  case 12:
-    return kKernels<12>;
-  case 16:
-    return kKernels<16>;
-  case 24:
-    return kKernels<24>;
-  case 32:
-    return kKernels<32>;
-  case 36:
-    return kKernels<36>;
-  default:
-    break;
-  }
-  assert(elementSize == 64);
-  return kKernels<64>;
+  auto const at = std::find(kHaloElementSizes.begin(), kHaloElementSizes.end(), elementSize);
+  assert(at != kHaloElementSizes.end());
+  return kTable[static_cast<std::size_t>(at - kHaloElementSizes.begin())];
 }
 
 } // namespace VLN::TileTree3D::Internal

@@ -47,7 +47,12 @@ struct HaloKernels {
   void (*tile5[kHaloTileKinds])(TileMove const&); ///< for W = 5
 };
 
-/// @pre One of the sizes of the element types.
+/// Sizes of elements that there are kernels for, rising. A type of a new size does not compile before its
+/// size is here.
+inline constexpr std::array<std::size_t, 10> kHaloElementSizes{1, 2, 4, 8, 12, 16, 24, 32, 36, 64};
+inline constexpr std::size_t kLargestElement = kHaloElementSizes.back();
+
+/// @pre One of these sizes.
 HaloKernels const& haloKernels(std::size_t elementSize);
 
 } // namespace VLN::TileTree3D::Internal

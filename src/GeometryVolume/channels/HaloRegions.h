@@ -8,6 +8,7 @@
 // target without halo keeps the seven directions without a negative step, and one that is not extended none.
 #pragma once
 
+#include "GeometryVolume/channels/ChannelLayouts.h"
 #include "GeometryVolume/channels/ChannelTypes.h"
 #include "GeometryVolume/channels/HaloKernels.h"
 #include "GeometryVolume/tiletree/TreeIndex.h"
@@ -29,7 +30,7 @@ struct HaloBox {
 struct HaloRegion : HaloBox {
   NeighborDirection direction = kNeighborSelf;
   bool face = false;
-  int place = 0; ///< steps in a block of children with one layer round them, i fastest
+  int blockSlot = 0; ///< steps in a block of children with one layer round them, i fastest
 };
 
 /// One axis of a read from the parent: the low one of two samples, and the fraction of the high one.
@@ -39,8 +40,8 @@ struct HaloAxis {
 };
 
 struct HaloTable {
-  static constexpr int kLargestWidth = 9;
-  static constexpr int kLargestTileWidth = 5;
+  static constexpr int kLargestWidth = kLargestChannelTileWidth;
+  static constexpr int kLargestTileWidth = std::max(PowerOfTwoTraits::kTW, OddTraits::kTW);
 
   int tileDataWidth = 0; ///< W
   int halo = 0;          ///< of the target
@@ -74,17 +75,12 @@ constexpr HaloAxis parentAxisAt(int child, int at, int tileDataWidth, int tileWi
 constexpr HaloTable makeHaloTable(ChannelLayout const& source, ChannelLayout const& target, int tileWidth) {
   HaloTable t;
   int const w = target.tileDataWidth;
-  auto const widthOf = [](ChannelLayout const& l) { return l.core + 2 * l.halo; };
-  auto const originOf = [&](ChannelLayout const& l) {
-    int const width = widthOf(l);
-    return l.halo * (1 + width + width * width);
-  };
   t.tileDataWidth = w;
   t.halo = target.halo;
   if (target.extended + target.halo == 1) t.kind = target.extended ? kHaloTileExtended : kHaloTileHalo1;
-  t.targetWidth = widthOf(target), t.sourceWidth = widthOf(source);
+  t.targetWidth = target.width(), t.sourceWidth = source.width();
   t.targetSize = target.size, t.sourceSize = source.size;
-  t.targetOrigin = originOf(target), t.sourceOrigin = originOf(source);
+  t.targetOrigin = target.element(0, 0, 0), t.sourceOrigin = source.element(0, 0, 0);
   t.core = {{0, 0, 0}, {w, w, w}, t.targetOrigin, t.sourceOrigin};
   t.offsets[kNeighborSelf] = t.sourceOrigin;
 
@@ -93,7 +89,7 @@ constexpr HaloTable makeHaloTable(ChannelLayout const& source, ChannelLayout con
     r.direction = neighborDirection(step.x, step.y, step.z);
     int const moved = (step.x != 0) + (step.y != 0) + (step.z != 0);
     r.face = moved == 1;
-    r.place = step.x + (tileWidth + 2) * (step.y + (tileWidth + 2) * step.z);
+    r.blockSlot = step.x + (tileWidth + 2) * (step.y + (tileWidth + 2) * step.z);
     int const steps[3] = {step.x, step.y, step.z};
     int targetStride = 1, sourceStride = 1;
     r.target = t.targetOrigin, r.source = t.sourceOrigin;
@@ -136,15 +132,15 @@ inline constexpr HaloTable kHaloTable = makeHaloTable(haloLayout(TraitsT::kTDW, 
                                                       haloLayout(TraitsT::kTDW, TargetExtended, TargetHalo),
                                                       TraitsT::kTW);
 
-// Where a place of the block lies: the parent, or the tile beside it in a direction, and the child's slot
+// Where a slot of the block lies: the parent, or the tile beside it in a direction, and the child's slot
 // there.
-struct PlaceHolder {
+struct NeighborSlot {
   NeighborDirection direction = kNeighborSelf;
   std::uint8_t slot = 0;
 };
-template <int Width> constexpr auto makePlaceHolders() {
+template <int Width> constexpr auto makeNeighborSlots() {
   constexpr int across = Width + 2;
-  std::array<PlaceHolder, std::size_t(across) * across * across> table{};
+  std::array<NeighborSlot, std::size_t(across) * across * across> table{};
   auto const side = [](int s) { return s < 0 ? -1 : s >= Width ? 1 : 0; };
   std::size_t n = 0;
   for (int k = -1; k <= Width; ++k)
@@ -156,7 +152,7 @@ template <int Width> constexpr auto makePlaceHolders() {
       }
   return table;
 }
-template <int Width> inline constexpr auto kPlaceHolders = makePlaceHolders<Width>();
+template <int Width> inline constexpr auto kNeighborSlots = makeNeighborSlots<Width>();
 
 template <int N>
 constexpr auto kNoChildren = [] {

@@ -15,7 +15,7 @@ public:
   using TileType = typename Accessor::TileType;
 
   /// @param width, origin Full width and flat index of coordinate (0,0,0) of the source's tiles.
-  HaloSampler(ErasedTiles const& source, int width, int origin, VoxelOffsetType offsetType,
+  HaloSampler(UntypedTiles const& source, int width, int origin, VoxelOffsetType offsetType,
               Accessor const& accessor)
       : m_source(source)
       , m_width(width)
@@ -39,7 +39,7 @@ private:
     return static_cast<std::byte const*>(tile) + index * static_cast<std::ptrdiff_t>(m_source.ops->size);
   }
 
-  ErasedTiles const& m_source;
+  UntypedTiles const& m_source;
   int m_width, m_origin;
   float3 m_offset;
   Accessor const& m_accessor;

@@ -17,6 +17,9 @@ enum HaloMode : std::int32_t {
   kHaloModeConstant = 5,      ///< the caller's constant
 };
 
+inline constexpr int kHaloModeCount = kHaloModeConstant + 1;
+constexpr bool isHaloMode(std::int32_t mode) { return mode >= 0 && mode < kHaloModeCount; }
+
 /// What is filled: a mask of these bits, and of haloSkip() for directions to leave alone.
 enum HaloType : std::int32_t {
   kHaloFaces = 1,

@@ -18,14 +18,10 @@ int nonLeafChildElement(ChannelLayout const& layout, VoxelOffsetType offsetType,
     int const c = std::min(static_cast<int>(offset[a] * static_cast<float>(layout.core)), layout.core - 1);
     at[a] = c + sample[a] % shared * 2;
   }
-  int const width = layout.core + 2 * layout.halo;
-  auto const flat = [&](int i, int j, int k) {
-    return i + (j + k * width) * width + layout.halo * (1 + width + width * width);
-  };
-  int const letter = flat(at[0], at[1], at[2]);
-  if (letter < layout.size) return letter;
+  int const exact = layout.element(at[0], at[1], at[2]);
+  if (exact < layout.size) return exact;
   int const last = layout.core - 1;
-  return flat(std::min(at[0], last), std::min(at[1], last), std::min(at[2], last));
+  return layout.element(std::min(at[0], last), std::min(at[1], last), std::min(at[2], last));
 }
 
 namespace {
@@ -37,14 +33,12 @@ struct Sample {
 
 template <class TraitsT> std::vector<Sample> samplesOf(NonLeafPass const& pass) {
   constexpr int w = TraitsT::kTDW, perVoxel = TraitsT::kTDW / TraitsT::kTW;
-  int const width = pass.layout.core + 2 * pass.layout.halo;
-  int const origin = pass.layout.halo * (1 + width + width * width);
   std::vector<Sample> samples;
   for (int k = 0; k < w; ++k)
     for (int j = 0; j < w; ++j)
       for (int i = 0; i < w; ++i)
         samples.push_back(
-            {origin + i + (j + k * width) * width,
+            {pass.layout.element(i, j, k),
              Tile<TraitsT, TraitsT::kTileSize>::slotOf(i / perVoxel, j / perVoxel, k / perVoxel),
              nonLeafChildElement(pass.layout, pass.offsetType, {i, j, k})});
   return samples;

@@ -11,7 +11,7 @@ namespace VLN::TileTree3D::Internal {
 using Velorn::Math::int3;
 
 struct NonLeafPass {
-  ErasedTiles tiles;
+  UntypedTiles tiles;
   ChannelLayout layout;
   VoxelOffsetType offsetType;
   int firstDepth, lastDepth;

@@ -2,7 +2,7 @@
 
 #include "GeometryVolume/core/FunctionRef.h"
 #include "GeometryVolume/core/Parallel.h"
-#include "GeometryVolume/core/TakenComponent.h"
+#include "GeometryVolume/core/ScopedExtraction.h"
 #include "GeometryVolume/core/YieldPointImpl.h"
 
 #include <vector>
@@ -40,7 +40,7 @@ private:
     return channel && (channel->getTargetName() == tree.name() || channel->owner() == tree.name());
   }
 
-  std::vector<VLN::Internal::TakenComponent<ChannelBase>> m_channels;
+  std::vector<VLN::Internal::ScopedExtraction<ChannelBase>> m_channels;
 };
 
 } // namespace

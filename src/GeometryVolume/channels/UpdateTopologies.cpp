@@ -2,7 +2,7 @@
 
 #include "GeometryVolume/channels/ChannelBase.h"
 #include "GeometryVolume/channels/UpdateDispatch.h"
-#include "GeometryVolume/core/TakenComponent.h"
+#include "GeometryVolume/core/ScopedExtraction.h"
 #include "GeometryVolume/topology/PointTopology.h"
 #include "GeometryVolume/topology/VoxelTopology.h"
 
@@ -31,7 +31,7 @@ void updateTopologies(Container<TraitsT> const& tree, VLN::Object& object, TileR
     if (!points && !object.component<VoxelTopology<TraitsT>>(name)) continue;
     if (object.component(name)->getTargetName() != tree.name() || (except && except->name() == name))
       continue;
-    VLN::Internal::TakenComponent<Component> const taken(object, name);
+    VLN::Internal::ScopedExtraction<Component> const taken(object, name);
     Component& topology = *taken;
     topology.update(tree);
     if (!removed) {

@@ -1,6 +1,6 @@
 #include "GeometryVolume/core/Object.h"
 
-#include "GeometryVolume/core/TakenComponent.h"
+#include "GeometryVolume/core/ScopedExtraction.h"
 
 #include <utility>
 
@@ -11,7 +11,7 @@ class Object::WriteAccess {
 public:
   explicit WriteAccess(Object& handle)
       : m_handle(handle)
-      , m_object(takeAlone(handle.m_object)) {}
+      , m_object(makeUnique(handle.m_object)) {}
   ~WriteAccess() { m_handle.m_object = std::move(m_object); }
   WriteAccess(WriteAccess const&) = delete;
   WriteAccess& operator=(WriteAccess const&) = delete;
@@ -19,7 +19,7 @@ public:
 
 private:
   /// Leaves the handle whole when the clone throws.
-  static Ostil::MutablePtr<Velorn::Object> takeAlone(Ostil::Ptr<Velorn::Object>& shared) {
+  static Ostil::MutablePtr<Velorn::Object> makeUnique(Ostil::Ptr<Velorn::Object>& shared) {
     if (shared.unique()) return Ostil::MutablePtr<Velorn::Object>(std::move(shared));
     Ostil::MutablePtr<Velorn::Object> own{Ostil::Ptr<Velorn::Object>(shared)};
     shared.reset();
@@ -65,7 +65,7 @@ Ostil::Ptr<Component> Object::component(Ostil::String const& name) const {
 
 Ostil::MutablePtr<Component> Object::extractComponent(Ostil::String const& name) {
   if (!component(name)) return nullptr;
-  return Internal::TakenComponent<Component>(*this, name).keep();
+  return Internal::ScopedExtraction<Component>(*this, name).keep();
 }
 
 void Object::removeComponent(Ostil::String const& name, Component*) {

@@ -2,8 +2,8 @@
 
 #include "GeometryVolume/channels/Channel.h"
 #include "GeometryVolume/channels/ElementTraits.h"
-#include "GeometryVolume/channels/EraseTilesImpl.h"
 #include "GeometryVolume/channels/NonLeafValues.h"
+#include "GeometryVolume/channels/UntypedTilesImpl.h"
 #include "GeometryVolume/core/ElementTypes.h"
 #include "GeometryVolume/nanovtt/GridVisitorImpl.h"
 #include "GeometryVolume/pools/ChannelPool.h"
@@ -121,8 +121,8 @@ template <class T> ChannelOf<T> const& typed(ChannelBase const& channel) {
   return static_cast<ChannelOf<T> const&>(channel);
 }
 
-template <class T> VLN::TileTree3D::Internal::ErasedTiles tiles(ChannelBase const& channel) {
-  return VLN::TileTree3D::Internal::eraseTiles<T>(typed<T>(channel));
+template <class T> VLN::TileTree3D::Internal::UntypedTiles tiles(ChannelBase const& channel) {
+  return VLN::TileTree3D::Internal::untypedTiles<T>(typed<T>(channel));
 }
 
 template <class T>
@@ -150,7 +150,7 @@ Ostil::Ptr<ChannelBase> withCoarser(ChannelBase const& channel, Tree const& tree
   for (int d = 0; d < kChannelDepths; ++d) counts[static_cast<std::size_t>(d)] = tree.tileCount(d);
   copy->resize(counts.data(), kTileSamples);
 
-  auto const from = VLN::TileTree3D::Internal::eraseTiles<T>(source);
+  auto const from = VLN::TileTree3D::Internal::untypedTiles<T>(source);
   auto const storage = copy->cloneData();
   for (int d = std::max(source.minDepth(), 0); d <= std::min(source.depth(), kMaxDepth); ++d) {
     auto& to = (*storage)[static_cast<std::size_t>(d)];
@@ -227,45 +227,21 @@ template <class T> ActiveBoxes fill(GridTask const& task) {
   return fillAs<void, T, Value>(task);
 }
 
-template <class T> constexpr GridElement elementOf(char const* name, GridType type) {
+template <class T> constexpr GridElement elementOf() {
+  auto const& known = VLN::TileTree3D::kElementType<T>;
   FogFix fog = nullptr;
   if constexpr (std::is_floating_point_v<T>) fog = &fixFog<T>;
-  return {name, type, &find<T>, &tiles<T>, &coarserDiffer<T>, &withCoarser<T>, fog, &fill<T>};
+  return {known.name,        GridType(known.flatId), &find<T>, &tiles<T>,
+          &coarserDiffer<T>, &withCoarser<T>,        fog,      &fill<T>};
 }
 
 } // namespace
 
 std::span<GridElement const> gridElements() {
   // The order is that of the grids in a buffer.
-  static constexpr GridElement kElements[] = {
-#if VLN_HAS_ELEMENT_FLOAT
-    elementOf<float>("float", GridType::kFloat),
-#endif
-#if VLN_HAS_ELEMENT_DOUBLE
-    elementOf<double>("double", GridType::kDouble),
-#endif
-#if VLN_HAS_ELEMENT_INT16
-    elementOf<short>("int16", GridType::kInt16),
-#endif
-#if VLN_HAS_ELEMENT_INT32
-    elementOf<int>("int32", GridType::kInt32),
-#endif
-#if VLN_HAS_ELEMENT_INT64
-    elementOf<std::int64_t>("int64", GridType::kInt64),
-#endif
-#if VLN_HAS_ELEMENT_FLOAT3
-    elementOf<float3>("float3", GridType::kFloat3),
-#endif
-#if VLN_HAS_ELEMENT_DOUBLE3
-    elementOf<double3>("double3", GridType::kDouble3),
-#endif
-#if VLN_HAS_ELEMENT_UINT32
-    elementOf<unsigned int>("uint32", GridType::kUInt32),
-#endif
-#if VLN_HAS_ELEMENT_FLOAT4
-    elementOf<float4>("float4", GridType::kFloat4),
-#endif
-  };
+#define VLN_ELEMENT(type, name) elementOf<type>(),
+  static constexpr GridElement kElements[] = {VLN_FOR_EACH_FLAT_ELEMENT_TYPE(VLN_ELEMENT)};
+#undef VLN_ELEMENT
   return kElements;
 }
 

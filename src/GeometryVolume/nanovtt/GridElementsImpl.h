@@ -19,7 +19,7 @@ struct GridElement {
 
   /// The object's channel of this type with tiles as wide as the tree's; null without.
   Ostil::Ptr<ChannelBase> (*find)(VLN::Object const& object, Ostil::String const& name);
-  VLN::TileTree3D::Internal::ErasedTiles (*tiles)(ChannelBase const& channel);
+  VLN::TileTree3D::Internal::UntypedTiles (*tiles)(ChannelBase const& channel);
   /// Whether coarse samples differ from those of their children by more than the tolerance.
   bool (*coarserDiffer)(ChannelBase const& channel, Tree const& tree, VLN::TileTree3D::VoxelOffsetType offset,
                         float tolerance, int firstDepth);

@@ -21,7 +21,7 @@ struct GridTask {
   ConversionSettings const& settings;
 
   // What is stored
-  VLN::TileTree3D::Internal::ErasedTiles source;
+  VLN::TileTree3D::Internal::UntypedTiles source;
   GridType type = GridType::kFloat;            ///< set by setType()
   std::uint64_t plainBytes = 0, haloBytes = 0; ///< of one tile; FpN tiles differ
   GridClass gridClass = GridClass::kOther;

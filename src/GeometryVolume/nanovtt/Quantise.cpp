@@ -29,11 +29,23 @@ struct Range {
   bool numbers; ///< no sample is NaN; those take no part in the rest
 };
 
+using Lanes = float __attribute__((vector_size(32)));
+using LaneMask = std::int32_t __attribute__((vector_size(32)));
+
+/// Lets the first lanes meet those that lie Step behind them.
+template <int Step> [[gnu::always_inline]] inline void fold(Lanes& low, Lanes& high, LaneMask& numbers) {
+  // Known to both compilers, unlike __builtin_shuffle.
+  Lanes const l = __builtin_shufflevector(low, low, Step, Step + 1, Step + 2, Step + 3, 0, 0, 0, 0);
+  Lanes const h = __builtin_shufflevector(high, high, Step, Step + 1, Step + 2, Step + 3, 0, 0, 0, 0);
+  low = l < low ? l : low;
+  high = h > high ? h : high;
+  numbers &= __builtin_shufflevector(numbers, numbers, Step, Step + 1, Step + 2, Step + 3, 0, 0, 0, 0);
+}
+
 NANOVTT_FOR_WIDE_LANES Range rangeOf(float const* values, std::size_t count) {
-  using Lanes = float __attribute__((vector_size(32)));
   constexpr float kLargest = 3.4028235e38f;
   Lanes low = Lanes{} + kLargest, high = -low;
-  auto numbers = low == low;
+  LaneMask numbers = low == low;
   for (std::size_t n = 0; n < count; n += 8) {
     Lanes v;
     std::memcpy(&v, values + n, sizeof v);
@@ -42,13 +54,9 @@ NANOVTT_FOR_WIDE_LANES Range rangeOf(float const* values, std::size_t count) {
     numbers &= v == v;
   }
   // Halves on halves: lane 0 has met all the others in the end.
-  using Lane = std::int32_t __attribute__((vector_size(32)));
-  for (Lane const& other : {Lane{4, 5, 6, 7}, Lane{2, 3}, Lane{1}}) {
-    Lanes const l = __builtin_shuffle(low, other), h = __builtin_shuffle(high, other);
-    low = l < low ? l : low;
-    high = h > high ? h : high;
-    numbers &= __builtin_shuffle(numbers, other);
-  }
+  fold<4>(low, high, numbers);
+  fold<2>(low, high, numbers);
+  fold<1>(low, high, numbers);
   return {low[0], high[0], numbers[0] != 0};
 }
 

@@ -13,7 +13,7 @@ constexpr auto& kTable = Internal3D::kHaloTable<Traits, 0, 0, 1, 0>;
 } // namespace
 
 struct TileSamples::Halo {
-  Halo(Internal3D::ErasedTiles const& source, Tree::ConstTileAccessor const& accessor)
+  Halo(Internal3D::UntypedTiles const& source, Tree::ConstTileAccessor const& accessor)
       : driver(source, kTable, accessor)
       , sampler(source, kTable.sourceWidth, kTable.sourceOrigin, VLN::TileTree3D::kVoxelOffsetCorner,
                 accessor) {}

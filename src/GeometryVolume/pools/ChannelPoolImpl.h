@@ -3,6 +3,7 @@
 #pragma once
 
 #include "GeometryVolume/channels/Channel.h"
+#include "GeometryVolume/core/ElementTypes.h"
 #include "GeometryVolume/core/Parallel.h"
 
 #include <algorithm>
@@ -28,10 +29,21 @@ struct ChannelKind {
   void (*reset)(ChannelBase& channel, void const* value, int maxDepth);
 
   std::size_t store() const {
-    return static_cast<std::size_t>((traitsIndex * 3 + layoutIndex) * 18 + typeIndex);
+    return static_cast<std::size_t>((traitsIndex * kMadeLayoutCount + layoutIndex) * kElementTypeCount +
+                                    typeIndex);
   }
 };
-inline constexpr std::size_t kStoreCount = 2 * 3 * 18;
+inline constexpr std::size_t kStoreCount = std::size_t(kShapeCount) * kMadeLayoutCount * kElementTypeCount;
+
+/// Place of a layout among the stores of a shape and element type: those with halo behind the others.
+constexpr int layoutIndexOf(int extended, int halo) { return halo > 0 ? 1 + halo : extended; }
+#define VLN_CHECK_LAYOUT(extended, halo) static_assert(layoutIndexOf(extended, halo) < kMadeLayoutCount);
+VLN_FOR_EACH_MADE_LAYOUT(VLN_CHECK_LAYOUT)
+#undef VLN_CHECK_LAYOUT
+#define VLN_STORE_BIT(type, name, pool, ...) | 1ull << pool
+static_assert((0 VLN_FOR_EACH_KNOWN_ELEMENT_TYPE(VLN_STORE_BIT)) == (1ull << kElementTypeCount) - 1,
+              "the places of element types among the pool's stores are 0, 1, 2, ..., each once");
+#undef VLN_STORE_BIT
 
 struct Request {
   void const* defaultValue;
@@ -81,44 +93,18 @@ Ostil::Ptr<ChannelBase> make(void const* value, bool isStatic, bool construct, i
                            lo, hi);
 }
 
-/// Position of an element type among the stores.
-template <class T> constexpr int typeIndexOf() {
-  using namespace Velorn::Math;
-  constexpr bool matches[] = {std::is_same_v<T, float>,
-                              std::is_same_v<T, float2>,
-                              std::is_same_v<T, float3>,
-                              std::is_same_v<T, float4>,
-                              std::is_same_v<T, float3x3>,
-                              std::is_same_v<T, float4x2>,
-                              std::is_same_v<T, float4x4>,
-                              std::is_same_v<T, double>,
-                              std::is_same_v<T, double3>,
-                              std::is_same_v<T, signed char>,
-                              std::is_same_v<T, short>,
-                              std::is_same_v<T, int>,
-                              std::is_same_v<T, Velorn::Math::int3>,
-                              std::is_same_v<T, std::int64_t>,
-                              std::is_same_v<T, unsigned char>,
-                              std::is_same_v<T, unsigned short>,
-                              std::is_same_v<T, unsigned int>,
-                              std::is_same_v<T, std::uint64_t>};
-  int i = 0;
-  while (!matches[i]) ++i;
-  return i;
-}
-
-template <class C> constexpr ChannelKind kindOf(char const* typeName) {
+template <class C> constexpr ChannelKind kindOf() {
   using Traits = typename C::Traits;
   using T = typename C::value_type;
   constexpr bool isPowerOfTwo = std::is_same_v<Traits, PowerOfTwoTraits>;
   return {isPowerOfTwo ? "Traits<2,4,0,1>" : "Traits<5,5,0,1>",
-          typeName,
+          kElementType<T>.name,
           C::kLayout.core,
           C::kHalo,
           C::kExtended,
           isPowerOfTwo ? 0 : 1,
-          C::kHalo == 1 ? 2 : C::kExtended,
-          typeIndexOf<T>(),
+          layoutIndexOf(C::kExtended, C::kHalo),
+          kElementType<T>.poolIndex,
           static_cast<std::uint64_t>(C::kSize) * sizeof(T),
           &make<C>,
           &callsElementConstructor<T>,

@@ -10,7 +10,7 @@
 // Beyond the last sample the weight reaches and passes 1; before the first, with an offset, i is -1.
 #pragma once
 
-#include "GeometryVolume/core/FourLanes.h"
+#include "GeometryVolume/core/SimdLanes.h"
 #include "GeometryVolume/tiletree/Container.h"
 #include "GeometryVolume/topology/VoxelTopology.h"
 
@@ -56,13 +56,13 @@ public:
   /// @numeric A place up to 1e-5 of a sample below the tile's first sample counts as on it.
   bool prepareToSample(Position position, SamplerSpace space, TreeIndex& out, int3& ijk, Position& weights,
                        int depth, Real* invVoxelWidth) const {
-    Place place;
-    bool const found = locate(position, space, depth, place);
-    out = place.tile;
+    SampleCell cell;
+    bool const found = locate(position, space, depth, cell);
+    out = cell.tile;
     if (!found) return false;
-    if (invVoxelWidth) *invVoxelWidth = place.invVoxelWidth;
-    ijk = Internal::toInt3(place.ijk);
-    weights = Internal::toFloat3(place.weights);
+    if (invVoxelWidth) *invVoxelWidth = cell.invVoxelWidth;
+    ijk = Internal::toInt3(cell.ijk);
+    weights = Internal::toFloat3(cell.weights);
     return true;
   }
 
@@ -70,24 +70,24 @@ protected:
   static constexpr int D = TraitsT::kTDW;
 
   /// What prepareToSample() gives, in lanes.
-  struct Place {
+  struct SampleCell {
     TreeIndex tile;
     float invVoxelWidth;
     Internal::IntLanes ijk;
     Internal::FloatLanes weights;
   };
   /// @return false without a tile: of `place` the tile alone is then set, and invalid.
-  bool locate(Position const& position, SamplerSpace space, int depth, Place& place) const {
+  bool locate(Position const& position, SamplerSpace space, int depth, SampleCell& cell) const {
     using namespace Internal;
     FloatLanes p = lanesOf(position);
     if (space == kSamplerWorldSpace) p *= m_worldToTile;
     IntLanes const c = floorLanesAnywhere(p);
-    place.tile = {};
+    cell.tile = {};
     if (depth < 0) return false;
-    place.tile = m_accessor.treeIndex(c[0], c[1], c[2], depth, false);
-    if (place.tile.depth < 0) return false;
-    Scale const& scale = kScales[static_cast<std::size_t>(place.tile.depth)];
-    place.invVoxelWidth = scale.invVoxelWidth;
+    cell.tile = m_accessor.treeIndex(c[0], c[1], c[2], depth, false);
+    if (cell.tile.depth < 0) return false;
+    Scale const& scale = kScales[static_cast<std::size_t>(cell.tile.depth)];
+    cell.invVoxelWidth = scale.invVoxelWidth;
     auto const corner = __builtin_convertvector(lanesOf(m_accessor.cursorCorner()), FloatLanes);
     FloatLanes l = (p - corner) * scale.samples - lanesOf(m_offset);
     FloatLanes const zero = {};
@@ -95,8 +95,8 @@ protected:
     l = (l > zero) | (l <= lanesOf(-1e-5f)) ? l : zero;
     // In reach of int: the tile holds p.
     IntLanes const i = floorLanes(l), last = IntLanes{} + (D - 1);
-    place.ijk = i < last ? i : last;
-    place.weights = l - __builtin_convertvector(place.ijk, FloatLanes);
+    cell.ijk = i < last ? i : last;
+    cell.weights = l - __builtin_convertvector(cell.ijk, FloatLanes);
     return true;
   }
 

@@ -104,8 +104,8 @@ VLN_SAMPLER_TEMPLATE float VLN_SAMPLER::sampleAbove(TreeIndex const& tile, int3 
   return sample(p, m_maxDepth, kSamplerTileSpace);
 }
 
-VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::cachedCell(TreeIndex const& tile, int3 const& ijk,
-                                                  Position const& weights) const -> Cell {
+VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::cachedCorners(TreeIndex const& tile, int3 const& ijk,
+                                                     Position const& weights) const -> CellCorners {
   auto const entry = [&](auto& cache) -> auto& {
     auto const d = static_cast<std::size_t>(tile.depth);
     if (m_lastTile[d] == tile.index) return cache[static_cast<std::size_t>(m_lastSlot[d])];
@@ -247,7 +247,7 @@ VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::fillTwoSided(typename ContainerT::TileTyp
                      &y = axes[1][static_cast<std::size_t>(j + 1)],
                      &z = axes[2][static_cast<std::size_t>(k + 1)];
           float const* const low = parent.data()->data() + flat(x.low, y.low, z.low);
-          value = Cell{low, D + 2, {x.fraction, y.fraction, z.fraction, 0.0f}}.value();
+          value = CellCorners{low, D + 2, {x.fraction, y.fraction, z.fraction, 0.0f}}.value();
         }
       }
 }

@@ -31,7 +31,7 @@ template <class TraitsT, class Value, int Components, class Real, class Position
 class VLN_API VoxelSamplerLinear : public VoxelSampler<TraitsT, Real, Position> {
   static_assert(std::is_same_v<Value, float> && Components == 1, "instantiated for float");
   using Base = VoxelSampler<TraitsT, Real, Position>;
-  using typename Base::Place;
+  using typename Base::SampleCell;
 
 public:
   using Base::D;
@@ -85,16 +85,16 @@ public:
     return sample(position, TraitsT::kMaxDepth, space);
   }
   float sample(Position const& position, int depth, SamplerSpace space) const {
-    Place place;
-    this->locate(position, space, std::min(depth, m_maxDepth), place);
-    return covers(place.tile) ? cellOf(place).value() : m_defaultValue;
+    SampleCell cell;
+    this->locate(position, space, std::min(depth, m_maxDepth), cell);
+    return covers(cell.tile) ? cornersOf(cell).value() : m_defaultValue;
   }
   /// The interpolation proper, of a cell as prepareToSample() gives it. A tile deeper than the channel stands
   /// for the same place at the channel's deepest depth.
   float sample(TreeIndex const& tile, int3 const& ijk, Position const& weights) const {
     if (tile.depth > m_maxDepth) return sampleAbove(tile, ijk, weights);
     if (!covers(tile)) return m_defaultValue;
-    return cellOf({tile, 0.0f, Internal::lanesOf(ijk), Internal::lanesOf(weights)}).value();
+    return cornersOf({tile, 0.0f, Internal::lanesOf(ijk), Internal::lanesOf(weights)}).value();
   }
 
   // Values with gradients
@@ -111,16 +111,16 @@ public:
     return sampleGradient(position, TraitsT::kMaxDepth, space, gradient);
   }
   float sampleGradient(Position const& position, int depth, SamplerSpace space, Position* gradient) const {
-    Place place;
-    bool const found = this->locate(position, space, std::min(depth, m_maxDepth), place);
-    if (!found || !covers(place.tile)) {
+    SampleCell cell;
+    bool const found = this->locate(position, space, std::min(depth, m_maxDepth), cell);
+    if (!found || !covers(cell.tile)) {
       *gradient = {0.0f, 0.0f, 0.0f};
       return m_defaultValue;
     }
-    Cell const cell = cellOf(place);
-    float const g = place.invVoxelWidth * 2.0f * m_invVoxelSize;
-    *gradient = cell.slope() * g;
-    return cell.value();
+    CellCorners const corners = cornersOf(cell);
+    float const g = cell.invVoxelWidth * 2.0f * m_invVoxelSize;
+    *gradient = corners.slope() * g;
+    return corners.value();
   }
 
   // Samples of voxels are not read: these are placeholders.
@@ -143,7 +143,7 @@ protected:
                                         std::vector<CacheEntry<TwoSidedTile>>& cache) const;
 
   // Eight samples and the weights between them.
-  struct Cell {
+  struct CellCorners {
     float const* low;
     int width;
     Internal::FloatLanes weights;
@@ -179,30 +179,30 @@ private:
   bool covers(TreeIndex const& tile) const {
     return tile.index >= 0 && tile.depth >= std::max(m_minDepth, 0);
   }
-  Cell cellOf(Place const& place) const {
-    if (m_channelWide) return wideCell(place);
+  CellCorners cornersOf(SampleCell const& cell) const {
+    if (m_channelWide) return wideCorners(cell);
     ++m_accessCount;
     int const low = this->m_offsetType == kVoxelOffsetCorner ? 0 : 1;
     auto const inside = [low](int i) { return i >= low && i + 1 < D; };
-    int const i = place.ijk[0], j = place.ijk[1], k = place.ijk[2];
+    int const i = cell.ijk[0], j = cell.ijk[1], k = cell.ijk[2];
     if (inside(i) && inside(j) && inside(k))
-      return {dataOf(*m_channelCore, place.tile) + i + D * (j + D * k), D, place.weights};
-    return cachedCell(place.tile, Internal::toInt3(place.ijk), Internal::toFloat3(place.weights));
+      return {dataOf(*m_channelCore, cell.tile) + i + D * (j + D * k), D, cell.weights};
+    return cachedCorners(cell.tile, Internal::toInt3(cell.ijk), Internal::toFloat3(cell.weights));
   }
-  Cell wideCell(Place const& place) const {
+  CellCorners wideCorners(SampleCell const& cell) const {
     constexpr int w = D + 1;
     // Below the first sample: extrapolate from the first cell, as the last one does at the top.
-    auto const below = place.ijk < 0;
-    auto const at = place.ijk & ~below;
-    auto const weights = place.weights + __builtin_convertvector(below, Internal::FloatLanes);
-    return {dataOf(*m_channelWide, place.tile) + at[0] + w * (at[1] + w * at[2]), w, weights};
+    auto const below = cell.ijk < 0;
+    auto const at = cell.ijk & ~below;
+    auto const weights = cell.weights + __builtin_convertvector(below, Internal::FloatLanes);
+    return {dataOf(*m_channelWide, cell.tile) + at[0] + w * (at[1] + w * at[2]), w, weights};
   }
   template <class ChannelT> static float const* dataOf(ChannelT const& channel, TreeIndex const& tile) {
     auto const& tiles = (*channel.tileArrays())[static_cast<std::size_t>(tile.depth)];
     return tiles[static_cast<std::size_t>(tile.index)].data();
   }
   float sampleAbove(TreeIndex const& tile, int3 const& ijk, Position const& weights) const;
-  Cell cachedCell(TreeIndex const& tile, int3 const& ijk, Position const& weights) const;
+  CellCorners cachedCorners(TreeIndex const& tile, int3 const& ijk, Position const& weights) const;
 
   void bind(CoreChannel const* core, WideChannel const* wide);
   void forgetTiles();

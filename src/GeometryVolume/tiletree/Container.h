@@ -235,7 +235,7 @@ protected:
 
   Data const* getData() const { return m_data.get(); }
   /// What leads from positions to tiles, built with the acceleration grid; else null.
-  PlaceTable<TraitsT> const* places() const { return m_data->m_places.get(); }
+  TileLookupTable<TraitsT> const* lookupTable() const { return m_data->m_lookupTable.get(); }
 
   // Lookup
   /// The deepest tile at or above `depth` that holds the point; invalid when there is none.
@@ -291,21 +291,21 @@ private:
   class Growth;
 
   /// A new tile without parent: a root, or one that hangs below a coarser tile with tiles between.
-  struct Unlinked {
+  struct DetachedTile {
     std::int64_t index;
     TreeIndex above;
   };
   /// A tile where there is none above.
   TreeIndex addRootTile(int i, int j, int k, int depth, Growth& growth);
-  /// Grows a depth by `n` tiles, of which the caller runs makeAt() for each index.
-  void allocateForMaking(int depth, std::int64_t n);
+  /// Grows a depth by `n` tiles, of which the caller runs initLinkedTile() for each index.
+  void allocateUninitialised(int depth, std::int64_t n);
   /// Makes the tile of a new index and links it to its parent, when that is known (not -1) or found.
-  /// @return false when it has none; `unlinked` then tells where it belongs.
+  /// @return false when it has none; `detached` then tells where it belongs.
   /// @threads Tiles of one depth are made in parallel: each slot belongs to exactly one tile.
-  bool makeAt(std::int64_t index, int depth, int3 const& corner, std::int64_t parent,
-              ConstTileAccessor const& accessor, Unlinked& unlinked);
-  /// Links what makeAt() could not, and lists what is new since the counts were `before`.
-  void finishMaking(int depth, std::vector<std::vector<Unlinked>> const& parts, Growth& growth,
+  bool initLinkedTile(std::int64_t index, int depth, int3 const& corner, std::int64_t parent,
+                      ConstTileAccessor const& accessor, DetachedTile& detached);
+  /// Links what initLinkedTile() could not, and lists what is new since the counts were `before`.
+  void linkDetached(int depth, std::vector<std::vector<DetachedTile>> const& parts, Growth& growth,
                     TileLists* newTiles);
   /// Appends the corners of all tiles made since the counts were `before`.
   void listNewTiles(Counts const& before, TileLists* newTiles) const;

@@ -32,11 +32,10 @@ public:
   static constexpr int kMaxDepth = TraitsT::kMaxDepth;
 
   explicit WantedTiles(typename Container<TraitsT>::TileLists const& points) {
-    auto const inDomain = [](int3 const& p) { return TraitsT::inDomain(p.x, p.y, p.z); };
-    for (int3 const& p : points[0]) m_domain = m_domain || inDomain(p);
+    for (int3 const& p : points[0]) m_domain = m_domain || TraitsT::inDomain(p);
     for (int d = 1; d <= kMaxDepth; ++d) {
       for (int3 const& p : points[static_cast<std::size_t>(d)]) {
-        if (inDomain(p)) add(p, d);
+        if (TraitsT::inDomain(p)) add(p, d);
       }
       join(groups(d));
     }
@@ -55,13 +54,13 @@ public:
       Groups& here = groups(d);
       if (here.empty()) continue;
       bool added = false;
-      std::vector<Cover> covers = coversAbove(d - 1);
+      std::vector<CoverageQuery> queries = coverageAbove(d - 1);
       for (Group const& group : here) {
         int3 const& p = group.parent;
         TreeIndex const above = accessor.treeIndex(p.x, p.y, p.z, d - 1, false);
         if (above.depth == d - 1) continue;
         if (above.valid() || m_domain ||
-            std::any_of(covers.begin(), covers.end(), [&](Cover& c) { return c.holds(p); }))
+            std::any_of(queries.begin(), queries.end(), [&](CoverageQuery& c) { return c.holds(p); }))
           add(p, d - 1), added = true;
       }
       if (added) join(groups(d - 1));
@@ -72,9 +71,6 @@ private:
   static bool less(Group const& a, Group const& b) {
     return a.key.high != b.key.high ? a.key.high < b.key.high : a.key.low < b.key.low;
   }
-  static int3 align(int3 const& p, int d) {
-    return {TraitsT::align(p.x, d), TraitsT::align(p.y, d), TraitsT::align(p.z, d)};
-  }
   static std::size_t slotOf(int3 const& p, int3 const& parent, int d) {
     std::int64_t const w = TraitsT::width(d);
     auto const digit = [&](int a) { return (std::int64_t(p[a]) - parent[a]) / w; };
@@ -83,7 +79,7 @@ private:
 
   void add(int3 const& p, int depth) {
     Groups& list = groups(depth);
-    int3 const parent = align(p, depth - 1);
+    int3 const parent = TraitsT::align(p, depth - 1);
     if (list.empty() || list.back().parent != parent) list.push_back({{}, parent, {}});
     list.back().slots.set(slotOf(p, parent, depth));
   }
@@ -106,16 +102,16 @@ private:
   }
 
   /// Whether a depth's wanted tiles hold a point. Remembers the last answer.
-  class Cover {
+  class CoverageQuery {
   public:
-    Cover(Groups const& list, int depth)
+    CoverageQuery(Groups const& list, int depth)
         : m_list(&list)
         , m_depth(depth) {}
     bool holds(int3 const& p) {
-      int3 const corner = align(p, m_depth);
+      int3 const corner = TraitsT::align(p, m_depth);
       if (m_asked && corner == m_corner) return m_answer;
       m_asked = true, m_corner = corner;
-      int3 const parent = align(p, m_depth - 1);
+      int3 const parent = TraitsT::align(p, m_depth - 1);
       Group const wanted{mortonRecord<TraitsT>(parent, 0), parent, {}};
       auto const at = std::lower_bound(m_list->begin(), m_list->end(), wanted, less);
       m_answer = at != m_list->end() && at->parent == parent && at->slots[slotOf(corner, parent, m_depth)];
@@ -128,12 +124,12 @@ private:
     bool m_asked = false, m_answer = false;
     int3 m_corner{0, 0, 0};
   };
-  std::vector<Cover> coversAbove(int depth) const {
-    std::vector<Cover> covers;
+  std::vector<CoverageQuery> coverageAbove(int depth) const {
+    std::vector<CoverageQuery> queries;
     for (int d = 1; d < depth; ++d) {
-      if (!groups(d).empty()) covers.emplace_back(groups(d), d);
+      if (!groups(d).empty()) queries.emplace_back(groups(d), d);
     }
-    return covers;
+    return queries;
   }
 
   bool m_domain = false;
@@ -196,7 +192,7 @@ void Container<TraitsT>::addTilesInBulk(TileLists const& corners, TileLists* new
     std::int64_t next = tileCount(d);
     for (std::int64_t& start : starts) next += std::exchange(start, next);
     if (next == tileCount(d)) continue;
-    allocateForMaking(d, next - tileCount(d));
+    allocateUninitialised(d, next - tileCount(d));
     auto& tiles = m_data->editTiles(d);
     auto* const above = &m_data->editTiles(d - 1);
     std::vector<std::vector<std::int64_t>> roots(starts.size());

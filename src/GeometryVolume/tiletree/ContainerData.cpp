@@ -32,7 +32,7 @@ ContainerData<TraitsT>::ContainerData(ContainerData const& b)
     , m_gridExtent(b.m_gridExtent)
     , m_gridDepth(b.m_gridDepth)
     , m_gridCellWidth(b.m_gridCellWidth)
-    , m_places(b.m_places)
+    , m_lookupTable(b.m_lookupTable)
     , m_voxelSize(b.m_voxelSize)
     , m_voxelSizeInv(b.m_voxelSizeInv)
     , m_maxRelativeRefinementError(b.m_maxRelativeRefinementError)
@@ -81,9 +81,9 @@ void ContainerData<TraitsT>::memUse(std::uint64_t& used, std::uint64_t& allocate
   used += m_gridTable.size() * sizeof(std::int64_t);
   allocated += m_gridTable.capacity() * sizeof(std::int64_t);
   // Used counts the grid alone; what goes with it is an aid, but it takes memory.
-  if (m_places)
-    allocated += m_places->cells.capacity() * sizeof(std::int64_t) +
-                 m_places->places.capacity() * sizeof(std::int32_t);
+  if (m_lookupTable)
+    allocated += m_lookupTable->cells.capacity() * sizeof(std::int64_t) +
+                 m_lookupTable->places.capacity() * sizeof(std::int32_t);
   used += m_allThreadLocal.size() * sizeof(m_allThreadLocal[0]);
   allocated += m_allThreadLocal.capacity() * sizeof(m_allThreadLocal[0]);
   for (auto const& scratch : m_allThreadLocal) {

@@ -5,9 +5,9 @@
 #include "GeometryVolume/core/FixedArray.h"
 #include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/tiletree/HaloWeights.h"
-#include "GeometryVolume/tiletree/PlaceTable.h"
 #include "GeometryVolume/tiletree/Tile.h"
 #include "GeometryVolume/tiletree/TileArray.h"
+#include "GeometryVolume/tiletree/TileLookupTable.h"
 #include "Ostil/Ptr.h"
 
 #include <array>
@@ -76,7 +76,8 @@ template <class TraitsT> struct VLN_API ContainerData {
   int3 m_gridExtent{0, 0, 0};
   std::int32_t m_gridDepth = -1;
   std::int32_t m_gridCellWidth = 1;
-  std::shared_ptr<PlaceTable<TraitsT> const> m_places; ///< built with the grid; null where it does not fit
+  std::shared_ptr<TileLookupTable<TraitsT> const>
+      m_lookupTable; ///< built with the grid; null where it does not fit
 
   float m_voxelSize = 1.0f;
   float m_voxelSizeInv = 1.0f;

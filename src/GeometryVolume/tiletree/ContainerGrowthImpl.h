@@ -24,7 +24,7 @@ public:
     for (std::size_t d = 0; d < listed.size(); ++d) listed[d] = (*newTiles)[d].size();
   }
   ~Growth() {
-    if (!m_kept) takeBack();
+    if (!m_kept) rollBack();
   }
   Growth(Growth const&) = delete;
   Growth& operator=(Growth const&) = delete;
@@ -42,7 +42,7 @@ private:
   bool isNew(std::int64_t index, int depth) const {
     return index >= m_before[static_cast<std::size_t>(depth)];
   }
-  void takeBack() {
+  void rollBack() {
     if (m_data.m_tileCounts == m_before) return;
     for (auto root = m_data.m_roots.begin(); root != m_data.m_roots.end();) {
       auto const next = std::next(root);

@@ -52,7 +52,7 @@ inline void refineCheckpoint() {
 
 } // namespace Internal
 
-template <class TraitsT> void Container<TraitsT>::allocateForMaking(int depth, std::int64_t n) {
+template <class TraitsT> void Container<TraitsT>::allocateUninitialised(int depth, std::int64_t n) {
   // At the deepest depth nothing is allocated for a tile, so that no record can stay unmade.
   if (depth < kMaxDepth) return allocateTiles(depth, n);
   m_data->detachTiles();
@@ -63,8 +63,8 @@ template <class TraitsT> void Container<TraitsT>::allocateForMaking(int depth, s
 }
 
 template <class TraitsT>
-bool Container<TraitsT>::makeAt(std::int64_t index, int depth, int3 const& p, std::int64_t parent,
-                                ConstTileAccessor const& accessor, Unlinked& unlinked) {
+bool Container<TraitsT>::initLinkedTile(std::int64_t index, int depth, int3 const& p, std::int64_t parent,
+                                        ConstTileAccessor const& accessor, DetachedTile& detached) {
   TreeIndex nearest;
   if (parent < 0 && depth > 0) {
     nearest = accessor.treeIndex(p.x, p.y, p.z, depth - 1, false);
@@ -77,16 +77,16 @@ bool Container<TraitsT>::makeAt(std::int64_t index, int depth, int3 const& p, st
   auto* const tile = &m_data->editTiles(depth)[index];
   if (depth == kMaxDepth) new (static_cast<void*>(tile)) TileType;
   tile->init(parent, p.x, p.y, p.z, depth, index);
-  unlinked = {index, nearest};
+  detached = {index, nearest};
   return parent >= 0;
 }
 
 template <class TraitsT>
-void Container<TraitsT>::finishMaking(int depth, std::vector<std::vector<Unlinked>> const& parts,
+void Container<TraitsT>::linkDetached(int depth, std::vector<std::vector<DetachedTile>> const& parts,
                                       Growth& growth, TileLists* newTiles) {
   bool anyRoot = false;
   for (auto const& part : parts) {
-    for (Unlinked const& made : part) {
+    for (DetachedTile const& made : part) {
       if (made.above.valid())
         insertChild(made.above, {made.index, depth});
       else
@@ -168,22 +168,22 @@ void Container<TraitsT>::refineInternal(Container const& source, bool last, Tile
       for (std::int64_t& start : starts) next += std::exchange(start, next);
       if (next > tileCount(d)) {
         Growth growth(*this, newTiles);
-        allocateForMaking(d, next - tileCount(d));
-        std::vector<std::vector<Unlinked>> parts(starts.size());
+        allocateUninitialised(d, next - tileCount(d));
+        std::vector<std::vector<DetachedTile>> parts(starts.size());
         auto const make = [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
           auto const accessor = std::as_const(*this).tileAccessor();
           std::int64_t index = starts[static_cast<std::size_t>(chunk)];
-          Unlinked unlinked;
+          DetachedTile detached;
           for (std::int64_t n = begin; n < end; ++n) {
             if (here[static_cast<std::size_t>(n)] != kMissing) continue;
             TileType const& wanted = tiles[n];
-            if (!makeAt(index, d, wanted.tijk(), parentHere(wanted), accessor, unlinked))
-              parts[static_cast<std::size_t>(chunk)].push_back(unlinked);
+            if (!initLinkedTile(index, d, wanted.tijk(), parentHere(wanted), accessor, detached))
+              parts[static_cast<std::size_t>(chunk)].push_back(detached);
             here[static_cast<std::size_t>(n)] = index++;
           }
         };
         Internal::refinePass(count, make, next - growth.before()[static_cast<std::size_t>(d)]);
-        finishMaking(d, parts, growth, newTiles);
+        linkDetached(d, parts, growth, newTiles);
         growth.keep();
       }
       Internal::refineCheckpoint();

@@ -220,7 +220,7 @@ template <class TraitsT> void Container<TraitsT>::clearCompressedTileHalos() {
 template <class TraitsT> void Container<TraitsT>::clearAccessorAccelerationStructure() {
   if (m_data->m_gridDepth < 0) return;
   m_data->m_gridDepth = -1;
-  m_data->m_places.reset();
+  m_data->m_lookupTable.reset();
   m_data->m_gridSize = {0, 0, 0};
   std::vector<std::int64_t>().swap(m_data->m_gridTable);
 }

@@ -105,9 +105,9 @@ float haloWeight(Tile<TraitsT, TraitsT::kTileSize> const& tile, int direction, i
 namespace {
 
 template <class TraitsT>
-std::shared_ptr<PlaceTable<TraitsT> const> computePlaces(Container<TraitsT> const& tree,
-                                                         ContainerData<TraitsT> const& data) {
-  using Table = PlaceTable<TraitsT>;
+std::shared_ptr<TileLookupTable<TraitsT> const> computePlaces(Container<TraitsT> const& tree,
+                                                              ContainerData<TraitsT> const& data) {
+  using Table = TileLookupTable<TraitsT>;
   int const g = data.m_gridDepth, last = std::min(g + Table::kLevels, TraitsT::kMaxDepth);
   for (int d = g; d <= last; ++d) {
     if (tree.tileCount(d) > Table::kMostTiles) return nullptr;
@@ -187,7 +187,7 @@ void buildAccelerationGrid(Container<TraitsT> const& tree, ContainerData<TraitsT
     std::uint32_t const largest = std::max({extent(box, 0), extent(box, 1), extent(box, 2)});
     if (largest / w > kMaxGridCells) continue;
 
-    data.m_places.reset();
+    data.m_lookupTable.reset();
     data.m_gridOrigin = box.min;
     data.m_gridCellWidth = static_cast<std::int32_t>(w);
     std::size_t cells = 1;
@@ -209,7 +209,7 @@ void buildAccelerationGrid(Container<TraitsT> const& tree, ContainerData<TraitsT
       data.m_gridTable[at] = n;
     }
     data.m_gridDepth = d; // lookups use it from here on
-    data.m_places = computePlaces(tree, data);
+    data.m_lookupTable = computePlaces(tree, data);
     return;
   }
 }

@@ -22,7 +22,7 @@ constexpr std::array<int, kHaloWeightCount> makeNumerators() {
   for (int first : {1024, 512, 2048, 256, 4096, 128, 768, 384}) take(first);
 
   // Simplest first: by reduced denominator, then by numerator, which for one denominator is by value.
-  auto const takeMarked = [&](std::array<bool, kUnit + 1> const& marked) {
+  auto const appendMarked = [&](std::array<bool, kUnit + 1> const& marked) {
     for (int denominator = 1; denominator <= kUnit; denominator *= 2) {
       int const step = kUnit / denominator;
       for (int numerator = step; numerator <= kUnit; numerator += step) {
@@ -49,8 +49,8 @@ constexpr std::array<int, kHaloWeightCount> makeNumerators() {
       }
     }
   }
-  takeMarked(readable);
-  takeMarked(products);
+  appendMarked(readable);
+  appendMarked(products);
   take(kLast);
   return table;
 }

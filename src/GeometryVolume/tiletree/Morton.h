@@ -29,4 +29,21 @@ template <class TraitsT> constexpr SortRecord mortonRecord(int3 const& corner, s
   return {word(16), word(0), value};
 }
 
+/// Whether a comes before b in the order of the keys, without making them: the axis whose coordinates differ
+/// in the highest bit decides.
+/// @pre Corners of the power-of-two shape.
+inline bool mortonLess(int3 const& a, int3 const& b) {
+  std::uint32_t highest = 0;
+  int axis = 0;
+  for (int n = 0; n < 3; ++n) {
+    auto const differ = static_cast<std::uint32_t>(a[n]) ^ static_cast<std::uint32_t>(b[n]);
+    if (highest < differ && highest < (highest ^ differ)) highest = differ, axis = n;
+  }
+  return a[axis] < b[axis];
+}
+/// For algorithms, which do not see through a pointer to a function.
+struct MortonOrder {
+  bool operator()(int3 const& a, int3 const& b) const { return mortonLess(a, b); }
+};
+
 } // namespace VLN::TileTree3D

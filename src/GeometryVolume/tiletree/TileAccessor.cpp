@@ -28,7 +28,7 @@ TreeIndex ConstTileAccessorOf<TraitsT>::findNear(int i, int j, int k, int depth)
     TreeIndex const next =
         (*table)[static_cast<std::size_t>(m_depth)][static_cast<std::size_t>(m_index)][entry];
     if (next.depth >= 0 && next.depth <= depth && m_container->tile(next).contains(i, j, k)) {
-      moveTo(m_container->tile(next));
+      setCursor(m_container->tile(next));
       return next;
     }
   }
@@ -66,7 +66,7 @@ TreeIndex ConstTileAccessorOf<TraitsT>::descend(TreeIndex at, int i, int j, int 
   m_path[static_cast<std::size_t>(at.depth)] = at.index;
   at = m_container->descend(at, i, j, k, depth, m_path.data());
   m_depth = at.depth, m_index = at.index;
-  m_corner = {TraitsT::align(i, at.depth), TraitsT::align(j, at.depth), TraitsT::align(k, at.depth)};
+  m_corner = TraitsT::align(int3{i, j, k}, at.depth);
   return at;
 }
 
@@ -74,8 +74,8 @@ template <class TraitsT>
 TreeIndex ConstTileAccessorOf<TraitsT>::find(int i, int j, int k, int depth, bool exact) const {
   if (!m_container || depth < 0 || !TraitsT::inDomain(i, j, k)) return {};
   TreeIndex at;
-  if (auto const* places = m_container->places(); places && depth >= places->lastDepth)
-    at = places->find(i, j, k);
+  if (auto const* table = m_container->lookupTable(); table && depth >= table->lastDepth)
+    at = table->find(i, j, k);
   if (at.valid())
     m_pathTop = at.depth;
   else
@@ -138,7 +138,7 @@ auto TileAccessorOf<TraitsT>::addTile(int i, int j, int k, int depth) -> TileTyp
   if (!TraitsT::isDepth(depth) || !TraitsT::inDomain(i, j, k)) return tree.invalidTile();
   if (depth == this->m_depth && this->holds(i, j, k)) return this->current();
   TreeIndex at = this->findNear(i, j, k, depth);
-  if (!at.valid()) return this->moveTo(tree.tile(tree.addTile(i, j, k, depth)));
+  if (!at.valid()) return this->setCursor(tree.tile(tree.addTile(i, j, k, depth)));
   at = this->descend(at, i, j, k, depth);
   if (at.depth != depth) {
     tree.addTileBelow(at, i, j, k, depth);
@@ -149,8 +149,7 @@ auto TileAccessorOf<TraitsT>::addTile(int i, int j, int k, int depth) -> TileTyp
 
 template <class TraitsT>
 auto TileAccessorOf<TraitsT>::addTile(int3 const& min, int3 const& max) -> TileType const& {
-  if (!TraitsT::inDomain(min.x, min.y, min.z) || !TraitsT::inDomain(max.x, max.y, max.z))
-    return m_mutableContainer->invalidTile();
+  if (!TraitsT::inDomain(min) || !TraitsT::inDomain(max)) return m_mutableContainer->invalidTile();
   auto const share = [&](int d) {
     for (int a = 0; a < 3; ++a) {
       if (TraitsT::align(min[a], d) != TraitsT::align(max[a], d)) return false;
@@ -186,7 +185,7 @@ template <class TraitsT> void TileAccessorOf<TraitsT>::rereadCursor() {
   ContainerT const& tree = *m_mutableContainer;
   if (this->m_depth >= 0 && this->m_index < tree.tileCount(this->m_depth) &&
       tree.tile(this->m_index, this->m_depth).valid())
-    this->moveTo(tree.tile(this->m_index, this->m_depth));
+    this->setCursor(tree.tile(this->m_index, this->m_depth));
   else
     this->resetCursor();
 }

@@ -44,12 +44,12 @@ public:
   /// @cost As tile(), without touching the tile's record.
   TreeIndex treeIndex(int i, int j, int k, int depth, bool exact) const {
     if (depth == m_depth && holds(i, j, k)) return {m_index, m_depth};
-    if (auto const* places = m_container ? m_container->places() : nullptr) {
+    if (auto const* table = m_container ? m_container->lookupTable() : nullptr) {
       // Complete answers alone: a tile of the last depth may have deeper ones below it.
-      TreeIndex const at = depth >= places->lastDepth ? places->find(i, j, k) : TreeIndex{};
-      if (at.depth == places->kNoTile) return {};
-      if (at.depth >= 0 && (at.depth < places->lastDepth || at.depth == depth)) {
-        moveTo(at, i, j, k);
+      TreeIndex const at = depth >= table->lastDepth ? table->find(i, j, k) : TreeIndex{};
+      if (at.depth == table->kNoTile) return {};
+      if (at.depth >= 0 && (at.depth < table->lastDepth || at.depth == depth)) {
+        setCursor(at, i, j, k);
         return exact && at.depth != depth ? TreeIndex{} : at;
       }
     }
@@ -116,14 +116,14 @@ protected:
   }
   TileType const& invalidTile() const;
   /// Puts the cursor on a tile whose ancestors are not known.
-  TileType const& moveTo(TileType const& t) const {
+  TileType const& setCursor(TileType const& t) const {
     m_corner = t.tijk(), m_depth = m_pathTop = t.depth(), m_index = t.index();
     if (m_depth >= 0) m_path[static_cast<std::size_t>(m_depth)] = m_index;
     return t;
   }
   /// The same for the tile that holds a point.
-  void moveTo(TreeIndex const& at, int i, int j, int k) const {
-    m_corner = {TraitsT::align(i, at.depth), TraitsT::align(j, at.depth), TraitsT::align(k, at.depth)};
+  void setCursor(TreeIndex const& at, int i, int j, int k) const {
+    m_corner = TraitsT::align(int3{i, j, k}, at.depth);
     m_depth = m_pathTop = at.depth, m_index = at.index;
     m_path[static_cast<std::size_t>(at.depth)] = at.index;
   }

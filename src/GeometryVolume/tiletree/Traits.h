@@ -15,6 +15,7 @@
 #pragma once
 
 #include "GeometryVolume/core/Export.h"
+#include "Velorn/Math.h"
 
 #include <array>
 #include <cstddef>
@@ -64,6 +65,7 @@ public:
   static constexpr bool inDomain(std::int32_t i, std::int32_t j, std::int32_t k) {
     return inDomain(i) && inDomain(j) && inDomain(k);
   }
+  static constexpr bool inDomain(Velorn::Math::int3 const& p) { return inDomain(p.x, p.y, p.z); }
   static constexpr bool isDepth(int d) {
     return static_cast<unsigned>(d) <= static_cast<unsigned>(kMaxDepth);
   }
@@ -73,6 +75,10 @@ public:
   static constexpr std::int32_t align(std::int32_t c, int d) {
     std::uint32_t const aligned = quotient(offset(c), d) * static_cast<std::uint32_t>(width(d));
     return static_cast<std::int32_t>(aligned + static_cast<std::uint32_t>(kMinTileCoord));
+  }
+
+  static constexpr Velorn::Math::int3 align(Velorn::Math::int3 const& p, int d) {
+    return {align(p.x, d), align(p.y, d), align(p.z, d)};
   }
 
   /// Quotient of an offset from kMinTileCoord and the width of depth `d`, for d in 0..kMaxDepth.
@@ -123,6 +129,8 @@ static_assert(PowerOfTwoTraits::kMaxDepth == 28 && PowerOfTwoTraits::kMinTileCoo
               PowerOfTwoTraits::kMaxTileCoord == 536870911);
 static_assert(OddTraits::kMaxDepth == 12 && OddTraits::kMinTileCoord == -610351562 &&
               OddTraits::kMaxTileCoord == 610351562);
+
+inline constexpr int kShapeCount = 2;
 
 /// Depths that every per-depth array of a channel has, for both shapes.
 inline constexpr int kChannelDepths = 29;

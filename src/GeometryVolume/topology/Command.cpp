@@ -1,6 +1,6 @@
 #include "GeometryVolume/topology/Command.h"
 
-#include "GeometryVolume/core/TakenComponent.h"
+#include "GeometryVolume/core/ScopedExtraction.h"
 
 namespace VLN::TileTree3D::Command {
 
@@ -74,7 +74,7 @@ void initializeTileData(Container<TraitsT> const& container,
   }
   for (auto const& name : object.componentRange()) {
     if (!isChannelOf<TraitsT>(object.component<ChannelBase>(name))) continue;
-    VLN::Internal::TakenComponent<ChannelBase> const taken(object, name);
+    VLN::Internal::ScopedExtraction<ChannelBase> const taken(object, name);
     ChannelBase& channel = *taken;
     int const last = std::min(channel.depth(), TraitsT::kMaxDepth);
     for (int d = std::max(channel.minDepth(), 0); d <= last; ++d)

@@ -64,18 +64,4 @@ createChannel(Ostil::String const& name, Channel<Traits<kTW, kTDW, A, 1>, T, E, 
                                                                          initializer, minDepth, maxDepth);
 }
 
-#define VLN_CREATE_CHANNEL(T, TW, TDW, E, H)                                                                 \
-  template VLN_API Ostil::MutablePtr<Channel<Traits<TW, TDW, 0, 1>, T, E, H>>                                \
-  createChannel<T, TW, TDW, E, 0, H>(Ostil::String const&, VoxelTopology<Traits<TW, TDW, 0, 1>> const&, T,   \
-                                     DataElementInitializerType, int, int);                                  \
-  template VLN_API Ostil::MutablePtr<Channel<Traits<TW, TDW, 0, 1>, T, E, H>>                                \
-  createChannel<T, TW, TDW, E, 0, H>(Ostil::String const&, VoxelTopology<Traits<TW, TDW, 0, 1>> const&,      \
-                                     VLN::Object&, T, DataElementInitializerType, int, int);                 \
-  template VLN_API Ostil::MutablePtr<Channel<Traits<TW, TDW, 0, 1>, T, E, H>>                                \
-  createChannel<T, TW, TDW, E, 0, H>(Ostil::String const&, PointTopology<Traits<TW, TDW, 0, 1>> const&,      \
-                                     VLN::Object&, T, DataElementInitializerType, int, int);                 \
-  template VLN_API Ostil::MutablePtr<Channel<Traits<TW, TDW, 0, 1>, T, E, H>>                                \
-  createChannel<T, TW, TDW, E, 0, H>(Ostil::String const&, Channel<Traits<TW, TDW, 0, 1>, T, E, 0> const&,   \
-                                     VLN::Object&, T, DataElementInitializerType, int, int);
-
 } // namespace VLN::TileTree3D::Command

@@ -38,9 +38,9 @@ template <class TraitsT> std::uint64_t PointTopology<TraitsT>::size() const {
 template <class TraitsT> void PointTopology<TraitsT>::update(VLN::Component const& source) {
   ObjectChange const change(this);
   if (auto const* container = dynamic_cast<Container<TraitsT> const*>(&source))
-    m_counts.takeTiles(*container, 0);
+    m_counts.countTiles(*container, 0);
   else if (auto const* other = dynamic_cast<Component const*>(&source))
-    m_counts.takeElements(*other, 0);
+    m_counts.countElements(*other, 0);
 }
 
 template <class TraitsT> void PointTopology<TraitsT>::copyTo(Ostil::Ptr<VLN::Component>& target) const {

@@ -8,7 +8,7 @@
 
 namespace VLN::TileTree3D {
 
-template <int Depths> void TreeCounts<Depths>::takeTiles(Component const& tree, std::uint32_t newElements) {
+template <int Depths> void TreeCounts<Depths>::countTiles(Component const& tree, std::uint32_t newElements) {
   // Room first: either all depths follow or none.
   for (int d = 0; d < Depths; ++d) {
     auto& tiles = elementsPerTile[static_cast<std::size_t>(d)];
@@ -23,7 +23,7 @@ template <int Depths> void TreeCounts<Depths>::takeTiles(Component const& tree, 
   }
 }
 
-template <int Depths> void TreeCounts<Depths>::takeElements(Component const& source, std::uint32_t atLeast) {
+template <int Depths> void TreeCounts<Depths>::countElements(Component const& source, std::uint32_t atLeast) {
   // What is thrown half-way leaves depths that have followed and others that have not: the sums must say so.
   struct Sums {
     TreeCounts& counts;

@@ -29,9 +29,9 @@ template <int Depths> struct TreeCounts {
   }
 
   /// Takes the tile counts of a tree. Tiles that are new get `newElements` elements.
-  void takeTiles(Component const& tree, std::uint32_t newElements);
+  void countTiles(Component const& tree, std::uint32_t newElements);
   /// Takes each tile's element count from `source`, but never less than `atLeast`. Tile counts stay.
-  void takeElements(Component const& source, std::uint32_t atLeast);
+  void countElements(Component const& source, std::uint32_t atLeast);
   void addMemory(std::uint64_t& used, std::uint64_t& allocated) const;
 
 private:

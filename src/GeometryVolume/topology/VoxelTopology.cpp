@@ -46,7 +46,7 @@ template <class TraitsT> void VoxelTopology<TraitsT>::update(VLN::Component cons
   ObjectChange const change(this);
   constexpr auto kElements = static_cast<std::uint32_t>(TraitsT::kTileDataSize);
   if (auto const* container = dynamic_cast<Container<TraitsT> const*>(&source)) {
-    m_counts.takeTiles(*container, kElements);
+    m_counts.countTiles(*container, kElements);
     m_counts.elementCountTotal = 0;
     for (std::size_t d = 0; d < m_counts.tileCounts.size(); ++d) {
       m_counts.elementCounts[d] = m_counts.tileCounts[d] * kElements;
@@ -55,7 +55,7 @@ template <class TraitsT> void VoxelTopology<TraitsT>::update(VLN::Component cons
     m_voxelSize = container->voxelSize();
     m_voxelSizeInv = 1.0f / m_voxelSize;
   } else if (auto const* other = dynamic_cast<Component const*>(&source)) {
-    m_counts.takeElements(*other, kElements);
+    m_counts.countElements(*other, kElements);
   }
 }
 

@@ -45,7 +45,7 @@ Chunk findRuns(FieldBlocks const& blocks, std::span<int3 const> positions, std::
     int3 const& p = positions[static_cast<std::size_t>(n)];
     if (run && holds(tile, 4, p)) continue;
     if (!run || !holds(at, FieldBlock::kWidth, p)) {
-      if (!VolumeShape::inDomain(p.x, p.y, p.z)) {
+      if (!VolumeShape::inDomain(p)) {
         out.outside = n;
         return out;
       }

@@ -3,6 +3,7 @@
 
 #include "GeometryVolume/channels/Halo.h"
 #include "GeometryVolume/channels/NonLeafValues.h"
+#include "GeometryVolume/core/ElementTypes.h"
 #include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/sampling/VoxelSamplerLinear.h"
 #include "GeometryVolume/topology/Command.h"
@@ -22,8 +23,6 @@ namespace Internal {
 inline constexpr int kFinest = VolumeShape::kMaxDepth;
 inline constexpr std::size_t kTileElements = 64;
 
-template <class T> char const* elementTypeName();
-
 template <class T> struct TypedSlot final : FieldSlot {
   using ChannelType = Channel<VolumeShape, T, 4, 0>;
   using HaloChannelType = Channel<VolumeShape, T, 4, 1>;
@@ -36,7 +35,7 @@ template <class T> struct TypedSlot final : FieldSlot {
   }
 
   Ostil::Ptr<ChannelBase> channel() const override { return m_channel; }
-  char const* typeName() const override { return elementTypeName<T>(); }
+  char const* typeName() const override { return kElementType<T>.name; }
   std::unique_ptr<FieldSlot> share() const override { return std::make_unique<TypedSlot>(m_channel); }
 
   void detach(VolumeData& volume) override {
@@ -384,7 +383,7 @@ template <class T> Field<T> Volume::field(std::string const& name) const {
   auto& slot = findSlot(name);
   if (!dynamic_cast<Internal::TypedSlot<T>*>(&slot))
     throw std::invalid_argument("field \"" + name + "\" holds " + slot.typeName() + ", not " +
-                                Internal::elementTypeName<T>());
+                                kElementType<T>.name);
   return Field<T>(*m_data, slot);
 }
 

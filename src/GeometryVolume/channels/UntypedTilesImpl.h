@@ -7,14 +7,14 @@
 namespace VLN::TileTree3D::Internal {
 
 /// Refers to the channel, which must stay as it is meanwhile.
-template <class T> ErasedTiles eraseTiles(TypedChannel<T> const& channel) {
+template <class T> UntypedTiles untypedTiles(TypedChannel<T> const& channel) {
   return {&TypedElementOps<T>::get(), channel.tileArrays(), &channel.defaultValue(),
           channel.minDepth(),         channel.depth(),      channel.layout().size};
 }
 /// The target of a pass, which is written and so shares nothing from here on.
-template <class T> ErasedTiles eraseTarget(TypedChannel<T>& channel) {
+template <class T> UntypedTiles untypedTarget(TypedChannel<T>& channel) {
   channel.cloneData();
-  return eraseTiles(channel);
+  return untypedTiles(channel);
 }
 
 } // namespace VLN::TileTree3D::Internal

@@ -1,4 +1,4 @@
-// PlaceTable: from a position straight to its tile, without a walk through the tile records.
+// TileLookupTable: from a position straight to its tile, without a walk through the tile records.
 //
 //   acceleration grid                        block of a tile of the grid's depth g
 //   +----+----+----+----+                    +--+--+--+--+    a number for each place of lastDepth:
@@ -20,7 +20,7 @@
 
 namespace VLN::TileTree3D {
 
-template <class TraitsT> struct PlaceTable {
+template <class TraitsT> struct TileLookupTable {
   /// Levels below the grid's depth that a block resolves.
   static constexpr int kLevels = TraitsT::kTW == 2 ? 2 : 1;
   /// Cells, and depths of answers: no tile at all there; and tiles of deeper roots alone, to be asked of the

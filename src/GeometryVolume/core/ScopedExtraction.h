@@ -1,4 +1,4 @@
-// TakenComponent: a component that is out of its object for as long as this lives.
+// ScopedExtraction: a component that is out of its object for as long as this lives.
 #pragma once
 
 #include "GeometryVolume/core/Object.h"
@@ -10,10 +10,10 @@ namespace VLN::Internal {
 /// As Object::extractComponent and putComponent, but the key keeps its place among the object's properties,
 /// and the component comes back whatever is thrown. A component that only the object holds is not copied, so
 /// the caller must hold no handle of its own.
-template <class T> class TakenComponent {
+template <class T> class ScopedExtraction {
 public:
   /// @pre The property is a `T`.
-  TakenComponent(VLN::Object& object, Ostil::String const& name)
+  ScopedExtraction(VLN::Object& object, Ostil::String const& name)
       : m_object(&object)
       , m_name(name) {
     auto shared = Ostil::staticCast<T>(object.component(name));
@@ -29,12 +29,12 @@ public:
       throw;
     }
   }
-  TakenComponent(TakenComponent&& other) noexcept
+  ScopedExtraction(ScopedExtraction&& other) noexcept
       : m_object(std::exchange(other.m_object, nullptr))
       , m_name(std::move(other.m_name))
       , m_component(std::move(other.m_component)) {}
-  TakenComponent& operator=(TakenComponent&&) = delete;
-  ~TakenComponent() {
+  ScopedExtraction& operator=(ScopedExtraction&&) = delete;
+  ~ScopedExtraction() {
     if (m_object) putBack(std::move(m_component));
   }
   T& operator*() const { return *m_component; }
