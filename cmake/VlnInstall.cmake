@@ -6,13 +6,13 @@ include(CMakePackageConfigHelpers)
 set(include_dir "${CMAKE_INSTALL_INCLUDEDIR}/GeometryVolume")
 set(package_dir "${CMAKE_INSTALL_LIBDIR}/cmake/GeometryVolume")
 
-install(TARGETS GeometryVolume EXPORT GeometryVolumeTargets
+install(TARGETS GeometryVolume GeometryVolumeRender GeometryVolumeReader EXPORT GeometryVolumeTargets
   RUNTIME DESTINATION "${CMAKE_INSTALL_BINDIR}"
   LIBRARY DESTINATION "${CMAKE_INSTALL_LIBDIR}"
   ARCHIVE DESTINATION "${CMAKE_INSTALL_LIBDIR}")
 install(EXPORT GeometryVolumeTargets NAMESPACE GeometryVolume:: DESTINATION "${package_dir}")
 
-set(rooms Ostil Velorn vljemalloc Reader GeometryVolume)
+set(rooms Ostil Velorn vljemalloc Reader Render GeometryVolume)
 if(TARGET GeometryVolumeInterop)
   list(APPEND rooms Interop)
   install(TARGETS GeometryVolumeInterop EXPORT GeometryVolumeInteropTargets

@@ -37,6 +37,15 @@ foreach(room IN LISTS rooms)
   target_link_libraries(${target} PRIVATE
     test_support GeometryVolume TBB::tbb Threads::Threads ${CMAKE_DL_LIBS}
     GTest::gmock GTest::gtest GTest::gtest_main)
+  if(room STREQUAL "render")
+    target_link_libraries(${target} PRIVATE GeometryVolumeRender)
+    if(vln_cuda) # compiled, not run
+      add_library(test_render_kernels OBJECT tests/render/Kernels.cu)
+      target_link_libraries(test_render_kernels PRIVATE GeometryVolumeReader)
+      target_compile_options(test_render_kernels PRIVATE --fmad=false)
+      set_target_properties(test_render_kernels PROPERTIES CUDA_STANDARD 17 CUDA_STANDARD_REQUIRED ON)
+    endif()
+  endif()
   if(room STREQUAL "faults" AND TARGET GeometryVolumeInterop)
     target_link_libraries(${target} PRIVATE GeometryVolumeInterop)
     target_compile_definitions(${target} PRIVATE VLN_TEST_INTEROP)

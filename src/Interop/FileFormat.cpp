@@ -21,13 +21,14 @@ struct Row {
 // By suffix: the order of lists.
 constexpr Row kTable[] = {
     {FileFormat::kCsv, ".csv", {}, FileContent::kValues},
-    {FileFormat::kJson, ".json", {}, {}},
+    {FileFormat::kExr, ".exr", {}, FileContent::kRenderings},
+    {FileFormat::kJson, ".json", {}, FileContent::kParameters},
     {FileFormat::kNpz, ".npz", {}, FileContent::kDense},
     {FileFormat::kNvtt, ".nvtt", FileContent::kVolumes | FileContent::kFlatBuffers,
      FileContent::kVolumes | FileContent::kFlatBuffers},
     {FileFormat::kObj, ".obj", {}, FileContent::kBoxes | FileContent::kPoints},
     {FileFormat::kPly, ".ply", FileContent::kPoints, FileContent::kPoints | FileContent::kPointData},
-    {FileFormat::kPng, ".png", {}, FileContent::kPictures},
+    {FileFormat::kPng, ".png", {}, FileContent::kPictures | FileContent::kRenderings},
     {FileFormat::kVdb, ".vdb", FileContent::kVolumes | FileContent::kGrids | FileContent::kPoints,
      FileContent::kVolumes | FileContent::kGrids | FileContent::kPoints | FileContent::kPointData},
     {FileFormat::kVti, ".vti", {}, FileContent::kDense},
@@ -52,7 +53,10 @@ char const* nameOf(FileContent content) {
   case FileContent::kBoxes:
     return "boxes";
   case FileContent::kPictures:
+  case FileContent::kRenderings:
     return "pictures";
+  case FileContent::kParameters:
+    return "parameters";
   case FileContent::kValues:
     return "values";
   case FileContent::kDense:

@@ -8,19 +8,21 @@
 
 namespace VLN::Interop {
 
-enum class FileFormat { kUnknown, kVdb, kNvtt, kPly, kObj, kPng, kCsv, kJson, kNpz, kVti };
+enum class FileFormat { kUnknown, kVdb, kNvtt, kPly, kObj, kPng, kCsv, kJson, kNpz, kVti, kExr };
 
 /// What a file holds, as messages call it.
 enum class FileContent : unsigned {
-  kVolumes = 1,     ///< "volumes": trees with channels
-  kGrids = 2,       ///< "grids": what is read and written again without loss
-  kFlatBuffers = 4, ///< "flat buffers"
-  kPoints = 8,      ///< "points"
-  kBoxes = 16,      ///< "boxes"
-  kPictures = 32,   ///< "pictures"
-  kValues = 64,     ///< "values": tables
-  kDense = 128,     ///< "dense boxes": arrays of one depth
-  kPointData = 256, ///< "points" again, with all that they have
+  kVolumes = 1,       ///< "volumes": trees with channels
+  kGrids = 2,         ///< "grids": what is read and written again without loss
+  kFlatBuffers = 4,   ///< "flat buffers"
+  kPoints = 8,        ///< "points"
+  kBoxes = 16,        ///< "boxes"
+  kPictures = 32,     ///< "pictures"
+  kValues = 64,       ///< "values": tables
+  kDense = 128,       ///< "dense boxes": arrays of one depth
+  kPointData = 256,   ///< "points" again, with all that they have
+  kRenderings = 512,  ///< "pictures" with opacity and depth
+  kParameters = 1024, ///< "parameters" of a picture
 };
 constexpr FileContent operator|(FileContent a, FileContent b) {
   return FileContent(unsigned(a) | unsigned(b));

@@ -4,6 +4,7 @@
 #include "GeometryVolume/sampling/VoxelSamplerLinear.h"
 #include "GeometryVolume/topology/Command.h"
 #include "Reader/NanoVTTCursor.h"
+#include "Reader/NanoVTTStructures.h"
 
 #include <gtest/gtest.h>
 
@@ -96,6 +97,79 @@ TEST(Cursor, RequirementBlendsAsTheSampler) {
     worst = std::max(worst, std::abs(cursor.trilinear(p.x, p.y, p.z) - sampler.sample(p, kSamplerTileSpace)));
   }
   EXPECT_LE(worst, 2e-6f);
+}
+
+// requirement: the derivative is that of the blend
+TEST(Cursor, RequirementGradientIsTheBlendsOwn) {
+  Ball const ball;
+  for (float halo : {0.0f, 1.0f}) {
+    auto const flat = ball.flatten(halo, false);
+    nanovtt::GridCursor cursor(nanovtt::BufferReader(flat.data()).grid(0));
+    std::mt19937 random(5);
+    for (int n = 0; n < 5000; ++n) {
+      // Inside of cells of every width, so that a step to both sides stays in the cell.
+      float p[3];
+      for (float& c : p) c = float(int(random() % 96)) - 48.0f + 0.25f + 0.5f * float(random() % 1000) / 1000;
+      float g[3];
+      ASSERT_EQ(cursor.trilinear(p[0], p[1], p[2], g), cursor.trilinear(p[0], p[1], p[2]));
+      for (int a = 0; a < 3; ++a) {
+        float q[3] = {p[0], p[1], p[2]};
+        q[a] = p[a] + 0.125f;
+        float const above = cursor.trilinear(q[0], q[1], q[2]);
+        q[a] = p[a] - 0.125f;
+        ASSERT_NEAR(g[a], (above - cursor.trilinear(q[0], q[1], q[2])) / 0.25f, 2e-5f)
+            << p[0] << ' ' << p[1] << ' ' << p[2] << " axis " << a << " halo " << halo;
+      }
+    }
+  }
+}
+
+// requirement: a cursor that stops above the deepest tiles reads what lookups to that depth read
+TEST(Cursor, RequirementStopsAtADepth) {
+  Ball const ball;
+  auto const flat = ball.flatten(0.5f, false);
+  auto const grid = nanovtt::BufferReader(flat.data()).grid(0);
+  for (int depth = 24; depth <= 28; ++depth) {
+    nanovtt::GridCursor cursor(grid, depth);
+    std::mt19937 random(6);
+    for (int n = 0; n < 20000; ++n) {
+      int const x = int(random() % 100) - 50, y = int(random() % 100) - 50, z = int(random() % 40) - 20;
+      ASSERT_EQ(double(cursor.value(x, y, z)), grid.valueAt(x, y, z, 0, depth)) << depth;
+    }
+  }
+}
+
+// requirement: the structures beside the buffer say what the tree says
+TEST(Structures, RequirementPlacesAndNeighbours) {
+  Ball const ball;
+  Buffer const pool;
+  Buffer traversal, neighbors;
+  auto const flat = nanovtt::vttToNanoVTT<Buffer, void, nanovdb::AbsDiff, true>(
+      *ball.object, "density", nanovdb::StatsMode(0), nanovdb::ChecksumMode(0), 0, -1.0f, false, 0.0f,
+      ball.rootLevel, 0, false, false, false, 1, false, false, 0.0f, false, true, &traversal, &neighbors,
+      nullptr, pool);
+  nanovtt::ContainerReader const tree(flat.data());
+  ASSERT_TRUE(nanovtt::TraversalReader::holdsRows(traversal.size(), tree.tileCount()));
+  ASSERT_TRUE(nanovtt::NeighborReader::holdsRows(neighbors.size(), tree.tileCount()));
+  EXPECT_FALSE(nanovtt::TraversalReader::holdsRows(traversal.size() - 1, tree.tileCount()));
+  nanovtt::TraversalReader const places(traversal.data());
+  nanovtt::NeighborReader const around(neighbors.data());
+  int found = 0;
+  tree.forEachTile([&](nanovtt::TileRef const& tile) {
+    auto const place = places.tile(tile.number);
+    EXPECT_EQ(place.depth, tile.depth);
+    EXPECT_EQ(place.corner.x, tile.corner.x);
+    EXPECT_EQ(place.corner.y, tile.corner.y);
+    EXPECT_EQ(place.corner.z, tile.corner.z);
+    for (int n = 0; n < 27; ++n) {
+      int const dx = n / 9 - 1, dy = n / 3 % 3 - 1, dz = n % 3 - 1, w = tile.width();
+      auto const there =
+          tree.find(tile.corner.x + dx * w, tile.corner.y + dy * w, tile.corner.z + dz * w, tile.depth);
+      ASSERT_EQ(around.neighbor(tile.number, dx, dy, dz), there.number) << tile.number << ' ' << n;
+      found += there.valid();
+    }
+  });
+  EXPECT_GT(found, 1000);
 }
 
 // negative

@@ -10,6 +10,7 @@ std::vector<Command> const& commandTable() {
       {"info", "Report what a volume file holds", "vln info smoke.vdb", declareInfo},
       {"slice", "Draw a channel on a plane as a PNG picture",
        "vln slice smoke.vdb --channel density --axis z -o slice.png", declareSlice},
+      {"render", "Draw a volume as a picture", "vln render bunny.vdb", declareRender},
       {"convert", "Write a volume file again, through the tree and back", "vln convert smoke.vdb copy.vdb",
        declareConvert},
       {"flatten", "Write a volume as one flat buffer that a GPU reads without pointers",

@@ -19,6 +19,7 @@ void declareValidate(CLI::App& self);
 void declareProbe(CLI::App& self);
 void declareMake(CLI::App& self);
 void declareChurn(CLI::App& self);
+void declareRender(CLI::App& self);
 void declarePoints(CLI::App& self);
 void declareTiles(CLI::App& self);
 void declareAdvect(CLI::App& self);

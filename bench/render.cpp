@@ -1,0 +1,157 @@
+// Rays from a camera that frames the grid, 512 x 512 of them, one thread, as values over items a second:
+//
+//   level set   the first surface of the bunny at 128 voxels, hit or missed, without shading: this library's
+//               rays, OpenVDB's LevelSetRayIntersector and NanoVDB's zero crossing on the same rays
+//   fog         shaded pixels of the preview of the smoke, those beside it included
+#include "BenchGrids.h"
+#include "Interop/Flatten.h"
+#include "Interop/VdbDetails.h"
+#include "Render/Renderer.h"
+#include "Render/Surface.h"
+
+#include <benchmark/benchmark.h>
+#include <openvdb/tools/LevelSetSphere.h>
+#include <openvdb/tools/RayIntersector.h>
+
+#include <memory>
+
+#include <nanovdb/util/HDDA.h>
+#include <nanovdb/util/OpenToNanoVDB.h>
+#include <nanovdb/util/Ray.h>
+
+namespace {
+
+using namespace VLN;
+using namespace VLN::Render;
+
+constexpr int kAcross = 512;
+
+openvdb::FloatGrid::Ptr gridOf(char const* name) {
+  openvdb::initialize();
+  std::string const folder = VLN_BENCH_DATA_DIR;
+  std::filesystem::path const file = std::filesystem::path(folder) / "vdb" / name;
+  std::error_code unknown;
+  if (!folder.empty() && std::filesystem::exists(file, unknown)) return Bench::readFloatGrid(file.string());
+  return openvdb::tools::createLevelSetSphere<openvdb::FloatGrid>(60, {0, 0, 0}, 1, 3);
+}
+
+struct Data {
+  openvdb::FloatGrid::Ptr grid;
+  Interop::VdbImport content;
+  Interop::FlatVolume flat;
+  std::unique_ptr<Field> field;
+  Affine toWorld;
+  Camera camera;
+
+  explicit Data(char const* name)
+      : grid(gridOf(name))
+      , content(Bench::importGrid(grid)) {
+    auto const& volume = content.volumes.at(0);
+    Interop::FlattenOptions options;
+    options.channels = volume.channels.at(0).name, options.haloFraction = 1;
+    flat = Interop::flattenVolume(*volume.object, options);
+    field = std::make_unique<Field>(nanovtt::BufferReader(flat.buffer.data()).grid(0));
+    auto const rows = Interop::matrixOf(volume.indexToWorld);
+    for (int a = 0; a < 3; ++a) {
+      auto const& row = rows[static_cast<std::size_t>(a)];
+      toWorld.rows[a] = {row[0], row[1], row[2]}, toWorld.shift[a] = row[3];
+    }
+    std::vector<Vec3d> outline;
+    for (Vec3 const &p : field->outline([&](float low, float high) { return low != high; }))
+      outline.push_back(toWorld.point(p.as<double>() + field->origin()));
+    camera = Camera({}, outline, 0, 1);
+  }
+  template <class Body> void forRays(Body const& body) const {
+    for (int y = 0; y < kAcross; ++y)
+      for (int x = 0; x < kAcross; ++x) body(camera.ray((x + 0.5) / kAcross, (y + 0.5) / kAcross));
+  }
+};
+
+Data& bunny() {
+  static Data data("bunny_ls_128.vdb");
+  return data;
+}
+
+void finish(benchmark::State& state, std::int64_t hits) {
+  state.SetItemsProcessed(state.iterations() * kAcross * kAcross);
+  state.counters["hits"] = static_cast<double>(hits);
+}
+
+void levelSetOurs(benchmark::State& state) {
+  Data& data = bunny();
+  data.field->weigh([](float low, float high) { return crosses(low, high, 0) ? 1.0f : 0.0f; });
+  FieldView const& view = data.field->view();
+  Affine local = data.toWorld.inverse();
+  local.shift = local.shift - data.field->origin();
+  Vec3d const eye = local.point(data.camera.position);
+  // As render() does it: floats begin near the box.
+  double const near = 0.5 * length(data.camera.position - data.camera.focalPoint);
+  std::int64_t hits = 0;
+  for (auto _ : state) {
+    hits = 0;
+    data.forRays([&](Vec3d const& world) {
+      Vec3d const d = local.vector(world);
+      Ray const ray((eye + d * near).as<float>(), d.as<float>());
+      float t;
+      hits += hitSurface(view, ray, 0, 3e38f, 0, t);
+    });
+  }
+  finish(state, hits);
+}
+BENCHMARK(levelSetOurs)->Name("level set/this library")->Unit(benchmark::kMillisecond);
+
+void levelSetOpenVdb(benchmark::State& state) {
+  Data& data = bunny();
+  openvdb::tools::LevelSetRayIntersector<openvdb::FloatGrid> intersector(*data.grid);
+  Vec3d const p = data.camera.position;
+  std::int64_t hits = 0;
+  for (auto _ : state) {
+    hits = 0;
+    data.forRays([&](Vec3d const& d) {
+      openvdb::math::Ray<double> const ray({p.x, p.y, p.z}, {d.x, d.y, d.z});
+      openvdb::Vec3d at;
+      hits += intersector.intersectsWS(ray, at);
+    });
+  }
+  finish(state, hits);
+}
+BENCHMARK(levelSetOpenVdb)->Name("level set/OpenVDB LevelSetRayIntersector")->Unit(benchmark::kMillisecond);
+
+void levelSetNano(benchmark::State& state) {
+  Data& data = bunny();
+  auto const handle = nanovdb::openToNanoVDB(*data.grid);
+  auto const* const grid = handle.grid<float>();
+  auto accessor = grid->getAccessor();
+  Vec3d const p = data.camera.position;
+  std::int64_t hits = 0;
+  for (auto _ : state) {
+    hits = 0;
+    data.forRays([&](Vec3d const& d) {
+      nanovdb::Ray<float> const world({float(p.x), float(p.y), float(p.z)},
+                                      {float(d.x), float(d.y), float(d.z)});
+      auto ray = world.worldToIndexF(*grid);
+      nanovdb::Coord cell;
+      float value, t;
+      hits += nanovdb::ZeroCrossing(ray, accessor, cell, value, t);
+    });
+  }
+  finish(state, hits);
+}
+BENCHMARK(levelSetNano)
+    ->Name("level set/NanoVDB ZeroCrossing (voxel, not root)")
+    ->Unit(benchmark::kMillisecond);
+
+void fogOurs(benchmark::State& state) {
+  static Data data("smoke.vdb");
+  RenderOptions options;
+  options.width = options.height = kAcross;
+  options.threads = 1;
+  options.transfer.high = data.field->high();
+  double seconds = 0;
+  for (auto _ : state) seconds = render(*data.field, data.toWorld, data.camera, options).seconds;
+  finish(state, 0);
+  state.counters["rays alone, s"] = seconds;
+}
+BENCHMARK(fogOurs)->Name("fog/this library, preview with its preparation")->Unit(benchmark::kMillisecond);
+
+} // namespace

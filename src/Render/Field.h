@@ -1,0 +1,92 @@
+// Field: what rays need of a grid beside its buffer, made once and in parallel.
+#pragma once
+
+#include "Render/Export.h"
+#include "Render/FieldView.h"
+
+#include <functional>
+#include <vector>
+
+namespace VLN::Render {
+
+/// Smallest and largest value of a tile and of all below it, the layer beyond its high sides included: no
+/// blend that begins in the tile lies outside. Codes of 16 bits between the bounds of the field, rounded
+/// outward.
+struct TileBounds {
+  std::uint16_t low, high;
+};
+
+struct FieldOptions {
+  int component = -1; ///< of vectors; -1 for their length
+  int threads = 0;    ///< 0: one for each processor
+};
+
+class VLN_RENDER_API Field {
+public:
+  /// Samples of tiles of floats that have their layer already stay where they are; others are gathered
+  /// beside the buffer, as floats: quantised ones, other types, vectors by their length. What is no finite
+  /// number counts as the background.
+  /// @pre The buffer was validated, and lives longer than this.
+  /// @error std::invalid_argument for a component that the grid lacks, and for a grid whose box is wider
+  /// than rays can be told apart in.
+  /// @numeric The same for any number of threads.
+  explicit Field(nanovtt::GridReader const& grid, FieldOptions const& options = {});
+
+  /// Of all samples. Both 0 without tiles.
+  float low() const { return m_low; }
+  float high() const { return m_high; }
+  float background() const { return m_view.background; }
+  std::uint32_t tileCount() const { return static_cast<std::uint32_t>(m_bounds.size()); }
+  TileBounds bounds(std::uint32_t tile) const { return m_bounds[tile]; }
+  /// What a code stands for. @numeric value(bounds.low) <= each sample <= value(bounds.high).
+  float value(std::uint16_t code) const;
+
+  /// Mean of the values below a tile, each by the volume that it stands for; of the tile's own where it has
+  /// no children.
+  float mean(std::uint32_t tile) const { return m_means[tile]; }
+
+  /// Tile-space position of local (0, 0, 0).
+  Vec3d origin() const { return m_origin; }
+  /// Local box of the active samples: first and last.
+  Vec3 activeLow() const { return m_activeLow; }
+  Vec3 activeHigh() const { return m_activeHigh; }
+  bool empty() const { return m_isEmpty; }
+  /// Corners of boxes between which all tiles lie whose bounds pass, cut to the active box; of that box when
+  /// none does.
+  /// @cost Looks at every tile; one thread.
+  std::vector<Vec3> outline(std::function<bool(float low, float high)> const& shows) const;
+
+  /// How much a range of values matters to a picture: 0 for not at all.
+  using Weight = std::function<float(float low, float high)>;
+  /// Weighs all tiles and cells anew; the view is valid until the next call.
+  /// @pre `weight` of a range is no less than that of a range inside it.
+  void weigh(Weight const& weight, int threads = 0);
+  FieldView const& view() const { return m_view; }
+  /// Rays stop at tiles of this depth.
+  void limitDepth(int depth) { m_view.maxDepth = depth; }
+
+  /// Values that differ from the background, of the deepest tiles, sorted: each n-th one, so that at most
+  /// about `count` come.
+  std::vector<float> sortedValues(std::size_t count) const;
+
+private:
+  struct Gather;
+  void place(double const lowest[3], double const highest[3]);
+
+  nanovtt::GridReader m_grid;
+  FieldView m_view;
+  float m_low = 0, m_high = 0;
+  double m_quantum = 0;
+  Vec3d m_origin;
+  Vec3 m_activeLow, m_activeHigh;
+  bool m_isEmpty = true;
+  std::vector<nanovtt::TileRef> m_tiles;
+  std::vector<std::uint64_t> m_bricks;
+  std::vector<float> m_beside;
+  std::vector<TileBounds> m_bounds;
+  std::vector<float> m_means;
+  std::vector<float> m_weights, m_rootWeights;
+  std::vector<std::uint64_t> m_cells;
+};
+
+} // namespace VLN::Render

@@ -1,0 +1,435 @@
+#include "Render/Renderer.h"
+
+#include "Render/Colors.h"
+#include "Render/Fog.h"
+#include "Render/LightLatticeImpl.h"
+#include "Render/Surface.h"
+#include "Render/Threads.h"
+
+#include <algorithm>
+#include <chrono>
+#include <cmath>
+#include <limits>
+#include <stdexcept>
+
+namespace VLN::Render {
+
+namespace {
+
+using Clock = std::chrono::steady_clock;
+
+constexpr std::int64_t kRowGrain = 4;
+constexpr float kNowhere = std::numeric_limits<float>::infinity();
+constexpr Vec3 kKeyLight{1.0f, 0.96f, 0.9f}, kSky{0.55f, 0.6f, 0.68f}, kGround{0.22f, 0.2f, 0.19f};
+constexpr Vec3 kClay{0.72f, 0.68f, 0.62f};
+/// The most points of a lattice of light along its longest axis.
+constexpr double kLatticePoints = 128;
+/// Of a march through the diagonal: where voxels are large, steps are smaller than they are.
+constexpr double kFewestSteps = 320;
+
+/// A camera's ray in local space. Its origin is where it enters the field's box.
+struct Start {
+  Vec3d world; ///< unit
+  Vec3 origin, direction;
+  double base = 0; ///< distance from the camera to the origin
+  float end = 0;   ///< distance in the box
+};
+
+struct Scene {
+  Field const& field;
+  Camera const& camera;
+  RenderOptions const& options;
+  Affine toWorld; ///< from local space
+  Affine toLocal;
+  Vec3d eye;       ///< local
+  Vec3d light;     ///< world, unit
+  double diagonal; ///< of the field's box, world length
+
+  bool start(double u, double v, Start& s) const {
+    s.world = camera.ray(u, v);
+    Vec3d const d = toLocal.vector(s.world);
+    double t0 = 0, t1 = std::numeric_limits<double>::max();
+    FieldView const& f = field.view();
+    for (int a = 0; a < 3; ++a) {
+      double const low = double(f.low[a]), high = double(f.high[a]);
+      if (d[a] == 0) {
+        if (eye[a] < low || eye[a] > high) return false;
+        continue;
+      }
+      double const p = (low - eye[a]) / d[a], q = (high - eye[a]) / d[a];
+      t0 = std::max(t0, std::min(p, q)), t1 = std::min(t1, std::max(p, q));
+    }
+    if (!(t0 < t1)) return false;
+    s.base = t0;
+    s.origin = (eye + d * t0).as<float>();
+    s.direction = d.as<float>();
+    s.end = static_cast<float>(t1 - t0);
+    return true;
+  }
+};
+
+struct Sample {
+  Vec3 color;
+  float opacity = 0, depth = 0; ///< depth times opacity
+  Vec3 normal;
+  float value = 0;
+};
+
+/// Smallest world length of a voxel's edges.
+double voxelOf(Affine const& m) { return std::min({m.edge(0), m.edge(1), m.edge(2)}); }
+
+// --- Surfaces
+// -------------------------------------------------------------------------------------------------
+
+struct SurfaceShader {
+  Scene const& scene;
+  int occlusionRays;
+  float reach; ///< of occlusion, world length
+  float lift;  ///< off the surface before other rays start, world length
+
+  Vec3 local(Vec3 w) const { return scene.toLocal.vector(w.as<double>()).as<float>(); }
+
+  bool meets(Vec3 from, Vec3 world, float far) const {
+    Ray const ray(from, local(world));
+    float t;
+    return hitSurface(scene.field.view(), ray, 0, far, scene.options.iso, t);
+  }
+
+  Sample operator()(Start const& s, std::uint32_t pixel, std::uint32_t sample) const {
+    Sample out;
+    Ray const ray(s.origin, s.direction);
+    float t;
+    if (!hitSurface(scene.field.view(), ray, 0, s.end, scene.options.iso, t)) return out;
+    Vec3 const p = ray.at(t);
+    // Gradients go from local space to the world by the transposed inverse.
+    Vec3 n = normalized(scene.toLocal.transposed(gradientAt(scene.field.view(), p).as<double>()).as<float>());
+    Vec3 const view = s.world.as<float>();
+    if (dot(n, n) == 0 || dot(n, view) > 0) n = -n;
+    if (dot(n, n) == 0) n = -view;
+    Vec3 const off = p + local(n) * lift;
+    Vec3 const up = scene.camera.up.as<float>(), toLight = scene.light.as<float>();
+
+    float open = 1;
+    if (occlusionRays > 0) {
+      // One set of directions for all pixels, shifted by pixel: evenly spread, and without a pattern.
+      Random random(pixel, 0xA0u);
+      float const shiftU = random.next(), shiftV = random.next();
+      int met = 0;
+      Vec3 const other = n.x * n.x < 0.5f ? Vec3{1, 0, 0} : Vec3{0, 1, 0};
+      Vec3 const a = normalized(cross(n, other)), b = cross(n, a);
+      for (int r = 0; r < occlusionRays; ++r) {
+        auto const k = static_cast<float>(sample * static_cast<std::uint32_t>(occlusionRays) +
+                                          static_cast<std::uint32_t>(r) + 1);
+        // Additive recurrence by powers of the plastic number (M. Roberts, 2018).
+        float u = shiftU + 0.7548776662f * k, v = shiftV + 0.5698402910f * k;
+        u -= std::floor(u), v -= std::floor(v);
+        float const radius = std::sqrt(u), phi = 6.28318530718f * v;
+        Vec3 const d = a * (radius * std::cos(phi)) + b * (radius * std::sin(phi)) + n * std::sqrt(1 - u);
+        met += meets(off, d, reach);
+      }
+      open = 1 - static_cast<float>(met) / static_cast<float>(occlusionRays);
+    }
+    float const toward = std::max(0.0f, dot(n, toLight));
+    float const lit = toward > 0 && !(occlusionRays > 0 && meets(off, toLight, 3e38f)) ? toward : 0;
+    float const side = 0.5f + 0.5f * dot(n, up);
+    Vec3 const half = normalized(toLight - view);
+    float const gloss = lit > 0 ? 0.12f * std::pow(std::max(0.0f, dot(n, half)), 40.0f) : 0;
+    Vec3 const ambient = (kGround * (1 - side) + kSky * side) * (0.75f * open);
+    out.color = kClay * (ambient + kKeyLight * (0.85f * lit)) + kKeyLight * gloss;
+    out.opacity = 1;
+    out.depth = static_cast<float>(s.base) + t;
+    out.normal = n;
+    return out;
+  }
+};
+
+// --- Projections
+// ------------------------------------------------------------------------------------------------
+
+struct ProjectionShader {
+  Scene const& scene;
+  float step; ///< world length
+  bool isMean;
+
+  Sample operator()(Start const& s, std::uint32_t, std::uint32_t) const {
+    Sample out;
+    FieldView const& f = scene.field.view();
+    float const background = f.background;
+    Ray const ray(s.origin, s.direction);
+    Walk walk(f, ray, 0, s.end);
+    Segment piece;
+    float best = scene.field.low(), first = -1;
+    double sum = 0;
+    bool any = false;
+    while (walk.next(piece, isMean || !any ? 0 : best - scene.field.low())) {
+      int const count = 1 + static_cast<int>((piece.t1 - piece.t0) / step);
+      float const dt = (piece.t1 - piece.t0) / static_cast<float>(count);
+      for (int n = 0; n < count; ++n) {
+        float const t = piece.t0 + (static_cast<float>(n) + 0.5f) * dt;
+        float const v = trilinear(piece.brick, piece.samples(ray.at(t)));
+        if (isMean) {
+          sum += double(v - background) * double(dt);
+          if (first < 0 && v != background) first = t;
+        } else if (!any || v > best) {
+          best = v, first = t;
+        }
+        any = true;
+      }
+    }
+    if (!any) return out;
+    out.value = isMean ? background + static_cast<float>(sum / double(s.end)) : best;
+    out.opacity = 1;
+    out.depth = static_cast<float>(s.base) + std::max(first, 0.0f);
+    return out;
+  }
+};
+
+// --- Fogs
+// -------------------------------------------------------------------------------------------------------
+
+struct FogShader {
+  FogView const& fog;
+  bool isFinal;
+
+  Sample operator()(Start const& s, std::uint32_t pixel, std::uint32_t sample) const {
+    Ray const ray(s.origin, s.direction);
+    Random random(pixel, sample);
+    float const shift = static_cast<float>(std::fmod(s.base, double(fog.step)));
+    Vec3 const world = s.world.as<float>();
+    FogSample const f =
+        isFinal ? traceFog(fog, ray, world, 0, s.end, random) : marchFog(fog, ray, world, 0, s.end, shift);
+    Sample out;
+    out.color = f.color, out.opacity = f.opacity;
+    out.depth = f.depth + static_cast<float>(s.base) * f.opacity;
+    return out;
+  }
+};
+
+/// A length over which the field is neither clear nor a wall: most rays from the camera that meet anything
+/// have an optical depth below 3, the denser half of them more than about 1.
+double chooseUnit(Scene const& scene, FogView& fog, double voxel) {
+  constexpr int kAcross = 40;
+  constexpr double kThick = 3.0, kShare = 0.9;
+  std::vector<float> depths(kAcross * kAcross);
+  fog.perUnit = 1;
+  forRanges(kAcross * kAcross, 16, scene.options.threads, [&](std::int64_t begin, std::int64_t end) {
+    for (std::int64_t n = begin; n < end; ++n) {
+      Start s;
+      if (!scene.start((double(n % kAcross) + 0.5) / kAcross, (double(n / kAcross) + 0.5) / kAcross, s))
+        continue;
+      Ray const ray(s.origin, s.direction);
+      depths[static_cast<std::size_t>(n)] = opticalDepth(fog, ray, 0, s.end, static_cast<float>(2 * voxel));
+    }
+  });
+  std::erase_if(depths, [](float d) { return !(d > 0); });
+  if (depths.empty()) return voxel;
+  auto const at = depths.begin() + static_cast<std::ptrdiff_t>(kShare * double(depths.size() - 1));
+  std::nth_element(depths.begin(), at, depths.end());
+  return double(*at) / kThick;
+}
+
+/// Rays end at the depth whose samples are about as wide as a pixel where the camera is nearest.
+void limitDepth(Field& field, Scene const& scene, RenderOptions const& options, double voxel) {
+  int depth = options.depth;
+  if (depth < 0) {
+    Vec3d nearest = scene.eye; // of the box, local
+    for (int a = 0; a < 3; ++a)
+      nearest[a] = std::clamp(nearest[a], double(field.activeLow()[a]), double(field.activeHigh()[a]));
+    double const distance = dot(scene.toWorld.point(nearest) - scene.camera.position, scene.camera.forward);
+    double const pixel = 2 * scene.camera.halfHeight / options.height * std::max(distance, 0.0);
+    double const voxels = pixel / voxel;
+    depth = nanovtt::kMaxDepth - (voxels >= 2 ? static_cast<int>(std::floor(std::log2(voxels))) : 0);
+  }
+  int const root = nanovtt::kTileSpaceBits - field.view().rootShift;
+  field.limitDepth(std::clamp(depth, root, nanovtt::kMaxDepth));
+}
+
+} // namespace
+
+Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, RenderOptions const& options,
+               std::function<void(double)> const& watch) {
+  if (options.width < 1 || options.height < 1 || options.width > 32768 || options.height > 32768)
+    throw std::invalid_argument("a picture has 1 to 32768 pixels an axis");
+  double const determinant = tileToWorld.determinant();
+  if (!std::isfinite(determinant) || determinant == 0)
+    throw std::invalid_argument("its transform cannot be inverted");
+  Affine toWorld = tileToWorld;
+  toWorld.shift = tileToWorld.point(field.origin());
+  Scene scene{field, camera, options, toWorld, toWorld.inverse(), {}, {}, {}};
+  scene.diagonal = length(tileToWorld.vector((field.view().high - field.view().low).as<double>()));
+  scene.eye = scene.toLocal.point(camera.position);
+  scene.light = length(options.light) > 0
+                    ? normalized(options.light)
+                    : normalized(camera.up * 0.9 - camera.right * 0.75 - camera.forward * 0.8);
+
+  bool const isFinal = options.quality == Quality::kFinal, isFog = options.mode == Mode::kFog;
+  double const voxel = voxelOf(tileToWorld);
+  Picture picture;
+  picture.width = options.width, picture.height = options.height;
+  Transfer transfer(options.transfer);
+  picture.low = options.transfer.low, picture.high = options.transfer.high;
+
+  limitDepth(field, scene, options, voxel);
+  FogView fog;
+  LightLattice direct, above;
+  switch (options.mode) {
+  case Mode::kSurface:
+    field.weigh([&](float low, float high) { return crosses(low, high, options.iso) ? 1.0f : 0.0f; },
+                options.threads);
+    break;
+  case Mode::kMaximum:
+    field.weigh(
+        [&](float low, float high) {
+          return low == high && high == field.background() ? 0 : std::max(high - field.low(), 1e-30f);
+        },
+        options.threads);
+    break;
+  case Mode::kMean:
+    field.weigh(
+        [&](float low, float high) { return low == high && high == field.background() ? 0.0f : 1.0f; },
+        options.threads);
+    break;
+  case Mode::kFog:
+    field.weigh([&](float low, float high) { return transfer.largestOpacity(low, high); }, options.threads);
+    fog.transfer = &transfer.view();
+    fog.field = field.view();
+    fog.colored = options.colored;
+    fog.albedo = static_cast<float>(options.albedo);
+    fog.anisotropy = static_cast<float>(options.anisotropy);
+    fog.light = scene.light.as<float>();
+    fog.lightLocal = scene.toLocal.vector(scene.light).as<float>();
+    for (int a = 0; a < 3; ++a) fog.worldToLocal[a] = scene.toLocal.rows[a].as<float>();
+    fog.viewUp = camera.viewUp.as<float>();
+    fog.lightColor = kKeyLight * (isFinal ? 0.32f : 1.6f);
+    fog.sky = kSky * (isFinal ? 0.8f : 0.35f);
+    fog.ground = kGround * (isFinal ? 1.2f : 0.5f);
+    fog.bounces = options.bounces;
+    fog.step = static_cast<float>(std::min(0.8 * voxel, scene.diagonal / kFewestSteps));
+    picture.opacityUnit = options.opacityUnit > 0 ? options.opacityUnit : chooseUnit(scene, fog, voxel);
+    fog.perUnit = static_cast<float>(1 / picture.opacityUnit);
+    if (!isFinal) {
+      Vec3 spacing;
+      double longest = 0;
+      for (int pass = 0; pass < 2; ++pass)
+        for (int a = 0; a < 3; ++a) {
+          double const edge = tileToWorld.edge(a);
+          double const extent = edge * double(fog.field.high[a] - fog.field.low[a]);
+          if (pass == 0) longest = std::max(longest, extent);
+          spacing[a] = static_cast<float>(std::max(1.0, longest / kLatticePoints / edge));
+        }
+      direct = sweepLight(fog, fog.lightLocal, spacing, options.threads);
+      above = sweepLight(fog, scene.toLocal.vector(camera.viewUp).as<float>(), spacing, options.threads);
+      fog.direct = direct.view, fog.above = above.view;
+    }
+    break;
+  }
+
+  auto const count = static_cast<std::size_t>(options.width) * static_cast<std::size_t>(options.height);
+  picture.color.resize(count), picture.opacity.resize(count);
+  picture.depth.resize(count), picture.normal.resize(count);
+  if (!isFog && options.mode != Mode::kSurface) picture.value.resize(count);
+  int const samples = options.samples > 0              ? options.samples
+                      : options.mode == Mode::kSurface ? (isFinal ? 64 : 4)
+                      : isFog                          ? (isFinal ? 64 : 1)
+                                                       : (isFinal ? 16 : 1);
+
+  auto const pass = [&](int sample, auto const& shader) {
+    forRanges(
+        options.height, kRowGrain, options.threads,
+        [&](std::int64_t begin, std::int64_t end) {
+          for (std::int64_t y = begin; y < end; ++y)
+            for (int x = 0; x < options.width; ++x) {
+              auto const n = static_cast<std::size_t>(y) * static_cast<std::size_t>(options.width) +
+                             static_cast<std::size_t>(x);
+              auto const pixel = static_cast<std::uint32_t>(n);
+              double du = 0.5, dv = 0.5;
+              if (samples > 1) {
+                // The same recurrence as above, from the middle on.
+                du += 0.7548776662 * (sample + 1), dv += 0.5698402910 * (sample + 1);
+                du -= std::floor(du), dv -= std::floor(dv);
+              }
+              Start s;
+              if (!scene.start((x + du) / options.width, (double(y) + dv) / options.height, s)) continue;
+              Sample const got = shader(s, pixel, static_cast<std::uint32_t>(sample));
+              if (!(got.opacity > 0)) continue;
+              picture.color[n] = picture.color[n] + got.color;
+              picture.opacity[n] += got.opacity;
+              picture.depth[n] += got.depth;
+              picture.normal[n] = picture.normal[n] + got.normal;
+              if (!picture.value.empty()) picture.value[n] += got.value;
+            }
+        },
+        [&](double share) {
+          if (watch) watch((sample + share) / samples);
+        });
+  };
+  auto const began = Clock::now();
+  auto const seconds = [&] { return std::chrono::duration<double>(Clock::now() - began).count(); };
+  int done = 0;
+  for (; done < samples; ++done) {
+    if (done > 0 && options.timeLimit > 0 && seconds() >= options.timeLimit) break;
+    if (options.mode == Mode::kSurface) {
+      int const rays = options.occlusionRays >= 0 ? options.occlusionRays : 2;
+      pass(done, SurfaceShader{scene, rays, static_cast<float>(0.15 * scene.diagonal),
+                               static_cast<float>(0.5 * voxel)});
+    } else if (isFog) {
+      pass(done, FogShader{fog, isFinal});
+    } else {
+      pass(done, ProjectionShader{scene, static_cast<float>(0.5 * voxel), options.mode == Mode::kMean});
+    }
+  }
+  picture.seconds = seconds();
+  picture.samples = done;
+  picture.rays = static_cast<std::int64_t>(count) * done;
+
+  float const scale = done > 0 ? 1 / static_cast<float>(done) : 0;
+  for (std::size_t n = 0; n < count; ++n) {
+    float const opacity = picture.opacity[n];
+    picture.depth[n] = opacity > 0 ? picture.depth[n] / opacity : kNowhere;
+    picture.normal[n] = normalized(picture.normal[n]);
+    if (!picture.value.empty() && opacity > 0) picture.value[n] /= opacity;
+    picture.color[n] = picture.color[n] * scale;
+    picture.opacity[n] = opacity * scale;
+  }
+  if (!picture.value.empty()) {
+    if (options.rangeFromPicture) {
+      picture.low = std::numeric_limits<float>::max(), picture.high = -picture.low;
+      for (std::size_t n = 0; n < count; ++n)
+        if (picture.opacity[n] > 0)
+          picture.low = std::min(picture.low, picture.value[n]),
+          picture.high = std::max(picture.high, picture.value[n]);
+      if (!(picture.low < picture.high))
+        picture.low = options.transfer.low, picture.high = options.transfer.high;
+      TransferOptions own = options.transfer;
+      own.low = picture.low, own.high = picture.high;
+      if (own.log) own.low = picture.low = std::max(picture.low, picture.high * 1e-4f);
+      if (own.low < own.high) transfer = Transfer(own);
+    }
+    auto const& map = transfer.view();
+    for (std::size_t n = 0; n < count; ++n) {
+      float const place = map.place(picture.value[n]);
+      // The lowest tenth of the range fades, so that what is nearly nothing does not cover the background.
+      picture.opacity[n] *= std::min(1.0f, 10 * place);
+      picture.color[n] = map.colorAt(place) * picture.opacity[n];
+    }
+  }
+  return picture;
+}
+
+std::vector<std::uint8_t> toBytes(Picture const& picture, Vec3 background, bool opaque) {
+  std::vector<std::uint8_t> bytes(picture.color.size() * 4);
+  for (std::size_t n = 0; n < picture.color.size(); ++n) {
+    Vec3 c = picture.color[n];
+    float const a = std::min(picture.opacity[n], 1.0f);
+    if (opaque)
+      c = c + background * (1 - a);
+    else if (a > 0)
+      c = c * (1 / a);
+    for (int channel = 0; channel < 3; ++channel)
+      bytes[4 * n + static_cast<std::size_t>(channel)] = toSrgbByte(c[channel]);
+    bytes[4 * n + 3] = opaque ? 255 : static_cast<std::uint8_t>(std::lround(255 * a));
+  }
+  return bytes;
+}
+
+} // namespace VLN::Render
