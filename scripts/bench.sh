@@ -1,5 +1,6 @@
 #!/bin/sh
-# bench.sh [ARGUMENTS]: builds and runs every benchmark and writes the figures to docs/benchmarks.md.
+# bench.sh [ARGUMENTS]: builds and runs every benchmark and writes the figures to docs/benchmarks.md, above the line
+# there below which figures are measured by hand.
 # Arguments go to each binary, such as --benchmark_filter=REGEX or --benchmark_min_time=0.1;
 # with any, the table goes to standard output and the document stays as it is.
 set -eu
@@ -31,6 +32,7 @@ if [ $# -gt 0 ]; then
 else
   mkdir -p docs
   python3 scripts/bench_table.py build/bench "$results"/*.json >"$results/table.md"
+  sed -n '/^<!-- What stands below is measured by hand/,$p' docs/benchmarks.md >>"$results/table.md"
   mv "$results/table.md" docs/benchmarks.md
   echo "bench: wrote docs/benchmarks.md" >&2
 fi

@@ -231,6 +231,8 @@ def test_requirement_other_threads_run_while_a_long_call_does(data):
 
 LONG = """
 import numpy as np, signal, sys, threading, time, vln
+# A process that is started in the background ignores the signal, and so do its children.
+signal.signal(signal.SIGINT, signal.default_int_handler)
 volume = vln.Volume.from_numpy(np.random.default_rng(0).random((64, 64, 64), np.float32))
 channel = volume["density"]
 xyz = np.random.default_rng(1).uniform(-100, 100, (60_000_000, 3))

@@ -82,7 +82,7 @@ class File:
         target = _checks.path_of(path)
         volumes = self._held()
         if len(volumes) == 1 and not self._points:
-            volumes[0].save(target)
+            volumes[0].save(target, progress=progress)
             return
         if os.path.splitext(target)[1].lower() != ".vdb":
             raise _vln.FileError(f"{target}: several volumes, or points, are written as .vdb")

@@ -116,11 +116,15 @@ FileFormat checkOutputFor(FileContent content, std::string const& path) {
   FileFormat const format = formatOf(path);
   bool const fits = isWritten(format, content);
   auto const possible = suffixes(content, &Row::written);
-  bool const only = possible.size() == 1;
-  if (!fits && !(only && (lowerSuffix(path).empty() || findOutputTarget(path).straight)))
+  // What names without a suffix, pipes and devices get.
+  FileFormat const standard = content == FileContent::kRenderings ? FileFormat::kPng
+                              : possible.size() == 1 ? formatOf(std::string("a") + possible.front())
+                                                     : FileFormat::kUnknown;
+  if (!fits &&
+      (standard == FileFormat::kUnknown || !(lowerSuffix(path).empty() || findOutputTarget(path).straight)))
     throw FileError(path, std::string(nameOf(content)) + " are written as " + listOf(possible));
   checkOutput(path);
-  return fits ? format : formatOf(std::string("a") + possible.front());
+  return fits ? format : standard;
 }
 
 } // namespace VLN::Interop

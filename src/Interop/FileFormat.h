@@ -42,7 +42,7 @@ VLN_API std::string suffixesRead(FileContent content);
 VLN_API std::string suffixesWritten(FileContent content);
 
 /// Tells whether content could be written to a file of that name, before the work that leads to it. Pipes and
-/// devices, and for content of a single format names without a suffix, pass.
+/// devices, and names without a suffix, pass where the content has a single format or a usual one.
 /// @return The format.
 /// @error FileError for a suffix that stands for no format of these, and as checkOutput().
 VLN_API FileFormat checkOutputFor(FileContent content, std::string const& path);

@@ -80,7 +80,7 @@ Camera::Camera(CameraOptions const& o, std::vector<Vec3d> const& points, double 
       if (!o.focalPoint) shift[axis] = 0.5 * (a - b);
     }
     focalPoint = focalPoint + right * shift[0] + up * shift[1];
-    distance = std::max(back, 1e-9 * (1 + length(high - low)));
+    distance = std::max({back, 1e-9 * (1 + length(high - low)), 1e-9 * length(focalPoint)});
   }
   position = focalPoint - forward * distance;
   if (o.zoom != 1) {

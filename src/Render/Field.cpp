@@ -328,12 +328,17 @@ void Field::weigh(Weight const& weight, int threads) {
   m_view.cells = m_cells.data();
 }
 
+bool Field::isFinest(std::uint32_t n) const {
+  TileRef const& t = m_tiles[n];
+  return t.valid() && t.width() == m_view.brick(n).core;
+}
+
 std::vector<Vec3> Field::outline(std::function<bool(float, float)> const& shows) const {
   // Of each row of tiles along x the ends are enough.
   std::map<std::tuple<std::int32_t, std::int32_t, int>, std::pair<std::int32_t, std::int32_t>> rows;
   for (std::uint32_t n = 0; n < m_tiles.size(); ++n) {
     TileRef const& t = m_tiles[n];
-    if (t.depth != nanovtt::kMaxDepth) continue;
+    if (!isFinest(n)) continue;
     if (!shows(value(m_bounds[n].low), value(m_bounds[n].high))) continue;
     auto const [at, isNew] = rows.try_emplace({t.corner.y, t.corner.z, t.width()}, t.corner.x, t.corner.x);
     auto& [low, high] = at->second;
@@ -361,11 +366,16 @@ std::vector<float> Field::sortedValues(std::size_t count) const {
   std::vector<float> values;
   std::vector<std::uint32_t> deepest;
   for (std::uint32_t n = 0; n < m_tiles.size(); ++n)
-    if (m_tiles[n].depth == nanovtt::kMaxDepth) deepest.push_back(n);
+    if (isFinest(n)) deepest.push_back(n);
   if (deepest.empty())
     for (std::uint32_t n = 0; n < m_tiles.size(); ++n)
       if (m_tiles[n].valid()) deepest.push_back(n);
-  std::size_t const step = 1 + deepest.size() * nanovtt::kTileSamples / std::max<std::size_t>(count, 1);
+  std::size_t samples = 0;
+  for (std::uint32_t n : deepest) {
+    auto const core = static_cast<std::size_t>(m_view.brick(n).core);
+    samples += core * core * core;
+  }
+  std::size_t const step = 1 + samples / std::max<std::size_t>(count, 1);
   std::size_t next = 0, at = 0;
   for (std::uint32_t n : deepest) {
     Brick const b = m_view.brick(n);

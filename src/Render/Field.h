@@ -70,6 +70,8 @@ public:
   std::vector<float> sortedValues(std::size_t count) const;
 
 private:
+  /// Whether the samples are one apart: of a tile of the deepest depth, or of a merged block of such.
+  bool isFinest(std::uint32_t n) const;
   struct Gather;
   void place(double const lowest[3], double const highest[3]);
 

@@ -123,8 +123,8 @@ NANOVTT_HD inline FogSample marchFog(FogView const& fog, Ray const& ray, Vec3 wo
   Segment s;
   while (through > 2e-3f && walk.next(s)) {
     std::uint64_t const cells = fog.field.cells[s.tile];
-    for (float n = std::ceil((s.t0 + shift) / fog.step);; n += 1) {
-      float const t = n * fog.step - shift;
+    for (auto n = static_cast<std::int64_t>(std::ceil((s.t0 + shift) / fog.step));; ++n) {
+      float const t = static_cast<float>(n) * fog.step - shift;
       if (!(t < s.t1)) break;
       Vec3 const p = ray.at(t);
       Vec3 const u = s.samples(p);
@@ -151,6 +151,12 @@ NANOVTT_HD inline FogSample marchFog(FogView const& fog, Ray const& ray, Vec3 wo
   return out;
 }
 
+/// The end of a free flight from `t` through matter of extinction `most`: always further on.
+NANOVTT_HD inline float fly(float t, float most, Random& random) {
+  float const end = t - std::log(1 - random.next()) / most;
+  return end > t ? end : t + (t > -t ? t : -t) * 2e-7f + 1e-30f;
+}
+
 /// Share of light that comes through, without bias.
 /// @source J. Novák, A. Selle, W. Jarosz, "Residual Ratio Tracking for Estimating Attenuation in
 /// Participating Media", 2014.
@@ -162,7 +168,7 @@ NANOVTT_HD inline float ratioTrack(FogView const& fog, Ray const& ray, float t1,
     float const most = s.weight * fog.perUnit;
     float t = s.t0;
     for (;;) {
-      t -= std::log(1 - random.next()) / most;
+      t = fly(t, most, random);
       if (!(t < s.t1)) break;
       float place;
       through *= 1 - fog.extinction(trilinear(s.brick, s.samples(ray.at(t))), place) / most;
@@ -182,7 +188,7 @@ NANOVTT_HD inline bool collide(FogView const& fog, Ray const& ray, float t0, flo
     float const most = s.weight * fog.perUnit;
     float t = s.t0;
     for (;;) {
-      t -= std::log(1 - random.next()) / most;
+      t = fly(t, most, random);
       if (!(t < s.t1)) break;
       float const sigma = fog.extinction(trilinear(s.brick, s.samples(ray.at(t))), place);
       if (random.next() * most < sigma) {

@@ -30,8 +30,8 @@ Picture renderPoints(PointCloud const& cloud, Camera const& camera, int width, i
     double const r = std::max(0.5 * cloud.radius / (p.z * camera.halfHeight) * tall, 0.71);
     double const x = p.x * wide, y = p.y * tall;
     if (!(x + r >= 0 && y + r >= 0 && x - r <= wide && y - r <= tall)) continue;
-    int const x0 = std::max(0, static_cast<int>(x - r)), x1 = std::min(wide - 1, static_cast<int>(x + r));
-    int const y0 = std::max(0, static_cast<int>(y - r)), y1 = std::min(tall - 1, static_cast<int>(y + r));
+    int const x0 = static_cast<int>(std::max(0.0, x - r)), x1 = static_cast<int>(std::min(wide - 1.0, x + r));
+    int const y0 = static_cast<int>(std::max(0.0, y - r)), y1 = static_cast<int>(std::min(tall - 1.0, y + r));
     auto const z = static_cast<float>(p.z);
     for (int j = y0; j <= y1; ++j)
       for (int i = x0; i <= x1; ++i) {

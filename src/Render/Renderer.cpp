@@ -26,6 +26,8 @@ constexpr Vec3 kClay{0.72f, 0.68f, 0.62f};
 constexpr double kLatticePoints = 128;
 /// Of a march through the diagonal: where voxels are large, steps are smaller than they are.
 constexpr double kFewestSteps = 320;
+/// And where one edge of a voxel is far shorter than the others, larger.
+constexpr double kMostSteps = 65536;
 
 /// A camera's ray in local space. Its origin is where it enters the field's box.
 struct Start {
@@ -228,6 +230,11 @@ double chooseUnit(Scene const& scene, FogView& fog, double voxel) {
   return double(*at) / kThick;
 }
 
+/// Below the size of voxels, and above what a march of bounded length takes: voxels may be far from cubes.
+double stepOf(Scene const& scene, double voxel) {
+  return std::clamp(0.8 * voxel, scene.diagonal / kMostSteps, scene.diagonal / kFewestSteps);
+}
+
 /// Rays end at the depth whose samples are about as wide as a pixel where the camera is nearest.
 void limitDepth(Field& field, Scene const& scene, RenderOptions const& options, double voxel) {
   int depth = options.depth;
@@ -237,7 +244,7 @@ void limitDepth(Field& field, Scene const& scene, RenderOptions const& options, 
       nearest[a] = std::clamp(nearest[a], double(field.activeLow()[a]), double(field.activeHigh()[a]));
     double const distance = dot(scene.toWorld.point(nearest) - scene.camera.position, scene.camera.forward);
     double const pixel = 2 * scene.camera.halfHeight / options.height * std::max(distance, 0.0);
-    double const voxels = pixel / voxel;
+    double const voxels = std::min(pixel / voxel, 1e9);
     depth = nanovtt::kMaxDepth - (voxels >= 2 ? static_cast<int>(std::floor(std::log2(voxels))) : 0);
   }
   int const root = nanovtt::kTileSpaceBits - field.view().rootShift;
@@ -266,7 +273,8 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
   double const voxel = voxelOf(tileToWorld);
   Picture picture;
   picture.width = options.width, picture.height = options.height;
-  Transfer transfer(options.transfer);
+  // Surfaces have no colours of their own: their values may span what a transfer function cannot.
+  Transfer transfer(options.mode == Mode::kSurface ? TransferOptions() : options.transfer);
   picture.low = options.transfer.low, picture.high = options.transfer.high;
 
   limitDepth(field, scene, options, voxel);
@@ -304,7 +312,9 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
     fog.sky = kSky * (isFinal ? 0.8f : 0.35f);
     fog.ground = kGround * (isFinal ? 1.2f : 0.5f);
     fog.bounces = options.bounces;
-    fog.step = static_cast<float>(std::min(0.8 * voxel, scene.diagonal / kFewestSteps));
+    fog.step = static_cast<float>(stepOf(scene, voxel));
+    if (options.opacityUnit > 0 && options.opacityUnit < 1e-3 * voxel)
+      throw std::invalid_argument("the unit of opacity is less than a thousandth of a voxel");
     picture.opacityUnit = options.opacityUnit > 0 ? options.opacityUnit : chooseUnit(scene, fog, voxel);
     fog.perUnit = static_cast<float>(1 / picture.opacityUnit);
     if (!isFinal) {
@@ -401,9 +411,12 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
       if (!(picture.low < picture.high))
         picture.low = options.transfer.low, picture.high = options.transfer.high;
       TransferOptions own = options.transfer;
-      own.low = picture.low, own.high = picture.high;
-      if (own.log) own.low = picture.low = std::max(picture.low, picture.high * 1e-4f);
-      if (own.low < own.high) transfer = Transfer(own);
+      own.low = own.log ? std::max(picture.low, picture.high * 1e-4f) : picture.low, own.high = picture.high;
+      if (own.low < own.high && (!own.log || own.low > 0))
+        transfer = Transfer(own);
+      else
+        own = options.transfer;
+      picture.low = own.low, picture.high = own.high;
     }
     auto const& map = transfer.view();
     for (std::size_t n = 0; n < count; ++n) {

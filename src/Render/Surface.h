@@ -99,7 +99,7 @@ NANOVTT_HD inline bool hitSurface(FieldView const& field, Ray const& ray, float 
     Vec3 const o = s.samples(ray.origin);
     for (int a = 0; a < 3; ++a) {
       int const n = static_cast<int>(u[a]);
-      cell[a] = u[a] < 0 ? 0 : n > last ? last : n;
+      cell[a] = n < 0 ? 0 : n > last ? last : n;
       bool const rises = d[a] > 0;
       way[a] = rises ? 1 : -1;
       step[a] = (rises ? width : -width) * ray.inverse[a];

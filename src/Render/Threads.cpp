@@ -4,7 +4,6 @@
 #include <atomic>
 #include <exception>
 #include <mutex>
-#include <system_error>
 #include <thread>
 #include <vector>
 
@@ -38,8 +37,9 @@ void forRanges(std::int64_t count, std::int64_t grain, int threads,
   };
   std::vector<std::thread> others;
   try {
+    others.reserve(static_cast<std::size_t>(threads));
     for (int n = 1; n < threads; ++n) others.emplace_back(work, false);
-  } catch (std::system_error const&) {} // fewer threads do the same work
+  } catch (std::exception const&) {} // fewer threads do the same work
   work(true);
   for (auto& other : others) other.join();
   if (error) std::rethrow_exception(error);

@@ -1,4 +1,6 @@
 // vln render as people call it: every real file, options, and what goes wrong.
+#include "GeometryVolume/volume/Volume.h"
+#include "Interop/VolumeIo.h"
 #include "support/PngReader.h"
 #include "support/RealVolumes.h"
 #include "support/TempFolder.h"
@@ -267,6 +269,67 @@ TEST_F(RenderProgramTest, RequirementPointsAreDiscs) {
     }
   for (int count : {red, green, blue}) EXPECT_NEAR(count, red, 0.3 * red);
   EXPECT_GT(red, 20);
+}
+
+// regression: names that are filters, or none, or longer than a flat buffer keeps
+TEST_F(RenderProgramTest, RegressionChannelsMayHaveAnyName) {
+  for (std::string const& name :
+       {std::string("a b"), std::string("my-density"), std::string("a*"), std::string(300, 'n')}) {
+    TileTree3D::Volume volume;
+    auto other = volume.addField<float>("a", 0), field = volume.addField<float>(name, 0);
+    other.set(0, 0, 0, 1);
+    for (int i = 0; i < 8; ++i) field.set(i, i, 0, 1);
+    std::string const path = m_folder / "names.vdb";
+    Interop::save(volume, path);
+    EXPECT_GT(drawn(picture(path, {"--channel", name})).count, 20) << name;
+  }
+}
+
+// regression: final paths and marches that stood still, a scalar bar without height
+TEST_F(RenderProgramTest, RegressionExtremesEnd) {
+  TileTree3D::Volume volume;
+  volume.addField<float>("density", 0).set(0, 0, 0, 1);
+  std::string const path = m_folder / "one.vdb", out = m_folder / "p.png";
+  Interop::save(volume, path);
+  for (std::string const unit : {"0.001", "0.01", "1e9"})
+    for (std::string const quality : {"preview", "final"})
+      EXPECT_EQ(
+          vln({"render", path, "--opacity-unit", unit, "--quality", quality, "--size", "8x8", "-o", out})
+              .code,
+          0)
+          << unit;
+  EXPECT_EQ(vln({"render", path, "--opacity-unit", "1e-30", "-o", m_folder / "q.png"}).code, 1);
+  EXPECT_EQ(vln({"render", path, "--mode", "mip", "--scalar-bar", "--size", "2x2", "-o", out}).code, 0);
+  EXPECT_EQ(render(path, {"--mode", "mip", "--log"}).code, 0);
+}
+
+// regression: points that are nowhere left the camera nowhere
+TEST_F(RenderProgramTest, RegressionPointsThatAreNowhereAreLeftOut) {
+  std::string const path = m_folder / "points.ply";
+  auto const write = [&](std::string const& rows) {
+    std::ofstream(path) << "ply\nformat ascii 1.0\nelement vertex 3\nproperty double x\nproperty double y\n"
+                           "property double z\nend_header\n" +
+                               rows;
+  };
+  write("nan 0 0\n0 0 0\n1 1 1\n");
+  EXPECT_GT(drawn(picture(path, {})).count, 4);
+  write("nan 0 0\ninf 0 0\n0 1e308 0\n");
+  expectFailure(vln({"render", path, "-o", m_folder / "q.png"}),
+                path + ": has no points that could be drawn");
+}
+
+// regression: devices were refused, and JSON was mixed with remarks
+TEST_F(RenderProgramTest, RegressionStandardOutput) {
+  std::string const file = torus();
+  RunResult const image = vln({"render", file, "--size", "16x16", "-o", "/dev/stdout"});
+  EXPECT_EQ(image.code, 0) << image.err;
+  EXPECT_EQ(image.out.substr(1, 3), "PNG");
+  RunResult const json =
+      vln({"render", file, "--size", "16x16", "-o", m_folder / "p.png", "--parameters", "/dev/stdout"});
+  EXPECT_EQ(json.out.front(), '{');
+  EXPECT_EQ(json.out.substr(json.out.size() - 2), "}\n");
+  expectFailure(vln({"render", file, "--turntable", "2", "-o", "/dev/stdout"}),
+                "/dev/stdout: several pictures are written as .exr or .png files");
 }
 
 // negative: one line, exit code 1, and no picture

@@ -59,6 +59,9 @@ void convert(ConvertOptions const& options) {
     for (auto const& volume : content.volumes) written += volume.channels.size();
     if (written == 0) throw FileError(options.file, "has no grid that could be written" + whyNot(content));
     if (options.strict) checkWhole(content);
+    if (options.strict && dense && !content.points.empty())
+      throw FileError(content.file,
+                      "would not be written whole: it has points, which dense files do not hold");
     if (dense)
       writeDense(content, format, options.output, bar.progress(0.7, 1));
     else

@@ -164,6 +164,8 @@ void render(RenderCommandOptions const& options) {
   std::string const output =
       options.output.empty() ? std::filesystem::path(options.file).stem().string() + ".png" : options.output;
   checkOutputFor(FileContent::kRenderings, output);
+  if (options.turntable > 0 && formatOf(output) == FileFormat::kUnknown)
+    throw FileError(output, "several pictures are written as .exr or .png files");
   if (!options.parameters.empty()) checkOutputFor(FileContent::kParameters, options.parameters);
   checkBackground(options.background);
   TransferOptions early; // what is wrong with the opacity is told before the file is read
@@ -191,11 +193,15 @@ void render(RenderCommandOptions const& options) {
                           frame.options.transfer.high, frame.picture.opacityUnit);
         else if (frame.hasColors)
           summary += fmt::format("colours: --clim {:.6g},{:.6g}\n", frame.picture.low, frame.picture.high);
+        else if (frame.options.mode == Mode::kSurface && frame.options.iso != 0)
+          summary += fmt::format("surface: --iso {}\n", frame.options.iso);
         summary += "camera: " + cameraText(frame.camera) + "\n";
       }
     } catch (std::invalid_argument const& error) { throw FileError(options.file, error.what()); }
   }
-  remarks(output) << summary;
+  // Beside neither the picture nor the parameters where one of them is standard output.
+  bool const beside = &remarks(options.parameters.empty() ? output : options.parameters) == &std::cerr;
+  (beside ? std::cerr : remarks(output)) << summary;
   if (!note.empty()) std::cerr << fmt::format("vln: {}: note: {}\n", options.file, note);
 }
 

@@ -88,7 +88,8 @@ public:
     int const height = m_height / 2, width = 10 * m_scale, x = m_width - width - 70 * m_scale,
               top = (m_height - height) / 2;
     for (int j = 0; j < height; ++j) {
-      Vec3 const c = transfer.view().colorAt(1 - static_cast<float>(j) / static_cast<float>(height - 1));
+      Vec3 const c =
+          transfer.view().colorAt(1 - static_cast<float>(j) / static_cast<float>(std::max(1, height - 1)));
       box(x, top + j, width, 1, {toSrgbByte(c.x), toSrgbByte(c.y), toSrgbByte(c.z)});
     }
     for (int n = 0; n <= 4; ++n) {
@@ -120,7 +121,7 @@ private:
   int m_width, m_height, m_scale;
 };
 
-std::string vectorText(Vec3d v) { return fmt::format("{:.9g},{:.9g},{:.9g}", v.x, v.y, v.z); }
+std::string vectorText(Vec3d v) { return fmt::format("{},{},{}", v.x, v.y, v.z); }
 
 void writeLight(std::string const& path, Picture const& p) {
   std::vector<float> parts[6];
@@ -140,7 +141,7 @@ void writeLight(std::string const& path, Picture const& p) {
 
 std::string cameraText(Camera const& camera) {
   return fmt::format(
-      "--camera-position {} --camera-focal-point {} --camera-view-up {} --camera-view-angle {:.9g}",
+      "--camera-position {} --camera-focal-point {} --camera-view-up {} --camera-view-angle {}",
       vectorText(camera.position), vectorText(camera.focalPoint), vectorText(camera.viewUp),
       camera.viewAngle);
 }
@@ -197,7 +198,7 @@ void writeParameters(std::string const& path, std::string const& picture, Render
     json["mode"] = "points";
   }
   OutputFile file(path);
-  file.write(json.dump(2) + "\n");
+  file.write(json.dump(2, ' ', false, nlohmann::json::error_handler_t::replace) + "\n");
   file.commit();
 }
 

@@ -101,18 +101,23 @@ std::vector<Vec3> ownColors(PointSet const& set) {
   return colors;
 }
 
-PointCloud cloudOf(std::vector<PointSet> const& sets, int heightAxis) {
+PointCloud cloudOf(std::string const& file, std::vector<PointSet> const& sets, int heightAxis) {
   PointCloud cloud;
   std::array<Vec3, 256> map;
   VLN::Render::colorMap("viridis", map);
   for (PointSet const& set : sets) {
-    auto colors = ownColors(set);
+    // What is nowhere, or too far away for lengths between points to be finite, is not drawn.
+    constexpr double kFarthest = 1e150;
+    auto const own = ownColors(set);
+    std::vector<Vec3> colors;
     std::size_t const first = cloud.positions.size();
     for (std::size_t n = 0; n < set.size(); ++n) {
       auto const p = set.world(n);
+      if (!(std::abs(p.x) < kFarthest && std::abs(p.y) < kFarthest && std::abs(p.z) < kFarthest)) continue;
       cloud.positions.push_back({p.x, p.y, p.z});
+      if (!own.empty()) colors.push_back(own[n]);
     }
-    if (colors.empty() && set.size() > 0) {
+    if (own.empty() && cloud.positions.size() > first) {
       std::vector<double> heights;
       for (std::size_t n = first; n < cloud.positions.size(); ++n)
         heights.push_back(cloud.positions[n][heightAxis]);
@@ -126,6 +131,7 @@ PointCloud cloudOf(std::vector<PointSet> const& sets, int heightAxis) {
     }
     cloud.colors.insert(cloud.colors.end(), colors.begin(), colors.end());
   }
+  if (cloud.positions.empty()) throw FileError(file, "has no points that could be drawn");
   // As large as lets discs on the largest face of the box just cover it.
   Vec3d low = cloud.positions.front(), high = low;
   for (Vec3d const& p : cloud.positions)
@@ -137,6 +143,15 @@ PointCloud cloudOf(std::vector<PointSet> const& sets, int heightAxis) {
 }
 
 // --- Grids
+
+/// Of the channels the one: its name may be anything, and so no filter.
+VLN::Object withOneChannel(VLN::Object object, std::string const& channel) {
+  std::vector<std::string> others;
+  for (auto const& name : object.componentRange())
+    if (name != kVdbContainerName && name != kVdbTopologyName && name != channel) others.push_back(name);
+  for (auto const& name : others) object.eraseProperty(name);
+  return object;
+}
 
 VdbChannel const* preferred(VdbImport const& content, std::vector<std::string> const& flat) {
   auto const usable = [&](VdbChannel const& c) {
@@ -163,7 +178,7 @@ RenderSource renderSource(std::string const& file, std::string const& channel, V
     if (progress) progress("reading", 0);
     auto const set = readPly(file);
     if (set.size() == 0) throw FileError(file, "has no points");
-    source.points = cloudOf({set}, 2);
+    source.points = cloudOf(file, {set}, 2);
     return source;
   }
   auto const content = importVolumes(file, limits, progress);
@@ -179,7 +194,7 @@ RenderSource renderSource(std::string const& file, std::string const& channel, V
         if (auto set = pointSetOf(points); set.size() > 0) sets.push_back(std::move(set));
       if (sets.empty())
         throw FileError(file, "has neither a channel with active voxels that can be drawn nor points");
-      source.points = cloudOf(sets, 1);
+      source.points = cloudOf(file, sets, 1);
       return source;
     }
     source.channel = chosen->name;
@@ -189,17 +204,19 @@ RenderSource renderSource(std::string const& file, std::string const& channel, V
   if (info.activeBox.empty()) throw FileError(file, "channel '" + source.channel + "' has no active voxel");
   auto const details = detailsOf(volume);
   source.gridClass = details[static_cast<std::size_t>(&info - volume.channels.data())].gridClass;
+  if (source.gridClass == "unknown") source.gridClass.clear();
   auto const flat = flatChannels(*volume.object, "*");
   if (std::find(flat.begin(), flat.end(), source.channel) == flat.end())
     throw FileError(file, "channel '" + oneLine(source.channel, 60) +
                               "' is of a type that cannot be drawn: " + info.type);
   FlattenOptions options;
-  options.channels = source.channel;
   options.haloFraction = 1;
   options.checksum = 0;
-  source.flat = flattenVolume(*volume.object, options);
+  source.flat = flattenVolume(withOneChannel(*volume.object, source.channel), options);
   nanovtt::BufferReader const reader(source.flat.buffer.data());
-  source.grid = reader.grid(reader.find(source.channel.c_str()));
+  if (reader.gridCount() != 1)
+    throw FileError(file, "channel '" + oneLine(source.channel, 60) + "' cannot be drawn");
+  source.grid = reader.grid(0);
   auto const rows = matrixOf(volume.indexToWorld);
   if (rows.empty())
     source.note = "its transform is not linear; the picture is one of index space";
