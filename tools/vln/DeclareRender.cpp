@@ -177,7 +177,8 @@ void declareRender(CLI::App& self) {
   self.add_option("--turntable", o.turntable, "So many pictures from all round: OUT_0001.png, ...")
       ->check(CLI::Range(1, 9999))
       ->type_name("N");
-  self.add_option("--depth", o.depth, "Draw no tile deeper than this (default: where samples are about as wide as a pixel)")
+  self.add_option("--depth", o.depth,
+                  "Draw no tile deeper than this (default: where samples are about as wide as a pixel)")
       ->check(CLI::Range(0, 28))
       ->type_name("D");
   self.add_option("--parameters", o.parameters, "Also all parameters of the picture")->type_name("OUT.json");
