@@ -394,11 +394,11 @@ py::array Core::values(std::string const& name, int depth, bool writable) {
         auto const ops = ChannelOps::of(m_state->volume, name);
         element = ops->element();
         block = ops->block(depth);
-        if (block.regular) pin = std::make_unique<Pin>(m_state);
+        if (block.regular) pin = std::make_unique<Pin>(m_state, name);
       }
       if (pin) break;
       if (attempt > 2) throw std::runtime_error("the tiles of '" + name + "' do not lie in one block");
-      Changing const changing(*m_state);
+      Changing const changing(*m_state, name);
       pack(name);
     }
   }

@@ -32,13 +32,20 @@ void State::endRead() {
   m_changed.notify_all();
 }
 
-void State::beginWrite(bool ignoreViews) {
+int State::views(std::string const& channel) const {
+  if (channel.empty()) return views();
+  std::lock_guard const lock(m_viewsMutex);
+  auto const found = m_viewsOf.find(channel);
+  return found == m_viewsOf.end() ? 0 : found->second;
+}
+
+void State::beginWrite(bool ignoreViews, std::string const& channel) {
   auto const self = std::this_thread::get_id();
   std::unique_lock lock(m_mutex);
   if (m_writer == self || std::find(m_readers.begin(), m_readers.end(), self) != m_readers.end())
     throw std::runtime_error("the volume is in use by the call that this one comes out of");
   wait(lock, [&] { return m_writer == std::thread::id() && m_readers.empty(); });
-  if (int const count = views(); count > 0 && !ignoreViews)
+  if (int const count = views(channel); count > 0 && !ignoreViews)
     throw ViewsAlive("the volume cannot be changed while " + std::to_string(count) +
                      (count == 1 ? " array shows" : " arrays show") +
                      " its memory: copy what you need and drop them (del), or leave 'with writable()'");

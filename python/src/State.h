@@ -14,8 +14,10 @@
 
 #include <atomic>
 #include <condition_variable>
+#include <map>
 #include <memory>
 #include <mutex>
+#include <string>
 #include <thread>
 #include <vector>
 
@@ -44,20 +46,24 @@ public:
   void beginRead();
   void endRead();
   /// @error As beginRead(), also when the thread is reading; ViewsAlive.
-  void beginWrite(bool ignoreViews);
+  void beginWrite(bool ignoreViews, std::string const& channel);
   void endWrite();
 
   int views() const { return m_views.load(); }
+  /// Of one channel; of all for an empty name.
+  int views(std::string const& channel) const;
 
 private:
   friend class Pin;
   template <class Free> void wait(std::unique_lock<std::mutex>& lock, Free const& free);
 
-  std::mutex m_mutex;
+  mutable std::mutex m_mutex;
   std::condition_variable m_changed;
   std::vector<std::thread::id> m_readers;
   std::thread::id m_writer;
   std::atomic<int> m_views{0};
+  mutable std::mutex m_viewsMutex;
+  std::map<std::string, int> m_viewsOf; ///< by channel
 };
 
 /// @pre The interpreter's lock is not held.
@@ -80,7 +86,12 @@ class Changing {
 public:
   explicit Changing(State& state, bool ignoreViews = false)
       : m_state(state) {
-    m_state.beginWrite(ignoreViews);
+    m_state.beginWrite(ignoreViews, "");
+  }
+  /// A change that leaves the memory of all other channels where it is.
+  Changing(State& state, std::string const& channel)
+      : m_state(state) {
+    m_state.beginWrite(false, channel);
   }
   ~Changing() { m_state.endWrite(); }
   Changing(Changing const&) = delete;
@@ -93,16 +104,24 @@ private:
 /// @pre Made while the calling thread reads or changes the volume.
 class Pin {
 public:
-  explicit Pin(std::shared_ptr<State> state)
-      : m_state(std::move(state)) {
+  Pin(std::shared_ptr<State> state, std::string channel)
+      : m_state(std::move(state))
+      , m_channel(std::move(channel)) {
+    std::lock_guard const lock(m_state->m_viewsMutex);
+    ++m_state->m_viewsOf[m_channel];
     ++m_state->m_views;
   }
-  ~Pin() { --m_state->m_views; }
+  ~Pin() {
+    std::lock_guard const lock(m_state->m_viewsMutex);
+    --m_state->m_viewsOf.find(m_channel)->second;
+    --m_state->m_views;
+  }
   Pin(Pin const&) = delete;
   Pin& operator=(Pin const&) = delete;
 
 private:
   std::shared_ptr<State> m_state;
+  std::string m_channel;
 };
 
 /// OpenVDB is called by one thread at a time: reading a file forks, and a child must find no lock taken.

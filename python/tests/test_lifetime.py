@@ -54,6 +54,27 @@ def test_requirement_no_change_while_a_view_lives():
     volume["density"].set((0, 0, 0), 1)
 
 
+def test_regression_a_view_of_one_channel_leaves_the_others_free():
+    volume = volume_of()
+    volume.add("other")
+    rng = np.random.default_rng(3)
+    volume["other"].set(rng.integers(0, 24, (500, 3)), 2.0)
+    volume["density"].set(rng.integers(0, 24, (500, 3)), 3.0)
+    first = volume["density"].values()
+    before = first.copy()
+    second = volume["other"].values()  # moved into one block, under the first view
+    np.testing.assert_array_equal(first, before)
+    assert (second == 2).any()
+    with pytest.raises(BufferError):
+        volume.refine((0, 0, 0), (100, 100, 100))
+    del first
+    with pytest.raises(BufferError):
+        volume.refine((0, 0, 0), (100, 100, 100))
+    del second
+    gc.collect()
+    volume.refine((0, 0, 0), (100, 100, 100))
+
+
 def test_requirement_views_outlive_their_volume():
     volume = volume_of()
     channel = volume["density"]
