@@ -146,16 +146,18 @@ std::uint64_t availableMemory() {
          static_cast<std::uint64_t>(sysconf(_SC_PAGESIZE));
 }
 
-// First and second figure of /proc/<process>/statm: address space and resident memory, in bytes.
+// Of /proc/<process>/statm, in bytes: the address space, and the resident memory that is no file's. A child
+// begins with all of its parent's memory but not with its pages of files: with those counted, a child of a
+// large program could grow by as much unseen.
 struct Memory {
-  std::uint64_t space = 0, resident = 0;
+  std::uint64_t space = 0, own = 0;
 };
 Memory memoryOf(char const* process) {
-  Memory memory;
   std::ifstream in(std::string("/proc/") + process + "/statm");
-  in >> memory.space >> memory.resident;
+  std::uint64_t space = 0, resident = 0, ofFiles = 0;
+  in >> space >> resident >> ofFiles;
   auto const page = static_cast<std::uint64_t>(sysconf(_SC_PAGESIZE));
-  return {memory.space * page, memory.resident * page};
+  return {space * page, (resident - std::min(resident, ofFiles)) * page};
 }
 
 // What a process is doing, and its processor time so far in clock ticks.
@@ -223,7 +225,7 @@ void readInChild(std::string const& path, VdbReadLimits const& limits, Memory co
   verdictEnd = fd, memoryVerdict = &noMemory;
   std::set_new_handler(onNoMemory);
   prctl(PR_SET_PDEATHSIG, SIGKILL); // nobody waits for the verdict of an orphan
-  // A sanitizer reserves address space by the terabyte; there the parent's watch over resident memory is the
+  // A sanitizer reserves address space by the terabyte; there the parent's watch over its memory is the
   // only bound.
   if (start.space < (std::uint64_t(1) << 40)) {
     // Without room for a stack even the verdict that there is no memory would fail.
@@ -239,7 +241,8 @@ void readInChild(std::string const& path, VdbReadLimits const& limits, Memory co
     for (int n = 0; n < 3; ++n) dup2(null, n);
   try {
     VdbFile file = readWhole(path);
-    writeAll(fd, "ok");
+    // The parent may not have looked since: a child can be quicker than the watch.
+    writeAll(fd, memoryOf("self").own > start.own + limits.memoryBytes ? noMemory : "ok");
     _exit(0);
   } catch (...) { writeAll(fd, currentReason(limits.memoryBytes)); }
 }
@@ -260,9 +263,9 @@ struct Child {
   int end = -1;
   pid_t process = -1;
 
-  int wait(rusage& usage) {
+  int wait() {
     int status = 0;
-    while (wait4(process, &status, 0, &usage) < 0 && errno == EINTR) {}
+    while (waitpid(process, &status, 0) < 0 && errno == EINTR) {}
     process = -1;
     return status;
   }
@@ -270,8 +273,7 @@ struct Child {
     if (end >= 0) close(end);
     if (process < 0) return;
     kill(process, SIGKILL);
-    rusage unused;
-    wait(unused);
+    wait();
   }
 };
 
@@ -307,7 +309,7 @@ Verdict watchChild(int fd, pid_t child, VdbReadLimits const& limits, Memory cons
     Activity const seen = activityOf(process);
     if (seen.state != 'S' || !(seen == activity)) activity = seen, activeAt = now;
     verdict.stalled = now - activeAt > stallSeconds;
-    if (memoryOf(process.c_str()).resident > start.resident + limits.memoryBytes)
+    if (memoryOf(process.c_str()).own > start.own + limits.memoryBytes)
       verdict.reason = memoryReason(limits.memoryBytes);
     else if (now - begin > patience)
       verdict.reason = "cannot be read in " + std::to_string(static_cast<long>(patience)) + " s";
@@ -339,14 +341,8 @@ bool probeOnce(std::string const& path, VdbReadLimits const& limits, double stal
   if (child.process < 0)
     throw FileError(path, std::string("no process to read it in: ") + std::strerror(error));
   Verdict verdict = watchChild(child.end, child.process, limits, start, stallSeconds);
-  rusage usage = {};
-  int const status = child.wait(usage);
+  int const status = child.wait();
   if (verdict.stalled && !verdict.reason) return true;
-  // A child that was quicker than the watch; its greatest size is told in kB.
-  if (!verdict.reason &&
-      static_cast<std::uint64_t>(usage.ru_maxrss) * 1024 > start.resident + limits.memoryBytes)
-    verdict.reason = memoryReason(limits.memoryBytes);
-
   if (verdict.reason) throw FileError(path, *verdict.reason);
   if (WIFSIGNALED(status)) {
     int const number = WTERMSIG(status);
