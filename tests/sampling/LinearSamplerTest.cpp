@@ -138,28 +138,59 @@ TYPED_TEST(LinearSamplerTest, GradientAgainstDifferences) {
   }
 }
 
-// requirement: every cell of the tile edges goes through the cache that the offset type selects, the others
-// do not
+// requirement: with samples elsewhere than on corners, every cell of the tile edges goes through the cache,
+// the others do not
 TYPED_TEST(LinearSamplerTest, CachesAreUsedOnTheEdges) {
   using Traits = TypeParam;
   constexpr int D = Traits::kTDW, deep = Traits::kMaxDepth;
-  for (int type = 0; type < 8; ++type) {
+  for (int type = 0; type < 7; ++type) {
     SamplerVolume<Traits> volume(static_cast<VoxelOffsetType>(type));
     volume.add({0, 0, 0}, deep, deep - 1);
     volume.fill(wavyField, 0.0f);
     auto const at = std::as_const(volume.tree).tile(0, deep).treeIndex();
-    for (int i = type == 7 ? 0 : -1; i < D; ++i) {
+    for (int i = -1; i < D; ++i) {
       Sampler<Traits> const sampler(volume.tree, volume.topology, *volume.core);
       float const before = sampler.sample(at, {i, 1, 1}, {0.5f, 0.5f, 0.5f});
       EXPECT_EQ(sampler.accessCount(), 1u);
       // A cached cell does not see a change of the channel; one that is read in place does.
       volume.core->tileData(at).set(100.0f);
-      bool const cached = type == 7 ? i == D - 1 : i <= 0 || i == D - 1;
+      bool const cached = i <= 0 || i == D - 1;
       EXPECT_EQ(sampler.sample(at, {i, 1, 1}, {0.5f, 0.5f, 0.5f}), cached ? before : 100.0f)
           << type << ' ' << i;
       volume.fill(wavyField, 0.0f);
     }
   }
+}
+
+// requirement: with corner samples a cell between tiles of one depth is read in place; a tile beside gaps is
+// widened once it is asked for many of them, and not before
+TYPED_TEST(LinearSamplerTest, CornerCellsBetweenTilesAreReadInPlace) {
+  using Traits = TypeParam;
+  constexpr int D = Traits::kTDW, deep = Traits::kMaxDepth;
+  SamplerVolume<Traits> volume;
+  volume.add({0, 0, 0}, deep, deep - 1);
+  volume.add({Traits::width(deep), 0, 0}, deep, deep - 1);
+  volume.fill(wavyField, 0.0f);
+  TreeIndex const at = std::as_const(volume.tree).tileAccessor().treeIndex(0, 0, 0, deep, true);
+  Sampler<Traits> const sampler(volume.tree, volume.topology, *volume.core);
+  auto const value = [&](int3 const& cell) { return sampler.sample(at, cell, {0.5f, 0.5f, 0.5f}); };
+  auto const setAll = [&](float v) {
+    for (int d : {deep - 1, deep})
+      for (std::int64_t n = 0; n < volume.tree.tileCount(d); ++n) volume.core->tileData(n, d).set(v);
+  };
+  float last = 0;
+  for (int n = 0; n < 40; ++n) {
+    setAll(last = 1.0f + float(n));
+    EXPECT_EQ(value({D - 1, 1, 1}), last) << "between two tiles";
+  }
+  int changes = 0, seen = 0;
+  for (; changes < 40; ++changes) {
+    setAll(last = 100.0f + float(changes));
+    if (value({1, D - 1, 1}) != last) break;
+    seen = changes;
+  }
+  EXPECT_GT(seen, 2) << "read in place at first";
+  EXPECT_LT(changes, 40) << "widened in the end";
 }
 
 // requirement: cold copies; the clock; a second query of a tile does not move the last use

@@ -1,10 +1,18 @@
 #include "GeometryVolume/sampling/VoxelSamplerLinear.h"
 
 #include "GeometryVolume/channels/Halo.h"
+#include "GeometryVolume/channels/HaloRegions.h"
 
 namespace VLN::TileTree3D {
 
 int const kCacheSizeCoarserLevels = 1;
+
+namespace {
+/// Cells of ancestors that are read for one cell at most, and cells with gaps for which a tile is read in
+/// place: beyond them its widened form is the shorter way.
+constexpr int kMostParentCells = 12;
+constexpr std::uint32_t kGapsWorthWidening = 8;
+} // namespace
 
 #define VLN_SAMPLER_TEMPLATE                                                                                 \
   template <class TraitsT, class Value, int Components, class Real, class Position, int A, int B>
@@ -81,6 +89,7 @@ VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::forgetTiles() {
   m_accessCount = 0;
   m_lastTile.fill(-1);
   m_lastSlot.fill(-1);
+  m_highSides.fill({});
 }
 
 VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::findTile(int i, int j, int k, int depth) const -> CoreTile {
@@ -112,6 +121,13 @@ VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::cachedCorners(TreeIndex const& tile, int3
     return updateCache(tile.index, tile.depth, cache);
   };
   if (this->m_offsetType == kVoxelOffsetCorner) {
+    // A tile that is asked for gaps again and again is worth widening.
+    auto const d = static_cast<std::size_t>(tile.depth);
+    int budget = kMostParentCells;
+    if (m_lastTile[d] != tile.index &&
+        (m_highSides[d].tile != tile.index || m_highSides[d].gaps < kGapsWorthWidening) &&
+        edgeCorners(tile, ijk, m_corners.data(), budget))
+      return {m_corners.data(), 2, Internal::lanesOf(weights)};
     constexpr int w = D + 1;
     float const* const data = entry(m_cacheOneSided).data.data()->data();
     return {data + ijk.x + w * (ijk.y + w * ijk.z), w, Internal::lanesOf(weights)};
@@ -119,6 +135,76 @@ VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::cachedCorners(TreeIndex const& tile, int3
   constexpr int w = D + 2;
   float const* const data = entry(m_cacheTwoSided).data.data()->data();
   return {data + (ijk.x + 1) + w * ((ijk.y + 1) + w * (ijk.z + 1)), w, Internal::lanesOf(weights)};
+}
+
+// The samples of the tile of the same depth that lies on in a direction, null where there is none.
+VLN_SAMPLER_TEMPLATE float const* VLN_SAMPLER::highSide(TreeIndex const& tile, HighSides& sides,
+                                                        unsigned direction) const {
+  if (sides.known >> direction & 1) return sides.data[direction];
+  auto const& here = this->m_accessor;
+  int3 const corner = here.cursorTile() == tile ? here.cursorCorner() : m_container->tile(tile).tijk();
+  int const w = TraitsT::width(tile.depth);
+  auto const on = [&](unsigned bit) { return direction & bit ? w : 0; };
+  TreeIndex const at =
+      m_tileAccessor.treeIndex(corner.x + on(1), corner.y + on(2), corner.z + on(4), tile.depth, true);
+  sides.known |= 1u << direction;
+  return sides.data[direction] = at.valid() ? dataOf(*m_channelCore, at) : nullptr;
+}
+
+// The eight samples of a cell of corner samples, x fastest: those beyond the tile from the tiles beside it,
+// and what these lack blended from the parent's cell. Just what the widened tile holds, without the rest of
+// it.
+// @return false where that takes more than `budget` cells of ancestors.
+VLN_SAMPLER_TEMPLATE bool VLN_SAMPLER::edgeCorners(TreeIndex const& tile, int3 const& low, float* corners,
+                                                   int& budget) const {
+  auto& sides = m_highSides[static_cast<std::size_t>(tile.depth)];
+  if (sides.tile != tile.index) {
+    sides.tile = tile.index, sides.known = 1, sides.gaps = 0;
+    sides.data[0] = dataOf(*m_channelCore, tile);
+  }
+  unsigned const edge =
+      unsigned(low.x == D - 1) | unsigned(low.y == D - 1) << 1 | unsigned(low.z == D - 1) << 2;
+  unsigned gaps = 0;
+  for (unsigned c = 0; c < 8; ++c) {
+    float const* const data = highSide(tile, sides, c & edge);
+    if (!data) {
+      gaps |= 1u << c;
+      continue;
+    }
+    auto const at = [&](int i, unsigned bit) { return !(c & bit) ? i : edge & bit ? 0 : i + 1; };
+    corners[c] = data[at(low.x, 1) + D * (at(low.y, 2) + D * at(low.z, 4))];
+  }
+  if (gaps == 0) return true;
+
+  ++sides.gaps;
+  auto const& record = m_container->tile(tile);
+  if (!hasUsableParent(record)) {
+    for (unsigned c = 0; c < 8; ++c) {
+      auto const at = [&](int i, unsigned bit) { return std::min(c & bit ? i + 1 : i, D - 1); };
+      if (gaps >> c & 1) corners[c] = sides.data[0][at(low.x, 1) + D * (at(low.y, 2) + D * at(low.z, 4))];
+    }
+    return true;
+  }
+  TreeIndex const parent = record.parentTreeIndex();
+  int3 const child = m_container->tile(parent).childIJK(record);
+  auto const& axes = Internal::kHaloTable<TraitsT, 0, 0, 1, 0>.parentAxis;
+  int3 lowOfParent{-1, -1, -1};
+  std::array<float, 8> cornersOfParent;
+  for (unsigned c = 0; c < 8; ++c) {
+    if (!(gaps >> c & 1)) continue;
+    Internal::HaloAxis axis[3];
+    for (int a = 0; a < 3; ++a)
+      axis[a] = axes[static_cast<std::size_t>(child[a])][static_cast<std::size_t>(low[a] + int(c >> a & 1))];
+    int3 const cell{axis[0].at, axis[1].at, axis[2].at};
+    if (cell != lowOfParent) {
+      if (budget-- == 0 || !edgeCorners(parent, cell, cornersOfParent.data(), budget)) return false;
+      lowOfParent = cell;
+    }
+    corners[c] =
+        CellCorners{cornersOfParent.data(), 2, {axis[0].fraction, axis[1].fraction, axis[2].fraction, 0.0f}}
+            .value();
+  }
+  return true;
 }
 
 // The entry that holds the tile, or null.

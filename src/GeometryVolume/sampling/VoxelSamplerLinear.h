@@ -1,9 +1,9 @@
 // VoxelSamplerLinear: trilinear values of a float channel, and their gradient, at any position.
 //
 //   wide channel (E = D+1)            core channel (E = D)
-//   the next tile's first samples     a cell inside the core is read in place; one on the tile's edge from a
-//   are stored in each tile:          cache that holds one widened tile for each depth:
-//   always read in place
+//   the next tile's first samples     a cell inside the core is read in place; one on the tile's edge from it
+//   are stored in each tile:          and the tiles beside it (corner samples), or from a cache that holds
+//   one always read in place              widened tile for each depth
 //                                       corner samples (type 7)      any other offset type
 //      0 1 2 3|4                        0 1 2 3|4                  -1|0 1 2 3|4
 //
@@ -189,6 +189,15 @@ private:
       return {dataOf(*m_channelCore, cell.tile) + i + D * (j + D * k), D, cell.weights};
     return cachedCorners(cell.tile, Internal::toInt3(cell.ijk), Internal::toFloat3(cell.weights));
   }
+  // What lies on the high sides of a tile, as far as it was asked for.
+  struct HighSides {
+    std::int64_t tile = -1;
+    std::uint32_t known = 0; ///< bits of the directions below that were looked up
+    std::uint32_t gaps = 0;  ///< cells that needed a coarser tile
+    std::array<float const*, 8>
+        data; ///< of the tile itself, and at 1, 2 and 4 on along x, y and z; null: none
+  };
+
   CellCorners wideCorners(SampleCell const& cell) const {
     constexpr int w = D + 1;
     // Below the first sample: extrapolate from the first cell, as the last one does at the top.
@@ -203,6 +212,8 @@ private:
   }
   float sampleAbove(TreeIndex const& tile, int3 const& ijk, Position const& weights) const;
   CellCorners cachedCorners(TreeIndex const& tile, int3 const& ijk, Position const& weights) const;
+  bool edgeCorners(TreeIndex const& tile, int3 const& low, float* corners, int& budget) const;
+  float const* highSide(TreeIndex const& tile, HighSides& sides, unsigned direction) const;
 
   void bind(CoreChannel const* core, WideChannel const* wide);
   void forgetTiles();
@@ -224,6 +235,8 @@ private:
   mutable std::uint64_t m_accessCount = 0;
   mutable std::array<std::int64_t, kDepths> m_lastTile;
   mutable std::array<std::int32_t, kDepths> m_lastSlot;
+  mutable std::array<HighSides, kDepths> m_highSides;
+  mutable std::array<float, 8> m_corners;
   ContainerT const* m_container = nullptr;
   CoreChannel const* m_channelCore = nullptr;
   WideChannel const* m_channelWide = nullptr;
