@@ -66,8 +66,6 @@ public:
     return m_depth >= 0 ? m_container->tile(m_index, m_depth) : invalidTile();
   }
 
-  /// The tile found last, whose corner is cursorCorner(); invalid where there is none.
-  TreeIndex cursorTile() const { return {m_index, m_depth}; }
   /// Corner of the tile found last, without touching its record. After a lookup that found no tile it is that
   /// of the tile where the search ended, or of an earlier one.
   int3 const& cursorCorner() const { return m_corner; }
