@@ -178,6 +178,11 @@ TEST(VolumeTest, RequirementSamplesAreThoseOfTheSampler) {
       for (int i = -6; i < 10; ++i) field.set(i, j, k, float(i + 2 * j + 3 * k));
   EXPECT_FLOAT_EQ(field.sample({0.75f, 0.25f, 1.0f}), 1.5f + 1.0f + 6.0f);
   EXPECT_FLOAT_EQ(field.sample({1.5f, 0.5f, 2.0f}, kSamplerTileSpace), 1.5f + 1.0f + 6.0f);
+  std::vector<float3> const positions{{0.75f, 0.25f, 1.0f}, {0.25f, 0.25f, 0.5f}, {1e9f, 0, 0}};
+  std::vector<float> values(positions.size());
+  field.sample(positions, values);
+  for (std::size_t n = 0; n < positions.size(); ++n) EXPECT_EQ(values[n], field.sample(positions[n])) << n;
+  EXPECT_THROW(field.sample(positions, std::span(values).first(2)), std::invalid_argument);
   float3 const g = field.gradient({0.75f, 0.25f, 1.0f});
   EXPECT_FLOAT_EQ(g.x, 2.0f);
   EXPECT_FLOAT_EQ(g.y, 4.0f);

@@ -107,6 +107,11 @@ public:
   /// VoxelSamplerLinear for the rest.
   float sample(float3 const& position,
                SamplerSpace space = kSamplerWorldSpace) const requires std::is_same_v<T, float>;
+  /// Many positions: values[n] = sample(positions[n], space). @shape As many values as positions.
+  /// @cost At random places half of as many single calls, or less.
+  /// @error std::invalid_argument where there are not as many values as positions.
+  void sample(std::span<float3 const> positions, std::span<float> values,
+              SamplerSpace space = kSamplerWorldSpace) const requires std::is_same_v<T, float>;
   /// In world space, whatever the position is given in.
   float3 gradient(float3 const& position,
                   SamplerSpace space = kSamplerWorldSpace) const requires std::is_same_v<T, float>;

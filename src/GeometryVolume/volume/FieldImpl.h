@@ -300,6 +300,17 @@ float Field<T>::sample(float3 const& position, SamplerSpace space) const require
 }
 
 template <class T>
+void Field<T>::sample(std::span<float3 const> positions, std::span<float> values,
+                      SamplerSpace space) const requires std::is_same_v<T, float> {
+  if (positions.size() != values.size())
+    throw std::invalid_argument("field \"" + m_slot->name + "\": " + std::to_string(positions.size()) +
+                                " positions with " + std::to_string(values.size()) + " values");
+  static_cast<FloatVoxelSamplerLinear<Internal::VolumeShape> const*>(sampler())->sample(
+      positions.data(), values.data(), static_cast<std::int64_t>(positions.size()),
+      Internal::VolumeShape::kMaxDepth, space);
+}
+
+template <class T>
 float3 Field<T>::gradient(float3 const& position,
                           SamplerSpace space) const requires std::is_same_v<T, float> {
   float3 out;
