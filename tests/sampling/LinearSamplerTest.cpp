@@ -253,7 +253,8 @@ TYPED_TEST(LinearSamplerTest, TablesReadWhereTheValuesAre) {
   float3 const inside{float(tile.ti()) + 1.5f, float(tile.tj()) + 1.5f, float(tile.tk()) + 1.5f};
   volume.wide->tileData(tile.treeIndex()).set(7.0f);
   EXPECT_EQ(sampler.sample(inside, kSamplerTileSpace), 7.0f);
-  auto const copy = *volume.wide; // shares the values until one of them is written
+  auto const copy = *volume.wide; // shares the values until one of them has its own
+  volume.wide->cloneData();
   volume.wide->tileData(tile.treeIndex()).set(8.0f);
   EXPECT_EQ(sampler.sample(inside, kSamplerTileSpace), 8.0f);
 }
