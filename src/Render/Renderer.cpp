@@ -251,12 +251,8 @@ void limitDepth(Field& field, Scene const& scene, RenderOptions const& options, 
   field.limitDepth(std::clamp(depth, root, nanovtt::kMaxDepth));
 }
 
-} // namespace
-
-Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, RenderOptions const& options,
-               std::function<void(double)> const& watch) {
-  if (options.width < 1 || options.height < 1 || options.width > 32768 || options.height > 32768)
-    throw std::invalid_argument("a picture has 1 to 32768 pixels an axis");
+Scene sceneOf(Field const& field, Affine const& tileToWorld, Camera const& camera,
+              RenderOptions const& options) {
   double const determinant = tileToWorld.determinant();
   if (!std::isfinite(determinant) || determinant == 0)
     throw std::invalid_argument("its transform cannot be inverted");
@@ -268,7 +264,49 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
   scene.light = length(options.light) > 0
                     ? normalized(options.light)
                     : normalized(camera.up * 0.9 - camera.right * 0.75 - camera.forward * 0.8);
+  return scene;
+}
 
+/// Weighs the field by its opacity. Unit and lattices of light are still to come.
+FogView fogOf(Scene const& scene, Field& field, Transfer const& transfer, double voxel) {
+  RenderOptions const& options = scene.options;
+  bool const isFinal = options.quality == Quality::kFinal;
+  field.weigh([&](float low, float high) { return transfer.largestOpacity(low, high); }, options.threads);
+  FogView fog;
+  fog.transfer = &transfer.view();
+  fog.field = field.view();
+  fog.colored = options.colored;
+  fog.albedo = static_cast<float>(options.albedo);
+  fog.anisotropy = static_cast<float>(options.anisotropy);
+  fog.light = scene.light.as<float>();
+  fog.lightLocal = scene.toLocal.vector(scene.light).as<float>();
+  for (int a = 0; a < 3; ++a) fog.worldToLocal[a] = scene.toLocal.rows[a].as<float>();
+  fog.viewUp = scene.camera.viewUp.as<float>();
+  fog.lightColor = kKeyLight * (isFinal ? 0.32f : 1.6f);
+  fog.sky = kSky * (isFinal ? 0.8f : 0.35f);
+  fog.ground = kGround * (isFinal ? 1.2f : 0.5f);
+  fog.bounces = options.bounces;
+  fog.step = static_cast<float>(stepOf(scene, voxel));
+  return fog;
+}
+
+} // namespace
+
+double opacityUnit(Field& field, Affine const& tileToWorld, Camera const& camera,
+                   RenderOptions const& options) {
+  Scene const scene = sceneOf(field, tileToWorld, camera, options);
+  Transfer const transfer(options.transfer);
+  double const voxel = voxelOf(tileToWorld);
+  limitDepth(field, scene, options, voxel);
+  FogView fog = fogOf(scene, field, transfer, voxel);
+  return chooseUnit(scene, fog, voxel);
+}
+
+Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, RenderOptions const& options,
+               std::function<void(double)> const& watch) {
+  if (options.width < 1 || options.height < 1 || options.width > 32768 || options.height > 32768)
+    throw std::invalid_argument("a picture has 1 to 32768 pixels an axis");
+  Scene const scene = sceneOf(field, tileToWorld, camera, options);
   bool const isFinal = options.quality == Quality::kFinal, isFog = options.mode == Mode::kFog;
   double const voxel = voxelOf(tileToWorld);
   Picture picture;
@@ -298,21 +336,7 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
         options.threads);
     break;
   case Mode::kFog:
-    field.weigh([&](float low, float high) { return transfer.largestOpacity(low, high); }, options.threads);
-    fog.transfer = &transfer.view();
-    fog.field = field.view();
-    fog.colored = options.colored;
-    fog.albedo = static_cast<float>(options.albedo);
-    fog.anisotropy = static_cast<float>(options.anisotropy);
-    fog.light = scene.light.as<float>();
-    fog.lightLocal = scene.toLocal.vector(scene.light).as<float>();
-    for (int a = 0; a < 3; ++a) fog.worldToLocal[a] = scene.toLocal.rows[a].as<float>();
-    fog.viewUp = camera.viewUp.as<float>();
-    fog.lightColor = kKeyLight * (isFinal ? 0.32f : 1.6f);
-    fog.sky = kSky * (isFinal ? 0.8f : 0.35f);
-    fog.ground = kGround * (isFinal ? 1.2f : 0.5f);
-    fog.bounces = options.bounces;
-    fog.step = static_cast<float>(stepOf(scene, voxel));
+    fog = fogOf(scene, field, transfer, voxel);
     if (options.opacityUnit > 0 && options.opacityUnit < 1e-3 * voxel)
       throw std::invalid_argument("the unit of opacity is less than a thousandth of a voxel");
     picture.opacityUnit = options.opacityUnit > 0 ? options.opacityUnit : chooseUnit(scene, fog, voxel);
