@@ -1,7 +1,12 @@
-# cmake -DIN=view.js -DOUT=ViewScript.cpp -P EmbedView.cmake: the bytes of a file as a source; none where IN is empty.
+# cmake -DIN=view.js -DLICENSE=lil-gui/LICENSE.md -DOUT=ViewScript.cpp -P EmbedView.cmake: the bytes of a file as a source,
+# behind the licence of what is in it beside our own; none where IN is empty.
 set(bytes "")
 if(IN)
+  file(READ "${LICENSE}" license)
+  string(CONCAT license "/*! lil-gui, whose licence this is:\n\n" "${license}" "*/\n")
+  string(HEX "${license}" head)
   file(READ "${IN}" bytes HEX)
+  string(PREPEND bytes "${head}")
   # Rows of 32: not one line for all.
   string(REGEX REPLACE "(................................................................)" "\\1\n" bytes "${bytes}")
   string(REGEX REPLACE "([0-9a-f][0-9a-f])" "0x\\1," bytes "${bytes}")

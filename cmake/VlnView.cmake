@@ -43,7 +43,7 @@ endif()
 
 add_custom_command(
   OUTPUT "${view_source}"
-  COMMAND "${CMAKE_COMMAND}" "-DIN=${view_bundle}" "-DOUT=${view_source}"
+  COMMAND "${CMAKE_COMMAND}" "-DIN=${view_bundle}" "-DLICENSE=${view_folder}/node_modules/lil-gui/LICENSE.md" "-DOUT=${view_source}"
     -P "${PROJECT_SOURCE_DIR}/cmake/EmbedView.cmake"
   DEPENDS ${view_bundle} "${PROJECT_SOURCE_DIR}/cmake/EmbedView.cmake"
   COMMENT "" VERBATIM)

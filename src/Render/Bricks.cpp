@@ -26,7 +26,9 @@ public:
   Packer(Field const& field, PackOptions const& options)
       : m_view(field.view())
       , m_options(options) {
-    m_view.maxDepth = options.depth;
+    // Coarse samples are means of those of the next depth, where there is one.
+    m_isMean = options.depth < finestDepth(field);
+    m_view.maxDepth = std::max(options.depth + m_isMean, m_view.tree.rootDepth());
     m_packed.depth = options.depth;
     m_step = std::int64_t(1) << (nanovtt::kMaxDepth - options.depth);
     m_packed.spacing = static_cast<double>(m_step);
@@ -47,7 +49,7 @@ public:
 private:
   // The items of a tile: all of it, or the places of missing children.
   void addTile(TileRef const& t) {
-    if (t.depth > m_options.depth) return;
+    if (t.depth > m_view.maxDepth) return;
     Brick const b = m_view.brick(t.number);
     std::int64_t const spacing = t.width() / b.core;
     int level = 0;
@@ -57,7 +59,7 @@ private:
     if (t.depth < nanovtt::kMaxDepth) {
       children = m_view.tree.children(t.number);
       // All of a tile's children lie at one depth.
-      if (t.depth + children.levels + 1 <= m_options.depth) across = static_cast<int>(children.across());
+      if (t.depth + children.levels + 1 <= m_view.maxDepth) across = static_cast<int>(children.across());
     }
     std::int64_t const corner[3] = {t.corner.x - m_fieldOrigin[0], t.corner.y - m_fieldOrigin[1],
                                     t.corner.z - m_fieldOrigin[2]};
@@ -171,9 +173,9 @@ private:
     for (int k = 0; k < kPackedWidth; ++k)
       for (int j = 0; j < kPackedWidth; ++j)
         for (int i = 0; i < kPackedWidth; ++i)
-          *out++ = std::clamp(path.value(m_view, {static_cast<float>(corner[0] + i * spacing),
-                                                  static_cast<float>(corner[1] + j * spacing),
-                                                  static_cast<float>(corner[2] + k * spacing)}),
+          *out++ = std::clamp(sample(path, {static_cast<float>(corner[0] + i * spacing),
+                                            static_cast<float>(corner[1] + j * spacing),
+                                            static_cast<float>(corner[2] + k * spacing)}),
                               -kLargest, kLargest);
     auto const [low, high] = std::minmax_element(values, values + kPackedSamples);
     brick.low = *low, brick.high = *high;
@@ -183,7 +185,25 @@ private:
       codes[n] = static_cast<std::uint8_t>(std::lround((double(values[n]) - double(brick.low)) * scale));
   }
 
+  // The weights of a tent, 1/4 1/2 1/4 along each axis: what a blend of samples twice as far apart keeps of them.
+  float sample(FieldPath& path, Vec3 p) const {
+    if (!m_isMean) return path.value(m_view, p);
+    auto const half = static_cast<float>(m_step / 2);
+    float const first = path.value(m_view, p);
+    double sum = 0;
+    bool isConstant = true;
+    for (int n = 0; n < 27; ++n) {
+      int const i = n % 3 - 1, j = n / 3 % 3 - 1, k = n / 9 - 1;
+      float const v = path.value(m_view, p + Vec3{static_cast<float>(i), static_cast<float>(j),
+                                                  static_cast<float>(k)} * half);
+      isConstant = isConstant && v == first;
+      sum += double(v) / (8 << (std::abs(i) + std::abs(j) + std::abs(k)));
+    }
+    return isConstant ? first : static_cast<float>(sum);
+  }
+
   FieldView m_view;
+  bool m_isMean = false;
   PackOptions const m_options;
   PackedField m_packed;
   std::int64_t m_step, m_fieldOrigin[3], m_origin[3];
@@ -191,6 +211,16 @@ private:
 };
 
 } // namespace
+
+int finestDepth(Field const& field) {
+  int depth = 0;
+  field.view().tree.forEachTile([&](TileRef const& t) {
+    int own = t.depth;
+    for (int core = field.view().brick(t.number).core; core > nanovtt::kTileWidth; core /= 2) ++own;
+    depth = std::max(depth, own);
+  });
+  return depth;
+}
 
 PackedField packField(Field const& field, PackOptions const& options) {
   return Packer(field, options).pack();

@@ -39,8 +39,12 @@ struct PackOptions {
   int threads = 0;
 };
 
-/// Bricks for all tiles that hold anything but the background. Samples are those of the tiles at the depth, and
-/// where the tree is not that deep blends of the coarser ones, which the bricks' own blends repeat.
+/// The depth at which samples are as near to each other as anywhere in the field.
+VLN_RENDER_API int finestDepth(Field const& field);
+
+/// Bricks for all tiles that hold anything but the background, at any depth, also above the roots. At the finest
+/// depth samples are those of the tiles, and where the tree is not that deep blends of the coarser ones, which the
+/// bricks' own blends repeat. At others they are means of those of the next depth, as far as the next samples.
 /// @return Nothing but the number of bricks, and no codes, where there are more than was allowed.
 /// @edges Values beyond 1e38 count as 1e38.
 /// @numeric The same for any number of threads.

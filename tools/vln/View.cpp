@@ -10,6 +10,7 @@
 #include <algorithm>
 #include <array>
 #include <bit>
+#include <cmath>
 #include <filesystem>
 #include <iostream>
 #include <stdexcept>
@@ -74,17 +75,20 @@ struct Channel {
 
 // Depths from the roots on, until one is too large.
 std::vector<Level> packLevels(Field const& field, ViewCommandOptions const& options, Progress const& progress) {
-  auto const& tree = field.view().tree;
-  int const wanted = options.look.depth >= 0 ? options.look.depth : nanovtt::kMaxDepth;
-  std::vector<int> depths;
-  for (int depth = tree.rootDepth(); depth <= nanovtt::kMaxDepth; ++depth)
-    if (tree.tileCount(depth) > 0 && (depth <= wanted || depths.empty())) depths.push_back(depth);
+  int const finest = finestDepth(field);
+  int const deepest = options.look.depth >= 0 ? std::min(options.look.depth, finest) : finest;
+  // The first depth at which the field is more than a brick wide.
+  Vec3 const extent = field.view().high - field.view().low;
+  float const widest = std::max({extent.x, extent.y, extent.z});
+  int first = deepest;
+  while (first > 0 && widest > std::ldexp(float(kPackedCore), nanovtt::kMaxDepth - first)) --first;
   bool const isLimited = options.look.depth < 0 || options.hasMaxSize;
   std::vector<Level> levels;
   std::uint64_t sum = 0;
-  for (std::size_t n = 0; n < depths.size(); ++n) {
-    if (progress) progress("packing", double(n) / double(depths.size()));
-    auto const packed = packField(field, {depths[n], kMostBricks, options.look.render.threads});
+  for (int depth = first; depth <= deepest; ++depth) {
+    // Each depth is up to eight times as much work as the one above it.
+    if (progress) progress("packing", std::ldexp(1.0, 3 * (depth - deepest)) / 8);
+    auto const packed = packField(field, {depth, kMostBricks, options.look.render.threads});
     if (packed.bricks.empty()) continue;
     if (packed.bricks.size() > kMostBricks) break;
     Level level = packedLevel(packed);
@@ -94,8 +98,8 @@ std::vector<Level> packLevels(Field const& field, ViewCommandOptions const& opti
     sum += level.block.size();
     levels.push_back(std::move(level));
   }
-  if (options.look.depth >= 0 && (levels.empty() || levels.back().depth < depths.back()))
-    throw std::invalid_argument(fmt::format("its depth {} does not fit{}", depths.back(),
+  if (options.look.depth >= 0 && (levels.empty() || levels.back().depth < deepest))
+    throw std::invalid_argument(fmt::format("its depth {} does not fit{}", deepest,
                                             options.hasMaxSize ? " into the size" : ""));
   if (levels.empty()) throw std::invalid_argument("nothing of it differs from the background");
   return levels;

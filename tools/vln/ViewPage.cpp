@@ -80,7 +80,7 @@ void writeViewPage(std::string const& path, std::string const& title, nlohmann::
   file.write("<!doctype html>\n<html lang=\"en\">\n<head>\n<meta charset=\"utf-8\">\n");
   // The page can ask for nothing, neither from a network nor from a disk.
   file.write("<meta http-equiv=\"Content-Security-Policy\" content=\"default-src 'none'; script-src "
-             "'unsafe-inline'; style-src 'unsafe-inline'; img-src data: blob:\">\n"
+             "'unsafe-inline'; style-src 'unsafe-inline'; img-src data: blob:; font-src data:\">\n"
              "<meta name=\"viewport\" content=\"width=device-width, initial-scale=1\">\n");
   file.write("<title>" + escaped(title) + "</title>\n</head>\n<body>\n");
   file.write("<script type=\"application/json\" id=\"about\">" + text + "</script>\n");
