@@ -1,0 +1,92 @@
+// node view.mjs VLN MODULES: pages of generated volumes in a browser, beside the pictures of `vln render`.
+
+import assert from 'node:assert/strict';
+import { execFileSync } from 'node:child_process';
+import { mkdtempSync, readFileSync, rmSync, statSync } from 'node:fs';
+import { tmpdir } from 'node:os';
+import { join } from 'node:path';
+import { decoded, openBrowser, openPage, pixels } from './browser.mjs';
+
+const [program, modules] = process.argv.slice(2);
+const folder = mkdtempSync(join(tmpdir(), 'vln-view-'));
+const vln = (...args) => execFileSync(program, args, { stdio: ['ignore', 'pipe', 'pipe'], encoding: 'utf8' });
+const SIZE = 128;
+
+/** Mean over all pixels and channels, of 255; and the share of pixels that are far off. */
+function difference(a, b) {
+  assert.equal(a.data.length, b.data.length);
+  let sum = 0, far = 0;
+  for (let n = 0; n < a.data.length; n += 4) {
+    let most = 0;
+    for (let c = 0; c < 3; ++c) {
+      const d = Math.abs(a.data[n + c] - b.data[n + c]);
+      sum += d, most = Math.max(most, d);
+    }
+    far += most > 32;
+  }
+  const pixels = a.data.length / 4;
+  return { mean: sum / pixels / 3, far: far / pixels };
+}
+
+const browser = await openBrowser(modules);
+const failures = [];
+async function test(name, body) {
+  const began = Date.now();
+  try {
+    await body();
+    console.log(`ok      ${name} (${Date.now() - began} ms)`);
+  } catch (error) {
+    failures.push(name);
+    console.log(`FAILED  ${name}: ${error.stack}`);
+  }
+}
+
+/** A page beside the picture of the same file with the same options. */
+async function pageOf(file, options = []) {
+  const out = join(folder, 'page.html');
+  vln('view', file, '-o', out, ...options);
+  return openPage(browser, out, SIZE, SIZE);
+}
+async function pictureOf(file, options) {
+  const out = join(folder, 'picture.png');
+  vln('render', file, '-o', out, '--size', `${SIZE}x${SIZE}`, ...options);
+  return decoded(browser, readFileSync(out));
+}
+async function hidePanel(opened) {
+  await opened.page.evaluate(() => globalThis.vlnView.panel.gui.hide());
+}
+
+const cloud = join(folder, 'cloud.vdb'), torus = join(folder, 'torus.vdb');
+vln('make', 'cloud', cloud, '--voxels', '30000');
+vln('make', 'torus', torus, '--voxels', '60000');
+
+// What both draw: [name, file, options, mean difference of 255, share of pixels that differ by more than 32]. What is
+// left are codes of 8 bits, edges between pixels, and other random numbers.
+const alike = [
+  ['a fog', cloud, [], 2, 0.01],
+  ['a coloured fog', cloud, ['--cmap', 'inferno', '--opacity', 'sigmoid', '--light', '-1,1,0'], 2, 0.01],
+  ['a level set', torus, [], 3, 0.03],
+  ['an iso-surface', cloud, ['--iso', '0.4'], 3, 0.03],
+  ['a projection', cloud, ['--mode', 'mip', '--clim', '0,1', '--cmap', 'turbo'], 2, 0.01],
+  ['a mean', cloud, ['--mode', 'mean', '--clim', '0,0.3'], 2, 0.01],
+];
+for (const [name, file, options, mean, far] of alike)
+  await test(`agrees with render: ${name}`, async () => {
+    const opened = await pageOf(file, options);
+    const drawn = await pixels(opened.page);
+    const unit = await opened.page.evaluate(() => globalThis.vlnView.channel.unit);
+    // Depths by size of pixels are the picture's alone.
+    const picture = await pictureOf(file, [...options, '--depth', '28', '--spp', '8', ...(unit ? ['--opacity-unit', String(unit)] : [])]);
+    const { mean: is, far: share } = difference(drawn, picture);
+    console.log(`          mean ${is.toFixed(2)}, far ${(100 * share).toFixed(2)} %`);
+    const empty = { data: drawn.data.map((v, n) => drawn.data[n % 4]) };
+    assert.ok(difference(drawn, empty).mean > 2 * mean, 'the page is empty');
+    assert.ok(is < mean && share < far, `mean ${is}, far ${share}`);
+    assert.deepEqual(opened.faults, []);
+    assert.deepEqual(opened.requests(), []);
+    await opened.page.context().close();
+  });
+
+rmSync(folder, { recursive: true });
+await browser.close();
+if (failures.length > 0) process.exitCode = 1;
