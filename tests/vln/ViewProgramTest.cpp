@@ -77,7 +77,12 @@ INSTANTIATE_TEST_SUITE_P(Files, ViewRealTest, realVolumes(), volumeName);
 TEST_P(ViewRealTest, RequirementEveryFileHasAPage) {
   std::string const data = VLN_TEST_DATA_DIR;
   if (data.empty()) GTEST_SKIP() << "no real input files";
-  std::string const text = page(data + "/vdb/" + GetParam(), {"--max-size", "2MB"});
+  std::string const volume = data + "/vdb/" + GetParam();
+  if (std::string(GetParam()).find("points") != std::string::npos) {
+    expectFailure(vln({"view", volume, "-o", m_folder / "p.html"}), volume + ": has points; view shows volumes alone");
+    return;
+  }
+  std::string const text = page(volume, {"--max-size", "2MB"});
   EXPECT_LT(text.size(), std::size_t(2) << 20);
   auto const json = nlohmann::json::parse(part(text, "about"));
   std::size_t blocks = 1;
@@ -97,7 +102,7 @@ TEST_F(ViewPageTest, RequirementSizeChoosesTheDepth) {
   std::string const volume = made("torus", 400000);
   int deepest = 29;
   std::size_t last = ~std::size_t(0);
-  for (std::string const size : {"20MB", "400KB", "256KB"}) {
+  for (std::string const size : {"20MB", "300KB"}) {
     std::string const text = page(volume, {"--max-size", size});
     auto const json = nlohmann::json::parse(part(text, "about"));
     int const depth = json["channels"][0]["levels"].back()["depth"];
@@ -164,7 +169,7 @@ TEST_F(ViewPageTest, RequirementSeveralChannels) {
     for (int n = 0; n < 2000; ++n) grid->tree().setValueOn(openvdb::Coord(n % 20, n / 20 % 10, n / 200), value);
     return grid;
   };
-  std::string const volume = file({sphere("whole", std::int32_t(7)), sphere("fine", 0.25), sphere("speed", openvdb::Vec3f(3, 4, 0))});
+  std::string const volume = file({sphere("whole", std::int32_t(7)), sphere("fine", 0.25f), sphere("speed", openvdb::Vec3f(3, 4, 0))});
   auto const json = about(volume, {"--channel", "speed", "--channel", "whole", "--channel", "fine"});
   ASSERT_EQ(json["channels"].size(), 3u);
   EXPECT_EQ(json["channels"][0]["name"], "speed");
@@ -217,11 +222,13 @@ TEST_F(ViewPageTest, BoundaryLargeTilesAreFewBricks) {
   openvdb::initialize();
   auto grid = openvdb::FloatGrid::create(0.0f);
   grid->setName("density");
-  grid->fill(openvdb::CoordBBox(openvdb::Coord(0), openvdb::Coord(511)), 0.5f);
+  grid->fill(openvdb::CoordBBox(openvdb::Coord(0), openvdb::Coord(255)), 0.5f);
   for (int n = 0; n < 20; ++n) grid->tree().setValueOn(openvdb::Coord(200 + n, 200, 200), 1.0f);
-  auto const json = about(file({grid}))["channels"][0];
+  std::string const text = page(file({grid}));
+  auto const json = nlohmann::json::parse(part(text, "about"))["channels"][0];
   EXPECT_EQ(json["levels"].back()["depth"], 28);
-  EXPECT_LT(json["levels"].back()["bricks"], 60000); // of 262144
+  EXPECT_LT(json["levels"].back()["bricks"], 16384); // of 32768
+  EXPECT_LT(text.size(), 500000u);
 }
 
 // negative
@@ -257,6 +264,39 @@ TEST_F(ViewPageTest, RequirementOutputIsWholeOrNotThere) {
   EXPECT_EQ(piped.code, 0);
   EXPECT_EQ(piped.out.substr(0, 15), "<!doctype html>");
   EXPECT_EQ(piped.out.substr(piped.out.size() - 8), "</html>\n");
+}
+
+// requirement: what the page draws in a browser, beside the pictures of render, and what its controls do
+TEST_F(ViewProgramTest, RequirementPagesInABrowser) {
+  made("cloud"), made("torus", 60000);
+  // Turned, of voxels that are no cubes, far from the origin; with a coarse inside.
+  auto const turned = turnedRamp();
+  turned->setName("ramp");
+  file({turned}, "turned.vdb");
+  auto const egg = openvdb::FloatGrid::create(3.0f);
+  egg->setName("surface");
+  egg->setGridClass(openvdb::GRID_LEVEL_SET);
+  auto const transform = turned->transform().copy();
+  transform->preTranslate(openvdb::Vec3d(-40000, 30000, 20000));
+  egg->setTransform(transform);
+  openvdb::Coord const middle(40000, -30000, -20000);
+  for (auto it = openvdb::CoordBBox(openvdb::Coord(-18), openvdb::Coord(18)).begin(); it; ++it) {
+    double const d = (*it).asVec3d().length() - 14;
+    if (std::abs(d) < 3) egg->tree().setValueOn(*it + middle, static_cast<float>(d));
+    else if (d < 0) egg->tree().setValueOff(*it + middle, -3.0f);
+  }
+  file({egg}, "egg.vdb");
+  auto const steps = openvdb::FloatGrid::create(0.0f); // of tiles 8 and 128 wide
+  steps->setName("density");
+  steps->fill(openvdb::CoordBBox(openvdb::Coord(0), openvdb::Coord(127, 127, 127)), 0.3f);
+  steps->fill(openvdb::CoordBBox(openvdb::Coord(128, 0, 0), openvdb::Coord(159, 63, 63)), 0.6f);
+  for (int n = 0; n < 12; ++n) steps->fill(openvdb::CoordBBox(openvdb::Coord(160 + n, 10, 10), openvdb::Coord(160 + n, 20 + n, 20 + n)), 1.0f);
+  auto const other = steps->deepCopy();
+  other->setName("other");
+  file({steps, other}, "tiles.vdb");
+  RunResult const run = runProgram({VLN_NODE, VLN_VIEW_TEST, VLN_PROGRAM, VLN_VIEW_MODULES, m_folder / ""});
+  std::cout << run.out;
+  EXPECT_EQ(run.code, 0) << run.err;
 }
 
 #endif

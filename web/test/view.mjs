@@ -1,14 +1,13 @@
-// node view.mjs VLN MODULES: pages of generated volumes in a browser, beside the pictures of `vln render`.
+// node view.mjs VLN MODULES FOLDER: pages in a browser of the volumes that tests/vln/ViewProgramTest.cpp puts into the
+// folder, beside the pictures of `vln render`; then what the controls do.
 
 import assert from 'node:assert/strict';
 import { execFileSync } from 'node:child_process';
-import { mkdtempSync, readFileSync, rmSync, statSync } from 'node:fs';
-import { tmpdir } from 'node:os';
+import { readFileSync } from 'node:fs';
 import { join } from 'node:path';
 import { decoded, openBrowser, openPage, pixels } from './browser.mjs';
 
-const [program, modules] = process.argv.slice(2);
-const folder = mkdtempSync(join(tmpdir(), 'vln-view-'));
+const [program, modules, folder] = process.argv.slice(2);
 const vln = (...args) => execFileSync(program, args, { stdio: ['ignore', 'pipe', 'pipe'], encoding: 'utf8' });
 const SIZE = 128;
 
@@ -56,17 +55,18 @@ async function hidePanel(opened) {
   await opened.page.evaluate(() => globalThis.vlnView.panel.gui.hide());
 }
 
-const cloud = join(folder, 'cloud.vdb'), torus = join(folder, 'torus.vdb');
-vln('make', 'cloud', cloud, '--voxels', '30000');
-vln('make', 'torus', torus, '--voxels', '60000');
+const [cloud, torus, turned, egg, tiles] = ['cloud', 'torus', 'turned', 'egg', 'tiles'].map((n) => join(folder, n + '.vdb'));
 
 // What both draw: [name, file, options, mean difference of 255, share of pixels that differ by more than 32]. What is
 // left are codes of 8 bits, edges between pixels, and other random numbers.
 const alike = [
   ['a fog', cloud, [], 2, 0.01],
   ['a coloured fog', cloud, ['--cmap', 'inferno', '--opacity', 'sigmoid', '--light', '-1,1,0'], 2, 0.01],
-  ['a level set', torus, [], 3, 0.03],
-  ['an iso-surface', cloud, ['--iso', '0.4'], 3, 0.03],
+  ['a level set', torus, [], 2, 0.02],
+  ['a turned ramp, in colours', turned, ['--cmap', 'coolwarm'], 3, 0.02],
+  ['a level set far away, of voxels that are no cubes', egg, [], 2, 0.02],
+  ['tiles of several depths', tiles, ['--channel', 'density'], 3, 0.03],
+  ['an iso-surface', cloud, ['--iso', '0.4'], 2, 0.02],
   ['a projection', cloud, ['--mode', 'mip', '--clim', '0,1', '--cmap', 'turbo'], 2, 0.01],
   ['a mean', cloud, ['--mode', 'mean', '--clim', '0,0.3'], 2, 0.01],
 ];
@@ -87,6 +87,51 @@ for (const [name, file, options, mean, far] of alike)
     await opened.page.context().close();
   });
 
-rmSync(folder, { recursive: true });
+// What the controls do: each changes the picture by more than noise, and nothing goes wrong.
+await test('controls change the picture', async () => {
+  const out = join(folder, 'page.html');
+  vln('view', tiles, '-o', out, '--channel', 'density', '--channel', 'other');
+  const opened = await openPage(browser, out, SIZE, SIZE), { page } = opened;
+  let last = await pixels(page);
+  const changes = async (name, body) => {
+    await body();
+    await page.waitForTimeout(50);
+    const next = await pixels(page);
+    const { mean } = difference(last, next);
+    assert.ok(mean > 0.5, `${name} changes nothing: ${mean}`);
+    last = next;
+  };
+  const set = (name, value) => page.evaluate(([name, value]) => {
+    const found = globalThis.vlnView.panel.gui.controllersRecursive().find((c) => c.property === name);
+    found.setValue(value);
+  }, [name, value]);
+  await hidePanel(opened);
+  await changes('a drag', async () => {
+    await page.mouse.move(60, 60);
+    await page.mouse.down();
+    await page.mouse.move(90, 70, { steps: 3 });
+    await page.mouse.up();
+  });
+  await changes('a drag of another button', async () => {
+    await page.mouse.down({ button: 'right' });
+    await page.mouse.move(70, 60, { steps: 3 });
+    await page.mouse.up({ button: 'right' });
+  });
+  await changes('the wheel', () => page.mouse.wheel(0, -300));
+  for (const [name, value] of [['logDensity', 0.7], ['depth', 26], ['slice', 'x'], ['slicePlace', 0.2], ['cut', true], ['slice', 'off'],
+    ['colored', true], ['colors', 'turbo'], ['opacity', 'constant'], ['high', 0.8], ['mode', 'mip'], ['mode', 'surface'], ['iso', 0.7],
+    ['channel', 'other'], ['backgroundColor', '#ffffff']])
+    await changes(name, () => set(name, value));
+
+  // The picture as a file, without the panel.
+  const [download] = await Promise.all([page.waitForEvent('download'),
+    page.evaluate(() => globalThis.vlnView.panel.gui.controllersRecursive().find((c) => c.property === 'screenshot').getValue()())]);
+  assert.equal(download.suggestedFilename(), 'tiles.png');
+  const saved = await decoded(browser, readFileSync(await download.path()));
+  assert.equal(difference(saved, last).mean, 0);
+  assert.deepEqual(opened.faults, []);
+  assert.deepEqual(opened.requests(), []);
+});
+
 await browser.close();
 if (failures.length > 0) process.exitCode = 1;
