@@ -68,7 +68,8 @@ class Page {
   takeChannel() {
     const c = this.channel = this.about.channels.find((c) => c.name === this.look.channel);
     const own = c.ownOpacity && { table: c.ownOpacity, range: c.range, log: c.log };
-    Object.assign(this.look, { mode: c.mode, iso: c.iso, colors: c.colors, colored: c.colored, log: c.log, opacity: c.opacity,
+    Object.assign(this.look, { mode: c.mode,
+      iso: c.mode === 'surface' ? c.iso : (c.range[0] + c.range[1]) / 2, colors: c.colors, colored: c.colored, log: c.log, opacity: c.opacity,
       own, awayFrom: c.awayFrom, low: c.range[0], high: c.range[1], logDensity: 0, density: 1, depth: c.levels.at(-1).depth });
     this.range = { low: Math.min(c.low, c.range[0]), high: Math.max(c.high, c.range[1]),
       depths: c.levels.map((l) => l.depth), ownOpacity: own && c.opacity };

@@ -27,6 +27,7 @@ export class Renderer {
     this.transferTexture = texture(gl, gl.TEXTURE_2D, gl.NEAREST);
     this.seen = texture(gl, gl.TEXTURE_2D, gl.NEAREST);
     this.scale = 0.5;
+    this.most = Infinity; // samples, for scripts that are in a hurry
     this.samples = 0, this.row = 0, this.rows = 16;
     this.sizeLimit = gl.getParameter(gl.MAX_3D_TEXTURE_SIZE);
   }
@@ -90,7 +91,7 @@ export class Renderer {
     this.samples = 0, this.row = 0;
   }
   get done() {
-    return this.samples >= SAMPLES[this.look.mode];
+    return this.samples >= Math.min(this.most, SAMPLES[this.look.mode]);
   }
 
   // Light through the fog from the lamp and from above; what does not change with the camera is kept.
