@@ -73,7 +73,8 @@ private:
     }
   }
 
-  bool isBackground(Brick const& b, std::int64_t const at[3], std::int64_t width, std::int64_t spacing) const {
+  bool isBackground(Brick const& b, std::int64_t const at[3], std::int64_t width,
+                    std::int64_t spacing) const {
     // A child may be narrower than the samples of its parent are apart.
     int first[3], last[3];
     for (int a = 0; a < 3; ++a)
@@ -185,7 +186,8 @@ private:
       codes[n] = static_cast<std::uint8_t>(std::lround((double(values[n]) - double(brick.low)) * scale));
   }
 
-  // The weights of a tent, 1/4 1/2 1/4 along each axis: what a blend of samples twice as far apart keeps of them.
+  // The weights of a tent, 1/4 1/2 1/4 along each axis: what a blend of samples twice as far apart keeps of
+  // them.
   float sample(FieldPath& path, Vec3 p) const {
     if (!m_isMean) return path.value(m_view, p);
     auto const half = static_cast<float>(m_step / 2);
@@ -194,8 +196,8 @@ private:
     bool isConstant = true;
     for (int n = 0; n < 27; ++n) {
       int const i = n % 3 - 1, j = n / 3 % 3 - 1, k = n / 9 - 1;
-      float const v = path.value(m_view, p + Vec3{static_cast<float>(i), static_cast<float>(j),
-                                                  static_cast<float>(k)} * half);
+      float const v = path.value(
+          m_view, p + Vec3{static_cast<float>(i), static_cast<float>(j), static_cast<float>(k)} * half);
       isConstant = isConstant && v == first;
       sum += double(v) / (8 << (std::abs(i) + std::abs(j) + std::abs(k)));
     }

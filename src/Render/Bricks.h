@@ -1,10 +1,12 @@
 // Bricks: a field at one depth as cubes of 8^3 samples of a byte, for what draws it without the buffer.
 //
-//      +---+---+--+          a brick of level n is 8 * 4^n samples of the depth wide and has 9 samples an axis:
-//      |   | 0 | 0|  1       the last ones are the first of its neighbours, so that every blend stays in it.
+//      +---+---+--+          a brick of level n is 8 * 4^n samples of the depth wide and has 9 samples an
+//      axis: |   | 0 | 0|  1       the last ones are the first of its neighbours, so that every blend stays
+//      in it.
 //      +---+---+--+          Level 0 where there is detail, higher ones where the tree is coarse.
 //
-// In a brick the code c stands for low + (high - low) * c / 255: no sample is off by more than 1/510 of the range.
+// In a brick the code c stands for low + (high - low) * c / 255: no sample is off by more than 1/510 of the
+// range.
 #pragma once
 
 #include "Render/Field.h"
@@ -42,9 +44,10 @@ struct PackOptions {
 /// The depth at which samples are as near to each other as anywhere in the field.
 VLN_RENDER_API int finestDepth(Field const& field);
 
-/// Bricks for all tiles that hold anything but the background, at any depth, also above the roots. At the finest
-/// depth samples are those of the tiles, and where the tree is not that deep blends of the coarser ones, which the
-/// bricks' own blends repeat. At others they are means of those of the next depth, as far as the next samples.
+/// Bricks for all tiles that hold anything but the background, at any depth, also above the roots. At the
+/// finest depth samples are those of the tiles, and where the tree is not that deep blends of the coarser
+/// ones, which the bricks' own blends repeat. At others they are means of those of the next depth, as far as
+/// the next samples.
 /// @return Nothing but the number of bricks, and no codes, where there are more than was allowed.
 /// @edges Values beyond 1e38 count as 1e38.
 /// @numeric The same for any number of threads.

@@ -85,15 +85,15 @@ TEST(Bricks, RequirementCodesRepeatTheField) {
       std::uniform_int_distribution<int> place(-26 * 16, 42 * 16);
       for (int n = 0; n < 1500; ++n) {
         Vec3d p{place(random) / 16.0, place(random) / 16.0, place(random) / 16.0};
-        // Where depths meet, a coarse tile's blend is not that of its neighbour, from which samples come; where
-        // tiles have codes of their own, their layer is not what the neighbour has.
+        // Where depths meet, a coarse tile's blend is not that of its neighbour, from which samples come;
+        // where tiles have codes of their own, their layer is not what the neighbour has.
         if (isMixed || flat.fp8) p = {std::floor(p.x), std::floor(p.y), std::floor(p.z)};
         p = p - field.origin();
         double off = 0;
         double const wanted = double(path.value(field.view(), p.as<float>()));
         double const got = bricks.value(p, double(field.background()), off);
-        ASSERT_NEAR(got, wanted, off + 1e-5) << p.x << " " << p.y << " " << p.z << " halo " << flat.halo << " mixed "
-                                             << isMixed << " coalesced " << flat.coalesce;
+        ASSERT_NEAR(got, wanted, off + 1e-5) << p.x << " " << p.y << " " << p.z << " halo " << flat.halo
+                                             << " mixed " << isMixed << " coalesced " << flat.coalesce;
       }
     }
 }

@@ -1,6 +1,6 @@
 // vln view as people call it: what pages hold, how large they are, and what goes wrong.
-#include "Interop/VolumeIo.h"
 #include "GeometryVolume/volume/Volume.h"
+#include "Interop/VolumeIo.h"
 #include "support/RealVolumes.h"
 #include "support/TempFolder.h"
 #include "support/TurnedRamp.h"
@@ -79,7 +79,8 @@ TEST_P(ViewRealTest, RequirementEveryFileHasAPage) {
   if (data.empty()) GTEST_SKIP() << "no real input files";
   std::string const volume = data + "/vdb/" + GetParam();
   if (std::string(GetParam()).find("points") != std::string::npos) {
-    expectFailure(vln({"view", volume, "-o", m_folder / "p.html"}), volume + ": has points; view shows volumes alone");
+    expectFailure(vln({"view", volume, "-o", m_folder / "p.html"}),
+                  volume + ": has points; view shows volumes alone");
     return;
   }
   std::string const text = page(volume, {"--max-size", "2MB"});
@@ -94,7 +95,8 @@ TEST_P(ViewRealTest, RequirementEveryFileHasAPage) {
     }
   EXPECT_NE(text.find("default-src 'none'"), std::string::npos);
   EXPECT_EQ(text.find("src=\"http"), std::string::npos);
-  EXPECT_NE(text.find("Permission is hereby granted"), std::string::npos) << "a licence travels with what it is of";
+  EXPECT_NE(text.find("Permission is hereby granted"), std::string::npos)
+      << "a licence travels with what it is of";
 }
 
 // requirement: the size chooses the depth
@@ -109,9 +111,7 @@ TEST_F(ViewPageTest, RequirementSizeChoosesTheDepth) {
     EXPECT_LT(depth, deepest) << size;
     EXPECT_LT(text.size(), last);
     deepest = depth, last = text.size();
-    if (size != "20MB") {
-      EXPECT_LE(text.size(), std::stoul(size) * 1024);
-    }
+    if (size != "20MB") { EXPECT_LE(text.size(), std::stoul(size) * 1024); }
   }
 }
 
@@ -128,7 +128,8 @@ TEST_F(ViewPageTest, RequirementDepthIsKept) {
 // requirement: the page begins with what render would draw
 TEST_F(ViewPageTest, RequirementBeginsWithRendersPicture) {
   std::string const volume = made("cloud"), parameters = m_folder / "p.json";
-  std::vector<std::string> const options = {"--cmap", "magma", "--opacity", "sigmoid", "--camera-direction", "1,-1,0.5"};
+  std::vector<std::string> const options = {"--cmap",  "magma", "--opacity", "sigmoid", "--camera-direction",
+                                            "1,-1,0.5"};
   auto const json = about(volume, options);
   std::vector<std::string> render{"render", volume, "-o", m_folder / "p.png", "--parameters", parameters};
   render.insert(render.end(), options.begin(), options.end());
@@ -164,12 +165,15 @@ TEST_F(ViewPageTest, RequirementTransformsAreKept) {
 TEST_F(ViewPageTest, RequirementSeveralChannels) {
   openvdb::initialize();
   auto const sphere = [](char const* name, auto value) {
-    auto grid = openvdb::Grid<typename openvdb::tree::Tree4<decltype(value), 5, 4, 3>::Type>::create(decltype(value)(0));
+    auto grid = openvdb::Grid<typename openvdb::tree::Tree4<decltype(value), 5, 4, 3>::Type>::create(
+        decltype(value)(0));
     grid->setName(name);
-    for (int n = 0; n < 2000; ++n) grid->tree().setValueOn(openvdb::Coord(n % 20, n / 20 % 10, n / 200), value);
+    for (int n = 0; n < 2000; ++n)
+      grid->tree().setValueOn(openvdb::Coord(n % 20, n / 20 % 10, n / 200), value);
     return grid;
   };
-  std::string const volume = file({sphere("whole", std::int32_t(7)), sphere("fine", 0.25f), sphere("speed", openvdb::Vec3f(3, 4, 0))});
+  std::string const volume = file(
+      {sphere("whole", std::int32_t(7)), sphere("fine", 0.25f), sphere("speed", openvdb::Vec3f(3, 4, 0))});
   auto const json = about(volume, {"--channel", "speed", "--channel", "whole", "--channel", "fine"});
   ASSERT_EQ(json["channels"].size(), 3u);
   EXPECT_EQ(json["channels"][0]["name"], "speed");
@@ -237,12 +241,19 @@ TEST_F(ViewPageTest, NegativeOneLineEach) {
   auto const empty = openvdb::FloatGrid::create(1.0f);
   empty->setName("empty");
   std::string const nothing = file({empty}, "empty.vdb"), cloud = made("cloud"), out = m_folder / "q.html";
-  expectFailure(vln({"view", nothing, "--channel", "empty", "-o", out}), nothing + ": channel 'empty' has no active voxel");
-  expectFailure(vln({"view", cloud, "-o", m_folder / "q.png"}), (m_folder / "q.png") + ": pages are written as .html");
-  for (std::vector<std::string> const& options :
-       {std::vector<std::string>{"--max-size", "12"}, {"--max-size", "x"}, {"--depth", "29"}, {"--cmap", "none"},
-        {"--channel", "nothing"}, {"--opacity", "steep"}, {"--clim", "1,0"}, {"--iso", "9"},
-        {"--camera-view-up", "0,0,0"}}) {
+  expectFailure(vln({"view", nothing, "--channel", "empty", "-o", out}),
+                nothing + ": channel 'empty' has no active voxel");
+  expectFailure(vln({"view", cloud, "-o", m_folder / "q.png"}),
+                (m_folder / "q.png") + ": pages are written as .html");
+  for (std::vector<std::string> const& options : {std::vector<std::string>{"--max-size", "12"},
+                                                  {"--max-size", "x"},
+                                                  {"--depth", "29"},
+                                                  {"--cmap", "none"},
+                                                  {"--channel", "nothing"},
+                                                  {"--opacity", "steep"},
+                                                  {"--clim", "1,0"},
+                                                  {"--iso", "9"},
+                                                  {"--camera-view-up", "0,0,0"}}) {
     std::vector<std::string> all{"view", cloud, "-o", out};
     all.insert(all.end(), options.begin(), options.end());
     RunResult const run = vln(all);
@@ -282,15 +293,19 @@ TEST_F(ViewProgramTest, RequirementPagesInABrowser) {
   openvdb::Coord const middle(40000, -30000, -20000);
   for (auto it = openvdb::CoordBBox(openvdb::Coord(-18), openvdb::Coord(18)).begin(); it; ++it) {
     double const d = (*it).asVec3d().length() - 14;
-    if (std::abs(d) < 3) egg->tree().setValueOn(*it + middle, static_cast<float>(d));
-    else if (d < 0) egg->tree().setValueOff(*it + middle, -3.0f);
+    if (std::abs(d) < 3)
+      egg->tree().setValueOn(*it + middle, static_cast<float>(d));
+    else if (d < 0)
+      egg->tree().setValueOff(*it + middle, -3.0f);
   }
   file({egg}, "egg.vdb");
   auto const steps = openvdb::FloatGrid::create(0.0f); // of tiles 8 and 128 wide
   steps->setName("density");
   steps->fill(openvdb::CoordBBox(openvdb::Coord(0), openvdb::Coord(127, 127, 127)), 0.3f);
   steps->fill(openvdb::CoordBBox(openvdb::Coord(128, 0, 0), openvdb::Coord(159, 63, 63)), 0.6f);
-  for (int n = 0; n < 12; ++n) steps->fill(openvdb::CoordBBox(openvdb::Coord(160 + n, 10, 10), openvdb::Coord(160 + n, 20 + n, 20 + n)), 1.0f);
+  for (int n = 0; n < 12; ++n)
+    steps->fill(openvdb::CoordBBox(openvdb::Coord(160 + n, 10, 10), openvdb::Coord(160 + n, 20 + n, 20 + n)),
+                1.0f);
   auto const other = steps->deepCopy();
   other->setName("other");
   file({steps, other}, "tiles.vdb");

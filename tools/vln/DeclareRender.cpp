@@ -212,8 +212,7 @@ void declareView(CLI::App& self) {
       ->allow_extra_args(false)
       ->type_name("NAME");
   self.add_option_function<std::uint64_t>(
-          "--max-size",
-          [&o](std::uint64_t bytes) { o.maxSize = bytes, o.hasMaxSize = true; },
+          "--max-size", [&o](std::uint64_t bytes) { o.maxSize = bytes, o.hasMaxSize = true; },
           "What the page may take: it holds the deepest depth that fits (1 KB is 1024 bytes)")
       ->transform(CLI::AsSizeValue(false))
       ->check(CLI::Range(std::uint64_t(1) << 18, std::uint64_t(1) << 40))

@@ -48,7 +48,8 @@ struct Level {
 Level packedLevel(PackedField const& packed) {
   Level level;
   std::string bytes;
-  for (std::uint32_t PackedBrick::*part : {&PackedBrick::x, &PackedBrick::y, &PackedBrick::z, &PackedBrick::level})
+  for (std::uint32_t PackedBrick::*part :
+       {&PackedBrick::x, &PackedBrick::y, &PackedBrick::z, &PackedBrick::level})
     for (PackedBrick const& b : packed.bricks) append(bytes, &(b.*part), 1);
   for (float PackedBrick::*part : {&PackedBrick::low, &PackedBrick::high})
     for (PackedBrick const& b : packed.bricks) append(bytes, &(b.*part), 1);
@@ -74,7 +75,8 @@ struct Channel {
 };
 
 // Depths from the roots on, until one is too large.
-std::vector<Level> packLevels(Field const& field, ViewCommandOptions const& options, Progress const& progress) {
+std::vector<Level> packLevels(Field const& field, ViewCommandOptions const& options,
+                              Progress const& progress) {
   int const finest = finestDepth(field);
   int const deepest = options.look.depth >= 0 ? std::min(options.look.depth, finest) : finest;
   // The first depth at which the field is more than a brick wide.
@@ -99,8 +101,8 @@ std::vector<Level> packLevels(Field const& field, ViewCommandOptions const& opti
     levels.push_back(std::move(level));
   }
   if (options.look.depth >= 0 && (levels.empty() || levels.back().depth < deepest))
-    throw std::invalid_argument(fmt::format("its depth {} does not fit{}", deepest,
-                                            options.hasMaxSize ? " into the size" : ""));
+    throw std::invalid_argument(
+        fmt::format("its depth {} does not fit{}", deepest, options.hasMaxSize ? " into the size" : ""));
   if (levels.empty()) throw std::invalid_argument("nothing of it differs from the background");
   return levels;
 }
@@ -139,7 +141,8 @@ ordered_json aboutChannel(Drawing& drawing, double unit) {
                         {"levels", ordered_json::array()}};
   if (r.transfer.awayFrom) about["awayFrom"] = r.transfer.from;
   if (!isNamed)
-    about["ownOpacity"] = std::vector<float>(transfer.view().opacity, transfer.view().opacity + kTransferSize);
+    about["ownOpacity"] =
+        std::vector<float>(transfer.view().opacity, transfer.view().opacity + kTransferSize);
   return about;
 }
 
@@ -199,7 +202,8 @@ Page makePage(ViewCommandOptions const& options, ProgressBar& bar) {
   // Where all together are too large, the largest goes without its deepest depth.
   bool const isLimited = options.look.depth < 0 || options.hasMaxSize;
   auto const total = [&] {
-    std::uint64_t sum = kViewPageBytes + common.size();
+    // Beside the blocks: the scripts, and a description of less than a page of paper for each channel.
+    std::uint64_t sum = viewScript().size() + common.size() + 4096 * (2 + channels.size());
     for (Channel const& channel : channels) sum += channel.bytes();
     return sum;
   };
@@ -208,7 +212,8 @@ Page makePage(ViewCommandOptions const& options, ProgressBar& bar) {
       return a.levels.back().block.size() < b.levels.back().block.size();
     });
     if (options.look.depth >= 0 || largest->levels.size() == 1)
-      throw std::invalid_argument(fmt::format("does not fit into {} bytes: it takes {}", options.maxSize, total()));
+      throw std::invalid_argument(
+          fmt::format("does not fit into {} bytes: it takes {}", options.maxSize, total()));
     largest->levels.pop_back();
   }
 
@@ -236,8 +241,9 @@ void view(ViewCommandOptions const& options) {
                                  ? std::filesystem::path(file).stem().string() + ".html"
                                  : options.look.output;
   if (viewScript().empty())
-    throw std::runtime_error("this program was built without the viewer's page; -DVLN_WITH_VIEW=ON builds it in "
-                             "(docs/viewing.md)");
+    throw std::runtime_error(
+        "this program was built without the viewer's page; -DVLN_WITH_VIEW=ON builds it in "
+        "(docs/viewing.md)");
   checkOutputFor(FileContent::kPages, output);
   TransferOptions early; // what is wrong with the opacity is told before the file is read
   early.opacity = options.look.render.transfer.opacity;

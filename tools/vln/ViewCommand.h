@@ -27,13 +27,10 @@ std::string_view viewScript();
 std::string packedText(std::string_view bytes);
 
 /// Writes the page, whole or not at all.
-/// @param about What the page's scripts read first. @param blocks By packedText(), in the order in which `about`
-/// counts them.
+/// @param about What the page's scripts read first. @param blocks By packedText(), in the order in which
+/// `about` counts them.
 /// @error FileError.
 void writeViewPage(std::string const& path, std::string const& title, nlohmann::ordered_json const& about,
                    std::vector<std::string> const& blocks);
-
-/// The size that the page would have beside its blocks, roughly.
-inline constexpr std::uint64_t kViewPageBytes = 120'000;
 
 } // namespace Vln

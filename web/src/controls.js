@@ -34,6 +34,8 @@ export function panel(page, look, range, actions, changed) {
   gui.add(actions, 'screenshot');
   gui.add(actions, 'reset').name('reset camera');
 
+  for (const folder of [colors, slice]) folder.close();
+
   const update = (range) => {
     const step = (range.high - range.low) / 500;
     for (const c of [iso, low, high]) c.min(range.low).max(range.high).step(step || 1e-6);

@@ -76,8 +76,7 @@ class Page {
   }
 
   async useDepth() {
-    // The slider steps over depths at which the tree has no tiles.
-    const level = this.channel.levels.filter((l) => l.depth <= this.look.depth).at(-1) ?? this.channel.levels[0];
+    const level = this.channel.levels.find((l) => l.depth === this.look.depth);
     let loading = this.loaded.get(level.block);
     if (!loading) {
       const { channel } = this;
