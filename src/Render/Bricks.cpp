@@ -178,12 +178,19 @@ private:
                                             static_cast<float>(corner[1] + j * spacing),
                                             static_cast<float>(corner[2] + k * spacing)}),
                               -kLargest, kLargest);
-    auto const [low, high] = std::minmax_element(values, values + kPackedSamples);
-    brick.low = *low, brick.high = *high;
+    auto const [least, most] = std::minmax_element(values, values + kPackedSamples);
+    brick.low = *least, brick.high = *most;
     if (!(brick.low < brick.high)) return;
-    double const scale = 255 / (double(brick.high) - double(brick.low));
+    double low = double(brick.low), step = (double(brick.high) - low) / 255;
+    if (brick.low < 0 && brick.high > 0) {
+      // 0 is a code: rounded to either side, a plateau of zeros would be full of surfaces.
+      step = (double(brick.high) - low) / 254;
+      low = -std::ceil(-low / step) * step;
+      brick.low = static_cast<float>(low), brick.high = static_cast<float>(low + 255 * step);
+    }
     for (int n = 0; n < kPackedSamples; ++n)
-      codes[n] = static_cast<std::uint8_t>(std::lround((double(values[n]) - double(brick.low)) * scale));
+      codes[n] =
+          static_cast<std::uint8_t>(std::clamp(std::lround((double(values[n]) - low) / step), 0l, 255l));
   }
 
   // The weights of a tent, 1/4 1/2 1/4 along each axis: what a blend of samples twice as far apart keeps of

@@ -5,8 +5,8 @@
 //      in it.
 //      +---+---+--+          Level 0 where there is detail, higher ones where the tree is coarse.
 //
-// In a brick the code c stands for low + (high - low) * c / 255: no sample is off by more than 1/510 of the
-// range.
+// In a brick the code c stands for low + (high - low) * c / 255: no sample is off by more than 1/508 of the
+// range of the brick's samples. Where there are values of both signs 0 is a code, up to rounding.
 #pragma once
 
 #include "Render/Field.h"
@@ -23,7 +23,7 @@ inline constexpr int kPackedSamples = kPackedWidth * kPackedWidth * kPackedWidth
 struct PackedBrick {
   std::uint32_t x = 0, y = 0, z = 0; ///< in bricks of its level, from the origin
   std::uint32_t level = 0;
-  float low = 0, high = 0; ///< of its samples; equal where they are, and then there are no codes
+  float low = 0, high = 0; ///< its samples lie between; equal where they are, and then there are no codes
 };
 
 struct PackedField {

@@ -309,6 +309,15 @@ TEST_F(ViewProgramTest, RequirementPagesInABrowser) {
   auto const other = steps->deepCopy();
   other->setName("other");
   file({steps, other}, "tiles.vdb");
+  // Zeros round it, which no surface crosses.
+  auto const halo = egg->deepCopy();
+  halo->tree().clear();
+  for (auto it = openvdb::CoordBBox(openvdb::Coord(-18), openvdb::Coord(18)).begin(); it; ++it) {
+    double const d = (*it).asVec3d().length() - 11;
+    halo->tree().setValueOn(
+        *it, static_cast<float>(d < 0 ? std::max(d, -2.7) : std::max(0.0, std::min(d - 4, 3.0))));
+  }
+  file({halo}, "zeros.vdb");
   RunResult const run = runProgram({VLN_NODE, VLN_VIEW_TEST, VLN_PROGRAM, VLN_VIEW_MODULES, m_folder / ""});
   std::cout << run.out;
   EXPECT_EQ(run.code, 0) << run.err;

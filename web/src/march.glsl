@@ -157,7 +157,8 @@ vec4 marchFog(Ray r, vec3 world, float t0, float t1) {
 
 // --- Surfaces
 
-// Where values first cross uIso.
+// Where values first cross uIso. What is a part in 10,000 of the brick's range below it, less than a code, counts as
+// equal: zeros are codes, but decoded with an error of rounding.
 bool hitSurface(Ray r, float t0, float t1, float samples, out float at) {
   at = 0.0;
   if (!clipTo(r, t0, t1)) return false;
@@ -175,16 +176,16 @@ bool hitSurface(Ray r, float t0, float t1, float samples, out float at) {
       continue;
     }
     Brick b = brickOf(e, corner, s);
-    float u = t, last = t, step = dt / b.scale;
+    float u = t, last = t, step = dt / b.scale, iso = uIso - 1e-4 * b.range;
     for (int n = 0; n < 512; ++n) {
-      float f = valueIn(b, r.o + r.d * u) - uIso;
+      float f = valueIn(b, r.o + r.d * u) - iso;
       if (has && (f < 0.0) != (before < 0.0)) {
         // Regula falsi with the Illinois rule; bricks that meet may differ by a code.
         float a = last, fa = before, z = u, fz = f;
         int side = 0;
         for (int m = 0; m < 8 && z > a; ++m) {
           float x = clamp((fa * z - fz * a) / (fa - fz), a, z);
-          float fx = valueIn(b, r.o + r.d * x) - uIso;
+          float fx = valueIn(b, r.o + r.d * x) - iso;
           if ((fx < 0.0) == (fa < 0.0)) {
             a = x, fa = fx;
             if (side == -1) fz *= 0.5;

@@ -55,7 +55,7 @@ async function hidePanel(opened) {
   await opened.page.evaluate(() => globalThis.vlnView.panel.gui.hide());
 }
 
-const [cloud, torus, turned, egg, tiles] = ['cloud', 'torus', 'turned', 'egg', 'tiles'].map((n) => join(folder, n + '.vdb'));
+const [cloud, torus, turned, egg, tiles, zeros] = ['cloud', 'torus', 'turned', 'egg', 'tiles', 'zeros'].map((n) => join(folder, n + '.vdb'));
 
 // What both draw: [name, file, options]. What is left are codes of 8 bits, edges between pixels, and other random
 // numbers; docs/viewing.md tells these bounds.
@@ -66,6 +66,7 @@ const alike = [
   ['a level set', torus, []],
   ['a turned ramp, in colours', turned, ['--cmap', 'coolwarm']],
   ['a level set far away, of voxels that are no cubes', egg, []],
+  ['zeros beside a surface', zeros, []],
   ['tiles of several depths', tiles, ['--channel', 'density']],
   ['an iso-surface', cloud, ['--iso', '0.4']],
   ['a projection', cloud, ['--mode', 'mip', '--clim', '0,1', '--cmap', 'turbo']],
