@@ -13,19 +13,6 @@
 namespace VLN::Test {
 namespace {
 
-std::string bytesOf(std::string const& path) {
-  std::ifstream in(path, std::ios::binary);
-  return {std::istreambuf_iterator<char>(in), {}};
-}
-
-// The text of a script of the page.
-std::string part(std::string const& page, std::string const& id) {
-  std::size_t const tag = page.find("id=\"" + id + "\">");
-  if (tag == std::string::npos) return "";
-  std::size_t const first = page.find('>', tag) + 1;
-  return page.substr(first, page.find("</script>", first) - first);
-}
-
 class ViewProgramTest : public testing::Test {
 protected:
   std::string made(std::string const& shape, int voxels = 30000) {
@@ -55,6 +42,19 @@ TEST_F(ViewProgramTest, NegativeBuiltWithoutThePage) {
 }
 
 #else
+
+std::string bytesOf(std::string const& path) {
+  std::ifstream in(path, std::ios::binary);
+  return {std::istreambuf_iterator<char>(in), {}};
+}
+
+// The text of a script of the page.
+std::string part(std::string const& page, std::string const& id) {
+  std::size_t const tag = page.find("id=\"" + id + "\">");
+  if (tag == std::string::npos) return "";
+  std::size_t const first = page.find('>', tag) + 1;
+  return page.substr(first, page.find("</script>", first) - first);
+}
 
 class ViewPageTest : public ViewProgramTest {
 protected:
