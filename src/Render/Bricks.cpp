@@ -169,15 +169,11 @@ private:
     std::int64_t const corner[3] = {m_origin[0] + brick.x * width, m_origin[1] + brick.y * width,
                                     m_origin[2] + brick.z * width};
     float values[kPackedSamples];
-    FieldPath path;
-    float* out = values;
-    for (int k = 0; k < kPackedWidth; ++k)
-      for (int j = 0; j < kPackedWidth; ++j)
-        for (int i = 0; i < kPackedWidth; ++i)
-          *out++ = std::clamp(sample(path, {static_cast<float>(corner[0] + i * spacing),
-                                            static_cast<float>(corner[1] + j * spacing),
-                                            static_cast<float>(corner[2] + k * spacing)}),
-                              -kLargest, kLargest);
+    if (m_isMean && brick.level == 0)
+      readMeans(corner, values);
+    else
+      read(corner, spacing, kPackedWidth, values);
+    for (float& v : values) v = std::clamp(v, -kLargest, kLargest);
     auto const [least, most] = std::minmax_element(values, values + kPackedSamples);
     brick.low = *least, brick.high = *most;
     if (!(brick.low < brick.high)) return;
@@ -193,22 +189,43 @@ private:
           static_cast<std::uint8_t>(std::clamp(std::lround((double(values[n]) - low) / step), 0l, 255l));
   }
 
-  // The weights of a tent, 1/4 1/2 1/4 along each axis: what a blend of samples twice as far apart keeps of
-  // them.
-  float sample(FieldPath& path, Vec3 p) const {
-    if (!m_isMean) return path.value(m_view, p);
-    auto const half = static_cast<float>(m_step / 2);
-    float const first = path.value(m_view, p);
-    double sum = 0;
-    bool isConstant = true;
-    for (int n = 0; n < 27; ++n) {
-      int const i = n % 3 - 1, j = n / 3 % 3 - 1, k = n / 9 - 1;
-      float const v = path.value(
-          m_view, p + Vec3{static_cast<float>(i), static_cast<float>(j), static_cast<float>(k)} * half);
-      isConstant = isConstant && v == first;
-      sum += double(v) / (8 << (std::abs(i) + std::abs(j) + std::abs(k)));
+  // Values of a cube of that many samples along an axis.
+  void read(std::int64_t const corner[3], std::int64_t spacing, int width, float* out) const {
+    FieldPath path;
+    for (int k = 0; k < width; ++k)
+      for (int j = 0; j < width; ++j)
+        for (int i = 0; i < width; ++i)
+          *out++ = path.value(m_view, {static_cast<float>(corner[0] + i * spacing),
+                                       static_cast<float>(corner[1] + j * spacing),
+                                       static_cast<float>(corner[2] + k * spacing)});
+  }
+
+  // From samples twice as near to each other, by a tent of 1/4, 1/2, 1/4 along each axis in turn.
+  void readMeans(std::int64_t const corner[3], float* out) const {
+    constexpr int kFine = 2 * kPackedWidth + 1;
+    std::int64_t const half = m_step / 2;
+    std::int64_t const first[3] = {corner[0] - half, corner[1] - half, corner[2] - half};
+    std::vector<float> values(kFine * kFine * kFine);
+    read(first, half, kFine, values.data());
+    int size[3] = {kFine, kFine, kFine};
+    for (int axis = 0; axis < 3; ++axis) {
+      int const stride = axis == 0 ? 1 : axis == 1 ? size[0] : size[0] * size[1];
+      int to[3] = {size[0], size[1], size[2]};
+      to[axis] = kPackedWidth;
+      std::size_t n = 0; // behind what is still read
+      for (int k = 0; k < to[2]; ++k)
+        for (int j = 0; j < to[1]; ++j)
+          for (int i = 0; i < to[0]; ++i, ++n) {
+            int const at[3] = {axis == 0 ? 2 * i : i, axis == 1 ? 2 * j : j, axis == 2 ? 2 * k : k};
+            float const* const v = values.data() + (at[2] * size[1] + at[1]) * size[0] + at[0];
+            // Equal values stay equal.
+            values[n] = v[0] == v[stride] && v[stride] == v[2 * stride]
+                            ? v[0]
+                            : 0.25f * v[0] + 0.5f * v[stride] + 0.25f * v[2 * stride];
+          }
+      size[axis] = kPackedWidth;
     }
-    return isConstant ? first : static_cast<float>(sum);
+    std::copy_n(values.begin(), kPackedSamples, out);
   }
 
   FieldView m_view;

@@ -48,12 +48,15 @@ struct Level {
 Level packedLevel(PackedField const& packed) {
   Level level;
   std::string bytes;
+  bytes.reserve(packed.bricks.size() * sizeof(PackedBrick) + packed.codes.size());
   for (std::uint32_t PackedBrick::*part :
        {&PackedBrick::x, &PackedBrick::y, &PackedBrick::z, &PackedBrick::level})
     for (PackedBrick const& b : packed.bricks) append(bytes, &(b.*part), 1);
   for (float PackedBrick::*part : {&PackedBrick::low, &PackedBrick::high})
     for (PackedBrick const& b : packed.bricks) append(bytes, &(b.*part), 1);
-  append(bytes, packed.codes.data(), packed.codes.size());
+  // Differences along x pack better than codes.
+  for (std::size_t n = 0; n < packed.codes.size(); ++n)
+    bytes += static_cast<char>(packed.codes[n] - (n % kPackedWidth ? packed.codes[n - 1] : 0));
   level.depth = packed.depth;
   level.block = packedText(bytes);
   level.about = {{"depth", packed.depth},

@@ -20,11 +20,14 @@ export function bricksOf(level, buffer) {
   const n = level.bricks;
   const integers = (part) => new Uint32Array(buffer, 4 * part * n, n);
   const floats = (part) => new Float32Array(buffer, 4 * part * n, n);
+  const codes = new Uint8Array(buffer, 24 * n);
+  for (let at = 0; at < codes.length; at += 9) // differences along a row
+    for (let i = at + 1; i < at + 9; ++i) codes[i] += codes[i - 1];
   return {
     count: n,
     x: integers(0), y: integers(1), z: integers(2), level: integers(3),
     low: floats(4), high: floats(5),
-    codes: new Uint8Array(buffer, 24 * n),
+    codes,
   };
 }
 
