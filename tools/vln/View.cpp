@@ -13,6 +13,7 @@
 #include <cmath>
 #include <filesystem>
 #include <iostream>
+#include <memory>
 #include <stdexcept>
 
 #include <fmt/format.h>
@@ -121,8 +122,6 @@ ordered_json aboutChannel(Drawing& drawing, double unit) {
   auto const& toWorld = drawing.source().tileToWorld;
   ordered_json rows = ordered_json::array();
   for (Vec3d const& row : toWorld.rows) rows.push_back(numbers(row));
-  // Values of opacity are those of the range; where another is chosen in the page, they stay where they are.
-  Transfer const transfer(r.mode == Mode::kSurface ? TransferOptions() : r.transfer);
   auto const names = opacityNames();
   bool const isNamed = std::find(names.begin(), names.end(), r.transfer.opacity) != names.end();
   ordered_json about = {{"name", drawing.source().channel},
@@ -143,10 +142,26 @@ ordered_json aboutChannel(Drawing& drawing, double unit) {
                         {"boxHigh", numbers(field.view().high.as<double>())},
                         {"levels", ordered_json::array()}};
   if (r.transfer.awayFrom) about["awayFrom"] = r.transfer.from;
-  if (!isNamed)
+  if (!isNamed) {
+    // Of the range; where another is chosen in the page, opacities stay where they are.
+    auto const transfer = std::make_unique<Transfer>(r.transfer);
     about["ownOpacity"] =
-        std::vector<float>(transfer.view().opacity, transfer.view().opacity + kTransferSize);
+        std::vector<float>(transfer->view().opacity, transfer->view().opacity + kTransferSize);
+  }
   return about;
+}
+
+// The page may show a surface as fog, whatever its values.
+double unitOf(Drawing& drawing, Camera const& camera) {
+  auto const& r = drawing.options();
+  if (r.opacityUnit > 0) return r.opacityUnit;
+  auto const& toWorld = drawing.source().tileToWorld;
+  try {
+    return opacityUnit(drawing.field(), toWorld, camera, r);
+  } catch (std::invalid_argument const&) {
+    if (r.mode != Mode::kSurface) throw;
+    return toWorld.edge(0);
+  }
 }
 
 // Colour maps and opacities by name, the same for all channels.
@@ -189,12 +204,8 @@ Page makePage(ViewCommandOptions const& options, ProgressBar& bar) {
                               {"focalPoint", numbers(camera.focalPoint)},
                               {"viewUp", numbers(camera.viewUp)},
                               {"viewAngle", camera.viewAngle}};
-    auto const& r = drawing.options();
-    double unit = r.opacityUnit;
-    if (!(unit > 0) && r.mode != Mode::kSurface)
-      unit = opacityUnit(drawing.field(), drawing.source().tileToWorld, camera, r);
     Channel channel;
-    channel.about = aboutChannel(drawing, unit);
+    channel.about = aboutChannel(drawing, unitOf(drawing, camera));
     channel.levels = packLevels(drawing.field(), options, bar.progress(from + 0.5 * (to - from), to));
     channels.push_back(std::move(channel));
   }

@@ -137,5 +137,21 @@ await test('controls change the picture', async () => {
   assert.deepEqual(opened.requests(), []);
 });
 
+await test('a surface becomes a fog, and a slice', async () => {
+  const opened = await pageOf(torus), { page } = opened;
+  let last = await pixels(page);
+  for (const [name, value] of [['mode', 'fog'], ['slice', 'y']]) {
+    await page.evaluate(([name, value]) => {
+      globalThis.vlnView.renderer.most = 1;
+      globalThis.vlnView.panel.gui.controllersRecursive().find((c) => c.property === name).setValue(value);
+    }, [name, value]);
+    await page.waitForTimeout(50);
+    const next = await pixels(page);
+    assert.ok(difference(last, next).mean > 0.5, name);
+    last = next;
+  }
+  assert.deepEqual(opened.faults, []);
+});
+
 await browser.close();
 if (failures.length > 0) process.exitCode = 1;
