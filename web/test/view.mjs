@@ -63,6 +63,7 @@ const MEAN = 2, FAR = 0.01;
 const alike = [
   ['a fog', cloud, []],
   ['a coloured fog', cloud, ['--cmap', 'inferno', '--opacity', 'sigmoid', '--light', '-1,1,0']],
+  ['a fog of its own opacity, by logarithms', cloud, ['--log', '--clim', '0.01,1', '--opacity', '0.01:0,0.3:0.8,1:0.2']],
   ['a level set', torus, []],
   ['a turned ramp, in colours', turned, ['--cmap', 'coolwarm']],
   ['a level set far away, of voxels that are no cubes', egg, []],
