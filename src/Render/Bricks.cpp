@@ -25,6 +25,7 @@ class Packer {
 public:
   Packer(Field const& field, PackOptions const& options)
       : m_view(field.view())
+      , m_tiles(field.tiles())
       , m_options(options) {
     // Coarse samples are means of those of the next depth, where there is one.
     m_isMean = options.depth < finestDepth(field);
@@ -36,7 +37,8 @@ public:
   }
 
   PackedField pack() {
-    m_view.tree.forEachTile([&](TileRef const& t) { addTile(t); });
+    for (TileRef const& t : m_tiles)
+      if (t.valid()) addTile(t);
     if (m_items.empty()) return std::move(m_packed);
     place();
     std::vector<std::uint32_t> all(m_items.size());
@@ -229,6 +231,7 @@ private:
   }
 
   FieldView m_view;
+  std::vector<TileRef> const& m_tiles;
   bool m_isMean = false;
   PackOptions const m_options;
   PackedField m_packed;
@@ -240,11 +243,12 @@ private:
 
 int finestDepth(Field const& field) {
   int depth = 0;
-  field.view().tree.forEachTile([&](TileRef const& t) {
+  for (TileRef const& t : field.tiles()) {
+    if (!t.valid()) continue;
     int own = t.depth;
     for (int core = field.view().brick(t.number).core; core > nanovtt::kTileWidth; core /= 2) ++own;
     depth = std::max(depth, own);
-  });
+  }
   return depth;
 }
 
