@@ -6,6 +6,9 @@
 //   sum       all active voxels; an item is an active voxel
 //   import    an item is an active voxel. A deep copy is less work: an import arranges the values anew, fills
 //             the coarser tiles, and finds out which state is implied by the values
+//   file      a whole file, read back from where a grid was just written; here with all its guards, in a
+//   child
+//             process first
 //   memory    bytes that the whole grid or volume holds for each active voxel
 #include "BenchGrids.h"
 #include "GeometryVolume/channels/ChannelReader.h"
@@ -17,10 +20,14 @@
 
 #include <algorithm>
 #include <bit>
+#include <filesystem>
 #include <functional>
 #include <map>
 #include <memory>
 #include <random>
+#include <stdexcept>
+
+#include <stdlib.h>
 
 namespace {
 
@@ -43,7 +50,6 @@ struct Subject {
   Interop::VdbImport content;
   Ostil::Ptr<Tree> tree;
   Ostil::Ptr<Values> values;
-  std::unique_ptr<Tree> accelerated; ///< the tree with an acceleration grid
   std::unique_ptr<ChannelReader<Values>> reader;
   std::vector<Coord> leaves; ///< corners, in the order of the grid's tree
   std::vector<Coord> ordered, shuffled;
@@ -57,8 +63,6 @@ struct Subject {
     auto const& volume = content.volumes.at(0);
     tree = volume.object->component<Tree>(Interop::kVdbContainerName);
     values = volume.object->component<Values>(volume.channels.at(0).name);
-    accelerated = std::make_unique<Tree>(*tree);
-    accelerated->buildAccessorAccelerationStructure(Shape::kMaxDepth);
     reader = std::make_unique<ChannelReader<Values>>(*tree, *values);
     activeVoxels = static_cast<double>(grid->activeVoxelCount());
     for (auto leaf = grid->tree().cbeginLeaf(); leaf; ++leaf) leaves.push_back(leaf->origin());
@@ -276,6 +280,40 @@ void deepCopy(benchmark::State& state, Subject const& s) {
   countItems(state, s.activeVoxels);
 }
 
+/// A file of the grid, in a folder that goes with the process.
+class GridFile {
+public:
+  explicit GridFile(Subject const& s) {
+    std::string name = (std::filesystem::temp_directory_path() / "vln_bench_XXXXXX").string();
+    if (!mkdtemp(name.data())) throw std::runtime_error("no folder for the file");
+    m_folder = name;
+    openvdb::io::File(path()).write(openvdb::GridPtrVec{s.grid});
+  }
+  ~GridFile() {
+    std::error_code ignored;
+    std::filesystem::remove_all(m_folder, ignored);
+  }
+  std::string path() const { return (m_folder / "grid.vdb").string(); }
+
+private:
+  std::filesystem::path m_folder;
+};
+
+void getGrids(benchmark::State& state, Subject const& s) {
+  GridFile const file(s);
+  for (auto _ : state) {
+    openvdb::io::File in(file.path());
+    in.open(false); // all values, now
+    benchmark::DoNotOptimize(in.getGrids()->size());
+  }
+  countItems(state, s.activeVoxels);
+}
+void importFile(benchmark::State& state, Subject const& s) {
+  GridFile const file(s);
+  for (auto _ : state) benchmark::DoNotOptimize(Interop::importVdb(file.path()).volumes.size());
+  countItems(state, s.activeVoxels);
+}
+
 // --- Memory: a figure, not a time ---
 
 void bytes(benchmark::State& state, double amount, double voxels) {
@@ -328,8 +366,6 @@ void addAll(Subject const& s) {
     add(s, (order + "NanoVDB").c_str(), [&](auto& st) { readNano(st, *s.nano.grid<float>(), places); });
     add(s, (order + "ChannelReader").c_str(), [&](auto& st) { readReader(st, *s.reader, places); });
     add(s, (order + "accessor").c_str(), [&](auto& st) { readOurs(st, *s.tree, *s.values, places); });
-    add(s, (order + "accessor, acceleration grid").c_str(),
-        [&](auto& st) { readOurs(st, *s.accelerated, *s.values, places); });
   }
   for (int threads : {1, 2}) {
     add(
@@ -340,6 +376,10 @@ void addAll(Subject const& s) {
         s, "import/OpenVDB deepCopy", [&](auto& st) { deepCopy(st, s); }, threads);
     add(
         s, "import/import", [&](auto& st) { import(st, s); }, threads);
+    add(
+        s, "file/OpenVDB getGrids", [&](auto& st) { getGrids(st, s); }, threads);
+    add(
+        s, "file/importVdb", [&](auto& st) { importFile(st, s); }, threads);
   }
   add(s, "import/ChannelReader", [&](auto& st) {
     for (auto _ : st) benchmark::DoNotOptimize(ChannelReader<Values>(*s.tree, *s.values).memUsage());

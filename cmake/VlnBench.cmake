@@ -24,3 +24,14 @@ foreach(source IN LISTS sources)
 endforeach()
 # As the renderer's own loops; NanoVDB's warn there.
 set_source_files_properties("${PROJECT_SOURCE_DIR}/bench/render.cpp" PROPERTIES COMPILE_OPTIONS "-O3;-Wno-maybe-uninitialized")
+
+# How time and memory grow with a volume: a program of its own, in a process for each size.
+if(TARGET GeometryVolumeInterop AND OpenVDB_FOUND)
+  add_executable(growth "${PROJECT_SOURCE_DIR}/bench/growth/growth.cpp")
+  vln_target(growth)
+  set_target_properties(growth PROPERTIES RUNTIME_OUTPUT_DIRECTORY "${PROJECT_BINARY_DIR}/bench")
+  target_include_directories(growth PRIVATE "${PROJECT_SOURCE_DIR}/bench")
+  target_compile_definitions(growth PRIVATE "VLN_BENCH_DATA_DIR=\"\"")
+  target_link_libraries(growth PRIVATE GeometryVolume GeometryVolumeInterop)
+  vln_uses_openvdb(growth)
+endif()

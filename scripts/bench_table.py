@@ -117,6 +117,7 @@ def main():
     print(f"- compiler: {compiler}, {build_type}: `{flags}`")
     print(f"- versions: {versions}")
     print(f"- allocator: {cache(build, 'VLN_ALLOCATOR')}, load at the start: {context.get('load_avg', '?')}\n")
+    print("<!-- The short table, by bench.sh --quick -->\n<!-- The end of the short table -->\n")
     print("Where a benchmark says what its items are, the fourth column is the time for one of them.\n")
     binary = None
     for row in rows:

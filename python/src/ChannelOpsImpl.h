@@ -7,6 +7,7 @@
 #include "GeometryVolume/core/Numeric.h"
 #include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/sampling/VoxelSamplerLinear.h"
+#include "Interop/ElementScalarImpl.h"
 
 #include <algorithm>
 #include <cmath>
@@ -18,12 +19,7 @@
 
 namespace VLN::Python {
 
-template <class T> struct ScalarOf { using type = T; };
-template <class T>
-requires requires { typename T::Scalar; }
-struct ScalarOf<T> {
-  using type = typename T::Scalar;
-};
+using Interop::ScalarOf;
 
 template <class T> struct ElementShape {
   static std::vector<int> of() {
@@ -348,13 +344,6 @@ private:
                                                 {m_volume.tree(), m_volume.topology(), m_field.channel()}});
   }
 
-  static S componentOf(T const& value, int c) {
-    S s;
-    std::memcpy(&s, reinterpret_cast<char const*>(&value) + static_cast<std::size_t>(c) * sizeof(S),
-                sizeof(S));
-    return s;
-  }
-
   static T blend(TileTree3D::ChannelReader<ChannelT> const& reader, double3 const& p) {
     if constexpr (std::is_integral_v<S>) {
       return reader.value(toIntFloor(p.x + 0.5), toIntFloor(p.y + 0.5), toIntFloor(p.z + 0.5));
@@ -378,7 +367,7 @@ private:
         }
         if (share == 0) continue;
         T const& value = reader.value(at);
-        for (int c = 0; c < kComponents; ++c) sums[c] += share * double(componentOf(value, c));
+        for (int c = 0; c < kComponents; ++c) sums[c] += share * double(Interop::componentOf(value, c));
       }
       S scalars[kComponents];
       for (int c = 0; c < kComponents; ++c) scalars[c] = static_cast<S>(sums[c]);
@@ -512,7 +501,7 @@ private:
   static bool near(T const& a, T const& b, double tolerance) {
     if (std::memcmp(&a, &b, sizeof(T)) == 0) return true;
     for (int c = 0; c < kComponents; ++c) {
-      S const x = componentOf(a, c), y = componentOf(b, c);
+      S const x = Interop::componentOf(a, c), y = Interop::componentOf(b, c);
       if constexpr (std::is_floating_point_v<S>) {
         if (!(x == y || std::abs(double(x) - double(y)) <= tolerance)) return false;
       } else {

@@ -4,17 +4,18 @@ from __future__ import annotations
 
 import errno
 import os
-from typing import Any, Callable, Dict, Iterator, List, Optional, Tuple
+from typing import Any, Callable, Dict, List, Optional, Tuple
 
 from . import _checks, _vln
 from ._channel import Channel
+from ._mapping import ByName
 from ._points import Points
 from ._volume import Volume
 
 Progress = Callable[[str, float], Any]
 
 
-class File:
+class File(ByName):
     """The content of a file: a mapping from the names of its grids to channels.
 
     Grids of one transform share a Volume. Everything is in memory; close(), or the end of a with statement,
@@ -57,18 +58,6 @@ class File:
     @property
     def names(self) -> List[str]:
         return [name for volume in self._held() for name in volume.names]
-
-    def keys(self) -> List[str]:
-        return self.names
-
-    def __len__(self) -> int:
-        return len(self.names)
-
-    def __iter__(self) -> Iterator[str]:
-        return iter(self.names)
-
-    def __contains__(self, name: object) -> bool:
-        return name in self.names
 
     def __getitem__(self, name: str) -> Channel:
         for volume in self._held():

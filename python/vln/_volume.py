@@ -3,12 +3,13 @@
 from __future__ import annotations
 
 import os
-from typing import Any, Callable, Dict, Iterator, List, Mapping, Optional, Tuple
+from typing import Any, Callable, Dict, List, Mapping, Optional, Tuple
 
 import numpy as np
 
 from . import _checks, _html, _vln
 from ._channel import Channel, _box, _depth, _three
+from ._mapping import ByName
 from ._points import Points
 from ._vln import FINEST, Flat
 
@@ -17,7 +18,7 @@ _CHILDREN = np.array([(i & 1, i >> 1 & 1, i >> 2) for i in range(8)], dtype=np.i
 _LOWEST, _HIGHEST = -(2**31), 2**31 - 1
 
 
-class Volume:
+class Volume(ByName):
     """A tree of tiles, with fields ("channels") on it: a mapping from names to channels.
 
     Indices are those of the deepest depth, and world = origin + voxel_size * index unless a file says
@@ -93,18 +94,6 @@ class Volume:
     @property
     def names(self) -> List[str]:
         return self._core.names()
-
-    def keys(self) -> List[str]:
-        return self.names
-
-    def __len__(self) -> int:
-        return len(self.names)
-
-    def __iter__(self) -> Iterator[str]:
-        return iter(self.names)
-
-    def __contains__(self, name: object) -> bool:
-        return name in self.names
 
     def __getitem__(self, name: str) -> Channel:
         if not isinstance(name, str):

@@ -1,15 +1,14 @@
 #include "Interop/Image.h"
 
 #include "Interop/OutputFile.h"
+#include "Interop/PngImpl.h"
 
 #include <algorithm>
 #include <stdexcept>
 
-#include <png.h>
-
 namespace VLN::Interop {
 
-static_assert(sizeof(Rgb) == 3, "rows of pixels are handed to libpng as they are");
+static_assert(sizeof(Rgb) == 3, "rows of pixels are coded as they are");
 
 namespace {
 
@@ -103,17 +102,7 @@ int Image::textWidth(std::string_view characters, int scale) {
 }
 
 std::vector<unsigned char> Image::png() const {
-  png_image image = {};
-  image.version = PNG_IMAGE_VERSION;
-  image.width = static_cast<png_uint_32>(m_width);
-  image.height = static_cast<png_uint_32>(m_height);
-  image.format = PNG_FORMAT_RGB;
-  png_alloc_size_t size = PNG_IMAGE_PNG_SIZE_MAX(image);
-  std::vector<unsigned char> bytes(size);
-  if (!png_image_write_to_memory(&image, bytes.data(), &size, 0, m_pixels.data(), 0, nullptr))
-    throw std::runtime_error(std::string("the picture cannot be coded: ") + image.message);
-  bytes.resize(size);
-  return bytes;
+  return codePng(m_pixels.data(), m_width, m_height, PixelBytes::kRgb);
 }
 
 void Image::writePng(std::string const& path) const {

@@ -1,10 +1,7 @@
 #include "Interop/Picture.h"
 
 #include "Interop/OutputFile.h"
-
-#include <stdexcept>
-
-#include <png.h>
+#include "Interop/PngImpl.h"
 
 namespace VLN::Interop {
 
@@ -18,17 +15,9 @@ void writeRgbaPng(std::string const& path, int width, int height, std::vector<st
     for (std::size_t n = 0; n < pixels.size() / 4; ++n)
       for (std::size_t c = 0; c < 3; ++c) rgb[3 * n + c] = pixels[4 * n + c];
   }
-  png_image image = {};
-  image.version = PNG_IMAGE_VERSION;
-  image.width = static_cast<png_uint_32>(width);
-  image.height = static_cast<png_uint_32>(height);
-  image.format = opaque ? PNG_FORMAT_RGB : PNG_FORMAT_RGBA;
-  png_alloc_size_t size = PNG_IMAGE_PNG_SIZE_MAX(image);
-  std::vector<unsigned char> bytes(size);
-  if (!png_image_write_to_memory(&image, bytes.data(), &size, 0, opaque ? rgb.data() : pixels.data(), 0,
-                                 nullptr))
-    throw std::runtime_error(std::string("the picture cannot be coded: ") + image.message);
-  file.write(bytes.data(), size);
+  auto const bytes = opaque ? codePng(rgb.data(), width, height, PixelBytes::kRgb)
+                            : codePng(pixels.data(), width, height, PixelBytes::kRgba);
+  file.write(bytes.data(), bytes.size());
   file.commit();
 }
 

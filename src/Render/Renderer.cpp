@@ -80,8 +80,7 @@ struct Sample {
 /// Smallest world length of a voxel's edges.
 double voxelOf(Affine const& m) { return std::min({m.edge(0), m.edge(1), m.edge(2)}); }
 
-// --- Surfaces
-// -------------------------------------------------------------------------------------------------
+// Surfaces
 
 struct SurfaceShader {
   Scene const& scene;
@@ -145,8 +144,7 @@ struct SurfaceShader {
   }
 };
 
-// --- Projections
-// ------------------------------------------------------------------------------------------------
+// Projections
 
 struct ProjectionShader {
   Scene const& scene;
@@ -186,8 +184,7 @@ struct ProjectionShader {
   }
 };
 
-// --- Fogs
-// -------------------------------------------------------------------------------------------------------
+// Fogs
 
 struct FogShader {
   FogView const& fog;
@@ -267,8 +264,46 @@ Scene sceneOf(Field const& field, Affine const& tileToWorld, Camera const& camer
   return scene;
 }
 
+/// Tells the field where rays have something to find, for modes other than fog.
+void weighField(Field& field, RenderOptions const& options) {
+  float const low = field.low(), background = field.background();
+  auto const isEmpty = [background](float from, float to) { return from == to && to == background; };
+  switch (options.mode) {
+  case Mode::kSurface:
+    return field.weigh([&](float from, float to) { return crosses(from, to, options.iso) ? 1.0f : 0.0f; },
+                       options.threads);
+  case Mode::kMaximum:
+    return field.weigh(
+        [&](float from, float to) { return isEmpty(from, to) ? 0 : std::max(to - low, 1e-30f); },
+        options.threads);
+  case Mode::kMean:
+    return field.weigh([&](float from, float to) { return isEmpty(from, to) ? 0.0f : 1.0f; },
+                       options.threads);
+  case Mode::kFog:
+    return;
+  }
+}
+
+/// A fog, and the lattices of light that its preview reads.
+struct FogScene {
+  FogView view;
+  double unit = 0; ///< of opacity
+  LightLattice direct, above;
+};
+
+/// World lengths between the points of a lattice of light, in samples.
+Vec3 latticeSpacing(FieldView const& field, Affine const& tileToWorld) {
+  double longest = 0;
+  for (int a = 0; a < 3; ++a)
+    longest = std::max(longest, tileToWorld.edge(a) * double(field.high[a] - field.low[a]));
+  Vec3 spacing;
+  for (int a = 0; a < 3; ++a)
+    spacing[a] = static_cast<float>(std::max(1.0, longest / kLatticePoints / tileToWorld.edge(a)));
+  return spacing;
+}
+
 /// Weighs the field by its opacity. Unit and lattices of light are still to come.
-FogView fogOf(Scene const& scene, Field& field, Transfer const& transfer, double voxel) {
+FogView fogOf(Field& field, Scene const& scene, Transfer const& transfer, double voxel) {
   RenderOptions const& options = scene.options;
   bool const isFinal = options.quality == Quality::kFinal;
   field.weigh([&](float low, float high) { return transfer.largestOpacity(low, high); }, options.threads);
@@ -290,6 +325,109 @@ FogView fogOf(Scene const& scene, Field& field, Transfer const& transfer, double
   return fog;
 }
 
+FogScene prepareFog(Field& field, Scene const& scene, Transfer const& transfer, Affine const& tileToWorld) {
+  RenderOptions const& options = scene.options;
+  double const voxel = voxelOf(tileToWorld);
+  FogScene result;
+  FogView& fog = result.view;
+  fog = fogOf(field, scene, transfer, voxel);
+  if (options.opacityUnit > 0 && options.opacityUnit < 1e-3 * voxel)
+    throw std::invalid_argument("the unit of opacity is less than a thousandth of a voxel");
+  result.unit = options.opacityUnit > 0 ? options.opacityUnit : chooseUnit(scene, fog, voxel);
+  fog.perUnit = static_cast<float>(1 / result.unit);
+  if (options.quality == Quality::kFinal) return result;
+  Vec3 const spacing = latticeSpacing(fog.field, tileToWorld);
+  Vec3 const up = scene.toLocal.vector(scene.camera.viewUp).as<float>();
+  result.direct = sweepLight(fog, fog.lightLocal, spacing, options.threads);
+  result.above = sweepLight(fog, up, spacing, options.threads);
+  fog.direct = result.direct.view, fog.above = result.above.view;
+  return result;
+}
+
+int samplesOf(RenderOptions const& options) {
+  if (options.samples > 0) return options.samples;
+  bool const isFinal = options.quality == Quality::kFinal;
+  switch (options.mode) {
+  case Mode::kSurface:
+    return isFinal ? 64 : 4;
+  case Mode::kFog:
+    return isFinal ? 64 : 1;
+  default:
+    return isFinal ? 16 : 1;
+  }
+}
+
+/// Adds one sample to every pixel.
+template <class Shader>
+void addSample(Picture& picture, Scene const& scene, int sample, int samples, Shader const& shader,
+               std::function<void(double)> const& watch) {
+  auto const rows = [&](std::int64_t begin, std::int64_t end) {
+    for (std::int64_t y = begin; y < end; ++y)
+      for (int x = 0; x < picture.width; ++x) {
+        auto const n = static_cast<std::size_t>(y) * static_cast<std::size_t>(picture.width) +
+                       static_cast<std::size_t>(x);
+        double du = 0.5, dv = 0.5;
+        if (samples > 1) {
+          // The recurrence of the occlusion rays, from the middle on.
+          du += 0.7548776662 * (sample + 1), dv += 0.5698402910 * (sample + 1);
+          du -= std::floor(du), dv -= std::floor(dv);
+        }
+        Start s;
+        if (!scene.start((x + du) / picture.width, (double(y) + dv) / picture.height, s)) continue;
+        Sample const got = shader(s, static_cast<std::uint32_t>(n), static_cast<std::uint32_t>(sample));
+        if (!(got.opacity > 0)) continue;
+        picture.color[n] = picture.color[n] + got.color;
+        picture.opacity[n] += got.opacity;
+        picture.depth[n] += got.depth;
+        picture.normal[n] = picture.normal[n] + got.normal;
+        if (!picture.value.empty()) picture.value[n] += got.value;
+      }
+  };
+  forRanges(picture.height, kRowGrain, scene.options.threads, rows, [&](double share) {
+    if (watch) watch((sample + share) / samples);
+  });
+}
+
+/// From sums to means.
+void divide(Picture& picture) {
+  float const scale = picture.samples > 0 ? 1 / static_cast<float>(picture.samples) : 0;
+  for (std::size_t n = 0; n < picture.color.size(); ++n) {
+    float const opacity = picture.opacity[n];
+    picture.depth[n] = opacity > 0 ? picture.depth[n] / opacity : kNowhere;
+    picture.normal[n] = normalized(picture.normal[n]);
+    if (!picture.value.empty() && opacity > 0) picture.value[n] /= opacity;
+    picture.color[n] = picture.color[n] * scale;
+    picture.opacity[n] = opacity * scale;
+  }
+}
+
+/// The colours of a projection's values, over their own range where the options ask for it.
+void colorValues(Picture& picture, RenderOptions const& options, Transfer transfer) {
+  if (options.rangeFromPicture) {
+    picture.low = std::numeric_limits<float>::max(), picture.high = -picture.low;
+    for (std::size_t n = 0; n < picture.value.size(); ++n)
+      if (picture.opacity[n] > 0)
+        picture.low = std::min(picture.low, picture.value[n]),
+        picture.high = std::max(picture.high, picture.value[n]);
+    if (!(picture.low < picture.high))
+      picture.low = options.transfer.low, picture.high = options.transfer.high;
+    TransferOptions own = options.transfer;
+    own.low = own.log ? std::max(picture.low, picture.high * 1e-4f) : picture.low, own.high = picture.high;
+    if (own.low < own.high && (!own.log || own.low > 0))
+      transfer = Transfer(own);
+    else
+      own = options.transfer;
+    picture.low = own.low, picture.high = own.high;
+  }
+  auto const& map = transfer.view();
+  for (std::size_t n = 0; n < picture.value.size(); ++n) {
+    float const place = map.place(picture.value[n]);
+    // The lowest tenth of the range fades, so that what is nearly nothing does not cover the background.
+    picture.opacity[n] *= std::min(1.0f, 10 * place);
+    picture.color[n] = map.colorAt(place) * picture.opacity[n];
+  }
+}
+
 } // namespace
 
 double opacityUnit(Field& field, Affine const& tileToWorld, Camera const& camera,
@@ -298,7 +436,7 @@ double opacityUnit(Field& field, Affine const& tileToWorld, Camera const& camera
   Transfer const transfer(options.transfer);
   double const voxel = voxelOf(tileToWorld);
   limitDepth(field, scene, options, voxel);
-  FogView fog = fogOf(scene, field, transfer, voxel);
+  FogView fog = fogOf(field, scene, transfer, voxel);
   return chooseUnit(scene, fog, voxel);
 }
 
@@ -307,149 +445,50 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
   if (options.width < 1 || options.height < 1 || options.width > 32768 || options.height > 32768)
     throw std::invalid_argument("a picture has 1 to 32768 pixels an axis");
   Scene const scene = sceneOf(field, tileToWorld, camera, options);
-  bool const isFinal = options.quality == Quality::kFinal, isFog = options.mode == Mode::kFog;
+
+  bool const isFinal = options.quality == Quality::kFinal;
   double const voxel = voxelOf(tileToWorld);
   Picture picture;
   picture.width = options.width, picture.height = options.height;
-  // Surfaces have no colours of their own: their values may span what a transfer function cannot.
-  Transfer transfer(options.mode == Mode::kSurface ? TransferOptions() : options.transfer);
   picture.low = options.transfer.low, picture.high = options.transfer.high;
-
+  // Surfaces have no colours of their own: their values may span what a transfer function cannot.
+  Transfer const transfer(options.mode == Mode::kSurface ? TransferOptions() : options.transfer);
   limitDepth(field, scene, options, voxel);
-  FogView fog;
-  LightLattice direct, above;
-  switch (options.mode) {
-  case Mode::kSurface:
-    field.weigh([&](float low, float high) { return crosses(low, high, options.iso) ? 1.0f : 0.0f; },
-                options.threads);
-    break;
-  case Mode::kMaximum:
-    field.weigh(
-        [&](float low, float high) {
-          return low == high && high == field.background() ? 0 : std::max(high - field.low(), 1e-30f);
-        },
-        options.threads);
-    break;
-  case Mode::kMean:
-    field.weigh(
-        [&](float low, float high) { return low == high && high == field.background() ? 0.0f : 1.0f; },
-        options.threads);
-    break;
-  case Mode::kFog:
-    fog = fogOf(scene, field, transfer, voxel);
-    if (options.opacityUnit > 0 && options.opacityUnit < 1e-3 * voxel)
-      throw std::invalid_argument("the unit of opacity is less than a thousandth of a voxel");
-    picture.opacityUnit = options.opacityUnit > 0 ? options.opacityUnit : chooseUnit(scene, fog, voxel);
-    fog.perUnit = static_cast<float>(1 / picture.opacityUnit);
-    if (!isFinal) {
-      Vec3 spacing;
-      double longest = 0;
-      for (int pass = 0; pass < 2; ++pass)
-        for (int a = 0; a < 3; ++a) {
-          double const edge = tileToWorld.edge(a);
-          double const extent = edge * double(fog.field.high[a] - fog.field.low[a]);
-          if (pass == 0) longest = std::max(longest, extent);
-          spacing[a] = static_cast<float>(std::max(1.0, longest / kLatticePoints / edge));
-        }
-      direct = sweepLight(fog, fog.lightLocal, spacing, options.threads);
-      above = sweepLight(fog, scene.toLocal.vector(camera.viewUp).as<float>(), spacing, options.threads);
-      fog.direct = direct.view, fog.above = above.view;
-    }
-    break;
+  FogScene fog;
+  if (options.mode == Mode::kFog) {
+    fog = prepareFog(field, scene, transfer, tileToWorld);
+    picture.opacityUnit = fog.unit;
+  } else {
+    weighField(field, options);
   }
 
   auto const count = static_cast<std::size_t>(options.width) * static_cast<std::size_t>(options.height);
   picture.color.resize(count), picture.opacity.resize(count);
   picture.depth.resize(count), picture.normal.resize(count);
-  if (!isFog && options.mode != Mode::kSurface) picture.value.resize(count);
-  int const samples = options.samples > 0              ? options.samples
-                      : options.mode == Mode::kSurface ? (isFinal ? 64 : 4)
-                      : isFog                          ? (isFinal ? 64 : 1)
-                                                       : (isFinal ? 16 : 1);
+  if (options.mode == Mode::kMaximum || options.mode == Mode::kMean) picture.value.resize(count);
 
-  auto const pass = [&](int sample, auto const& shader) {
-    forRanges(
-        options.height, kRowGrain, options.threads,
-        [&](std::int64_t begin, std::int64_t end) {
-          for (std::int64_t y = begin; y < end; ++y)
-            for (int x = 0; x < options.width; ++x) {
-              auto const n = static_cast<std::size_t>(y) * static_cast<std::size_t>(options.width) +
-                             static_cast<std::size_t>(x);
-              auto const pixel = static_cast<std::uint32_t>(n);
-              double du = 0.5, dv = 0.5;
-              if (samples > 1) {
-                // The same recurrence as above, from the middle on.
-                du += 0.7548776662 * (sample + 1), dv += 0.5698402910 * (sample + 1);
-                du -= std::floor(du), dv -= std::floor(dv);
-              }
-              Start s;
-              if (!scene.start((x + du) / options.width, (double(y) + dv) / options.height, s)) continue;
-              Sample const got = shader(s, pixel, static_cast<std::uint32_t>(sample));
-              if (!(got.opacity > 0)) continue;
-              picture.color[n] = picture.color[n] + got.color;
-              picture.opacity[n] += got.opacity;
-              picture.depth[n] += got.depth;
-              picture.normal[n] = picture.normal[n] + got.normal;
-              if (!picture.value.empty()) picture.value[n] += got.value;
-            }
-        },
-        [&](double share) {
-          if (watch) watch((sample + share) / samples);
-        });
-  };
+  int const samples = samplesOf(options);
   auto const began = Clock::now();
   auto const seconds = [&] { return std::chrono::duration<double>(Clock::now() - began).count(); };
-  int done = 0;
-  for (; done < samples; ++done) {
-    if (done > 0 && options.timeLimit > 0 && seconds() >= options.timeLimit) break;
+  auto const addOne = [&](auto const& shader) {
+    addSample(picture, scene, picture.samples, samples, shader, watch);
+  };
+  for (picture.samples = 0; picture.samples < samples; ++picture.samples) {
+    if (picture.samples > 0 && options.timeLimit > 0 && seconds() >= options.timeLimit) break;
     if (options.mode == Mode::kSurface) {
       int const rays = options.occlusionRays >= 0 ? options.occlusionRays : 2;
-      pass(done, SurfaceShader{scene, rays, static_cast<float>(0.15 * scene.diagonal),
-                               static_cast<float>(0.5 * voxel)});
-    } else if (isFog) {
-      pass(done, FogShader{fog, isFinal});
+      addOne(SurfaceShader{scene, rays, static_cast<float>(0.15 * scene.diagonal),
+                           static_cast<float>(0.5 * voxel)});
+    } else if (options.mode == Mode::kFog) {
+      addOne(FogShader{fog.view, isFinal});
     } else {
-      pass(done, ProjectionShader{scene, static_cast<float>(0.5 * voxel), options.mode == Mode::kMean});
+      addOne(ProjectionShader{scene, static_cast<float>(0.5 * voxel), options.mode == Mode::kMean});
     }
   }
   picture.seconds = seconds();
-  picture.samples = done;
-  picture.rays = static_cast<std::int64_t>(count) * done;
-
-  float const scale = done > 0 ? 1 / static_cast<float>(done) : 0;
-  for (std::size_t n = 0; n < count; ++n) {
-    float const opacity = picture.opacity[n];
-    picture.depth[n] = opacity > 0 ? picture.depth[n] / opacity : kNowhere;
-    picture.normal[n] = normalized(picture.normal[n]);
-    if (!picture.value.empty() && opacity > 0) picture.value[n] /= opacity;
-    picture.color[n] = picture.color[n] * scale;
-    picture.opacity[n] = opacity * scale;
-  }
-  if (!picture.value.empty()) {
-    if (options.rangeFromPicture) {
-      picture.low = std::numeric_limits<float>::max(), picture.high = -picture.low;
-      for (std::size_t n = 0; n < count; ++n)
-        if (picture.opacity[n] > 0)
-          picture.low = std::min(picture.low, picture.value[n]),
-          picture.high = std::max(picture.high, picture.value[n]);
-      if (!(picture.low < picture.high))
-        picture.low = options.transfer.low, picture.high = options.transfer.high;
-      TransferOptions own = options.transfer;
-      own.low = own.log ? std::max(picture.low, picture.high * 1e-4f) : picture.low, own.high = picture.high;
-      if (own.low < own.high && (!own.log || own.low > 0))
-        transfer = Transfer(own);
-      else
-        own = options.transfer;
-      picture.low = own.low, picture.high = own.high;
-    }
-    auto const& map = transfer.view();
-    for (std::size_t n = 0; n < count; ++n) {
-      float const place = map.place(picture.value[n]);
-      // The lowest tenth of the range fades, so that what is nearly nothing does not cover the background.
-      picture.opacity[n] *= std::min(1.0f, 10 * place);
-      picture.color[n] = map.colorAt(place) * picture.opacity[n];
-    }
-  }
+  picture.rays = static_cast<std::int64_t>(count) * picture.samples;
+  divide(picture);
+  if (!picture.value.empty()) colorValues(picture, options, transfer);
   return picture;
 }
 

@@ -6,8 +6,11 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <atomic>
 #include <cmath>
 #include <limits>
+#include <random>
+#include <thread>
 #include <utility>
 
 using namespace VLN::TileTree3D;
@@ -156,6 +159,88 @@ TYPED_TEST(AccelerationGrid, LookupsAreThoseWithoutTheGrid) {
       }
     }
   }
+}
+
+// requirement: accessors that search far and often make a table of places: answers stay the same, the grid
+// stays off, and any change of the tree drops it
+TYPED_TEST(AccelerationGrid, FarSearchesMakeTheTableOfPlaces) {
+  using T = TypeParam;
+  Support::RandomForest<T> forest(77);
+  auto& tree = forest.tree();
+  auto adding = tree.tileAccessor();
+  int const d0 = T::kMaxDepth - 4, w = T::width(d0), x = T::align(5000, d0);
+  auto const point = [&] {
+    return int3{x + forest.pick(-w, 7 * w), x + forest.pick(-w, 7 * w), x + forest.pick(-w, 7 * w)};
+  };
+  adding.addTile({x, x, x}, d0 - 1);
+  for (int n = 0; n < 300; ++n) adding.addTile(point(), d0 + forest.pick(1, 4));
+  auto const& data = Access::data(tree);
+  for (int round = 0; round < 3; ++round) {
+    auto const plain = tree; // a copy of its own, which nobody searches
+    ASSERT_EQ(data.m_lookup.load(), nullptr);
+    auto const cursor = std::as_const(tree).tileAccessor();
+    int searches = 0;
+    for (; searches < 200000 && !data.m_lookup.load(); ++searches) {
+      int3 const p = point();
+      ASSERT_EQ(cursor.treeIndex(p.x, p.y, p.z, T::kMaxDepth, false),
+                Access::tileIndex(plain, p, T::kMaxDepth));
+    }
+    EXPECT_GT(searches, 10000) << "not for a few searches";
+    ASSERT_NE(data.m_lookup.load(), nullptr);
+    EXPECT_EQ(data.m_gridDepth, -1);
+    auto const copy = tree;
+    EXPECT_EQ(Access::data(copy).m_lookup.load(), data.m_lookup.load()) << "copies share it";
+    for (int n = 0; n < 4000; ++n) {
+      int3 const p = point();
+      int const d = forest.pick(d0 - 2, T::kMaxDepth + 1);
+      bool const exact = n % 2;
+      ASSERT_EQ(cursor.treeIndex(p.x, p.y, p.z, d, exact),
+                plain.tileAccessor().treeIndex(p.x, p.y, p.z, d, exact));
+    }
+    switch (round) {
+    case 0:
+      adding.addTile({x - 5 * w, x, x}, T::kMaxDepth);
+      break;
+    case 1: {
+      auto const [index, depth] = std::as_const(tree).tile(tree.tileCount(-1) - 1).treeIndex();
+      adding.removeTile({index, depth}, true);
+      break;
+    }
+    default:
+      tree.sortIntoMortonOrder();
+    }
+    EXPECT_NE(Access::data(copy).m_lookup.load(), nullptr) << "what a copy has stays";
+  }
+  EXPECT_EQ(data.m_lookup.load(), nullptr);
+}
+
+// requirement: whoever searches meanwhile, on any thread, gets the same answers
+TYPED_TEST(AccelerationGrid, ThreadsSearchWhileTheTableOfPlacesIsMade) {
+  using T = TypeParam;
+  Support::RandomForest<T> forest(78);
+  auto adding = forest.tree().tileAccessor();
+  int const d0 = T::kMaxDepth - 4, w = T::width(d0), x = T::align(5000, d0);
+  for (int n = 0; n < 200; ++n)
+    adding.addTile({x + forest.pick(-w, 7 * w), x + forest.pick(-w, 7 * w), x + forest.pick(-w, 7 * w)},
+                   d0 + forest.pick(1, 4));
+  auto const& tree = std::as_const(forest.tree());
+  std::atomic<int> wrong{0};
+  std::vector<std::thread> threads;
+  for (std::uint32_t t = 0; t < 4; ++t)
+    threads.emplace_back([&, t] {
+      std::mt19937 random(t);
+      auto const cursor = tree.tileAccessor();
+      for (int n = 0; n < 20000; ++n) {
+        auto const c = [&] { return x - w + static_cast<int>(random() % static_cast<unsigned>(8 * w)); };
+        int3 const p{c(), c(), c()};
+        wrong +=
+            cursor.treeIndex(p.x, p.y, p.z, T::kMaxDepth, false) != Access::tileIndex(tree, p, T::kMaxDepth);
+        if (n % 1000 == 0) Container<T> const copy(tree);
+      }
+    });
+  for (auto& thread : threads) thread.join();
+  EXPECT_EQ(wrong, 0);
+  EXPECT_NE(Access::data(tree).m_lookup.load(), nullptr);
 }
 
 // regression: a cell of the grid without a tile of its depth may still hold a deeper root

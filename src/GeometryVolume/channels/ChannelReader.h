@@ -2,8 +2,8 @@
 // it is.
 #pragma once
 
+#include "GeometryVolume/channels/BlockCursor.h"
 #include "GeometryVolume/channels/Channel.h"
-#include "GeometryVolume/channels/ReadTables.h"
 
 #include <memory>
 
@@ -28,7 +28,7 @@ public:
                                                 }))
       , m_channel(&channel)
       , m_tiles(tree.tileAccessor())
-      , m_block(&m_tables->noBlock()) {}
+      , m_blocks(*m_tables) {}
 
   /// The sample that holds the position, of the deepest tile that has data.
   /// @space Tile space.
@@ -36,16 +36,13 @@ public:
   /// @cost In the block of the read before: one test, and two loads. In another with a tile of the deepest
   /// depth: one load more. Elsewhere a lookup in the tree.
   value_type const& value(int i, int j, int k) const {
-    if (!inBlock(i, j, k)) [[unlikely]]
+    if (!m_blocks.holds(i, j, k)) [[unlikely]]
       setBlock(i, j, k);
-    std::size_t const x = within(i, m_corner.x), y = within(j, m_corner.y), z = within(k, m_corner.z);
-    constexpr std::size_t w = TraitsT::kTDW, slots = TraitsT::kTW;
-    // Sums of whole tile widths before the division: powers of two need one shift then.
-    void const* const tile = m_block->tiles[((x - x % w) + slots * ((y - y % w) + slots * (z - z % w))) / w];
-    if (!tile) [[unlikely]]
+    Internal::FinestSample const at = m_blocks.here(i, j, k);
+    if (!at.elements) [[unlikely]]
       return coarse(i, j, k);
-    return static_cast<value_type const*>(
-        tile)[kFirst + x % w + ChannelT::ConstTile::kWidth * (y % w + ChannelT::ConstTile::kWidth * (z % w))];
+    constexpr std::size_t w = ChannelT::ConstTile::kWidth;
+    return static_cast<value_type const*>(at.elements)[kFirst + at.i + w * (at.j + w * at.k)];
   }
   value_type const& value(int3 const& p) const { return value(p.x, p.y, p.z); }
 
@@ -54,26 +51,11 @@ public:
 
 private:
   static constexpr std::size_t kFirst = ChannelT::ConstTile::index(0, 0, 0);
-  static constexpr auto kBlockWidth = std::uint32_t(Tables::kBlockWidth);
 
-  /// Distance from the corner of the point's block.
-  static std::uint32_t within(int c, int corner) {
-    if constexpr (TraitsT::kTW == 2)
-      return static_cast<std::uint32_t>(c) % kBlockWidth; // blocks lie at multiples of their width
-    else
-      return static_cast<std::uint32_t>(c) - static_cast<std::uint32_t>(corner);
-  }
-  bool inBlock(int i, int j, int k) const {
-    if constexpr (TraitsT::kTW == 2)
-      return static_cast<std::uint32_t>((i ^ m_corner.x) | (j ^ m_corner.y) | (k ^ m_corner.z)) < kBlockWidth;
-    else
-      return within(i, m_corner.x) < kBlockWidth && within(j, m_corner.y) < kBlockWidth &&
-             within(k, m_corner.z) < kBlockWidth;
-  }
-  void setBlock(int i, int j, int k) const {
-    m_block = m_tables->block(i, j, k);
-    // Out of the domain, too, the corner is less than a block away, and the block is the empty one.
-    m_corner = TraitsT::align(int3{i, j, k}, Tables::kBlockDepth);
+  /// Apart, so that value() stays small.
+  [[gnu::noinline]] void setBlock(int i, int j, int k) const {
+    // Whoever goes on to the next block reads more of it, as a rule.
+    if (m_blocks.move(i, j, k)) m_blocks.prefetchElements(sizeof(value_type) * std::size_t(ChannelT::kSize));
   }
   /// Null for a tile that the channel lacks, or that has fewer elements than a whole one.
   static value_type const* elements(ChannelT const& channel, TreeIndex const& at) {
@@ -97,8 +79,7 @@ private:
   std::shared_ptr<Tables const> m_tables;
   ChannelT const* m_channel;
   ConstTileAccessorOf<TraitsT> m_tiles;
-  mutable typename Tables::Block const* m_block;
-  mutable int3 m_corner{TraitsT::kMinTileCoord, TraitsT::kMinTileCoord, TraitsT::kMinTileCoord};
+  mutable Internal::BlockCursor<TraitsT> m_blocks;
 };
 
 } // namespace VLN::TileTree3D

@@ -11,13 +11,21 @@ template <class TraitsT> void HaloSampler<TraitsT>::sample(int3 const& p, float 
   if (scale != 1.0f) m_source.ops->scale(out, scale);
 }
 
+template <class TraitsT> void HaloSampler<TraitsT>::setTile(int3 const& p, int depth) {
+  auto const& found = m_accessor.tile(p, depth, false);
+  m_extent = 0;
+  if (&found != m_tile) m_known = 0;
+  m_tile = &found;
+  m_elements = nullptr;
+  if (!found.valid()) return;
+  m_elements = m_source.elements(found.treeIndex());
+  int const covered = found.depth() == depth ? depth : found.depth() + 1;
+  m_corner = TraitsT::align(p, covered);
+  m_extent = static_cast<std::uint32_t>(TraitsT::width(covered));
+}
+
 template <class TraitsT> void HaloSampler<TraitsT>::read(int3 const& p, void* out) {
-  // A tile at the deepest depth that is asked for is the deepest one everywhere inside it.
-  int const depth = std::min(m_source.maxDepth, TraitsT::kMaxDepth);
-  if (!m_tile || m_tile->depth() != depth || !m_tile->contains(p)) {
-    m_tile = &m_accessor.tile(p, depth, false);
-    m_elements = m_tile->valid() ? m_source.elements(m_tile->treeIndex()) : nullptr;
-  }
+  if (!holds(p)) setTile(p, std::min(m_source.maxDepth, TraitsT::kMaxDepth));
   if (!m_elements) {
     std::memcpy(out, m_source.defaultValue, m_source.ops->size);
     return;
@@ -32,12 +40,30 @@ template <class TraitsT> void HaloSampler<TraitsT>::read(int3 const& p, void* ou
     low[a] = static_cast<int>(floor);
     blend.fraction[a] = l - floor;
   }
-  for (int n = 0; n < 8; ++n)
-    blend.corners[n] = corner({low[0] + (n & 1), low[1] + (n >> 1 & 1), low[2] + (n >> 2)});
+  auto const fits = [](int c) { return c >= 0 && c + 1 < TraitsT::kTDW; };
+  if (fits(low[0]) && fits(low[1]) && fits(low[2])) {
+    auto const* const first = static_cast<std::byte const*>(flat(m_elements, {low[0], low[1], low[2]}));
+    auto const size = static_cast<std::ptrdiff_t>(m_source.ops->size);
+    for (int n = 0; n < 8; ++n)
+      blend.corners[n] = first + size * ((n & 1) + m_width * ((n >> 1 & 1) + m_width * (n >> 2)));
+  } else {
+    for (int n = 0; n < 8; ++n)
+      blend.corners[n] = corner({low[0] + (n & 1), low[1] + (n >> 1 & 1), low[2] + (n >> 2)});
+  }
   m_source.ops->blendCorners(blend, out);
 }
 
-template <class TraitsT> void const* HaloSampler<TraitsT>::corner(int3 const& at) const {
+template <class TraitsT>
+auto HaloSampler<TraitsT>::beside(NeighborDirection direction, int3 const& place) -> Beside const& {
+  auto& found = m_beside[static_cast<std::size_t>(direction)];
+  if (m_known >> direction & 1) return found;
+  auto const& there = m_accessor.tile(place, m_tile->depth(), false);
+  found = {&there, there.valid() ? m_source.elements(there.treeIndex()) : nullptr};
+  m_known |= 1u << direction;
+  return found;
+}
+
+template <class TraitsT> void const* HaloSampler<TraitsT>::corner(int3 const& at) {
   constexpr int w = TraitsT::kTDW;
   auto const inside = [](int c) { return c >= 0 && c < w; };
   if (inside(at.x) && inside(at.y) && inside(at.z)) return flat(m_elements, at);
@@ -49,9 +75,9 @@ template <class TraitsT> void const* HaloSampler<TraitsT>::corner(int3 const& at
     if (inDomain) place[a] = static_cast<int>(c);
   }
   if (inDomain) {
-    auto const& there = m_accessor.tile(place, m_tile->depth(), false);
-    void const* const elements = there.valid() ? m_source.elements(there.treeIndex()) : nullptr;
-    if (elements) return flat(elements, there.childDataIJK(place));
+    auto const side = [](int c) { return c < 0 ? -1 : c >= w ? 1 : 0; };
+    auto const& there = beside(neighborDirection(side(at.x), side(at.y), side(at.z)), place);
+    if (there.elements) return flat(there.elements, there.tile->childDataIJK(place));
   }
   auto const nearest = [](int c) { return std::clamp(c, 0, w - 1); };
   return flat(m_elements, {nearest(at.x), nearest(at.y), nearest(at.z)});

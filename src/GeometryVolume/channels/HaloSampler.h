@@ -6,6 +6,8 @@
 #include "GeometryVolume/tiletree/Container.h"
 #include "GeometryVolume/topology/VoxelOffsetType.h"
 
+#include <array>
+
 namespace VLN::TileTree3D::Internal {
 
 /// @threads One for each thread: it moves the accessor, and remembers its last tile.
@@ -32,8 +34,23 @@ public:
   void sample(int3 const& p, float scale, void* out);
 
 private:
+  /// What lies beside the tile in a direction, at its depth or above: the same tile for every sample there.
+  struct Beside {
+    TileType const* tile;
+    void const* elements;
+  };
+
   void read(int3 const& p, void* out);
-  void const* corner(int3 const& at) const;
+  void setTile(int3 const& p, int depth);
+  /// Whether the tile of the last sample is that of the point too.
+  bool holds(int3 const& p) const {
+    for (int a = 0; a < 3; ++a)
+      if (static_cast<std::uint32_t>(p[a]) - static_cast<std::uint32_t>(m_corner[a]) >= m_extent)
+        return false;
+    return true;
+  }
+  Beside const& beside(NeighborDirection direction, int3 const& place);
+  void const* corner(int3 const& at);
   void const* flat(void const* tile, int3 const& at) const {
     auto const index = m_origin + at.x + (at.y + at.z * m_width) * m_width;
     return static_cast<std::byte const*>(tile) + index * static_cast<std::ptrdiff_t>(m_source.ops->size);
@@ -45,6 +62,11 @@ private:
   Accessor const& m_accessor;
   TileType const* m_tile = nullptr;
   void const* m_elements = nullptr;
+  /// Where that is the tile: all of it at the deepest depth that is asked for, else a voxel without a child.
+  int3 m_corner{0, 0, 0};
+  std::uint32_t m_extent = 0;
+  std::uint32_t m_known = 0; ///< bits of the directions that were looked up
+  std::array<Beside, kNeighborCount> m_beside;
 };
 
 } // namespace VLN::TileTree3D::Internal

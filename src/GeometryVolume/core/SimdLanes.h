@@ -9,6 +9,7 @@
 namespace VLN::TileTree3D::Internal {
 
 using FloatLanes = float __attribute__((vector_size(16)));
+using UnsignedLanes = std::uint32_t __attribute__((vector_size(16)));
 using IntLanes = std::int32_t __attribute__((vector_size(16)));
 
 inline FloatLanes lanesOf(Velorn::Math::float3 const& v) { return FloatLanes{v.x, v.y, v.z, 0.0f}; }

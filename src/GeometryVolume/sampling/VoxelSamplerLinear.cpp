@@ -1,10 +1,20 @@
 #include "GeometryVolume/sampling/VoxelSamplerLinear.h"
 
 #include "GeometryVolume/channels/Halo.h"
+#include "GeometryVolume/channels/HaloRegions.h"
 
 namespace VLN::TileTree3D {
 
 int const kCacheSizeCoarserLevels = 1;
+
+namespace {
+/// Cells of ancestors that are read for one cell at most, and cells with gaps for which a tile is read in
+/// place: beyond them its widened form is the shorter way.
+constexpr int kMostParentCells = 12;
+constexpr std::uint32_t kGapsWorthWidening = 8;
+/// Reads of other tiles than before for which tables are worth their while: some, and one for so many tiles.
+constexpr std::int64_t kFewTileChanges = 4096, kTilesPerChange = 8;
+} // namespace
 
 #define VLN_SAMPLER_TEMPLATE                                                                                 \
   template <class TraitsT, class Value, int Components, class Real, class Position, int A, int B>
@@ -57,6 +67,8 @@ VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::operator=(VoxelSamplerLinear const& other
   m_defaultValue = other.m_defaultValue;
   m_minDepth = other.m_minDepth;
   m_maxDepth = other.m_maxDepth;
+  m_shared = other.m_shared;
+  m_tablesArrays = other.m_tablesArrays;
   forgetTiles();
   return *this;
 }
@@ -74,6 +86,10 @@ VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::bind(CoreChannel const* core, WideChannel
     take(*core);
   else
     take(*wide);
+  if (m_maxDepth == TraitsT::kMaxDepth) {
+    m_shared = std::make_shared<Internal::SharedReadTables<TraitsT>>();
+    m_tablesArrays = tileArrays();
+  }
   forgetTiles();
 }
 
@@ -81,6 +97,9 @@ VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::forgetTiles() {
   m_accessCount = 0;
   m_lastTile.fill(-1);
   m_lastSlot.fill(-1);
+  m_highSides.fill({});
+  m_blocks = m_blocksBeside = {};
+  m_tileBefore = -1, m_tileChanges = 0;
 }
 
 VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::findTile(int i, int j, int k, int depth) const -> CoreTile {
@@ -112,6 +131,13 @@ VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::cachedCorners(TreeIndex const& tile, int3
     return updateCache(tile.index, tile.depth, cache);
   };
   if (this->m_offsetType == kVoxelOffsetCorner) {
+    // A tile that is asked for gaps again and again is worth widening.
+    auto const d = static_cast<std::size_t>(tile.depth);
+    int budget = kMostParentCells;
+    if (m_lastTile[d] != tile.index &&
+        (m_highSides[d].tile != tile.index || m_highSides[d].gaps < kGapsWorthWidening) &&
+        edgeCorners(tile, ijk, m_corners.data(), budget))
+      return {m_corners.data(), 2, Internal::lanesOf(weights)};
     constexpr int w = D + 1;
     float const* const data = entry(m_cacheOneSided).data.data()->data();
     return {data + ijk.x + w * (ijk.y + w * ijk.z), w, Internal::lanesOf(weights)};
@@ -119,6 +145,179 @@ VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::cachedCorners(TreeIndex const& tile, int3
   constexpr int w = D + 2;
   float const* const data = entry(m_cacheTwoSided).data.data()->data();
   return {data + (ijk.x + 1) + w * ((ijk.y + 1) + w * (ijk.z + 1)), w, Internal::lanesOf(weights)};
+}
+
+// Opens the tables once they are there. Makes them when as many reads have gone to other tiles as take about
+// the same time.
+VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::openTables(std::int64_t tileChanges) const {
+  if (!m_shared || m_blocks.isOpen()) return;
+  auto& shared = *m_shared;
+  auto const* tables = shared.ready.load(std::memory_order_acquire);
+  if (!tables) {
+    std::int64_t const changes = shared.tileChanges.fetch_add(tileChanges) + tileChanges;
+    std::int64_t const tiles = m_container->tileCount(TraitsT::kMaxDepth);
+    if (changes < kFewTileChanges + tiles / kTilesPerChange || shared.begun.test_and_set()) return;
+    try {
+      shared.tables = std::make_unique<Internal::ReadTables<TraitsT>>(
+          *m_container, [this](std::int64_t n) -> void const* {
+            constexpr auto depth = static_cast<std::size_t>(TraitsT::kMaxDepth);
+            auto const size =
+                static_cast<std::size_t>(m_channelWide ? WideChannel::kSize : CoreChannel::kSize);
+            auto const& arrays = (*tileArrays())[depth];
+            auto const at = static_cast<std::size_t>(n);
+            return at < arrays.size() && arrays[at].size() >= size ? arrays[at].data() : nullptr;
+          });
+    } catch (std::exception const&) { return; } // no memory, or too many tiles: it goes without
+    shared.ready.store(tables = shared.tables.get(), std::memory_order_release);
+  }
+  m_blocks = m_blocksBeside = Internal::BlockCursor<TraitsT>(*tables);
+}
+
+// A cell of corner samples on the edge of a tile of the deepest depth.
+VLN_SAMPLER_TEMPLATE bool VLN_SAMPLER::finestEdge(float const* data, int3 const& corner,
+                                                  SampleCell const& cell, CellCorners& corners) const {
+  unsigned edge = 0;
+  for (int a = 0; a < 3; ++a) edge |= unsigned(cell.ijk[a] == D - 1) << a;
+  std::array<float const*, 8> tiles;
+  tiles[0] = data;
+  for (unsigned direction = edge; direction; direction = (direction - 1) & edge) {
+    auto const on = [&](unsigned bit) { return direction & bit ? D : 0; };
+    auto const at = m_blocksBeside.find(corner.x + on(1), corner.y + on(2), corner.z + on(4));
+    if (!at.elements) return false;
+    tiles[direction] = static_cast<float const*>(at.elements);
+  }
+  readEdge(Internal::toInt3(cell.ijk), edge, tiles, m_corners.data());
+  ++m_accessCount;
+  corners = {m_corners.data(), 2, cell.weights};
+  return true;
+}
+
+// Goes through positions by portions, whose data it fetches first.
+VLN_SAMPLER_TEMPLATE template <class F>
+void VLN_SAMPLER::forBatches(Position const* positions, std::int64_t count, int depth, SamplerSpace space,
+                             F const& f) const {
+  constexpr std::int64_t kPortion = 32;
+  // So many reads pay for the tables if most of them go to other tiles.
+  if (depth >= TraitsT::kMaxDepth) openTables(count / 8);
+  for (std::int64_t begin = 0; begin < count; begin += kPortion) {
+    std::int64_t const end = std::min(count, begin + kPortion);
+    if (m_blocks.isOpen() && depth >= TraitsT::kMaxDepth) {
+      std::array<Internal::IntLanes, kPortion> floors;
+      auto blocks = m_blocks;
+      for (std::int64_t n = begin; n < end; ++n) {
+        auto const c = Internal::floorLanesAnywhere(this->toTileSpace(positions[n], space));
+        floors[static_cast<std::size_t>(n - begin)] = c;
+        blocks.seek(c[0], c[1], c[2]);
+        blocks.prefetch();
+      }
+      blocks = m_blocks;
+      int const w = m_channelWide ? D + 1 : D;
+      for (std::int64_t n = begin; n < end; ++n) {
+        auto const c = floors[static_cast<std::size_t>(n - begin)];
+        auto const at = blocks.find(c[0], c[1], c[2]);
+        if (!at.elements) continue;
+        auto const* const low =
+            static_cast<float const*>(at.elements) + (int(at.i) + w * (int(at.j) + w * int(at.k)));
+        __builtin_prefetch(low);
+        __builtin_prefetch(low + (w * w + w + 1));
+      }
+    }
+    for (std::int64_t n = begin; n < end; ++n) f(n);
+  }
+}
+
+VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::sample(Position const* positions, float* values, std::int64_t count,
+                                              int depth, SamplerSpace space) const {
+  forBatches(positions, count, depth, space,
+             [&](std::int64_t n) { values[n] = sample(positions[n], depth, space); });
+}
+VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::sampleGradient(Position const* positions, float* values,
+                                                      Position* gradients, std::int64_t count, int depth,
+                                                      SamplerSpace space) const {
+  forBatches(positions, count, depth, space,
+             [&](std::int64_t n) { values[n] = sampleGradient(positions[n], depth, space, &gradients[n]); });
+}
+
+// The samples of the tile of the same depth that lies on in a direction, null where there is none.
+VLN_SAMPLER_TEMPLATE float const* VLN_SAMPLER::highSide(TreeIndex const& tile, HighSides& sides,
+                                                        unsigned direction) const {
+  if (sides.known >> direction & 1) return sides.data[direction];
+  int3 const corner =
+      this->m_found == tile ? Internal::toInt3(this->m_foundCorner) : m_container->tile(tile).tijk();
+  int const w = TraitsT::width(tile.depth);
+  auto const on = [&](unsigned bit) { return direction & bit ? w : 0; };
+  TreeIndex const at =
+      m_tileAccessor.treeIndex(corner.x + on(1), corner.y + on(2), corner.z + on(4), tile.depth, true);
+  sides.known |= 1u << direction;
+  return sides.data[direction] = at.valid() ? dataOf(*m_channelCore, at) : nullptr;
+}
+
+// The eight samples of a cell of corner samples, x fastest.
+// @param edge Bits of the axes on which the cell begins at the tile's last sample.
+// @param tiles The tile, and those on along x, y and z by bits; null where there is none.
+// @return Bits of the samples that are not there.
+VLN_SAMPLER_TEMPLATE unsigned VLN_SAMPLER::readEdge(int3 const& low, unsigned edge,
+                                                    std::array<float const*, 8> const& tiles,
+                                                    float* corners) {
+  unsigned gaps = 0;
+  for (unsigned c = 0; c < 8; ++c) {
+    float const* const data = tiles[c & edge];
+    auto const at = [&](int i, unsigned bit) { return !(c & bit) ? i : edge & bit ? 0 : i + 1; };
+    if (data)
+      corners[c] = data[at(low.x, 1) + D * (at(low.y, 2) + D * at(low.z, 4))];
+    else
+      gaps |= 1u << c;
+  }
+  return gaps;
+}
+
+// The eight samples of a cell of corner samples: those beyond the tile from the tiles beside it,
+// and what these lack blended from the parent's cell. Just what the widened tile holds, without the rest of
+// it.
+// @return false where that takes more than `budget` cells of ancestors.
+VLN_SAMPLER_TEMPLATE bool VLN_SAMPLER::edgeCorners(TreeIndex const& tile, int3 const& low, float* corners,
+                                                   int& budget) const {
+  auto& sides = m_highSides[static_cast<std::size_t>(tile.depth)];
+  if (sides.tile != tile.index) {
+    sides.tile = tile.index, sides.known = 1, sides.gaps = 0;
+    sides.data[0] = dataOf(*m_channelCore, tile);
+  }
+  unsigned const edge =
+      unsigned(low.x == D - 1) | unsigned(low.y == D - 1) << 1 | unsigned(low.z == D - 1) << 2;
+  for (unsigned direction = edge; direction; direction = (direction - 1) & edge)
+    highSide(tile, sides, direction);
+  unsigned const gaps = readEdge(low, edge, sides.data, corners);
+  if (gaps == 0) return true;
+
+  ++sides.gaps;
+  auto const& record = m_container->tile(tile);
+  if (!hasUsableParent(record)) {
+    for (unsigned c = 0; c < 8; ++c) {
+      auto const at = [&](int i, unsigned bit) { return std::min(c & bit ? i + 1 : i, D - 1); };
+      if (gaps >> c & 1) corners[c] = sides.data[0][at(low.x, 1) + D * (at(low.y, 2) + D * at(low.z, 4))];
+    }
+    return true;
+  }
+  TreeIndex const parent = record.parentTreeIndex();
+  int3 const child = m_container->tile(parent).childIJK(record);
+  auto const& axes = Internal::kHaloTable<TraitsT, 0, 0, 1, 0>.parentAxis;
+  int3 lowOfParent{-1, -1, -1};
+  std::array<float, 8> cornersOfParent;
+  for (unsigned c = 0; c < 8; ++c) {
+    if (!(gaps >> c & 1)) continue;
+    Internal::HaloAxis axis[3];
+    for (int a = 0; a < 3; ++a)
+      axis[a] = axes[static_cast<std::size_t>(child[a])][static_cast<std::size_t>(low[a] + int(c >> a & 1))];
+    int3 const cell{axis[0].at, axis[1].at, axis[2].at};
+    if (cell != lowOfParent) {
+      if (budget-- == 0 || !edgeCorners(parent, cell, cornersOfParent.data(), budget)) return false;
+      lowOfParent = cell;
+    }
+    corners[c] =
+        CellCorners{cornersOfParent.data(), 2, {axis[0].fraction, axis[1].fraction, axis[2].fraction, 0.0f}}
+            .value();
+  }
+  return true;
 }
 
 // The entry that holds the tile, or null.

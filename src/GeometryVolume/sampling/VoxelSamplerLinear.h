@@ -1,9 +1,9 @@
 // VoxelSamplerLinear: trilinear values of a float channel, and their gradient, at any position.
 //
 //   wide channel (E = D+1)            core channel (E = D)
-//   the next tile's first samples     a cell inside the core is read in place; one on the tile's edge from a
-//   are stored in each tile:          cache that holds one widened tile for each depth:
-//   always read in place
+//   the next tile's first samples     a cell inside the core is read in place; one on the tile's edge from it
+//   are stored in each tile:          and the tiles beside it (corner samples), or from a cache that holds
+//   one always read in place              widened tile for each depth
 //                                       corner samples (type 7)      any other offset type
 //      0 1 2 3|4                        0 1 2 3|4                  -1|0 1 2 3|4
 //
@@ -11,11 +11,14 @@
 // the core channel where it changes often or memory is short, and walk through space in order.
 #pragma once
 
+#include "GeometryVolume/channels/BlockCursor.h"
 #include "GeometryVolume/channels/Channel.h"
 #include "GeometryVolume/sampling/VoxelSampler.h"
 #include "GeometryVolume/tiletree/Voxel.h"
 
 #include <cstdint>
+#include <memory>
+#include <utility>
 #include <vector>
 
 namespace VLN::TileTree3D {
@@ -86,9 +89,15 @@ public:
   }
   float sample(Position const& position, int depth, SamplerSpace space) const {
     SampleCell cell;
-    this->locate(position, space, std::min(depth, m_maxDepth), cell);
-    return covers(cell.tile) ? cornersOf(cell).value() : m_defaultValue;
+    CellCorners corners;
+    return cornersAt(position, depth, space, cell, corners) ? corners.value() : m_defaultValue;
   }
+  /// Many positions: values[n] = sample(positions[n], depth, space).
+  /// @shape `count` positions and values.
+  /// @cost At random places a third to a half of as many single calls: what the next ones need is fetched
+  /// ahead. In order about the same.
+  void sample(Position const* positions, float* values, std::int64_t count, int depth = TraitsT::kMaxDepth,
+              SamplerSpace space = kSamplerWorldSpace) const;
   /// The interpolation proper, of a cell as prepareToSample() gives it. A tile deeper than the channel stands
   /// for the same place at the channel's deepest depth.
   float sample(TreeIndex const& tile, int3 const& ijk, Position const& weights) const {
@@ -112,16 +121,20 @@ public:
   }
   float sampleGradient(Position const& position, int depth, SamplerSpace space, Position* gradient) const {
     SampleCell cell;
-    bool const found = this->locate(position, space, std::min(depth, m_maxDepth), cell);
-    if (!found || !covers(cell.tile)) {
+    CellCorners corners;
+    if (!cornersAt(position, depth, space, cell, corners)) {
       *gradient = {0.0f, 0.0f, 0.0f};
       return m_defaultValue;
     }
-    CellCorners const corners = cornersOf(cell);
     float const g = cell.invVoxelWidth * 2.0f * m_invVoxelSize;
     *gradient = corners.slope() * g;
     return corners.value();
   }
+
+  /// Many positions, as sample() takes them.
+  /// @shape `count` positions, values and gradients.
+  void sampleGradient(Position const* positions, float* values, Position* gradients, std::int64_t count,
+                      int depth = TraitsT::kMaxDepth, SamplerSpace space = kSamplerWorldSpace) const;
 
   // Samples of voxels are not read: these are placeholders.
   float sample(Voxel<TraitsT> const&, int3 const&) const { return 0.0f; }
@@ -179,23 +192,83 @@ private:
   bool covers(TreeIndex const& tile) const {
     return tile.index >= 0 && tile.depth >= std::max(m_minDepth, 0);
   }
-  CellCorners cornersOf(SampleCell const& cell) const {
-    if (m_channelWide) return wideCorners(cell);
-    ++m_accessCount;
+  // The cell of a position and its corners.
+  // @return false where it takes the default value.
+  bool cornersAt(Position const& position, int depth, SamplerSpace space, SampleCell& cell,
+                 CellCorners& corners) const {
+    depth = std::min(depth, m_maxDepth);
+    auto const p = this->toTileSpace(position, space);
+    auto const c = Internal::floorLanesAnywhere(p);
+    if (depth == TraitsT::kMaxDepth && m_blocks.isOpen() && !this->inLeafVoxel(c, depth) &&
+        finestCorners(p, c, cell, corners))
+      return true;
+    if (!this->locate(p, c, depth, cell) || !covers(cell.tile)) return false;
+    if (cell.tile.index != m_tileBefore) countTile(cell.tile.index);
+    corners = cornersOf(cell);
+    return true;
+  }
+  // The same by the tables.
+  // @return false where there is no tile of the deepest depth, or one of its neighbours is needed and not
+  // there.
+  bool finestCorners(Internal::FloatLanes p, Internal::IntLanes c, SampleCell& cell,
+                     CellCorners& corners) const {
+    using namespace Internal;
+    if (tileArrays() != m_tablesArrays) [[unlikely]]
+      return false;
+    FinestSample const at = m_blocks.find(c[0], c[1], c[2]);
+    if (!at.elements) return false;
+    auto const* const data = static_cast<float const*>(at.elements);
+    cell.tile = {-1, TraitsT::kMaxDepth};
+    IntLanes const corner = c - IntLanes{int(at.i), int(at.j), int(at.k), 0};
+    this->place(p, corner, cell);
+    if (m_channelWide) {
+      corners = wideCorners(data, cell);
+      return true;
+    }
+    if (isInside(cell)) {
+      ++m_accessCount;
+      corners = {data + cell.ijk[0] + D * (cell.ijk[1] + D * cell.ijk[2]), D, cell.weights};
+      return true;
+    }
+    return this->m_offsetType == kVoxelOffsetCorner && finestEdge(data, toInt3(corner), cell, corners);
+  }
+  void countTile(std::int64_t index) const {
+    m_tileBefore = index;
+    if (++m_tileChanges == kTileChangesTold) openTables(std::exchange(m_tileChanges, 0));
+  }
+  TileArrays<float> const* tileArrays() const {
+    return m_channelWide ? m_channelWide->tileArrays() : m_channelCore->tileArrays();
+  }
+  // Whether the cell of a core channel can be read in place.
+  bool isInside(SampleCell const& cell) const {
     int const low = this->m_offsetType == kVoxelOffsetCorner ? 0 : 1;
     auto const inside = [low](int i) { return i >= low && i + 1 < D; };
-    int const i = cell.ijk[0], j = cell.ijk[1], k = cell.ijk[2];
-    if (inside(i) && inside(j) && inside(k))
-      return {dataOf(*m_channelCore, cell.tile) + i + D * (j + D * k), D, cell.weights};
+    return inside(cell.ijk[0]) && inside(cell.ijk[1]) && inside(cell.ijk[2]);
+  }
+  CellCorners cornersOf(SampleCell const& cell) const {
+    if (m_channelWide) return wideCorners(dataOf(*m_channelWide, cell.tile), cell);
+    ++m_accessCount;
+    if (isInside(cell))
+      return {dataOf(*m_channelCore, cell.tile) + cell.ijk[0] + D * (cell.ijk[1] + D * cell.ijk[2]), D,
+              cell.weights};
     return cachedCorners(cell.tile, Internal::toInt3(cell.ijk), Internal::toFloat3(cell.weights));
   }
-  CellCorners wideCorners(SampleCell const& cell) const {
+  // What lies on the high sides of a tile, as far as it was asked for.
+  struct HighSides {
+    std::int64_t tile = -1;
+    std::uint32_t known = 0; ///< bits of the directions below that were looked up
+    std::uint32_t gaps = 0;  ///< cells that needed a coarser tile
+    std::array<float const*, 8>
+        data; ///< of the tile itself, and at 1, 2 and 4 on along x, y and z; null: none
+  };
+
+  CellCorners wideCorners(float const* data, SampleCell const& cell) const {
     constexpr int w = D + 1;
     // Below the first sample: extrapolate from the first cell, as the last one does at the top.
     auto const below = cell.ijk < 0;
     auto const at = cell.ijk & ~below;
     auto const weights = cell.weights + __builtin_convertvector(below, Internal::FloatLanes);
-    return {dataOf(*m_channelWide, cell.tile) + at[0] + w * (at[1] + w * at[2]), w, weights};
+    return {data + at[0] + w * (at[1] + w * at[2]), w, weights};
   }
   template <class ChannelT> static float const* dataOf(ChannelT const& channel, TreeIndex const& tile) {
     auto const& tiles = (*channel.tileArrays())[static_cast<std::size_t>(tile.depth)];
@@ -203,6 +276,15 @@ private:
   }
   float sampleAbove(TreeIndex const& tile, int3 const& ijk, Position const& weights) const;
   CellCorners cachedCorners(TreeIndex const& tile, int3 const& ijk, Position const& weights) const;
+  bool finestEdge(float const* data, int3 const& corner, SampleCell const& cell, CellCorners& corners) const;
+  void openTables(std::int64_t tileChanges) const;
+  template <class F>
+  void forBatches(Position const* positions, std::int64_t count, int depth, SamplerSpace space,
+                  F const& f) const;
+  static unsigned readEdge(int3 const& low, unsigned edge, std::array<float const*, 8> const& tiles,
+                           float* corners);
+  bool edgeCorners(TreeIndex const& tile, int3 const& low, float* corners, int& budget) const;
+  float const* highSide(TreeIndex const& tile, HighSides& sides, unsigned direction) const;
 
   void bind(CoreChannel const* core, WideChannel const* wide);
   void forgetTiles();
@@ -224,6 +306,16 @@ private:
   mutable std::uint64_t m_accessCount = 0;
   mutable std::array<std::int64_t, kDepths> m_lastTile;
   mutable std::array<std::int32_t, kDepths> m_lastSlot;
+  mutable std::array<HighSides, kDepths> m_highSides;
+  mutable std::array<float, 8> m_corners;
+  // What leads from positions straight to samples of the deepest depth: made by the first copy of the sampler
+  // for which it pays.
+  static constexpr int kTileChangesTold = 64;
+  std::shared_ptr<Internal::SharedReadTables<TraitsT>> m_shared;
+  mutable Internal::BlockCursor<TraitsT> m_blocks, m_blocksBeside;
+  mutable TileArrays<float> const* m_tablesArrays = nullptr; ///< of the channel when they were made
+  mutable std::int64_t m_tileBefore = -1;
+  mutable int m_tileChanges = 0;
   ContainerT const* m_container = nullptr;
   CoreChannel const* m_channelCore = nullptr;
   WideChannel const* m_channelWide = nullptr;

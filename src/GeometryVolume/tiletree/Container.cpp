@@ -254,12 +254,33 @@ template <class TraitsT> bool Container<TraitsT>::checkConsistency(bool verbose)
 template <class TraitsT> void Container<TraitsT>::buildAccessorAccelerationStructure(int maxDepth) {
   // First: where no depth qualifies, an older grid must not stay.
   clearAccessorAccelerationStructure();
+  m_data->m_lookupBusy.test_and_set();
   try {
     buildAccelerationGrid(*this, *m_data, maxDepth);
   } catch (...) {
     clearAccessorAccelerationStructure();
+    m_data->m_lookupBusy.clear();
     throw;
   }
+  m_data->m_lookupBusy.clear();
+}
+template <class TraitsT> void Container<TraitsT>::countLongSearches(std::int64_t n) const {
+  // A search takes 0.1 to 0.4 us; the table 1 to 2 ms, and 30 ns for each tile.
+  constexpr std::int64_t kFewSearches = 16384, kTilesPerSearch = 8;
+  Data& data = *m_data;
+  if (data.m_lookup.load(std::memory_order_relaxed)) return;
+  std::int64_t const searches = data.m_longSearches.fetch_add(n) + n;
+  if (searches < kFewSearches + data.m_tileCountTotal / kTilesPerSearch) return;
+  if (data.m_lookupBusy.test_and_set()) return; // another thread builds, or this one, which searches for it
+  std::shared_ptr<TileLookupTable<TraitsT> const> table;
+  try {
+    if (!data.m_lookup.load()) table = buildLookupTable(*this);
+  } catch (std::bad_alloc const&) {}
+  if (table)
+    data.setLookupTable(std::move(table));
+  else
+    data.m_longSearches = std::numeric_limits<std::int64_t>::min() / 2;
+  data.m_lookupBusy.clear();
 }
 template <class TraitsT> void Container<TraitsT>::precomputeTileNeighbors() {
   m_data->m_neighbors = computeTileNeighbors(*this);

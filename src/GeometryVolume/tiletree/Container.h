@@ -157,7 +157,9 @@ public:
   bool checkConsistency(bool verbose) const;
 
   // Derived caches: built on demand, dropped by every change of the tree. Where one finds no memory it is not
-  // built: the grid is off, the tables are those of before.
+  // built: the grid is off, the tables are those of before. Beside them, accessors that look for tiles far
+  // from each other, thousands of times, make themselves a table of places, which takes about as long as
+  // those searches and a small part of the tree's memory.
   /// Dense grid of tile indices for fast entry: at the deepest depth up to `maxDepth` whose tiles span at
   /// most 64 cells on each axis. @cost Linear in the tiles of the depths tried.
   void buildAccessorAccelerationStructure(int maxDepth);
@@ -234,8 +236,15 @@ protected:
   friend struct ContainerTestAccess;
 
   Data const* getData() const { return m_data.get(); }
-  /// What leads from positions to tiles, built with the acceleration grid; else null.
-  TileLookupTable<TraitsT> const* lookupTable() const { return m_data->m_lookupTable.get(); }
+  /// What leads from positions to tiles, or null.
+  TileLookupTable<TraitsT> const* lookupTable() const {
+    return m_data->m_lookup.load(std::memory_order_acquire);
+  }
+  /// Adds to the number of searches that led over many levels. Where the table would have paid for itself
+  /// since the tree changed, it is built. @threads Any, while nothing changes.
+  void countLongSearches(std::int64_t n) const;
+  /// For lookups while the tree grows: they never build the table.
+  ConstTileAccessor growthAccessor() const;
 
   // Lookup
   /// The deepest tile at or above `depth` that holds the point; invalid when there is none.

@@ -48,8 +48,7 @@ public:
   Groups const& groups(int depth) const { return m_groups[static_cast<std::size_t>(depth)]; }
 
   /// Adds the tiles between a wanted one and the next coarser one above, wanted or there.
-  void addBetween(Container<TraitsT> const& tree) {
-    auto const accessor = tree.tileAccessor();
+  void addBetween(ConstTileAccessorOf<TraitsT> const& accessor) {
     for (int d = kMaxDepth; d > 1; --d) {
       Groups& here = groups(d);
       if (here.empty()) continue;
@@ -143,7 +142,7 @@ void Container<TraitsT>::addTilesInBulk(TileLists const& corners, TileLists* new
   using Group = Internal::Siblings<TraitsT>;
   tilesAdded();
   Internal::WantedTiles<TraitsT> wanted(corners);
-  wanted.addBetween(*this);
+  wanted.addBetween(growthAccessor());
   Growth growth(*this, newTiles);
   if (wanted.domain() && !tileIndex(kMinTileCoord, kMinTileCoord, kMinTileCoord, 0).valid()) {
     addRootTile(kMinTileCoord, kMinTileCoord, kMinTileCoord, 0, growth);
@@ -165,7 +164,7 @@ void Container<TraitsT>::addTilesInBulk(TileLists const& corners, TileLists* new
     std::vector<std::int64_t> starts(static_cast<std::size_t>(chunkCount(0, count, kGrain)));
     parallelChunks(0, count, kGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
       Container const& tree = *this;
-      auto const accessor = tree.tileAccessor();
+      auto const accessor = tree.growthAccessor();
       std::size_t missing = 0;
       for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
         Group& group = groups[n];

@@ -32,16 +32,23 @@ ContainerData<TraitsT>::ContainerData(ContainerData const& b)
     , m_gridExtent(b.m_gridExtent)
     , m_gridDepth(b.m_gridDepth)
     , m_gridCellWidth(b.m_gridCellWidth)
-    , m_lookupTable(b.m_lookupTable)
     , m_voxelSize(b.m_voxelSize)
     , m_voxelSizeInv(b.m_voxelSizeInv)
     , m_maxRelativeRefinementError(b.m_maxRelativeRefinementError)
     , m_compactOnRemoval(b.m_compactOnRemoval) {
   for (auto& partitioner : m_affinityPartitioners) partitioner = std::make_unique<AffinityPartitioner>();
+  setLookupTable(b.lookupTable());
   linkArrays();
 }
 
 template <class TraitsT> ContainerData<TraitsT>::~ContainerData() = default;
+
+template <class TraitsT>
+void ContainerData<TraitsT>::setLookupTable(std::shared_ptr<TileLookupTable<TraitsT> const> table) {
+  std::lock_guard const lock(m_lookupMutex);
+  m_lookup.store(table.get(), std::memory_order_release);
+  m_lookupTable = std::move(table);
+}
 
 template <class TraitsT> void ContainerData<TraitsT>::linkArrays() {
   for (std::size_t d = 0; d < kMaxDepth; ++d) m_arrays[d] = &(*m_tiles)[d];
@@ -81,9 +88,9 @@ void ContainerData<TraitsT>::memUse(std::uint64_t& used, std::uint64_t& allocate
   used += m_gridTable.size() * sizeof(std::int64_t);
   allocated += m_gridTable.capacity() * sizeof(std::int64_t);
   // Used counts the grid alone; what goes with it is an aid, but it takes memory.
-  if (m_lookupTable)
-    allocated += m_lookupTable->cells.capacity() * sizeof(std::int64_t) +
-                 m_lookupTable->places.capacity() * sizeof(std::int32_t);
+  if (auto const table = lookupTable())
+    allocated +=
+        table->cells.capacity() * sizeof(std::int64_t) + table->places.capacity() * sizeof(std::int32_t);
   used += m_allThreadLocal.size() * sizeof(m_allThreadLocal[0]);
   allocated += m_allThreadLocal.capacity() * sizeof(m_allThreadLocal[0]);
   for (auto const& scratch : m_allThreadLocal) {

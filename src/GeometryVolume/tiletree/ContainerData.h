@@ -55,6 +55,12 @@ template <class TraitsT> struct VLN_API ContainerData {
 
   void memUse(std::uint64_t& used, std::uint64_t& allocated) const;
 
+  void setLookupTable(std::shared_ptr<TileLookupTable<TraitsT> const> table);
+  std::shared_ptr<TileLookupTable<TraitsT> const> lookupTable() const {
+    std::lock_guard const lock(m_lookupMutex);
+    return m_lookupTable;
+  }
+
   Ostil::Ptr<UpperArrays> m_tiles;
   Ostil::Ptr<Array> m_tilesMaxDepth; // apart, because these have no child tables
   std::shared_ptr<NeighborTable const> m_neighbors;
@@ -76,8 +82,15 @@ template <class TraitsT> struct VLN_API ContainerData {
   int3 m_gridExtent{0, 0, 0};
   std::int32_t m_gridDepth = -1;
   std::int32_t m_gridCellWidth = 1;
-  std::shared_ptr<TileLookupTable<TraitsT> const>
-      m_lookupTable; ///< built with the grid; null where it does not fit
+
+  /// Built with the grid, or by lookups that go far; null where it does not fit. The mutex guards the owner,
+  /// which readers of the tree may set; lookups read the pointer.
+  std::shared_ptr<TileLookupTable<TraitsT> const> m_lookupTable;
+  std::atomic<TileLookupTable<TraitsT> const*> m_lookup{nullptr};
+  mutable std::mutex m_lookupMutex;
+  /// Long searches since the tree changed; far below 0 where a table has been tried in vain.
+  std::atomic<std::int64_t> m_longSearches{0};
+  std::atomic_flag m_lookupBusy{};
 
   float m_voxelSize = 1.0f;
   float m_voxelSizeInv = 1.0f;

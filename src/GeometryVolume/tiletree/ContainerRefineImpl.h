@@ -143,7 +143,7 @@ void Container<TraitsT>::refineInternal(Container const& source, bool last, Tile
       std::vector<std::int64_t> starts(static_cast<std::size_t>(Internal::refineChunks(count)));
       Internal::refinePass(count, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
         Container const& tree = *this;
-        auto const accessor = tree.tileAccessor();
+        auto const accessor = tree.growthAccessor();
         std::int64_t missing = 0;
         for (std::int64_t n = begin; n < end; ++n) {
           TileType const& wanted = tiles[n];
@@ -171,7 +171,7 @@ void Container<TraitsT>::refineInternal(Container const& source, bool last, Tile
         allocateUninitialised(d, next - tileCount(d));
         std::vector<std::vector<DetachedTile>> parts(starts.size());
         auto const make = [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-          auto const accessor = std::as_const(*this).tileAccessor();
+          auto const accessor = this->growthAccessor();
           std::int64_t index = starts[static_cast<std::size_t>(chunk)];
           DetachedTile detached;
           for (std::int64_t n = begin; n < end; ++n) {

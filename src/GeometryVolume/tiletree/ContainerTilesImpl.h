@@ -218,9 +218,10 @@ template <class TraitsT> void Container<TraitsT>::clearCompressedTileHalos() {
   m_data->m_compressedHalos.reset();
 }
 template <class TraitsT> void Container<TraitsT>::clearAccessorAccelerationStructure() {
+  if (m_data->m_longSearches.load(std::memory_order_relaxed) != 0) m_data->m_longSearches = 0;
+  if (m_data->m_lookup.load(std::memory_order_relaxed)) m_data->setLookupTable(nullptr);
   if (m_data->m_gridDepth < 0) return;
   m_data->m_gridDepth = -1;
-  m_data->m_lookupTable.reset();
   m_data->m_gridSize = {0, 0, 0};
   std::vector<std::int64_t>().swap(m_data->m_gridTable);
 }

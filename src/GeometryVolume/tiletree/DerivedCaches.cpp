@@ -104,11 +104,57 @@ float haloWeight(Tile<TraitsT, TraitsT::kTileSize> const& tile, int direction, i
 
 namespace {
 
+/// A dense box of tile indices at one depth; without cells where no depth qualifies.
+struct Grid {
+  int depth = -1;
+  std::int32_t cellWidth = 1;
+  int3 origin{0, 0, 0}, extent{0, 0, 0};
+  std::array<std::int32_t, 3> size{0, 0, 0};
+  std::vector<std::int64_t> tiles;
+};
+
+template <class TraitsT> Grid computeGrid(Container<TraitsT> const& tree, int maxDepth) {
+  Grid grid;
+  for (int d = std::min(maxDepth, TraitsT::kMaxDepth); d >= 1; --d) {
+    if (tree.tileCount(d) == 0) continue;
+    bbox<int3, int> box;
+    tree.tileSpaceBounds(d, box);
+    if (box.empty()) continue;
+    auto const w = static_cast<std::uint32_t>(TraitsT::width(d));
+    std::uint32_t const largest = std::max({extent(box, 0), extent(box, 1), extent(box, 2)});
+    if (largest / w > kMaxGridCells) continue;
+
+    grid.depth = d;
+    grid.origin = box.min;
+    grid.cellWidth = static_cast<std::int32_t>(w);
+    std::size_t cells = 1;
+    for (int a = 0; a < 3; ++a) {
+      grid.extent[a] = static_cast<int>(extent(box, a));
+      grid.size[static_cast<std::size_t>(a)] = static_cast<std::int32_t>(extent(box, a) / w);
+      cells *= extent(box, a) / w;
+    }
+    grid.tiles.assign(cells, -1);
+    for (std::int64_t n = 0; n < tree.tileCount(d); ++n) {
+      auto const& tile = tree.tile(n, d);
+      if (!tile.valid()) continue;
+      std::size_t at = 0;
+      for (int a = 2; a >= 0; --a) {
+        auto const cell =
+            (static_cast<std::uint32_t>(tile.tijk()[a]) - static_cast<std::uint32_t>(box.min[a])) / w;
+        at = at * static_cast<std::size_t>(grid.size[static_cast<std::size_t>(a)]) + cell;
+      }
+      grid.tiles[at] = n;
+    }
+    break;
+  }
+  return grid;
+}
+
 template <class TraitsT>
 std::shared_ptr<TileLookupTable<TraitsT> const> computePlaces(Container<TraitsT> const& tree,
-                                                              ContainerData<TraitsT> const& data) {
+                                                              Grid const& grid) {
   using Table = TileLookupTable<TraitsT>;
-  int const g = data.m_gridDepth, last = std::min(g + Table::kLevels, TraitsT::kMaxDepth);
+  int const g = grid.depth, last = std::min(g + Table::kLevels, TraitsT::kMaxDepth);
   for (int d = g; d <= last; ++d) {
     if (tree.tileCount(d) > Table::kMostTiles) return nullptr;
   }
@@ -119,10 +165,10 @@ std::shared_ptr<TileLookupTable<TraitsT> const> computePlaces(Container<TraitsT>
   table->placeWidth = static_cast<std::uint32_t>(width), table->blockSize = static_cast<std::uint32_t>(size);
   for (int a = 0; a < 3; ++a) {
     auto const axis = static_cast<std::size_t>(a);
-    table->first[axis] = TraitsT::quotient(TraitsT::offset(data.m_gridOrigin[a]), g);
-    table->size[axis] = static_cast<std::uint32_t>(data.m_gridSize[axis]);
+    table->first[axis] = TraitsT::quotient(TraitsT::offset(grid.origin[a]), g);
+    table->size[axis] = static_cast<std::uint32_t>(grid.size[axis]);
   }
-  table->cells.assign(data.m_gridTable.size(), Table::kNoTile);
+  table->cells.assign(grid.tiles.size(), Table::kNoTile);
   // Below the grid's depth lie tiles of the grid's, and deeper roots.
   for (auto it = tree.cbeginRoots(); it != tree.cendRoots(); ++it) {
     if (it->second.depth <= g) continue;
@@ -136,19 +182,18 @@ std::shared_ptr<TileLookupTable<TraitsT> const> computePlaces(Container<TraitsT>
     }
     if (inside) table->cells[cell] = Table::kUnknown;
   }
-  std::int64_t const rows = std::int64_t(data.m_gridSize[1]) * data.m_gridSize[2];
+  std::int64_t const rows = std::int64_t(grid.size[1]) * grid.size[2];
   parallelFor(0, rows, [&](std::int64_t begin, std::int64_t end) {
     auto accessor = tree.tileAccessor();
     for (std::int64_t row = begin; row < end; ++row)
-      for (int i = 0; i < data.m_gridSize[0]; ++i) {
-        auto const cell = static_cast<std::size_t>(row * data.m_gridSize[0] + i);
-        TreeIndex at{data.m_gridTable[cell], g};
+      for (int i = 0; i < grid.size[0]; ++i) {
+        auto const cell = static_cast<std::size_t>(row * grid.size[0] + i);
+        TreeIndex at{grid.tiles[cell], g};
         if (at.index < 0) {
-          int const w = data.m_gridCellWidth;
-          at = accessor.treeIndex(data.m_gridOrigin.x + i * w,
-                                  data.m_gridOrigin.y + static_cast<int>(row % data.m_gridSize[1]) * w,
-                                  data.m_gridOrigin.z + static_cast<int>(row / data.m_gridSize[1]) * w, g,
-                                  false);
+          int const w = grid.cellWidth;
+          at = accessor.treeIndex(grid.origin.x + i * w,
+                                  grid.origin.y + static_cast<int>(row % grid.size[1]) * w,
+                                  grid.origin.z + static_cast<int>(row / grid.size[1]) * w, g, false);
         }
         if (at.index >= 0) table->cells[cell] = at.index * Table::kDepthUnit + at.depth;
       }
@@ -178,40 +223,22 @@ std::shared_ptr<TileLookupTable<TraitsT> const> computePlaces(Container<TraitsT>
 
 template <class TraitsT>
 void buildAccelerationGrid(Container<TraitsT> const& tree, ContainerData<TraitsT>& data, int maxDepth) {
-  for (int d = std::min(maxDepth, TraitsT::kMaxDepth); d >= 1; --d) {
-    if (tree.tileCount(d) == 0) continue;
-    bbox<int3, int> box;
-    tree.tileSpaceBounds(d, box);
-    if (box.empty()) continue;
-    auto const w = static_cast<std::uint32_t>(TraitsT::width(d));
-    std::uint32_t const largest = std::max({extent(box, 0), extent(box, 1), extent(box, 2)});
-    if (largest / w > kMaxGridCells) continue;
+  Grid grid = computeGrid(tree, maxDepth);
+  if (grid.depth < 0) return;
+  auto table = computePlaces(tree, grid);
+  data.m_gridOrigin = grid.origin;
+  data.m_gridCellWidth = grid.cellWidth;
+  data.m_gridExtent = grid.extent;
+  data.m_gridSize = grid.size;
+  data.m_gridTable = std::move(grid.tiles);
+  data.m_gridDepth = grid.depth; // lookups use it from here on
+  data.setLookupTable(std::move(table));
+}
 
-    data.m_lookupTable.reset();
-    data.m_gridOrigin = box.min;
-    data.m_gridCellWidth = static_cast<std::int32_t>(w);
-    std::size_t cells = 1;
-    for (int a = 0; a < 3; ++a) {
-      data.m_gridExtent[a] = static_cast<int>(extent(box, a));
-      data.m_gridSize[static_cast<std::size_t>(a)] = static_cast<std::int32_t>(extent(box, a) / w);
-      cells *= extent(box, a) / w;
-    }
-    data.m_gridTable.assign(cells, -1);
-    for (std::int64_t n = 0; n < tree.tileCount(d); ++n) {
-      auto const& tile = tree.tile(n, d);
-      if (!tile.valid()) continue;
-      std::size_t at = 0;
-      for (int a = 2; a >= 0; --a) {
-        auto const cell =
-            (static_cast<std::uint32_t>(tile.tijk()[a]) - static_cast<std::uint32_t>(box.min[a])) / w;
-        at = at * static_cast<std::size_t>(data.m_gridSize[static_cast<std::size_t>(a)]) + cell;
-      }
-      data.m_gridTable[at] = n;
-    }
-    data.m_gridDepth = d; // lookups use it from here on
-    data.m_lookupTable = computePlaces(tree, data);
-    return;
-  }
+template <class TraitsT>
+std::shared_ptr<TileLookupTable<TraitsT> const> buildLookupTable(Container<TraitsT> const& tree) {
+  Grid const grid = computeGrid(tree, TraitsT::kMaxDepth);
+  return grid.depth < 0 ? nullptr : computePlaces(tree, grid);
 }
 
 template <class TraitsT>
@@ -293,6 +320,7 @@ template <class TraitsT> int maxTileDistance(Container<TraitsT> const& tree) {
 #define VLN_INSTANTIATE(T)                                                                                   \
   template float haloWeight<T>(Tile<T, T::kTileSize> const&, int, int);                                      \
   template void buildAccelerationGrid(Container<T> const&, ContainerData<T>&, int);                          \
+  template std::shared_ptr<TileLookupTable<T> const> buildLookupTable(Container<T> const&);                  \
   template std::shared_ptr<typename ContainerData<T>::NeighborTable const> computeTileNeighbors(             \
       Container<T> const&);                                                                                  \
   template std::shared_ptr<typename ContainerData<T>::HaloTable const> computeTileHalos(                     \

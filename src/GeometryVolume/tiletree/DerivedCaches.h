@@ -6,8 +6,13 @@
 
 namespace VLN::TileTree3D {
 
+/// The grid, and the table of places with it.
 template <class TraitsT>
 void buildAccelerationGrid(Container<TraitsT> const& tree, ContainerData<TraitsT>& data, int maxDepth);
+
+/// The table of places alone; null where no grid or no table fits.
+template <class TraitsT>
+std::shared_ptr<TileLookupTable<TraitsT> const> buildLookupTable(Container<TraitsT> const& tree);
 
 template <class TraitsT>
 std::shared_ptr<typename ContainerData<TraitsT>::NeighborTable const>

@@ -80,12 +80,16 @@ TreeIndex ConstTileAccessorOf<TraitsT>::find(int i, int j, int k, int depth, boo
     m_pathTop = at.depth;
   else
     at = findNear(i, j, k, std::min(depth, TraitsT::kMaxDepth));
-  if (!at.valid()) {
-    at = m_container->entry(i, j, k, depth);
-    if (!at.valid()) return {};
-    m_pathTop = at.depth;
+  bool far = !at.valid();
+  if (far) at = m_container->entry(i, j, k, depth);
+  if (at.valid()) {
+    int const start = at.depth;
+    if (far) m_pathTop = start;
+    at = descend(at, i, j, k, depth);
+    far |= at.depth - start >= kLongSearch;
   }
-  at = descend(at, i, j, k, depth);
+  if (far && m_countsSearches && ++m_longSearches == kSearchesTold)
+    m_longSearches = 0, m_container->countLongSearches(kSearchesTold);
   return exact && at.depth != depth ? TreeIndex{} : at;
 }
 

@@ -99,8 +99,9 @@ protected:
   friend class Container<TraitsT>;
   friend class NeighborSearch<TraitsT>;
 
-  explicit ConstTileAccessorOf(ContainerT const& container)
-      : m_container(&container) {}
+  explicit ConstTileAccessorOf(ContainerT const& container, bool countsSearches = true)
+      : m_container(&container)
+      , m_countsSearches(countsSearches) {}
 
   /// The search behind a miss of the cursor; moves the cursor to the deepest tile that it reaches.
   TreeIndex find(int i, int j, int k, int depth, bool exact) const;
@@ -136,6 +137,8 @@ protected:
 
   /// Depth of a cursor without a tile. Asked for, it "hits" and gives the invalid index, which is the answer.
   static constexpr std::int32_t kNoDepth = -1;
+  /// Levels of a long search, and how many are counted before the container is told.
+  static constexpr int kLongSearch = 3, kSearchesTold = 64;
 
   ContainerT const* m_container = nullptr;
   mutable int3 m_corner{0, 0, 0};
@@ -143,6 +146,8 @@ protected:
   mutable std::int64_t m_index = -1;
   /// Indices of the cursor's tile and its ancestors, known from depth m_pathTop on.
   mutable std::int32_t m_pathTop = kNoDepth;
+  mutable std::int32_t m_longSearches = 0;
+  bool m_countsSearches = true;
   mutable std::array<std::int64_t, static_cast<std::size_t>(TraitsT::kDepths)> m_path;
 };
 
@@ -205,6 +210,9 @@ private:
 
 template <class TraitsT> ConstTileAccessorOf<TraitsT> Container<TraitsT>::tileAccessor() const {
   return ConstTileAccessorOf<TraitsT>(*this);
+}
+template <class TraitsT> ConstTileAccessorOf<TraitsT> Container<TraitsT>::growthAccessor() const {
+  return ConstTileAccessorOf<TraitsT>(*this, false);
 }
 template <class TraitsT> TileAccessorOf<TraitsT> Container<TraitsT>::tileAccessor() {
   return TileAccessorOf<TraitsT>(*this);

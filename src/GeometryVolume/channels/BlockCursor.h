@@ -1,0 +1,103 @@
+// BlockCursor: the last block of ReadTables that was read from, and tables that several readers make
+// together.
+#pragma once
+
+#include "GeometryVolume/channels/ReadTables.h"
+
+#include <atomic>
+#include <memory>
+#include <utility>
+
+namespace VLN::TileTree3D::Internal {
+
+/// A sample of a tile of the deepest depth; without elements where there is no such tile.
+struct FinestSample {
+  void const* elements;
+  std::uint32_t i, j, k; ///< within the tile
+};
+
+/// @pre The tables outlive it.
+/// @threads One for each thread.
+template <class TraitsT> class BlockCursor {
+public:
+  using Tables = ReadTables<TraitsT>;
+
+  BlockCursor() = default;
+  explicit BlockCursor(Tables const& tables)
+      : m_tables(&tables)
+      , m_block(&tables.noBlock()) {}
+
+  bool isOpen() const { return m_tables; }
+  /// @pre isOpen().
+  /// @cost In the block of the last one: a test, and one load. Elsewhere two loads more.
+  FinestSample find(int i, int j, int k) {
+    seek(i, j, k);
+    return here(i, j, k);
+  }
+  /// @pre The last seek() was to a point of the same block.
+  FinestSample here(int i, int j, int k) const {
+    std::uint32_t const x = within(i, m_corner.x), y = within(j, m_corner.y), z = within(k, m_corner.z);
+    constexpr std::uint32_t w = TraitsT::kTDW, slots = TraitsT::kTW;
+    // Sums of whole tile widths before the division: powers of two need one shift then.
+    return {m_block->tiles[((x - x % w) + slots * ((y - y % w) + slots * (z - z % w))) / w], x % w, y % w,
+            z % w};
+  }
+
+  /// Whether the point lies in the block of the last one.
+  bool holds(int i, int j, int k) const {
+    if constexpr (TraitsT::kTW == 2)
+      return static_cast<std::uint32_t>((i ^ m_corner.x) | (j ^ m_corner.y) | (k ^ m_corner.z)) < kBlockWidth;
+    else
+      return within(i, m_corner.x) < kBlockWidth && within(j, m_corner.y) < kBlockWidth &&
+             within(k, m_corner.z) < kBlockWidth;
+  }
+  void seek(int i, int j, int k) {
+    if (!holds(i, j, k)) [[unlikely]]
+      move(i, j, k);
+  }
+  /// Moves to the block of a point.
+  /// @return Whether it adjoins the one before, or is the same.
+  bool move(int i, int j, int k) {
+    m_block = m_tables->block(i, j, k);
+    // Out of the domain, too, the corner is less than a block away, and the block is the empty one.
+    int3 const corner = TraitsT::align(int3{i, j, k}, Tables::kBlockDepth),
+               old = std::exchange(m_corner, corner);
+    auto const near = [](int a, int b) {
+      return static_cast<std::uint32_t>(a) - static_cast<std::uint32_t>(b) + kBlockWidth <= 2 * kBlockWidth;
+    };
+    return near(corner.x, old.x) && near(corner.y, old.y) && near(corner.z, old.z);
+  }
+  /// Asks for the elements of the block's tiles, as far as they are few.
+  void prefetchElements(std::size_t bytesOfTile) const {
+    constexpr std::size_t kLine = 64, kFew = 512;
+    if (bytesOfTile > kFew) return;
+    for (void const* tile : m_block->tiles)
+      for (std::size_t at = 0; tile && at < bytesOfTile; at += kLine)
+        __builtin_prefetch(static_cast<char const*>(tile) + at);
+  }
+  void prefetch() const { __builtin_prefetch(m_block); }
+
+private:
+  static constexpr auto kBlockWidth = std::uint32_t(Tables::kBlockWidth);
+
+  /// Distance from the corner of the point's block.
+  static std::uint32_t within(int c, int corner) {
+    if constexpr (TraitsT::kTW == 2)
+      return static_cast<std::uint32_t>(c) % kBlockWidth; // blocks lie at multiples of their width
+    else
+      return static_cast<std::uint32_t>(c) - static_cast<std::uint32_t>(corner);
+  }
+  Tables const* m_tables = nullptr;
+  typename Tables::Block const* m_block = nullptr;
+  int3 m_corner{TraitsT::kMinTileCoord, TraitsT::kMinTileCoord, TraitsT::kMinTileCoord};
+};
+
+/// Made by the first of several readers of a channel for which they pay.
+template <class TraitsT> struct SharedReadTables {
+  std::atomic<ReadTables<TraitsT> const*> ready{nullptr};
+  std::atomic<std::int64_t> tileChanges{0}; ///< reads that went to another tile than the one before
+  std::atomic_flag begun{};
+  std::unique_ptr<ReadTables<TraitsT> const> tables;
+};
+
+} // namespace VLN::TileTree3D::Internal
