@@ -69,6 +69,10 @@ foreach(room IN LISTS rooms)
     target_compile_definitions(${target} PRIVATE "VLN_PROGRAM=\"$<TARGET_FILE:vln>\""
       "VLN_FAILING_CALLS=\"$<TARGET_FILE:vln_failing_calls>\"")
     add_dependencies(${target} vln vln_failing_calls)
+    if(VLN_WITH_VIEW) # of one source: the others are not compiled again where it is turned on
+      set_source_files_properties("${PROJECT_SOURCE_DIR}/tests/vln/ViewProgramTest.cpp" PROPERTIES COMPILE_DEFINITIONS
+        "VLN_WITH_VIEW;VLN_NODE=\"${VLN_NODE}\";VLN_VIEW_TEST=\"${PROJECT_SOURCE_DIR}/web/test/view.mjs\";VLN_VIEW_MODULES=\"${view_folder}\"")
+    endif()
   endif()
   # PRE_TEST: the list is asked for when ctest starts, not at the end of every link.
   gtest_discover_tests(${target}

@@ -5,9 +5,11 @@ if(sources AND TARGET GeometryVolumeInterop)
   vln_target(vln)
   target_include_directories(vln PRIVATE "${PROJECT_SOURCE_DIR}/tools")
   target_link_libraries(vln PRIVATE
-    GeometryVolumeInterop GeometryVolumeRender GeometryVolume CLI11::CLI11 PNG::PNG fmt::fmt nlohmann_json::nlohmann_json)
+    GeometryVolumeInterop GeometryVolumeRender GeometryVolume CLI11::CLI11 PNG::PNG ZLIB::ZLIB fmt::fmt nlohmann_json::nlohmann_json)
   file(RELATIVE_PATH lib_from_bin "/${CMAKE_INSTALL_BINDIR}" "/${CMAKE_INSTALL_LIBDIR}")
   set_target_properties(vln PROPERTIES INSTALL_RPATH "$ORIGIN/${lib_from_bin}")
+
+  include(VlnView)
 
   # The program writes its manual page and completions itself; where it cannot run here they are left out.
   if(NOT CMAKE_CROSSCOMPILING)

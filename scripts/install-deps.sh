@@ -1,6 +1,7 @@
 #!/bin/sh
-# install-deps.sh [--checks|--python]: installs the Debian packages that the build and the tests need, with --checks
-# those of scripts/check.sh too, with --python those of the Python module. Asks nothing; when all is there it does
+# install-deps.sh [--checks|--python|--view]: installs the Debian packages that the build and the tests need, with
+# --checks those of scripts/check.sh too, with --python those of the Python module, with --view those of the page of
+# vln view and its tests. Asks nothing; when all is there it does
 # nothing and calls no network.
 set -eu
 
@@ -8,7 +9,7 @@ packages="
   g++ binutils cmake ninja-build ccache git ca-certificates python3
   libtbb-dev libjemalloc-dev libnanovdb-dev
   libopenvdb-dev libopenvdb-tools libboost-iostreams-dev libimath-dev
-  libcli11-dev nlohmann-json3-dev libpng-dev libfmt-dev
+  libcli11-dev nlohmann-json3-dev libpng-dev zlib1g-dev libfmt-dev
   libgtest-dev libgmock-dev libbenchmark-dev
 "
 case ${1:-} in
@@ -18,6 +19,12 @@ case ${1:-} in
     packages="$packages python3-dev pybind11-dev python3-numpy python3-pip python3-venv python3-pytest mypy"
     # Beside which the tests load the module, and whose readers they ask.
     packages="$packages python3-scipy python3-openvdb python3-vtk9"
+    ;;
+  --view)
+    packages="$packages chromium"
+    # A node of another origin does as well, and goes with no npm of Debian's.
+    command -v node >/dev/null 2>&1 || packages="$packages nodejs"
+    command -v npm >/dev/null 2>&1 || packages="$packages npm"
     ;;
   *) echo "install-deps: unknown option '$1'" >&2 && exit 2 ;;
 esac

@@ -22,6 +22,7 @@ struct Row {
 constexpr Row kTable[] = {
     {FileFormat::kCsv, ".csv", {}, FileContent::kValues},
     {FileFormat::kExr, ".exr", {}, FileContent::kRenderings},
+    {FileFormat::kHtml, ".html", {}, FileContent::kPages},
     {FileFormat::kJson, ".json", {}, FileContent::kParameters},
     {FileFormat::kNpz, ".npz", {}, FileContent::kDense},
     {FileFormat::kNvtt, ".nvtt", FileContent::kVolumes | FileContent::kFlatBuffers,
@@ -63,6 +64,8 @@ char const* nameOf(FileContent content) {
     return "dense boxes";
   case FileContent::kPointData:
     return "points";
+  case FileContent::kPages:
+    return "pages";
   }
   return "";
 }

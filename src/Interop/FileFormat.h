@@ -8,7 +8,7 @@
 
 namespace VLN::Interop {
 
-enum class FileFormat { kUnknown, kVdb, kNvtt, kPly, kObj, kPng, kCsv, kJson, kNpz, kVti, kExr };
+enum class FileFormat { kUnknown, kVdb, kNvtt, kPly, kObj, kPng, kCsv, kJson, kNpz, kVti, kExr, kHtml };
 
 /// What a file holds, as messages call it.
 enum class FileContent : unsigned {
@@ -23,6 +23,7 @@ enum class FileContent : unsigned {
   kPointData = 256,   ///< "points" again, with all that they have
   kRenderings = 512,  ///< "pictures" with opacity and depth
   kParameters = 1024, ///< "parameters" of a picture
+  kPages = 2048,      ///< "pages" for browsers
 };
 constexpr FileContent operator|(FileContent a, FileContent b) {
   return FileContent(unsigned(a) | unsigned(b));

@@ -37,6 +37,8 @@ public:
   float high() const { return m_high; }
   float background() const { return m_view.background; }
   std::uint32_t tileCount() const { return static_cast<std::uint32_t>(m_bounds.size()); }
+  /// By number; not valid where a merged block has the samples.
+  std::vector<nanovtt::TileRef> const& tiles() const { return m_tiles; }
   TileBounds bounds(std::uint32_t tile) const { return m_bounds[tile]; }
   /// What a code stands for. @numeric value(bounds.low) <= each sample <= value(bounds.high).
   float value(std::uint16_t code) const;

@@ -248,6 +248,22 @@ void limitDepth(Field& field, Scene const& scene, RenderOptions const& options, 
   field.limitDepth(std::clamp(depth, root, nanovtt::kMaxDepth));
 }
 
+Scene sceneOf(Field const& field, Affine const& tileToWorld, Camera const& camera,
+              RenderOptions const& options) {
+  double const determinant = tileToWorld.determinant();
+  if (!std::isfinite(determinant) || determinant == 0)
+    throw std::invalid_argument("its transform cannot be inverted");
+  Affine toWorld = tileToWorld;
+  toWorld.shift = tileToWorld.point(field.origin());
+  Scene scene{field, camera, options, toWorld, toWorld.inverse(), {}, {}, {}};
+  scene.diagonal = length(tileToWorld.vector((field.view().high - field.view().low).as<double>()));
+  scene.eye = scene.toLocal.point(camera.position);
+  scene.light = length(options.light) > 0
+                    ? normalized(options.light)
+                    : normalized(camera.up * 0.9 - camera.right * 0.75 - camera.forward * 0.8);
+  return scene;
+}
+
 /// Tells the field where rays have something to find, for modes other than fog.
 void weighField(Field& field, RenderOptions const& options) {
   float const low = field.low(), background = field.background();
@@ -286,13 +302,12 @@ Vec3 latticeSpacing(FieldView const& field, Affine const& tileToWorld) {
   return spacing;
 }
 
-FogScene prepareFog(Field& field, Scene const& scene, Transfer const& transfer, Affine const& tileToWorld) {
+/// Weighs the field by its opacity. Unit and lattices of light are still to come.
+FogView fogOf(Field& field, Scene const& scene, Transfer const& transfer, double voxel) {
   RenderOptions const& options = scene.options;
   bool const isFinal = options.quality == Quality::kFinal;
-  double const voxel = voxelOf(tileToWorld);
   field.weigh([&](float low, float high) { return transfer.largestOpacity(low, high); }, options.threads);
-  FogScene result;
-  FogView& fog = result.view;
+  FogView fog;
   fog.transfer = &transfer.view();
   fog.field = field.view();
   fog.colored = options.colored;
@@ -307,11 +322,20 @@ FogScene prepareFog(Field& field, Scene const& scene, Transfer const& transfer, 
   fog.ground = kGround * (isFinal ? 1.2f : 0.5f);
   fog.bounces = options.bounces;
   fog.step = static_cast<float>(stepOf(scene, voxel));
+  return fog;
+}
+
+FogScene prepareFog(Field& field, Scene const& scene, Transfer const& transfer, Affine const& tileToWorld) {
+  RenderOptions const& options = scene.options;
+  double const voxel = voxelOf(tileToWorld);
+  FogScene result;
+  FogView& fog = result.view;
+  fog = fogOf(field, scene, transfer, voxel);
   if (options.opacityUnit > 0 && options.opacityUnit < 1e-3 * voxel)
     throw std::invalid_argument("the unit of opacity is less than a thousandth of a voxel");
   result.unit = options.opacityUnit > 0 ? options.opacityUnit : chooseUnit(scene, fog, voxel);
   fog.perUnit = static_cast<float>(1 / result.unit);
-  if (isFinal) return result;
+  if (options.quality == Quality::kFinal) return result;
   Vec3 const spacing = latticeSpacing(fog.field, tileToWorld);
   Vec3 const up = scene.toLocal.vector(scene.camera.viewUp).as<float>();
   result.direct = sweepLight(fog, fog.lightLocal, spacing, options.threads);
@@ -406,21 +430,21 @@ void colorValues(Picture& picture, RenderOptions const& options, Transfer transf
 
 } // namespace
 
+double opacityUnit(Field& field, Affine const& tileToWorld, Camera const& camera,
+                   RenderOptions const& options) {
+  Scene const scene = sceneOf(field, tileToWorld, camera, options);
+  Transfer const transfer(options.transfer);
+  double const voxel = voxelOf(tileToWorld);
+  limitDepth(field, scene, options, voxel);
+  FogView fog = fogOf(field, scene, transfer, voxel);
+  return chooseUnit(scene, fog, voxel);
+}
+
 Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, RenderOptions const& options,
                std::function<void(double)> const& watch) {
   if (options.width < 1 || options.height < 1 || options.width > 32768 || options.height > 32768)
     throw std::invalid_argument("a picture has 1 to 32768 pixels an axis");
-  double const determinant = tileToWorld.determinant();
-  if (!std::isfinite(determinant) || determinant == 0)
-    throw std::invalid_argument("its transform cannot be inverted");
-  Affine toWorld = tileToWorld;
-  toWorld.shift = tileToWorld.point(field.origin());
-  Scene scene{field, camera, options, toWorld, toWorld.inverse(), {}, {}, {}};
-  scene.diagonal = length(tileToWorld.vector((field.view().high - field.view().low).as<double>()));
-  scene.eye = scene.toLocal.point(camera.position);
-  scene.light = length(options.light) > 0
-                    ? normalized(options.light)
-                    : normalized(camera.up * 0.9 - camera.right * 0.75 - camera.forward * 0.8);
+  Scene const scene = sceneOf(field, tileToWorld, camera, options);
 
   bool const isFinal = options.quality == Quality::kFinal;
   double const voxel = voxelOf(tileToWorld);

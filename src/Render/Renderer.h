@@ -61,6 +61,11 @@ struct Picture {
 VLN_RENDER_API Picture render(Field& field, Affine const& tileToWorld, Camera const& camera,
                               RenderOptions const& options, std::function<void(double)> const& watch = {});
 
+/// The unit of opacity that render() would choose for a fog.
+/// @error As render().
+VLN_RENDER_API double opacityUnit(Field& field, Affine const& tileToWorld, Camera const& camera,
+                                  RenderOptions const& options);
+
 /// Light over a background, as sRGB bytes.
 /// @param background Linear light. @param opaque Alpha is 255 everywhere; else it is kept, the background is
 /// not drawn, and colours are not multiplied by it.

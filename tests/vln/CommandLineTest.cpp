@@ -133,8 +133,8 @@ TEST_F(CommandLineTest, RequirementManualAndCompletions) {
   RunResult const manual = vln({"manual"});
   EXPECT_EQ(manual.code, 0) << manual.err;
   EXPECT_EQ(manual.out.rfind(".TH VLN 1", 0), 0u);
-  for (std::string const command : {"info", "slice", "render", "convert", "probe", "make", "churn", "points",
-                                    "tiles", "advect", "completions"})
+  for (std::string const command : {"info", "slice", "render", "view", "convert", "probe", "make", "churn",
+                                    "points", "tiles", "advect", "completions"})
     EXPECT_NE(manual.out.find(".SS vln " + command), std::string::npos) << command;
   EXPECT_NE(manual.out.find("\\-\\-percentile \\fIP\\fR"), std::string::npos) << manual.out;
   for (std::string const shell : {"bash", "zsh", "fish"}) {

@@ -11,6 +11,7 @@ std::vector<Command> const& commandTable() {
       {"slice", "Draw a channel on a plane as a PNG picture",
        "vln slice smoke.vdb --channel density --axis z -o slice.png", declareSlice},
       {"render", "Draw a volume as a picture", "vln render bunny.vdb", declareRender},
+      {"view", "Write a page that shows a volume in a browser", "vln view smoke.vdb", declareView},
       {"convert", "Write a volume file again, through the tree and back", "vln convert smoke.vdb copy.vdb",
        declareConvert},
       {"flatten", "Write a volume as one flat buffer that a GPU reads without pointers",

@@ -20,6 +20,7 @@ void declareProbe(CLI::App& self);
 void declareMake(CLI::App& self);
 void declareChurn(CLI::App& self);
 void declareRender(CLI::App& self);
+void declareView(CLI::App& self);
 void declarePoints(CLI::App& self);
 void declareTiles(CLI::App& self);
 void declareAdvect(CLI::App& self);

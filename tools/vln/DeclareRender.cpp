@@ -2,6 +2,7 @@
 #include "Render/Colors.h"
 #include "Render/Transfer.h"
 #include "RenderCommand.h"
+#include "ViewCommand.h"
 
 #include <CLI/CLI.hpp>
 
@@ -12,6 +13,7 @@
 
 namespace Vln {
 
+using VLN::Interop::FileContent;
 using VLN::Render::Vec3d;
 
 namespace {
@@ -83,20 +85,8 @@ void addCamera(CLI::App& self, VLN::Render::CameraOptions& c) {
   self.option_defaults()->group("Options");
 }
 
-} // namespace
-
-void declareRender(CLI::App& self) {
-  using VLN::Render::Quality;
-  auto const options = std::make_shared<RenderCommandOptions>();
-  auto& o = *options;
-  self.add_option("FILE", o.file, "A .vdb, .nvtt or .ply file")->required();
-  self.add_option(
-          "-o,--output", o.output,
-          "The picture, .png, or .exr with depth and normals (default: the name of FILE with .png, here)")
-      ->type_name("OUT");
-  self.add_option("--channel", o.channel,
-                  "Name of the channel, as info tells it (default: density, or the first)")
-      ->type_name("NAME");
+// What a picture shows of a field, and how.
+void addLook(CLI::App& self, RenderCommandOptions& o) {
   self.add_option_function<std::string>(
           "--component", [&o](std::string const& c) { o.component = c == "length" ? -1 : c[0] - 'x'; },
           "Of vectors: x, y, z, or their length (the default)")
@@ -112,19 +102,6 @@ void declareRender(CLI::App& self) {
       ->transform(CLI::CheckedTransformer(modes, CLI::ignore_case))
       ->type_name("fog|surface|mip|mean|isosurface");
   finite(self.add_option("--iso", o.iso, "Value on the surface"))->type_name("V");
-  static std::map<std::string, Quality> const qualities{{"preview", Quality::kPreview},
-                                                        {"final", Quality::kFinal}};
-  self.add_option("--quality", o.render.quality, "A quick picture, or one without bias")
-      ->transform(CLI::CheckedTransformer(qualities, CLI::ignore_case))
-      ->default_str("preview")
-      ->type_name("preview|final");
-  self.add_option("--spp", o.render.samples, "Samples for each pixel (default: by mode and quality)")
-      ->check(CLI::Range(1, 1 << 20))
-      ->type_name("N");
-  finite(
-      self.add_option("--time-limit", o.render.timeLimit, "Seconds after which no further sample is begun"))
-      ->check(CLI::Range(1e-3, 1e9))
-      ->type_name("S");
   self.add_option("--cmap", o.colors, "Colours (default: viridis; fogs of density are white)")
       ->check(CLI::IsMember(VLN::Render::colorMapNames()))
       ->type_name("NAME");
@@ -150,6 +127,44 @@ void declareRender(CLI::App& self) {
       ->type_name("LENGTH");
   addVector(self, "--light", "Direction to the light (default: above the camera, to the left)", true,
             [&o](Vec3d v) { o.render.light = v; });
+}
+
+void addView(CLI::App& self, RenderCommandOptions& o) {
+  self.add_option("--threads", o.render.threads, "Threads (default: one for each processor)")
+      ->check(CLI::Range(1, 1024))
+      ->type_name("N");
+  addCamera(self, o.camera);
+  addMemoryLimit(self, o.limits);
+}
+
+} // namespace
+
+void declareRender(CLI::App& self) {
+  using VLN::Render::Quality;
+  auto const options = std::make_shared<RenderCommandOptions>();
+  auto& o = *options;
+  self.add_option("FILE", o.file, "A .vdb, .nvtt or .ply file")->required();
+  self.add_option(
+          "-o,--output", o.output,
+          "The picture, .png, or .exr with depth and normals (default: the name of FILE with .png, here)")
+      ->type_name("OUT");
+  self.add_option("--channel", o.channel,
+                  "Name of the channel, as info tells it (default: density, or the first)")
+      ->type_name("NAME");
+  addLook(self, o);
+  static std::map<std::string, Quality> const qualities{{"preview", Quality::kPreview},
+                                                        {"final", Quality::kFinal}};
+  self.add_option("--quality", o.render.quality, "A quick picture, or one without bias")
+      ->transform(CLI::CheckedTransformer(qualities, CLI::ignore_case))
+      ->default_str("preview")
+      ->type_name("preview|final");
+  self.add_option("--spp", o.render.samples, "Samples for each pixel (default: by mode and quality)")
+      ->check(CLI::Range(1, 1 << 20))
+      ->type_name("N");
+  finite(
+      self.add_option("--time-limit", o.render.timeLimit, "Seconds after which no further sample is begun"))
+      ->check(CLI::Range(1e-3, 1e9))
+      ->type_name("S");
   self.add_option_function<std::string>(
           "--size",
           [&o](std::string const& text) {
@@ -182,12 +197,33 @@ void declareRender(CLI::App& self) {
       ->check(CLI::Range(0, 28))
       ->type_name("D");
   self.add_option("--parameters", o.parameters, "Also all parameters of the picture")->type_name("OUT.json");
-  self.add_option("--threads", o.render.threads, "Threads (default: one for each processor)")
-      ->check(CLI::Range(1, 1024))
-      ->type_name("N");
-  addCamera(self, o.camera);
-  addMemoryLimit(self, o.limits);
+  addView(self, o);
   self.callback([options] { render(*options); });
+}
+
+void declareView(CLI::App& self) {
+  auto const options = std::make_shared<ViewCommandOptions>();
+  auto& o = *options;
+  self.add_option("FILE", o.look.file, inputFile(FileContent::kVolumes))->required();
+  self.add_option("-o,--output", o.look.output, "The page (default: the name of FILE with .html, here)")
+      ->type_name("OUT.html");
+  self.add_option("--channel", o.channels,
+                  "Name of a channel, as info tells it; may be given again (default: density, or the first)")
+      ->allow_extra_args(false)
+      ->type_name("NAME");
+  self.add_option_function<std::uint64_t>(
+          "--max-size", [&o](std::uint64_t bytes) { o.maxSize = bytes, o.hasMaxSize = true; },
+          "What the page may take: it holds the deepest depth that fits (1 KB is 1024 bytes)")
+      ->transform(CLI::AsSizeValue(false))
+      ->check(CLI::Range(std::uint64_t(1) << 18, std::uint64_t(1) << 40))
+      ->default_str("20MB")
+      ->type_name("SIZE");
+  self.add_option("--depth", o.look.depth, "The depth that the page holds (default: as --max-size allows)")
+      ->check(CLI::Range(0, 28))
+      ->type_name("D");
+  addLook(self, o.look);
+  addView(self, o.look);
+  self.callback([options] { view(*options); });
 }
 
 } // namespace Vln
