@@ -9,6 +9,11 @@ if(sources)
   target_link_libraries(GeometryVolumeInterop PUBLIC GeometryVolume)
   vln_uses_openvdb(GeometryVolumeInterop)
   target_link_libraries(GeometryVolumeInterop PRIVATE PNG::PNG)
+  if(vln_hdf5)
+    set_source_files_properties(src/Interop/VtkHdfWrite.cpp PROPERTIES
+      COMPILE_DEFINITIONS VLN_HDF5 INCLUDE_DIRECTORIES "${VLN_HDF5_INCLUDE_DIR}")
+    target_link_libraries(GeometryVolumeInterop PRIVATE "${VLN_HDF5_LIBRARY}")
+  endif()
   set_target_properties(GeometryVolumeInterop PROPERTIES
     VERSION ${PROJECT_VERSION}
     SOVERSION ${PROJECT_VERSION_MAJOR}.${PROJECT_VERSION_MINOR}

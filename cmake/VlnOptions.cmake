@@ -8,6 +8,7 @@ option(VLN_BUILD_EXAMPLES "Build the examples; with tests on, they are run as te
 option(VLN_BUILD_BENCH "Build the benchmarks" OFF)
 option(VLN_BUILD_PYTHON "Build the Python module vln (needs pybind11, and VLN_ALLOCATOR=system)" OFF)
 option(VLN_BUILD_FUZZ "Build the fuzzers (needs clang)" OFF)
+option(VLN_WITH_HDF5 "Write .vtkhdf files (with libhdf5, where it is found)" ON)
 option(VLN_WITH_CUDA "Build the device half of CopyableCudaDeviceBuffer (needs nvcc)" OFF)
 option(VLN_WERROR "Treat warnings as errors" ${PROJECT_IS_TOP_LEVEL})
 option(VLN_CCACHE "Compile through ccache when it is installed" ON)

@@ -8,7 +8,7 @@
 
 namespace VLN::Interop {
 
-enum class FileFormat { kUnknown, kVdb, kNvtt, kPly, kObj, kPng, kCsv, kJson, kNpz, kVti, kExr };
+enum class FileFormat { kUnknown, kVdb, kNvtt, kPly, kObj, kPng, kCsv, kJson, kNpz, kVti, kExr, kVtkHdf };
 
 /// What a file holds, as messages call it.
 enum class FileContent : unsigned {
@@ -23,6 +23,7 @@ enum class FileContent : unsigned {
   kPointData = 256,   ///< "points" again, with all that they have
   kRenderings = 512,  ///< "pictures" with opacity and depth
   kParameters = 1024, ///< "parameters" of a picture
+  kExports = 2048,    ///< "volumes" again, in any format that takes some of what they have
 };
 constexpr FileContent operator|(FileContent a, FileContent b) {
   return FileContent(unsigned(a) | unsigned(b));
@@ -44,7 +45,8 @@ VLN_API std::string suffixesWritten(FileContent content);
 /// Tells whether content could be written to a file of that name, before the work that leads to it. Pipes and
 /// devices, and names without a suffix, pass where the content has a single format or a usual one.
 /// @return The format.
-/// @error FileError for a suffix that stands for no format of these, and as checkOutput().
+/// @error FileError for a suffix that stands for no format of these, or of one that this build does not
+/// write; and as checkOutput().
 VLN_API FileFormat checkOutputFor(FileContent content, std::string const& path);
 
 } // namespace VLN::Interop

@@ -124,14 +124,8 @@ void declareSlice(CLI::App& self) {
 void declareConvert(CLI::App& self) {
   auto const options = std::make_shared<ConvertOptions>();
   auto& o = *options;
-  self.add_option("IN", o.file, inputFile(FileContent::kGrids) + "; for dense files any volume file")
-      ->required()
-      ->type_name("IN.vdb");
-  self.add_option("OUT", o.output,
-                  outputFile(FileContent::kGrids) + ", or a dense " +
-                      VLN::Interop::suffixesWritten(FileContent::kDense))
-      ->required()
-      ->type_name("OUT");
+  self.add_option("IN", o.file, inputFile(FileContent::kVolumes))->required()->type_name("IN");
+  self.add_option("OUT", o.output, outputFile(FileContent::kExports))->required()->type_name("OUT");
   addChannelFilter(self, o.limits);
   self.add_flag("--strict", o.strict, "Write nothing where anything of the file would be left out");
   addMemoryLimit(self, o.limits);
