@@ -6,6 +6,12 @@ find_package(NanoVDB REQUIRED)
 if(VLN_BUILD_INTEROP)
   find_package(OpenVDB REQUIRED)
   find_package(PNG REQUIRED)
+  find_package(ZLIB REQUIRED)
+  find_library(VLN_BLOSC_LIBRARY NAMES blosc) # comes with Debian's OpenVDB
+  mark_as_advanced(VLN_BLOSC_LIBRARY)
+  if(NOT VLN_BLOSC_LIBRARY)
+    message(STATUS "No blosc: .nvdb files that are packed with it are not read")
+  endif()
 endif()
 # HDF5 is never needed: CMake's own search asks for a compiler of C, and Debian has it in a folder of its own.
 set(vln_hdf5 OFF)

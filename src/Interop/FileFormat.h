@@ -8,7 +8,23 @@
 
 namespace VLN::Interop {
 
-enum class FileFormat { kUnknown, kVdb, kNvtt, kPly, kObj, kPng, kCsv, kJson, kNpz, kVti, kExr, kVtkHdf };
+enum class FileFormat {
+  kUnknown,
+  kVdb,
+  kNvtt,
+  kPly,
+  kObj,
+  kPng,
+  kCsv,
+  kJson,
+  kNpz,
+  kVti,
+  kExr,
+  kVtkHdf,
+  kNvdb,
+  kUsda,
+  kStl
+};
 
 /// What a file holds, as messages call it.
 enum class FileContent : unsigned {

@@ -3,6 +3,8 @@
 #include "Interop/DenseWrite.h"
 #include "Interop/FileError.h"
 #include "Interop/FileFormat.h"
+#include "Interop/NvdbFile.h"
+#include "Interop/UsdaWrite.h"
 #include "Interop/VdbExport.h"
 #include "Interop/VdbRecord.h"
 #include "Interop/VtkHdfWrite.h"
@@ -30,10 +32,17 @@ VdbImport const& grids(VdbImport const& content) {
 
 } // namespace
 
-void exportVolumes(VdbImport const& content, std::string const& path, Progress const& progress) {
+void exportVolumes(VdbImport const& content, std::string const& path, Progress const& progress,
+                   ExportOptions const& options) {
   switch (checkOutputFor(FileContent::kExports, path)) {
   case FileFormat::kNpz:
     return writeNpz(path, onlyVolume(content), progress);
+  case FileFormat::kNvdb:
+    return exportNvdb(grids(content), path, progress);
+  case FileFormat::kPly:
+    return exportSurface(grids(content), path, options.surface, progress);
+  case FileFormat::kUsda:
+    return writeUsda(path, grids(content), progress);
   case FileFormat::kVti:
     return writeVti(path, onlyVolume(content), progress);
   case FileFormat::kVtkHdf:

@@ -42,7 +42,8 @@ void convert(ConvertOptions const& options) {
   std::size_t written = 0;
   {
     ProgressBar bar;
-    content = importVolumes(options.file, options.limits, bar.progress(0, 0.7));
+    content =
+        importVolumes(options.file, options.limits, bar.progress(0, 0.7), {options.voxelSize, options.band});
     if (holdsPoints) written = content.points.size();
     for (auto const& volume : content.volumes) written += volume.channels.size();
     if (written == 0) throw FileError(options.file, "has no grid that could be written" + whyNot(content));
@@ -50,7 +51,8 @@ void convert(ConvertOptions const& options) {
     if (options.strict && !holdsPoints && !content.points.empty())
       throw FileError(content.file,
                       "would not be written whole: it has points, which such files do not hold");
-    exportVolumes(content, options.output, bar.progress(0.7, 1));
+    exportVolumes(content, options.output, bar.progress(0.7, 1),
+                  {.surface = {options.iso, options.adaptivity}});
   }
   for (auto const& s : content.skipped)
     std::cerr << fmt::format("vln: {}: note: '{}' is left out: {}\n", options.file, oneLine(s.grid, 60),

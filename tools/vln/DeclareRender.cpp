@@ -89,7 +89,7 @@ void declareRender(CLI::App& self) {
   using VLN::Render::Quality;
   auto const options = std::make_shared<RenderCommandOptions>();
   auto& o = *options;
-  self.add_option("FILE", o.file, "A .vdb, .nvtt or .ply file")->required();
+  self.add_option("FILE", o.file, inputFile(VLN::Interop::FileContent::kVolumes))->required();
   self.add_option(
           "-o,--output", o.output,
           "The picture, .png, or .exr with depth and normals (default: the name of FILE with .png, here)")
