@@ -42,9 +42,14 @@ constexpr std::uint64_t kAlignment = NANOVDB_DATA_ALIGNMENT;
 constexpr std::uint32_t kLongestName = 1u << 16;
 constexpr std::uint64_t kBloscPiece = std::uint64_t(1) << 30; ///< of this many bytes each part is packed
 
-struct Damaged : std::runtime_error {
+/// Of a file whose name is added by who reads it.
+struct Unreadable : FileError {
+  explicit Unreadable(std::string const& reason)
+      : FileError("", reason) {}
+};
+struct Damaged : Unreadable {
   explicit Damaged(std::string const& what)
-      : std::runtime_error("is damaged: " + what) {}
+      : Unreadable("is damaged: " + what) {}
 };
 
 // The bytes of one grid.
@@ -182,8 +187,7 @@ private:
     m_left -= bytes;
   }
   void need(std::uint64_t bytes) const {
-    if (bytes > m_left)
-      throw std::runtime_error("is truncated or damaged: data that it announces is missing");
+    if (bytes > m_left) throw Unreadable("is truncated or damaged: data that it announces is missing");
   }
 
   void readSegment() {
@@ -191,9 +195,9 @@ private:
     read(&header, sizeof header);
     if (header.magic != NANOVDB_MAGIC_NUMBER) throw Damaged("a segment does not begin as one");
     if (header.version.getMajor() != NANOVDB_MAJOR_VERSION_NUMBER)
-      throw std::runtime_error("is of version " + std::to_string(header.version.getMajor()) +
-                               " of NanoVDB's format, and " + std::to_string(NANOVDB_MAJOR_VERSION_NUMBER) +
-                               " is read");
+      throw Unreadable("is of version " + std::to_string(header.version.getMajor()) +
+                       " of NanoVDB's format, and " + std::to_string(NANOVDB_MAJOR_VERSION_NUMBER) +
+                       " is read");
     struct Entry {
       nanovdb::io::MetaData data;
       std::string name;
@@ -270,7 +274,7 @@ private:
       }
       return;
 #else
-      throw std::runtime_error("is packed with blosc, which this build was made without");
+      throw Unreadable("is packed with blosc, which this build was made without");
 #endif
     default:
       throw Damaged("its codec is none");
