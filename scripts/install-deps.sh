@@ -18,7 +18,7 @@ case ${1:-} in
   --python)
     packages="$packages python3-dev pybind11-dev python3-numpy python3-pip python3-venv python3-pytest mypy"
     # Beside which the tests load the module, and whose readers they ask.
-    packages="$packages python3-scipy python3-openvdb python3-vtk9"
+    packages="$packages python3-scipy python3-openvdb python3-vtk9 libhdf5-dev python3-h5py"
     ;;
   --view)
     packages="$packages chromium"

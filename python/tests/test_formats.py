@@ -91,6 +91,104 @@ def test_requirement_a_whole_level_set_goes_to_both(bunny, tmp_path):
     assert np.array_equal(read_vti(tmp_path / "a.vti")[1]["ls_bunny"], dense)
 
 
+def levels_of(path):
+    """Of a .vtkhdf file: for each level its spacing, its boxes, and its arrays box by box as [x, y, z]."""
+    h5py = pytest.importorskip("h5py")
+    with h5py.File(path, "r") as file:
+        root = file["VTKHDF"]
+        assert root.attrs["Type"] == b"OverlappingAMR" and tuple(root.attrs["Version"]) == (1, 0)
+        levels = []
+        for n in range(len(root)):
+            level = root[f"Level{n}"]
+            boxes, arrays = level["AMRBox"][:].astype(np.int64), {}
+            for name, values in level["CellData"].items():
+                values, parts, at = values[:], [], 0
+                for box in boxes:
+                    x, y, z = box[1::2] - box[::2] + 1
+                    part = values[at : at + x * y * z]
+                    at += len(part)
+                    parts.append(part.reshape((z, y, x) + part.shape[1:]).swapaxes(0, 2))
+                assert at == len(values)
+                arrays[name] = parts
+            levels.append((level.attrs["Spacing"], boxes, arrays))
+        return root.attrs["Origin"], levels
+
+
+def check_levels(path, volume):
+    """All that such a file tells of a volume, against the volume; returns what levels_of() does."""
+    origin, levels = levels_of(path)
+    tiles = volume.tiles_by_depth
+    depths = range(min(tiles), max(tiles) + 1)
+    assert len(levels) == len(depths)
+    unit = volume.to_world([(1, 1, 1)])[0] - volume.to_world([(0, 0, 0)])[0]
+    for depth, (spacing, boxes, arrays) in zip(depths, levels):
+        width = 2 ** (28 - depth)
+        assert np.allclose(spacing, unit * width, rtol=1e-12)
+        # The first voxel of a cell lies half a voxel behind the cell's corner.
+        low = volume.to_index(origin + boxes[:, ::2] * spacing) + 0.5
+        voxels = np.rint(low).astype(int)
+        assert np.abs(low - voxels).max() < 1e-3 and (voxels % (4 * width) == 0).all()
+        sizes = boxes[:, 1::2] - boxes[:, ::2] + 1
+        assert set(sizes.ravel()) <= {4, 8, 16, 32}
+        inside = {tuple(t) for low, size in zip(voxels // (4 * width), sizes // 4)
+                  for t in np.argwhere(np.ones(size, bool)) + low}
+        assert len(inside) == sizes.prod(axis=1).sum() // 64
+        if depth in tiles:
+            assert {tuple(t) for t in volume.origins(depth) // (4 * width)} <= inside
+        assert set(arrays) == {name.replace("/", "_") for name in volume.names}
+        for name in volume.names:
+            for box, size, part in zip(voxels, sizes, arrays[name.replace("/", "_")]):
+                assert np.array_equal(part, volume[name].to_numpy(box=(box, box + size * width), depth=depth)), name
+    return origin, levels
+
+
+def test_requirement_vtkhdf_has_every_level_and_value(bunny, tmp_path):
+    bunny.save(tmp_path / "a.vtkhdf")
+    _, levels = check_levels(tmp_path / "a.vtkhdf", bunny.volume)
+    assert len(levels) > 1 and any(32 in boxes[:, 1] - boxes[:, 0] + 1 for _, boxes, _ in levels)
+    volume, arrays = volume_of_many()
+    volume.save(tmp_path / "b.vtkhdf")
+    check_levels(tmp_path / "b.vtkhdf", volume)
+
+
+def test_requirement_vtkhdf_keeps_voxels_that_are_no_cubes(tmp_path):
+    peer = pytest.importorskip("pyopenvdb")
+    grid = peer.FloatGrid()
+    grid.name = "ramp"
+    grid.transform = peer.createLinearTransform([[0.5, 0, 0, 0], [0, 2, 0, 0], [0, 0, 0.125, 0], [3, -1, 2, 1]])
+    grid.copyFromArray(np.random.default_rng(5).uniform(1, 2, (30, 9, 20)), ijk=(-70000, 0, 8))
+    peer.write(str(tmp_path / "a.vdb"), grids=[grid])
+    with vln.open(tmp_path / "a.vdb") as file:
+        file.save(tmp_path / "a.vtkhdf")
+        check_levels(tmp_path / "a.vtkhdf", file.volume)
+
+
+def test_requirement_vtkhdf_is_read_by_vtk(bunny, tmp_path):
+    vtk_io = pytest.importorskip("vtkmodules.vtkIOHDF")
+    from vtkmodules.util.numpy_support import vtk_to_numpy
+    from vtkmodules.vtkCommonCore import vtkVersion
+
+    if (vtkVersion.GetVTKMajorVersion(), vtkVersion.GetVTKMinorVersion()) < (9, 2):
+        pytest.skip("VTK reads such files from 9.2 on")
+    bunny.volume.save(tmp_path / "a.vtkhdf")
+    origin, levels = levels_of(tmp_path / "a.vtkhdf")
+    reader = vtk_io.vtkHDFReader()
+    assert reader.CanReadFile(str(tmp_path / "a.vtkhdf"))
+    reader.SetFileName(str(tmp_path / "a.vtkhdf"))
+    reader.Update()
+    read = reader.GetOutputDataObject(0)
+    assert read.GetNumberOfLevels() == len(levels)
+    for n, (spacing, boxes, arrays) in enumerate(levels):
+        assert read.GetNumberOfDataSets(n) == len(boxes)
+        for k, box in enumerate(boxes):
+            grid = read.GetDataSet(n, k)
+            low = origin + box[::2] * spacing
+            assert np.allclose(np.reshape(grid.GetBounds(), (3, 2))[:, 0], low)
+            assert np.allclose(np.reshape(grid.GetBounds(), (3, 2))[:, 1], origin + (box[1::2] + 1) * spacing)
+            values = vtk_to_numpy(grid.GetCellData().GetArray("ls_bunny"))
+            assert np.array_equal(values, arrays["ls_bunny"][k].ravel(order="F"))
+
+
 @pytest.mark.parametrize("suffix", ["npz", "vti"])
 def test_negative_what_cannot_be_written_leaves_no_file(suffix, tmp_path):
     path = tmp_path / f"a.{suffix}"

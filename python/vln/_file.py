@@ -112,7 +112,7 @@ def open(
     progress: Optional[Progress] = None,
     memory: int = 0,
 ) -> File:
-    """Reads a .vdb or .nvtt file.
+    """Reads a file of volumes: .vdb, .nvdb, .nvtt, or a mesh (.obj, .stl, .ply), which becomes a level set.
 
     channels: a filter of grids by name, such as "density* | velocity".
     progress: called as progress(stage, share) now and then; what it raises ends the call.

@@ -229,7 +229,8 @@ class Volume(ByName):
         depth: Optional[int] = None,
         progress: Optional[Callable[[str, float], Any]] = None,
     ) -> None:
-        """Writes all channels, whole or not at all, in the format of the suffix: .vdb, .nvtt, or dense as .npz
+        """Writes all channels, whole or not at all, in the format of the suffix: .vdb, .nvdb, .nvtt, .usda (with a
+        .vdb beside it), .vtkhdf (ParaView, with all levels), .ply (the surface of a level set), or dense as .npz
         (numpy) or .vti (ParaView).
 
         box, depth, progress: of dense files alone; as in Channel.to_numpy(), and as in open().

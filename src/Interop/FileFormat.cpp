@@ -3,6 +3,7 @@
 #include "Interop/FileError.h"
 #include "Interop/OutputFile.h"
 #include "Interop/OutputTargetImpl.h"
+#include "Interop/VtkHdfWrite.h"
 
 #include <algorithm>
 #include <cctype>
@@ -24,15 +25,21 @@ constexpr Row kTable[] = {
     {FileFormat::kExr, ".exr", {}, FileContent::kRenderings},
     {FileFormat::kHtml, ".html", {}, FileContent::kPages},
     {FileFormat::kJson, ".json", {}, FileContent::kParameters},
-    {FileFormat::kNpz, ".npz", {}, FileContent::kDense},
+    {FileFormat::kNpz, ".npz", {}, FileContent::kDense | FileContent::kExports},
+    {FileFormat::kNvdb, ".nvdb", FileContent::kVolumes, FileContent::kVolumes | FileContent::kExports},
     {FileFormat::kNvtt, ".nvtt", FileContent::kVolumes | FileContent::kFlatBuffers,
      FileContent::kVolumes | FileContent::kFlatBuffers},
-    {FileFormat::kObj, ".obj", {}, FileContent::kBoxes | FileContent::kPoints},
-    {FileFormat::kPly, ".ply", FileContent::kPoints, FileContent::kPoints | FileContent::kPointData},
+    {FileFormat::kObj, ".obj", FileContent::kVolumes, FileContent::kBoxes | FileContent::kPoints},
+    {FileFormat::kPly, ".ply", FileContent::kVolumes | FileContent::kPoints,
+     FileContent::kVolumes | FileContent::kPoints | FileContent::kPointData | FileContent::kExports},
     {FileFormat::kPng, ".png", {}, FileContent::kPictures | FileContent::kRenderings},
+    {FileFormat::kStl, ".stl", FileContent::kVolumes, {}},
+    {FileFormat::kUsda, ".usda", {}, FileContent::kVolumes | FileContent::kExports},
     {FileFormat::kVdb, ".vdb", FileContent::kVolumes | FileContent::kGrids | FileContent::kPoints,
-     FileContent::kVolumes | FileContent::kGrids | FileContent::kPoints | FileContent::kPointData},
-    {FileFormat::kVti, ".vti", {}, FileContent::kDense},
+     FileContent::kVolumes | FileContent::kGrids | FileContent::kPoints | FileContent::kPointData |
+         FileContent::kExports},
+    {FileFormat::kVti, ".vti", {}, FileContent::kDense | FileContent::kExports},
+    {FileFormat::kVtkHdf, ".vtkhdf", {}, FileContent::kVolumes | FileContent::kExports},
 };
 
 Row const* rowOf(FileFormat format) {
@@ -44,6 +51,7 @@ Row const* rowOf(FileFormat format) {
 char const* nameOf(FileContent content) {
   switch (content) {
   case FileContent::kVolumes:
+  case FileContent::kExports:
     return "volumes";
   case FileContent::kGrids:
     return "grids";
@@ -121,11 +129,14 @@ FileFormat checkOutputFor(FileContent content, std::string const& path) {
   auto const possible = suffixes(content, &Row::written);
   // What names without a suffix, pipes and devices get.
   FileFormat const standard = content == FileContent::kRenderings ? FileFormat::kPng
+                              : content == FileContent::kExports  ? FileFormat::kVdb
                               : possible.size() == 1 ? formatOf(std::string("a") + possible.front())
                                                      : FileFormat::kUnknown;
   if (!fits &&
       (standard == FileFormat::kUnknown || !(lowerSuffix(path).empty() || findOutputTarget(path).straight)))
     throw FileError(path, std::string(nameOf(content)) + " are written as " + listOf(possible));
+  if (fits && format == FileFormat::kVtkHdf && !writesVtkHdf())
+    throw FileError(path, "this build writes no .vtkhdf files: it was made without HDF5");
   checkOutput(path);
   return fits ? format : standard;
 }

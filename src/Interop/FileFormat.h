@@ -8,7 +8,24 @@
 
 namespace VLN::Interop {
 
-enum class FileFormat { kUnknown, kVdb, kNvtt, kPly, kObj, kPng, kCsv, kJson, kNpz, kVti, kExr, kHtml };
+enum class FileFormat {
+  kUnknown,
+  kVdb,
+  kNvtt,
+  kPly,
+  kObj,
+  kPng,
+  kCsv,
+  kJson,
+  kNpz,
+  kVti,
+  kExr,
+  kVtkHdf,
+  kNvdb,
+  kUsda,
+  kStl,
+  kHtml
+};
 
 /// What a file holds, as messages call it.
 enum class FileContent : unsigned {
@@ -24,6 +41,7 @@ enum class FileContent : unsigned {
   kRenderings = 512,  ///< "pictures" with opacity and depth
   kParameters = 1024, ///< "parameters" of a picture
   kPages = 2048,      ///< "pages" for browsers
+  kExports = 4096,    ///< "volumes" again, in any format that takes some of what they have
 };
 constexpr FileContent operator|(FileContent a, FileContent b) {
   return FileContent(unsigned(a) | unsigned(b));
@@ -45,7 +63,8 @@ VLN_API std::string suffixesWritten(FileContent content);
 /// Tells whether content could be written to a file of that name, before the work that leads to it. Pipes and
 /// devices, and names without a suffix, pass where the content has a single format or a usual one.
 /// @return The format.
-/// @error FileError for a suffix that stands for no format of these, and as checkOutput().
+/// @error FileError for a suffix that stands for no format of these, or of one that this build does not
+/// write; and as checkOutput().
 VLN_API FileFormat checkOutputFor(FileContent content, std::string const& path);
 
 } // namespace VLN::Interop

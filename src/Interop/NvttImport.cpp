@@ -7,6 +7,8 @@
 #include "GeometryVolume/topology/Command.h"
 #include "GeometryVolume/utils/ChannelParser.h"
 #include "Interop/FileError.h"
+#include "Interop/Mesh.h"
+#include "Interop/NvdbFile.h"
 #include "Interop/NvttRead.h"
 #include "Interop/VolumeFile.h"
 
@@ -234,7 +236,10 @@ VdbImport importNvtt(std::string const& path, VdbReadLimits const& limits, Progr
   return Importer(file, path, limits.channels, progress).run(memory);
 }
 
-VdbImport importVolumes(std::string const& path, VdbReadLimits const& limits, Progress const& progress) {
+VdbImport importVolumes(std::string const& path, VdbReadLimits const& limits, Progress const& progress,
+                        MeshOptions const& mesh) {
+  if (isMeshFile(path)) return importMesh(path, mesh, limits, progress);
+  if (isNvdbFile(path)) return importNvdb(path, limits, progress);
   return isNvttFile(path) ? importNvtt(path, limits, progress) : importVdb(path, limits, progress);
 }
 

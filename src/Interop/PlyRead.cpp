@@ -1,5 +1,6 @@
 #include "Interop/FileError.h"
 #include "Interop/Ply.h"
+#include "Interop/PlyMeshImpl.h"
 
 #include <algorithm>
 #include <array>
@@ -93,6 +94,24 @@ public:
     }
     if (!found) fail("has no element 'vertex'");
     return place(options);
+  }
+
+  void runMesh(Mesh& mesh) {
+    readHeader();
+    bool faces = false;
+    for (Element const& element : m_elements) {
+      if (element.name == "vertex") {
+        readVertices(element);
+      } else if (element.name == "face") {
+        readFaces(element, mesh);
+        faces = true;
+        break;
+      } else {
+        skip(element);
+      }
+    }
+    if (!faces) fail("has no element 'face'");
+    mesh.points = std::move(m_world);
   }
 
 private:
@@ -370,6 +389,41 @@ private:
     }
   }
 
+  /// Behind the vertices, as all writers have them.
+  void readFaces(Element const& element, Mesh& mesh) {
+    std::size_t indices = element.properties.size();
+    for (std::size_t n = 0; n < element.properties.size(); ++n) {
+      Property const& p = element.properties[n];
+      if (p.isList && (p.name == "vertex_indices" || p.name == "vertex_index")) indices = n;
+    }
+    if (indices == element.properties.size()) fail("has faces without 'vertex_indices'");
+    checkCount(element);
+    std::vector<std::uint32_t> face;
+    for (std::uint64_t n = 0; n < element.count; ++n)
+      for (std::size_t k = 0; k < element.properties.size(); ++k) {
+        Property const& p = element.properties[k];
+        if (k == indices)
+          readFace(p, face, mesh);
+        else if (p.isList)
+          skipList(p);
+        else
+          read(p.type);
+      }
+  }
+  void readFace(Property const& property, std::vector<std::uint32_t>& face, Mesh& mesh) {
+    double const count = read(property.countType).number();
+    if (!(count >= 3 && count == std::floor(count))) fail("has a face of fewer than three vertices");
+    if (count > double(left())) failTruncated();
+    face.clear();
+    for (double n = 0; n < count; ++n) {
+      double const vertex = read(property.type).number();
+      if (!(vertex >= 0 && vertex < double(m_world.size()) && vertex == std::floor(vertex)))
+        fail("has a face of a vertex that is not there");
+      face.push_back(static_cast<std::uint32_t>(vertex));
+    }
+    for (std::size_t n = 2; n < face.size(); ++n) mesh.triangles.push_back({face[0], face[n - 1], face[n]});
+  }
+
   /// From world to tile space. Float positions keep the origin, so that a power of two scales them exactly.
   PointSet place(PlyOptions const& options) {
     m_points.voxelSize =
@@ -448,6 +502,10 @@ double chooseVoxelSize(std::vector<double3> const& world, double pointsPerTile) 
 
 PointSet parsePly(std::string const& path, char const* data, std::size_t size, PlyOptions const& options) {
   return Parser(path, data, size).run(options);
+}
+
+void parsePlyMesh(std::string const& path, char const* data, std::size_t size, Mesh& mesh) {
+  Parser(path, data, size).runMesh(mesh);
 }
 
 PointSet readPly(std::string const& path, PlyOptions const& options) {

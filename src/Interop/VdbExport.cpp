@@ -43,13 +43,10 @@ openvdb::GridBase::Ptr toGrid(Object const& object, VdbGridRecord const& record)
   return grid;
 }
 
-void write(std::vector<VdbVolume> const& volumes, std::vector<PointVolume> const& points,
-           std::string const& fileMetadata, std::string const& path, Progress const& progress) {
-  openvdb::initialize();
-  OutputFile out(path);
+// `metadata` takes that of the volumes.
+openvdb::GridPtrVec makeGrids(std::vector<VdbVolume> const& volumes, openvdb::MetaMap& metadata,
+                              Progress const& progress) {
   openvdb::GridPtrVec grids;
-  openvdb::MetaMap metadata;
-  if (!fileMetadata.empty()) readMetadata(fileMetadata, metadata);
   std::size_t count = 0, done = 0;
   Ostil::Any holder, bytesHolder;
   for (auto const& volume : volumes) count += volume.channels.size();
@@ -68,6 +65,16 @@ void write(std::vector<VdbVolume> const& volumes, std::vector<PointVolume> const
     if (auto const* bytes = property<Ostil::String>(*volume.object, kVdbMetadataProperty, bytesHolder))
       readMetadata(*bytes, metadata);
   }
+  return grids;
+}
+
+void write(std::vector<VdbVolume> const& volumes, std::vector<PointVolume> const& points,
+           std::string const& fileMetadata, std::string const& path, Progress const& progress) {
+  openvdb::initialize();
+  OutputFile out(path);
+  openvdb::MetaMap metadata;
+  if (!fileMetadata.empty()) readMetadata(fileMetadata, metadata);
+  openvdb::GridPtrVec grids = makeGrids(volumes, metadata, progress);
   for (auto const& volume : points)
     grids.push_back(makePointsGrid(pointSetOf(volume), volume.name.empty() ? "points" : volume.name));
   if (progress) progress("writing", 0.8);
@@ -76,6 +83,12 @@ void write(std::vector<VdbVolume> const& volumes, std::vector<PointVolume> const
 }
 
 } // namespace
+
+openvdb::GridPtrVec exportedGrids(VdbImport const& content, Progress const& progress) {
+  openvdb::initialize();
+  openvdb::MetaMap metadata;
+  return makeGrids(content.volumes, metadata, progress);
+}
 
 void exportVdb(std::vector<VdbVolume> const& volumes, std::string const& path, Progress const& progress) {
   write(volumes, {}, "", path, progress);

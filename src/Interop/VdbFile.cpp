@@ -1,5 +1,6 @@
 #include "Interop/VdbFile.h"
 
+#include "Interop/ChildProbeImpl.h"
 #include "Interop/FileError.h"
 #include "Interop/VdbFileImpl.h"
 
@@ -35,14 +36,8 @@ constexpr std::uint64_t kStackRoom = 32 * kMB;
 
 // Regular file that starts as a .vdb file does. Returns its size.
 std::uint64_t checkHeader(std::string const& path) {
-  struct stat info;
-  if (stat(path.c_str(), &info) != 0) throw FileError(path, std::strerror(errno));
-  if (S_ISDIR(info.st_mode)) throw FileError(path, "is a directory");
-  // A pipe or a device might never end, and cannot be read twice.
-  if (!S_ISREG(info.st_mode)) throw FileError(path, "is not a regular file");
+  std::uint64_t const size = regularFileSize(path);
   std::ifstream in(path, std::ios::binary);
-  if (!in) throw FileError(path, std::string("cannot be opened: ") + std::strerror(errno));
-  if (info.st_size == 0) throw FileError(path, "is empty");
   unsigned char head[8] = {};
   in.read(reinterpret_cast<char*>(head), sizeof head);
   static constexpr unsigned char kMagic[8] = {0x20, 0x42, 0x44, 0x56, 0, 0, 0, 0};
@@ -50,7 +45,7 @@ std::uint64_t checkHeader(std::string const& path) {
   if (std::memcmp(head, kMagic, std::min(got, sizeof head)) != 0)
     throw FileError(path, "is not an OpenVDB file");
   if (got < sizeof head) throw FileError(path, "is truncated");
-  return static_cast<std::uint64_t>(info.st_size);
+  return size;
 }
 
 // OpenVDB's own readers give a file up at the first grid of a type that is not registered. This one goes on
@@ -117,21 +112,6 @@ VdbFile readWhole(std::string const& path) {
 
 std::string memoryReason(std::uint64_t bytes) {
   return "is damaged, or needs more than " + std::to_string(bytes / kMB) + " MB of memory";
-}
-
-// The reason why readWhole() failed, from inside a catch block.
-std::string currentReason(std::uint64_t memoryBytes) {
-  try {
-    throw;
-  } catch (FileError const& error) { return error.reason(); } catch (std::bad_alloc const&) {
-    return memoryReason(memoryBytes);
-  } catch (std::length_error const&) {
-    return "is damaged: it claims a size that cannot be";
-  } catch (std::ios::failure const&) {
-    return "is truncated or damaged: data that it announces is missing";
-  } catch (std::exception const& error) { return "cannot be read: " + oneLine(error.what()); } catch (...) {
-    return "cannot be read";
-  }
 }
 
 std::uint64_t availableMemory() {
@@ -217,7 +197,7 @@ void onNoMemory() {
 }
 
 // Writes "ok", or the reason why not.
-void readInChild(std::string const& path, VdbReadLimits const& limits, Memory const& start, int fd,
+void readInChild(ReadInChild const& read, VdbReadLimits const& limits, Memory const& start, int fd,
                  std::string const& noMemory) {
   // The parent's worker threads do not exist here: loops that OpenVDB runs while it reads or gives up must
   // not wait for them.
@@ -240,20 +220,20 @@ void readInChild(std::string const& path, VdbReadLimits const& limits, Memory co
   if (null >= 0)
     for (int n = 0; n < 3; ++n) dup2(null, n);
   try {
-    VdbFile file = readWhole(path);
+    std::shared_ptr<void> const content = read();
     // The parent may not have looked since: a child can be quicker than the watch.
     writeAll(fd, memoryOf("self").own > start.own + limits.memoryBytes ? noMemory : "ok");
     _exit(0);
-  } catch (...) { writeAll(fd, currentReason(limits.memoryBytes)); }
+  } catch (...) { writeAll(fd, readFailure(limits.memoryBytes)); }
 }
 
 // The child's whole life. It never returns, whatever is thrown: what left this function would go on as a
 // second copy of the parent.
 // @param noMemory Made before the fork: the child may have no memory for it.
-[[noreturn]] void runChild(std::string const& path, VdbReadLimits const& limits, Memory const& start, int fd,
+[[noreturn]] void runChild(ReadInChild const& read, VdbReadLimits const& limits, Memory const& start, int fd,
                            std::string const& noMemory) noexcept {
   try {
-    readInChild(path, limits, start, fd, noMemory);
+    readInChild(read, limits, start, fd, noMemory);
   } catch (...) { writeAll(fd, noMemory); }
   _exit(0);
 }
@@ -329,14 +309,15 @@ VdbReadLimits effective(VdbReadLimits limits, std::uint64_t fileSize) {
 
 // Reads the file in one child.
 // @return Whether it stalled, and nothing is known of the file.
-bool probeOnce(std::string const& path, VdbReadLimits const& limits, double stallSeconds) {
+bool probeOnce(std::string const& path, ReadInChild const& read, VdbReadLimits const& limits,
+               double stallSeconds) {
   Memory const start = memoryOf("self");
   std::string const noMemory = memoryReason(limits.memoryBytes);
   int ends[2];
   if (pipe2(ends, O_CLOEXEC) != 0) throw FileError(path, std::string("no pipe: ") + std::strerror(errno));
   Child child{ends[0], fork()};
   int const error = errno;
-  if (child.process == 0) runChild(path, limits, start, ends[1], noMemory);
+  if (child.process == 0) runChild(read, limits, start, ends[1], noMemory);
   close(ends[1]);
   if (child.process < 0)
     throw FileError(path, std::string("no process to read it in: ") + std::strerror(error));
@@ -358,16 +339,48 @@ bool probeOnce(std::string const& path, VdbReadLimits const& limits, double stal
 
 // Probes and returns the limits in force.
 VdbReadLimits probe(std::string const& path, VdbReadLimits const& asked) {
-  VdbReadLimits const limits = effective(asked, checkHeader(path));
+  return probeInChild(path, asked, checkHeader(path),
+                      [&] { return std::make_shared<VdbFile>(readWhole(path)); });
+}
+
+} // namespace
+
+std::uint64_t regularFileSize(std::string const& path) {
+  struct stat info;
+  if (stat(path.c_str(), &info) != 0) throw FileError(path, std::strerror(errno));
+  if (S_ISDIR(info.st_mode)) throw FileError(path, "is a directory");
+  // A pipe or a device might never end, and cannot be read twice.
+  if (!S_ISREG(info.st_mode)) throw FileError(path, "is not a regular file");
+  if (std::ifstream in(path, std::ios::binary); !in)
+    throw FileError(path, std::string("cannot be opened: ") + std::strerror(errno));
+  if (info.st_size == 0) throw FileError(path, "is empty");
+  return static_cast<std::uint64_t>(info.st_size);
+}
+
+std::string readFailure(std::uint64_t memoryBytes) {
+  try {
+    throw;
+  } catch (FileError const& error) { return error.reason(); } catch (std::bad_alloc const&) {
+    return memoryReason(memoryBytes);
+  } catch (std::length_error const&) {
+    return "is damaged: it claims a size that cannot be";
+  } catch (std::ios::failure const&) {
+    return "is truncated or damaged: data that it announces is missing";
+  } catch (std::exception const& error) { return "cannot be read: " + oneLine(error.what()); } catch (...) {
+    return "cannot be read";
+  }
+}
+
+VdbReadLimits probeInChild(std::string const& path, VdbReadLimits const& asked, std::uint64_t fileSize,
+                           ReadInChild const& read) {
+  VdbReadLimits const limits = effective(asked, fileSize);
   openvdb::initialize();
   // A worker thread that happened to hold one of the scheduler's locks while the child was made does not
   // exist in the child, which then waits for ever. Another child will not have that bad luck. One that waits
   // for a slow disk looks the same, so that each has more time than the one before.
-  for (double stallSeconds = 0.25; probeOnce(path, limits, stallSeconds); stallSeconds *= 2) {}
+  for (double stallSeconds = 0.25; probeOnce(path, read, limits, stallSeconds); stallSeconds *= 2) {}
   return limits;
 }
-
-} // namespace
 
 void probeVdbFile(std::string const& path, VdbReadLimits const& limits) { probe(path, limits); }
 
@@ -377,7 +390,7 @@ VdbFile readVdbFile(std::string const& path, VdbReadLimits const& asked) {
     VdbFile file = readWhole(path);
     file.memoryBytes = limits.memoryBytes;
     return file;
-  } catch (...) { throw FileError(path, currentReason(limits.memoryBytes)); }
+  } catch (...) { throw FileError(path, readFailure(limits.memoryBytes)); }
 }
 
 char const* openvdbVersion() { return openvdb::getLibraryVersionString(); }

@@ -246,18 +246,23 @@ VdbImport importGrids(VdbFile const& file, Progress const& progress) {
   return result;
 }
 
-VdbImport importVdb(std::string const& path, VdbReadLimits const& limits, Progress const& progress) {
-  report(progress, "reading", 0);
-  VdbFile file = readVdbFile(path, limits);
+VdbImport importGrids(VdbFile& file, VdbReadLimits const& limits, Progress const& progress) {
   if (!limits.channels.empty()) {
     Utils::ChannelParser filter;
     if (auto const status = filter.parses(limits.channels); !status)
-      throw FileError(path, "the filter '" + oneLine(limits.channels, 60) + "' is none: " + status.message);
+      throw FileError(file.path,
+                      "the filter '" + oneLine(limits.channels, 60) + "' is none: " + status.message);
     std::erase_if(file.grids, [&](auto const& grid) {
       return !filter.accepts(grid->getName().empty() ? "unnamed" : grid->getName());
     });
   }
   return importGrids(file, progress);
+}
+
+VdbImport importVdb(std::string const& path, VdbReadLimits const& limits, Progress const& progress) {
+  report(progress, "reading", 0);
+  VdbFile file = readVdbFile(path, limits);
+  return importGrids(file, limits, progress);
 }
 
 } // namespace VLN::Interop

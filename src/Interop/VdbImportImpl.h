@@ -10,6 +10,13 @@ namespace VLN::Interop {
 /// Builds the volumes of a file that is in memory. Grids that cannot come in are named as skipped.
 VLN_API VdbImport importGrids(VdbFile const& file, Progress const& progress = {});
 
+/// The same of the grids that the limits' filter lets through.
+/// @error FileError for a filter that is none.
+VdbImport importGrids(VdbFile& file, VdbReadLimits const& limits, Progress const& progress);
+
+/// The grids of volumes that importGrids() made, points aside, as they are written.
+openvdb::GridPtrVec exportedGrids(VdbImport const& content, Progress const& progress = {});
+
 /// A volume for each points grid of the file. Those that cannot come in are named as skipped.
 std::vector<PointVolume> importPointGrids(VdbFile const& file, std::vector<SkippedGrid>& skipped);
 bool isPointGrid(openvdb::GridBase const& grid);

@@ -1,14 +1,16 @@
 // importVolumes(): the volumes of a file of any format that holds some.
 #pragma once
 
+#include "Interop/Mesh.h"
 #include "Interop/VdbImport.h"
 
 namespace VLN::Interop {
 
-/// A .vdb file as importVdb() reads it, or a .nvtt file as importNvtt() does: the content tells which.
+/// The level set of a mesh as importMesh() makes it, by the suffix; a .vdb file as importVdb() reads it, a
+/// .nvdb file as importNvdb() does, or a .nvtt file as importNvtt() does: the content tells which.
 /// @error FileError.
 VLN_API VdbImport importVolumes(std::string const& path, VdbReadLimits const& limits = {},
-                                Progress const& progress = {});
+                                Progress const& progress = {}, MeshOptions const& mesh = {});
 
 /// The volume of a flat buffer as a tree with channels again: one for each grid, quantised ones as float.
 /// Merged blocks become tiles again. What a flat buffer does not hold (active states, metadata, all of a

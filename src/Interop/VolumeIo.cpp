@@ -5,8 +5,8 @@
 #include "Interop/FileFormat.h"
 #include "Interop/Flatten.h"
 #include "Interop/NvttWrite.h"
-#include "Interop/VdbExport.h"
 #include "Interop/VdbRecord.h"
+#include "Interop/VolumeExport.h"
 
 #include <openvdb/openvdb.h>
 
@@ -94,7 +94,17 @@ void save(Volume const& volume, std::string const& path) {
   }
   VdbVolume written;
   written.object = Ostil::makePtr<Object>(withRecords(volume, path));
-  exportVdb(std::vector<VdbVolume>{std::move(written)}, path);
+  written.indexToWorld = IndexToWorld(propertyOr(*written.object, kVdbTransformProperty, Ostil::String()));
+  for (auto const& record : propertyOr(*written.object, kVdbGridsProperty, Ostil::Array<VdbGridRecord>())) {
+    VdbChannel channel;
+    channel.name = channel.gridName = record.channel;
+    channel.type = record.type;
+    written.channels.push_back(channel);
+  }
+  VdbImport content;
+  content.file = path;
+  content.volumes.push_back(std::move(written));
+  exportVolumes(content, path);
 }
 
 } // namespace VLN::Interop

@@ -13,7 +13,8 @@ namespace VLN::Interop {
 /// @error FileError; also for a file with none or more than one volume.
 VLN_API TileTree3D::Volume load(std::string const& path);
 
-/// Writes all fields, whole or not at all, in the format of the suffix: .vdb or .nvtt.
+/// Writes all fields, whole or not at all, in the format of the suffix: .vdb, .nvtt, or another one that
+/// exportVolumes() knows and that is not a dense box.
 ///
 /// In a .vdb file a grid that came from one keeps its transform, metadata and the states that it had; of a
 /// field that was added the samples that are not the background are active. A grid whose states were kept

@@ -58,8 +58,9 @@ TEST_F(CommandLineTest, NegativeSuffixesFitTheFormat) {
   std::string const path = torus();
   expectFailure(vln({"slice", path, "--channel", "surface", "--axis", "x", "-o", m_folder / "a.jpg"}),
                 (m_folder / "a.jpg") + ": pictures are written as .png");
-  expectFailure(vln({"convert", path, m_folder / "a.ply"}),
-                (m_folder / "a.ply") + ": grids are written as .vdb");
+  expectFailure(vln({"convert", path, m_folder / "a.png"}),
+                (m_folder / "a.png") +
+                    ": volumes are written as .npz, .nvdb, .ply, .usda, .vdb, .vti or .vtkhdf");
   expectFailure(vln({"make", "cloud", m_folder / "a.png"}),
                 (m_folder / "a.png") + ": grids are written as .vdb");
   expectFailure(vln({"tiles", path, "--depth", "28", "-o", m_folder / "a.stl"}),

@@ -35,6 +35,8 @@ struct ConvertOptions {
   std::string output;
   bool strict = false; ///< what would be left out is an error
   VLN::Interop::VdbReadLimits limits;
+  double voxelSize = 0, band = 3; ///< of what a mesh becomes
+  double iso = 0, adaptivity = 0; ///< of the surface that a .ply file gets
 };
 void convert(ConvertOptions const& options);
 

@@ -1,9 +1,8 @@
 #include "Commands.h"
-#include "Interop/DenseWrite.h"
 #include "Interop/FileError.h"
 #include "Interop/FileFormat.h"
 #include "Interop/OutputFile.h"
-#include "Interop/VdbExport.h"
+#include "Interop/VolumeExport.h"
 #include "Interop/VolumeFile.h"
 #include "PointsFile.h"
 #include "ProgressBar.h"
@@ -34,38 +33,26 @@ void checkWhole(VdbImport const& content) {
                       "would not be written whole; '" + oneLine(points.name, 60) + "': " + loss);
 }
 
-void writeDense(VdbImport const& content, FileFormat format, std::string const& output,
-                Progress const& progress) {
-  if (content.volumes.size() > 1)
-    throw FileError(content.file, "holds " + std::to_string(content.volumes.size()) +
-                                      " volumes, each with a transform of its own: choose with --channels");
-  auto const dense = denseVolumeOf(content.volumes.front());
-  format == FileFormat::kNpz ? writeNpz(output, dense, progress) : writeVti(output, dense, progress);
-}
-
 } // namespace
 
 void convert(ConvertOptions const& options) {
-  FileFormat const format = formatOf(options.output);
-  bool const dense = isWritten(format, FileContent::kDense);
-  checkOutputFor(dense ? FileContent::kDense : FileContent::kGrids, options.output);
+  FileFormat const format = checkOutputFor(FileContent::kExports, options.output);
+  bool const holdsPoints = isWritten(format, FileContent::kPointData);
   VdbImport content;
   std::size_t written = 0;
   {
     ProgressBar bar;
-    content = dense ? importVolumes(options.file, options.limits, bar.progress(0, 0.7))
-                    : importVdb(options.file, options.limits, bar.progress(0, 0.7));
-    if (!dense) written = content.points.size();
+    content =
+        importVolumes(options.file, options.limits, bar.progress(0, 0.7), {options.voxelSize, options.band});
+    if (holdsPoints) written = content.points.size();
     for (auto const& volume : content.volumes) written += volume.channels.size();
     if (written == 0) throw FileError(options.file, "has no grid that could be written" + whyNot(content));
     if (options.strict) checkWhole(content);
-    if (options.strict && dense && !content.points.empty())
+    if (options.strict && !holdsPoints && !content.points.empty())
       throw FileError(content.file,
-                      "would not be written whole: it has points, which dense files do not hold");
-    if (dense)
-      writeDense(content, format, options.output, bar.progress(0.7, 1));
-    else
-      exportVdb(content, options.output, bar.progress(0.7, 1));
+                      "would not be written whole: it has points, which such files do not hold");
+    exportVolumes(content, options.output, bar.progress(0.7, 1),
+                  {.surface = {options.iso, options.adaptivity}});
   }
   for (auto const& s : content.skipped)
     std::cerr << fmt::format("vln: {}: note: '{}' is left out: {}\n", options.file, oneLine(s.grid, 60),

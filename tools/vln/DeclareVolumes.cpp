@@ -124,15 +124,27 @@ void declareSlice(CLI::App& self) {
 void declareConvert(CLI::App& self) {
   auto const options = std::make_shared<ConvertOptions>();
   auto& o = *options;
-  self.add_option("IN", o.file, inputFile(FileContent::kGrids) + "; for dense files any volume file")
-      ->required()
-      ->type_name("IN.vdb");
-  self.add_option("OUT", o.output,
-                  outputFile(FileContent::kGrids) + ", or a dense " +
-                      VLN::Interop::suffixesWritten(FileContent::kDense))
-      ->required()
-      ->type_name("OUT");
+  self.add_option("IN", o.file, inputFile(FileContent::kVolumes))->required()->type_name("IN");
+  self.add_option("OUT", o.output, outputFile(FileContent::kExports))->required()->type_name("OUT");
   addChannelFilter(self, o.limits);
+  finite(
+      self.add_option("--voxel-size", o.voxelSize,
+                      "World length of a voxel of what a mesh becomes (default: 1/256 of its longest side)"))
+      ->check(CLI::PositiveNumber)
+      ->type_name("W");
+  finite(
+      self.add_option("--band", o.band, "How many voxels of a mesh's distances are kept to each side of it"))
+      ->check(CLI::Range(1.0, 1000.0))
+      ->capture_default_str()
+      ->type_name("N");
+  finite(self.add_option("--iso", o.iso, "Value on the surface that a .ply file gets"))
+      ->capture_default_str()
+      ->type_name("V");
+  finite(self.add_option("--adaptivity", o.adaptivity,
+                         "How much the flat parts of such a surface are made of larger faces"))
+      ->check(CLI::Range(0.0, 1.0))
+      ->capture_default_str()
+      ->type_name("0..1");
   self.add_flag("--strict", o.strict, "Write nothing where anything of the file would be left out");
   addMemoryLimit(self, o.limits);
   self.callback([options] { convert(*options); });

@@ -8,6 +8,7 @@
 #include "InfoPoints.h"
 #include "InfoVolume.h"
 #include "Interop/FileError.h"
+#include "Interop/Mesh.h"
 #include "Interop/VdbDetails.h"
 #include "Interop/VolumeFile.h"
 #include "PointsFile.h"
@@ -196,7 +197,7 @@ VdbImport read(std::string const& file, InfoOptions const& options) {
   VdbImport content;
   {
     ProgressBar bar;
-    if (isPointsFile(file)) {
+    if (isPointsFile(file) && !isMeshFile(file)) {
       PointsInput input;
       input.file = content.file = file;
       content.points = readPointVolumes(input, bar.progress());

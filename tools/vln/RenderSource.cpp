@@ -3,6 +3,7 @@
 #include "Content.h"
 #include "Interop/FileError.h"
 #include "Interop/FileFormat.h"
+#include "Interop/Mesh.h"
 #include "Interop/Ply.h"
 #include "Interop/VdbDetails.h"
 #include "Interop/VolumeFile.h"
@@ -173,7 +174,7 @@ RenderSource renderSource(std::string const& file, std::string const& channel, V
                           Progress const& progress) {
   if (isNvttFile(file)) return fromNvtt(file, channel);
   RenderSource source;
-  if (formatOf(file) == FileFormat::kPly) {
+  if (formatOf(file) == FileFormat::kPly && !isMeshFile(file)) {
     if (!channel.empty()) throw FileError(file, "has points, and no channel '" + oneLine(channel, 60) + "'");
     if (progress) progress("reading", 0);
     auto const set = readPly(file);
