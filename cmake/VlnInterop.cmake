@@ -1,6 +1,12 @@
 # GeometryVolumeInterop: traffic with other formats. OpenVDB stays out of its interface, so a
 # program that links the shared library needs OpenVDB at run time only.
 vln_glob(sources src/Interop/*.cpp)
+# OpenVDB's and NanoVDB's converters are large templates: two minutes of a processor.
+if(VLN_WITH_CONVERTERS)
+  list(FILTER sources EXCLUDE REGEX "/ConvertersLeftOut\\.cpp$")
+else()
+  list(FILTER sources EXCLUDE REGEX "/(NvdbFile|MeshVolume)\\.cpp$")
+endif()
 if(sources)
   vln_glob(headers src/Interop/*.h)
   add_library(GeometryVolumeInterop ${sources} ${headers})

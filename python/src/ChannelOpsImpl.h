@@ -7,7 +7,7 @@
 #include "GeometryVolume/core/Numeric.h"
 #include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/sampling/VoxelSamplerLinear.h"
-#include "Interop/ElementScalarImpl.h"
+#include "Interop/ElementScalar.h"
 
 #include <algorithm>
 #include <cmath>

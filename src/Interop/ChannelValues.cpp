@@ -3,7 +3,7 @@
 #include "GeometryVolume/channels/ChannelReader.h"
 #include "GeometryVolume/core/ElementTypes.h"
 #include "GeometryVolume/core/Numeric.h"
-#include "Interop/ElementScalarImpl.h"
+#include "Interop/ElementScalar.h"
 
 #include <charconv>
 #include <cmath>

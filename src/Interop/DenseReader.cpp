@@ -3,7 +3,7 @@
 #include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/tiletree/Container.h"
 #include "Interop/DenseReaderImpl.h"
-#include "Interop/ElementScalarImpl.h"
+#include "Interop/ElementScalar.h"
 #include "Interop/FileError.h"
 
 #include <algorithm>

@@ -1,4 +1,4 @@
-#include "Interop/ElementScalarImpl.h"
+#include "Interop/ElementScalar.h"
 #include "Interop/OutputFile.h"
 #include "Interop/Ply.h"
 

@@ -9,7 +9,7 @@
 #include "GeometryVolume/tiletree/Container.h"
 #include "Interop/ChannelValues.h"
 #include "Interop/ColorMap.h"
-#include "Interop/ElementScalarImpl.h"
+#include "Interop/ElementScalar.h"
 #include "Interop/VdbDetails.h"
 
 #include <algorithm>
