@@ -40,7 +40,7 @@ template <class Body> void withAnyElementType(std::string const& name, Body&& bo
 void addColumns(PointAttribute const& attribute, std::string& header, std::vector<Column>& columns) {
   withAnyElementType(attribute.type, [&]<class T>() {
     using S = typename ScalarOf<T>::type;
-    constexpr std::size_t kParts = sizeof(T) / sizeof(S);
+    constexpr auto kParts = static_cast<std::size_t>(kComponentsOf<T>);
     for (std::size_t n = 0; n < kParts; ++n) {
       static constexpr char const* kAxes[] = {"_x", "_y", "_z", "_w"};
       std::string const part = kParts == 1 ? "" : kParts <= 4 ? kAxes[n] : "_" + std::to_string(n);
