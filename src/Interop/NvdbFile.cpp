@@ -9,8 +9,8 @@
 // is met twice, and nothing that is read lies elsewhere.
 #include "Interop/NvdbFile.h"
 
-#include "Interop/ChildProbeImpl.h"
 #include "Interop/FileError.h"
+#include "Interop/GuardedReadImpl.h"
 #include "Interop/OutputFile.h"
 #include "Interop/VdbImportImpl.h"
 
@@ -327,14 +327,9 @@ bool isNvdbFile(std::string const& path) {
 
 VdbImport importNvdb(std::string const& path, VdbReadLimits const& asked, Progress const& progress) {
   if (progress) progress("reading", 0);
-  auto const limits = probeInChild(path, asked, regularFileSize(path),
-                                   [&] { return std::make_shared<VdbFile>(NvdbReader(path).run()); });
-  VdbFile file;
-  try {
-    file = NvdbReader(path).run();
-  } catch (...) { throw FileError(path, readFailure(limits.memoryBytes)); }
-  file.memoryBytes = limits.memoryBytes;
-  return importGrids(file, limits, progress);
+  openvdb::initialize();
+  VdbFile file = readGuarded(path, asked, regularFileSize(path), [&] { return NvdbReader(path).run(); });
+  return importGrids(file, asked, progress);
 }
 
 void exportNvdb(VdbImport const& content, std::string const& path, Progress const& progress) {

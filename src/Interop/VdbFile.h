@@ -1,6 +1,6 @@
 // Safe reading of .vdb files. No type of OpenVDB shows here.
 //
-//   file --> header looked at --> read whole in a child process --> read for real
+//   file --> header looked at --> read whole in a child process --> read for real, or the child goes on
 //                                 (memory and time bounded)
 //
 // OpenVDB trusts its input: a damaged file can make it ask for any amount of memory, loop, or crash. The
@@ -35,6 +35,14 @@ struct SkippedGrid {
 /// kind, truncated, damaged, or over a limit.
 /// @threads No other thread may be calling OpenVDB meanwhile: its locks would stay taken in the child.
 VLN_API void probeVdbFile(std::string const& path, VdbReadLimits const& limits = {});
+
+/// Makes this process read its first file once only, if it has no further threads by then: the child that
+/// reads it within the limits goes on as the program, and this process waits for it and ends as it does. For
+/// programs that do one thing and end: call it first, and endProgram() last.
+VLN_API void goOnInReader();
+/// Ends the program, in a child that has gone on without the destructors of libraries' globals: they may wait
+/// for threads that are not there.
+[[noreturn]] VLN_API void endProgram(int code);
 
 /// Version of the OpenVDB library in use, such as "10.0.1".
 VLN_API char const* openvdbVersion();

@@ -108,10 +108,9 @@ int finish() {
   return error == 0 ? 0 : fail("standard output cannot be written");
 }
 
-} // namespace
-
-int main(int argc, char** argv) {
+int run(int argc, char** argv) {
   prepareSignals();
+  VLN::Interop::goOnInReader();
   Vln::ForeignLines const foreign;
 
   CLI::App app("Looks at sparse volumes: what a file holds, and what it looks like.", "vln");
@@ -134,3 +133,7 @@ int main(int argc, char** argv) {
     return fail("out of memory");
   } catch (std::exception const& error) { return fail(error.what()); }
 }
+
+} // namespace
+
+int main(int argc, char** argv) { VLN::Interop::endProgram(run(argc, argv)); }

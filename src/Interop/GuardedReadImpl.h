@@ -1,10 +1,9 @@
 // What readers of files that must not be trusted share: a first reading in a child process with bounds.
 #pragma once
 
-#include "Interop/VdbFile.h"
+#include "Interop/VdbFileImpl.h"
 
 #include <functional>
-#include <memory>
 
 namespace VLN::Interop {
 
@@ -12,16 +11,18 @@ namespace VLN::Interop {
 /// @error FileError for what is missing, empty, or no regular file.
 std::uint64_t regularFileSize(std::string const& path);
 
-/// Reads a file, and returns what was read, whatever it is, so that its memory is counted.
-using ReadInChild = std::function<std::shared_ptr<void>()>;
+/// Reads all of a file.
+using ReadGrids = std::function<VdbFile()>;
 
-/// Runs `read` in a child process whose memory and processor time are bounded.
+/// Runs `read` in a child process whose memory and processor time are bounded, and drops what it read.
 /// @return The limits in force.
 /// @error FileError for whatever `read` throws, for a crash, and over a limit.
 VdbReadLimits probeInChild(std::string const& path, VdbReadLimits const& asked, std::uint64_t fileSize,
-                           ReadInChild const& read);
+                           ReadGrids const& read);
 
-/// Why a reading failed, for a FileError; called inside a catch block.
-std::string readFailure(std::uint64_t memoryBytes);
+/// The same, and then what it read: a second time, or, with goOnInReader(), out of the child as which the
+/// program goes on.
+VdbFile readGuarded(std::string const& path, VdbReadLimits const& asked, std::uint64_t fileSize,
+                    ReadGrids const& read);
 
 } // namespace VLN::Interop

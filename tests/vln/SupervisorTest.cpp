@@ -1,0 +1,112 @@
+// The program goes on as the process that read its file, and the one that was started waits for it.
+#include "support/VlnProgram.h"
+
+#include <algorithm>
+#include <csignal>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+
+namespace VLN::Test {
+namespace {
+
+/// The children of a process.
+std::vector<pid_t> childrenOf(pid_t process) {
+  std::string const id = std::to_string(process);
+  std::ifstream in("/proc/" + id + "/task/" + id + "/children");
+  return {std::istream_iterator<pid_t>(in), {}};
+}
+
+bool isThere(pid_t process) {
+  std::ifstream in("/proc/" + std::to_string(process) + "/stat");
+  std::string id, name, state;
+  return (in >> id >> name >> state) && state != "Z";
+}
+
+class SupervisorTest : public testing::Test {
+protected:
+  SupervisorTest() { EXPECT_EQ(vln({"make", "cloud", m_cloud, "--voxels", "1000000"}).code, 0); }
+
+  pid_t start() {
+    pid_t const process = fork();
+    if (process == 0) {
+      int const null = open("/dev/null", O_RDWR);
+      for (int n = 0; n < 3; ++n) dup2(null, n);
+      execl(VLN_PROGRAM, VLN_PROGRAM, "convert", m_cloud.c_str(), m_output.c_str(), nullptr);
+      _exit(127);
+    }
+    return process;
+  }
+  std::size_t fileCount() const {
+    return static_cast<std::size_t>(std::distance(std::filesystem::directory_iterator(m_folder / ""),
+                                                  std::filesystem::directory_iterator()));
+  }
+
+  TempFolder m_folder;
+  std::string const m_cloud = m_folder / "cloud.vdb", m_output = m_folder / "out.vdb";
+};
+
+// requirement: a signal to the process that was started ends the one that works too, by the same signal, and
+// leaves no part of a file, whenever it comes
+TEST_F(SupervisorTest, SignalsReachWhoeverWorks) {
+  int ended = 0;
+  for (int delay : {5, 20, 60, 120, 180, 240, 300}) {
+    for (int number : {SIGTERM, SIGINT, SIGHUP}) {
+      std::filesystem::remove(m_output);
+      pid_t const process = start();
+      usleep(static_cast<useconds_t>(delay) * 1000);
+      auto const children = childrenOf(process);
+      EXPECT_LE(children.size(), 1u);
+      kill(process, number);
+      int status = 0;
+      ASSERT_EQ(waitpid(process, &status, 0), process);
+      for (int n = 0; n < 200 && !children.empty() && isThere(children[0]); ++n) usleep(10000);
+      EXPECT_TRUE(children.empty() || !isThere(children[0]));
+      if (WIFSIGNALED(status)) {
+        ++ended;
+        EXPECT_EQ(WTERMSIG(status), number);
+        EXPECT_EQ(fileCount(), 1u) << "after " << delay << " ms";
+      } else {
+        EXPECT_EQ(WEXITSTATUS(status), 0); // it was done
+        EXPECT_EQ(fileCount(), 2u);
+      }
+    }
+  }
+  EXPECT_GT(ended, 3);
+}
+
+// requirement: killed without mercy, it leaves no process behind
+TEST_F(SupervisorTest, NoProcessOutlivesTheProgram) {
+  pid_t const process = start();
+  std::vector<pid_t> children;
+  for (int n = 0; n < 200 && children.empty(); ++n) {
+    usleep(2000);
+    children = childrenOf(process);
+  }
+  ASSERT_EQ(children.size(), 1u);
+  kill(process, SIGKILL);
+  int status = 0;
+  ASSERT_EQ(waitpid(process, &status, 0), process);
+  for (int n = 0; n < 300 && isThere(children[0]); ++n) usleep(10000);
+  EXPECT_FALSE(isThere(children[0]));
+}
+
+// requirement: codes and output are those of the work: several files, one of them damaged
+TEST_F(SupervisorTest, EndsAsTheWorkDoes) {
+  std::string const damaged = m_folder / "damaged.vdb";
+  std::string bytes = readAll(m_cloud);
+  std::ofstream(damaged, std::ios::binary) << bytes.substr(0, bytes.size() / 2);
+  auto const good = vln({"info", "--brief", m_cloud});
+  EXPECT_EQ(good.code, 0);
+  EXPECT_EQ(good.err, "");
+  for (auto const& files : {std::vector<std::string>{damaged, m_cloud}, {m_cloud, damaged}}) {
+    auto const run = vln({"info", "--brief", files[0], files[1]});
+    EXPECT_EQ(run.code, 1);
+    EXPECT_NE(run.out.find("cloud.vdb"), std::string::npos);
+    EXPECT_EQ(std::count(run.err.begin(), run.err.end(), '\n'), 1) << run.err;
+    EXPECT_NE(run.err.find("damaged.vdb"), std::string::npos);
+  }
+}
+
+} // namespace
+} // namespace VLN::Test
