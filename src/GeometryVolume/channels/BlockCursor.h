@@ -6,7 +6,6 @@
 
 #include <atomic>
 #include <memory>
-#include <utility>
 
 namespace VLN::TileTree3D::Internal {
 
@@ -32,10 +31,6 @@ public:
   /// @cost In the block of the last one: a test, and one load. Elsewhere two loads more.
   FinestSample find(int i, int j, int k) {
     seek(i, j, k);
-    return here(i, j, k);
-  }
-  /// @pre The last seek() was to a point of the same block.
-  FinestSample here(int i, int j, int k) const {
     std::uint32_t const x = within(i, m_corner.x), y = within(j, m_corner.y), z = within(k, m_corner.z);
     constexpr std::uint32_t w = TraitsT::kTDW, slots = TraitsT::kTW;
     // Sums of whole tile widths before the division: powers of two need one shift then.
@@ -43,37 +38,13 @@ public:
             z % w};
   }
 
-  /// Whether the point lies in the block of the last one.
-  bool holds(int i, int j, int k) const {
-    if constexpr (TraitsT::kTW == 2)
-      return static_cast<std::uint32_t>((i ^ m_corner.x) | (j ^ m_corner.y) | (k ^ m_corner.z)) < kBlockWidth;
-    else
-      return within(i, m_corner.x) < kBlockWidth && within(j, m_corner.y) < kBlockWidth &&
-             within(k, m_corner.z) < kBlockWidth;
-  }
-  void seek(int i, int j, int k) {
-    if (!holds(i, j, k)) [[unlikely]]
-      move(i, j, k);
-  }
   /// Moves to the block of a point.
-  /// @return Whether it adjoins the one before, or is the same.
-  bool move(int i, int j, int k) {
+  void seek(int i, int j, int k) {
+    if (inBlock(i, j, k)) [[likely]]
+      return;
     m_block = m_tables->block(i, j, k);
     // Out of the domain, too, the corner is less than a block away, and the block is the empty one.
-    int3 const corner = TraitsT::align(int3{i, j, k}, Tables::kBlockDepth),
-               old = std::exchange(m_corner, corner);
-    auto const near = [](int a, int b) {
-      return static_cast<std::uint32_t>(a) - static_cast<std::uint32_t>(b) + kBlockWidth <= 2 * kBlockWidth;
-    };
-    return near(corner.x, old.x) && near(corner.y, old.y) && near(corner.z, old.z);
-  }
-  /// Asks for the elements of the block's tiles, as far as they are few.
-  void prefetchElements(std::size_t bytesOfTile) const {
-    constexpr std::size_t kLine = 64, kFew = 512;
-    if (bytesOfTile > kFew) return;
-    for (void const* tile : m_block->tiles)
-      for (std::size_t at = 0; tile && at < bytesOfTile; at += kLine)
-        __builtin_prefetch(static_cast<char const*>(tile) + at);
+    m_corner = TraitsT::align(int3{i, j, k}, Tables::kBlockDepth);
   }
   void prefetch() const { __builtin_prefetch(m_block); }
 
@@ -87,6 +58,14 @@ private:
     else
       return static_cast<std::uint32_t>(c) - static_cast<std::uint32_t>(corner);
   }
+  bool inBlock(int i, int j, int k) const {
+    if constexpr (TraitsT::kTW == 2)
+      return static_cast<std::uint32_t>((i ^ m_corner.x) | (j ^ m_corner.y) | (k ^ m_corner.z)) < kBlockWidth;
+    else
+      return within(i, m_corner.x) < kBlockWidth && within(j, m_corner.y) < kBlockWidth &&
+             within(k, m_corner.z) < kBlockWidth;
+  }
+
   Tables const* m_tables = nullptr;
   typename Tables::Block const* m_block = nullptr;
   int3 m_corner{TraitsT::kMinTileCoord, TraitsT::kMinTileCoord, TraitsT::kMinTileCoord};

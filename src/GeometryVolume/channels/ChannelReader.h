@@ -36,9 +36,7 @@ public:
   /// @cost In the block of the read before: one test, and two loads. In another with a tile of the deepest
   /// depth: one load more. Elsewhere a lookup in the tree.
   value_type const& value(int i, int j, int k) const {
-    if (!m_blocks.holds(i, j, k)) [[unlikely]]
-      setBlock(i, j, k);
-    Internal::FinestSample const at = m_blocks.here(i, j, k);
+    Internal::FinestSample const at = m_blocks.find(i, j, k);
     if (!at.elements) [[unlikely]]
       return coarse(i, j, k);
     constexpr std::size_t w = ChannelT::ConstTile::kWidth;
@@ -52,11 +50,6 @@ public:
 private:
   static constexpr std::size_t kFirst = ChannelT::ConstTile::index(0, 0, 0);
 
-  /// Apart, so that value() stays small.
-  [[gnu::noinline]] void setBlock(int i, int j, int k) const {
-    // Whoever goes on to the next block reads more of it, as a rule.
-    if (m_blocks.move(i, j, k)) m_blocks.prefetchElements(sizeof(value_type) * std::size_t(ChannelT::kSize));
-  }
   /// Null for a tile that the channel lacks, or that has fewer elements than a whole one.
   static value_type const* elements(ChannelT const& channel, TreeIndex const& at) {
     if (!channel.tileArrays() || at.depth < channel.minDepth() || at.depth > channel.depth()) return nullptr;
