@@ -399,7 +399,7 @@ std::uint64_t regularFileSize(std::string const& path) {
 
 VdbReadLimits probeInChild(std::string const& path, VdbReadLimits const& asked, std::uint64_t fileSize,
                            ReadGrids const& read) {
-  VdbReadLimits const limits = effective(asked, fileSize);
+  VdbReadLimits limits = effective(asked, fileSize);
   readInSomeChild(path, read, limits, nullptr);
   return limits;
 }

@@ -5,8 +5,8 @@
 
 namespace VLN::Interop {
 
-/// Whether goOnInReader() was called, and this process has no threads but those that it had then: others would
-/// not exist in a child.
+/// Whether goOnInReader() was called, and this process has no threads but those that it had then: others
+/// would not exist in a child.
 bool mayGoOn();
 /// Tells that this process is the child, which goes on once only.
 void goneOn();

@@ -60,8 +60,9 @@ void declareCommands(CLI::App& program) {
       self->group("");
       continue;
     }
-    self->footer((note.empty() ? "" : note + "\n\n") + "Example:\n  " + example);
-    examples += "  " + example + "\n";
+    std::string footer = note.empty() ? "" : note + "\n\n";
+    self->footer(footer.append("Example:\n  ").append(example));
+    examples.append("  ").append(example).append("\n");
   }
   program.footer(examples + "\n'vln COMMAND --help' tells the options of a command.");
 }
