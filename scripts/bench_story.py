@@ -14,7 +14,9 @@ import re
 import statistics
 import sys
 
-TO_NS = {"ns": 1, "us": 1e3, "ms": 1e6, "s": 1e9}
+from bench_table import TO_NS
+from bench_table import time as shown
+
 GRIDS = ["bunny_ls_512_half", "smoke", "sphere_200"]
 
 
@@ -96,13 +98,6 @@ def read(paths):
             field = "real_time" if name.endswith(("real_time", "manual_time")) else "cpu_time"
             times.setdefault((binary, name), []).append(run[field] * TO_NS[run["time_unit"]])
     return times
-
-
-def shown(nanoseconds):
-    for unit, scale in (("s", 1e9), ("ms", 1e6), ("us", 1e3)):
-        if nanoseconds >= scale:
-            return f"{nanoseconds / scale:.3g} {unit}"
-    return f"{nanoseconds:.3g} ns"
 
 
 def spread(values):

@@ -22,7 +22,6 @@
 #include <sys/prctl.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
-#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -384,18 +383,6 @@ bool readInSomeChild(std::string const& path, ReadGrids const& read, VdbReadLimi
 }
 
 } // namespace
-
-std::uint64_t regularFileSize(std::string const& path) {
-  struct stat info;
-  if (stat(path.c_str(), &info) != 0) throw FileError(path, std::strerror(errno));
-  if (S_ISDIR(info.st_mode)) throw FileError(path, "is a directory");
-  // A pipe or a device might never end, and cannot be read twice.
-  if (!S_ISREG(info.st_mode)) throw FileError(path, "is not a regular file");
-  if (std::ifstream in(path, std::ios::binary); !in)
-    throw FileError(path, std::string("cannot be opened: ") + std::strerror(errno));
-  if (info.st_size == 0) throw FileError(path, "is empty");
-  return static_cast<std::uint64_t>(info.st_size);
-}
 
 VdbReadLimits probeInChild(std::string const& path, VdbReadLimits const& asked, std::uint64_t fileSize,
                            ReadGrids const& read) {

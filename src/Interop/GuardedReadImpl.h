@@ -7,10 +7,6 @@
 
 namespace VLN::Interop {
 
-/// The size of a file that can be read twice.
-/// @error FileError for what is missing, empty, or no regular file.
-std::uint64_t regularFileSize(std::string const& path);
-
 /// Reads all of a file.
 using ReadGrids = std::function<VdbFile()>;
 

@@ -2,14 +2,13 @@
 #include "Interop/FileFormat.h"
 #include "Interop/Mesh.h"
 #include "Interop/PlyMeshImpl.h"
+#include "Interop/RegularFileImpl.h"
 
 #include <algorithm>
 #include <charconv>
 #include <cmath>
 #include <cstring>
 #include <fstream>
-
-#include <sys/stat.h>
 
 namespace VLN::Interop {
 
@@ -121,15 +120,7 @@ void parseStl(std::string const& path, std::string const& bytes, Mesh& mesh) {
 }
 
 std::string contentOf(std::string const& path) {
-  struct stat info;
-  if (stat(path.c_str(), &info) != 0) throw FileError(path, std::strerror(errno));
-  if (S_ISDIR(info.st_mode)) throw FileError(path, "is a directory");
-  if (!S_ISREG(info.st_mode)) throw FileError(path, "is not a regular file");
-  std::ifstream in(path, std::ios::binary);
-  if (!in) throw FileError(path, std::string("cannot be opened: ") + std::strerror(errno));
-  std::string content(static_cast<std::size_t>(info.st_size), '\0');
-  in.read(content.data(), static_cast<std::streamsize>(content.size()));
-  content.resize(static_cast<std::size_t>(in.gcount()));
+  std::string content = regularFileContent(path);
   if (content.empty()) throw FileError(path, "is empty");
   return content;
 }

@@ -12,6 +12,7 @@
 #include "Interop/FileError.h"
 #include "Interop/GuardedReadImpl.h"
 #include "Interop/OutputFile.h"
+#include "Interop/RegularFileImpl.h"
 #include "Interop/VdbImportImpl.h"
 
 #define NANOVDB_USE_TBB

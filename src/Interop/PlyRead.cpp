@@ -1,11 +1,11 @@
 #include "Interop/FileError.h"
 #include "Interop/Ply.h"
 #include "Interop/PlyMeshImpl.h"
+#include "Interop/RegularFileImpl.h"
 
 #include <algorithm>
 #include <array>
 #include <bit>
-#include <cerrno>
 #include <charconv>
 #include <cmath>
 #include <cstring>
@@ -14,8 +14,6 @@
 #include <limits>
 #include <set>
 #include <sstream>
-
-#include <sys/stat.h>
 
 namespace VLN::Interop {
 
@@ -509,15 +507,7 @@ void parsePlyMesh(std::string const& path, char const* data, std::size_t size, M
 }
 
 PointSet readPly(std::string const& path, PlyOptions const& options) {
-  struct stat info;
-  if (stat(path.c_str(), &info) != 0) throw FileError(path, std::strerror(errno));
-  if (S_ISDIR(info.st_mode)) throw FileError(path, "is a directory");
-  if (!S_ISREG(info.st_mode)) throw FileError(path, "is not a regular file");
-  std::ifstream in(path, std::ios::binary);
-  if (!in) throw FileError(path, std::string("cannot be opened: ") + std::strerror(errno));
-  std::string content(static_cast<std::size_t>(info.st_size), '\0');
-  in.read(content.data(), static_cast<std::streamsize>(content.size()));
-  content.resize(static_cast<std::size_t>(in.gcount()));
+  std::string const content = regularFileContent(path);
   return parsePly(path, content.data(), content.size(), options);
 }
 

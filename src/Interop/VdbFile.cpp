@@ -2,6 +2,7 @@
 
 #include "Interop/FileError.h"
 #include "Interop/GuardedReadImpl.h"
+#include "Interop/RegularFileImpl.h"
 #include "Interop/VdbFileImpl.h"
 
 #include <openvdb/io/Archive.h>
