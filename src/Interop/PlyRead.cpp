@@ -308,8 +308,9 @@ private:
   void skipList(Property const& property) {
     double const count = read(property.countType).number();
     if (!(count >= 0 && count == std::floor(count))) fail("has a list of a bad length");
+    if (count > double(left())) failTruncated();
     if (m_format == Format::kText) {
-      for (double n = 0; n < count; ++n) read(property.type);
+      for (auto rest = static_cast<std::size_t>(count); rest > 0; --rest) read(property.type);
       return;
     }
     if (count * double(sizeOf(property.type)) > double(left())) failTruncated();
@@ -413,7 +414,7 @@ private:
     if (!(count >= 3 && count == std::floor(count))) fail("has a face of fewer than three vertices");
     if (count > double(left())) failTruncated();
     face.clear();
-    for (double n = 0; n < count; ++n) {
+    for (auto rest = static_cast<std::size_t>(count); rest > 0; --rest) {
       double const vertex = read(property.type).number();
       if (!(vertex >= 0 && vertex < double(m_world.size()) && vertex == std::floor(vertex)))
         fail("has a face of a vertex that is not there");
