@@ -1,6 +1,7 @@
 // Step 3, sample: values and gradients between the samples, in world space.
 #include "GeometryVolume/volume/ForEach.h"
 
+#include <algorithm>
 #include <cmath>
 #include <iostream>
 

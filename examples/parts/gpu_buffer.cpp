@@ -4,6 +4,7 @@
 #include "Reader/NanoVTTReader.h"
 #include "Reader/NanoVTTValidate.h"
 
+#include <algorithm>
 #include <cmath>
 #include <iostream>
 

@@ -4,6 +4,7 @@
 #include "GeometryVolume/sampling/VoxelSamplerLinear.h"
 #include "GeometryVolume/topology/Command.h"
 
+#include <algorithm>
 #include <cmath>
 #include <iostream>
 

@@ -8,6 +8,7 @@
 #include "Interop/FileError.h"
 #include "Reader/NanoVTTReader.h"
 
+#include <algorithm>
 #include <chrono>
 #include <cmath>
 #include <stdexcept>

@@ -6,7 +6,8 @@
 // A use count of 1 means that the holder is the only owner and may write in place.
 #pragma once
 
-#include <atomic>
+#include "Ostil/Atomic.h"
+
 #include <cassert>
 #include <cstddef>
 #include <cstdint>
@@ -25,10 +26,10 @@ public:
   /// Frees the object and this block.
   virtual void destroy() = 0;
 
-  std::int64_t useCount() const { return m_useCount.load(std::memory_order_acquire); }
-  void retain() { m_useCount.fetch_add(1, std::memory_order_relaxed); }
+  std::int64_t useCount() const { return m_useCount.loadAcquire(); }
+  void retain() { m_useCount.addRelaxed(1); }
   void release() {
-    if (m_useCount.fetch_sub(1, std::memory_order_acq_rel) == 1) destroy();
+    if (m_useCount.addAcquireRelease(-1) == 1) destroy();
   }
 
 protected:
@@ -38,7 +39,7 @@ protected:
   ~ControlBlock() = default;
 
 private:
-  std::atomic<std::int64_t> m_useCount{1};
+  Atomic<std::int64_t> m_useCount{1};
 };
 
 namespace Internal {

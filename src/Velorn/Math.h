@@ -1,7 +1,8 @@
 // Vectors, matrices and boxes of the host's math library: plain records of one scalar type.
 #pragma once
 
-#include <limits>
+#include <cfloat>
+#include <climits>
 #include <type_traits>
 
 namespace Velorn::Math {
@@ -53,7 +54,10 @@ using float4x4 = Matrix<float, 4, 4>;
 /// Axis-aligned box by its two corners. A default box is empty and grows by what it is given.
 /// The empty box runs from the largest scalar to minus the largest scalar on each axis.
 template <class V, class S = typename V::Scalar> struct bbox {
-  static constexpr S kLargest = std::numeric_limits<S>::max();
+  static_assert(std::is_same_v<S, int> || std::is_same_v<S, float> || std::is_same_v<S, double>);
+  static constexpr S kLargest = std::is_same_v<S, int>     ? S(INT_MAX)
+                                : std::is_same_v<S, float> ? S(FLT_MAX)
+                                                           : S(DBL_MAX);
   V min{kLargest, kLargest, kLargest};
   V max{-kLargest, -kLargest, -kLargest};
 

@@ -47,9 +47,9 @@ protected:
   Accounting() {
     s_held.clear();
     s_dump = false;
-    VLN::Internal::g_loggerHooks.store(&kHooks);
+    VLN::Internal::g_loggerHooks.storeRelease(&kHooks);
   }
-  ~Accounting() override { VLN::Internal::g_loggerHooks.store(nullptr); }
+  ~Accounting() override { VLN::Internal::g_loggerHooks.storeRelease(nullptr); }
 
   static inline std::map<Base const*, void const*> s_held;
   static inline int s_reallocated = 0;
@@ -129,7 +129,7 @@ TEST_F(Accounting, RequirementDumpTellsOfSharedData) {
 }
 
 TEST_F(Accounting, BoundaryCopyIntoAnEmptyTargetWithoutLoggingIsSilent) {
-  VLN::Internal::g_loggerHooks.store(nullptr);
+  VLN::Internal::g_loggerHooks.storeRelease(nullptr);
   C const a;
   Ostil::Ptr<VLN::Component> copy;
   testing::internal::CaptureStdout();

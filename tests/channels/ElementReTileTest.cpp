@@ -2,6 +2,7 @@
 #include "support/PointCloud.h"
 #include "support/Shapes.h"
 
+#include "GeometryVolume/core/Parallel.h"
 #include <limits>
 
 using namespace Support;

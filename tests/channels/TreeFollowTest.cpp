@@ -4,6 +4,7 @@
 #include "support/PointCloud.h"
 #include "support/Shapes.h"
 
+#include "GeometryVolume/core/Parallel.h"
 #include <numeric>
 
 using namespace Support;

@@ -154,7 +154,7 @@ TEST(Base, RegistersWithTheLoggerWhileOneIsInstalled) {
   EXPECT_FALSE(VLN::loggerDumpInProgress());
   VLN::pointerAllocated(nullptr, nullptr);
   g_registered.clear();
-  VLN::Internal::g_loggerHooks = &hooks;
+  VLN::Internal::g_loggerHooks.storeRelease(&hooks);
   VLN::Base const *first = nullptr, *second = nullptr, *third = nullptr;
   {
     OpenBase a("a");
@@ -168,7 +168,7 @@ TEST(Base, RegistersWithTheLoggerWhileOneIsInstalled) {
     EXPECT_TRUE(VLN::loggingEnabled());
     EXPECT_TRUE(VLN::loggerDumpInProgress());
   }
-  VLN::Internal::g_loggerHooks = nullptr;
+  VLN::Internal::g_loggerHooks.storeRelease(nullptr);
   using Events = decltype(g_registered);
   EXPECT_EQ(g_registered, (Events{{'+', first},
                                   {'+', second},

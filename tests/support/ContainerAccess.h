@@ -1,7 +1,7 @@
 // Opens the protected operations of Container and Tile to tests.
 #pragma once
 
-#include "GeometryVolume/tiletree/Container.h"
+#include "GeometryVolume/tiletree/ContainerDataImpl.h"
 
 namespace VLN::TileTree3D {
 

@@ -9,6 +9,7 @@
 #include "GeometryVolume/tiletree/TileAccessor.h"
 #include "GeometryVolume/topology/Command.h"
 
+#include <algorithm>
 #include <cmath>
 #include <random>
 #include <sstream>

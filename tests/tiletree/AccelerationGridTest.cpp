@@ -177,19 +177,19 @@ TYPED_TEST(AccelerationGrid, FarSearchesMakeTheTableOfPlaces) {
   auto const& data = Access::data(tree);
   for (int round = 0; round < 3; ++round) {
     auto const plain = tree; // a copy of its own, which nobody searches
-    ASSERT_EQ(data.m_lookup.load(), nullptr);
+    ASSERT_EQ(data.m_lookup.loadAcquire(), nullptr);
     auto const cursor = std::as_const(tree).tileAccessor();
     int searches = 0;
-    for (; searches < 200000 && !data.m_lookup.load(); ++searches) {
+    for (; searches < 200000 && !data.m_lookup.loadAcquire(); ++searches) {
       int3 const p = point();
       ASSERT_EQ(cursor.treeIndex(p.x, p.y, p.z, T::kMaxDepth, false),
                 Access::tileIndex(plain, p, T::kMaxDepth));
     }
     EXPECT_GT(searches, 10000) << "not for a few searches";
-    ASSERT_NE(data.m_lookup.load(), nullptr);
+    ASSERT_NE(data.m_lookup.loadAcquire(), nullptr);
     EXPECT_EQ(data.m_gridDepth, -1);
     auto const copy = tree;
-    EXPECT_EQ(Access::data(copy).m_lookup.load(), data.m_lookup.load()) << "copies share it";
+    EXPECT_EQ(Access::data(copy).m_lookup.loadAcquire(), data.m_lookup.loadAcquire()) << "copies share it";
     for (int n = 0; n < 4000; ++n) {
       int3 const p = point();
       int const d = forest.pick(d0 - 2, T::kMaxDepth + 1);
@@ -209,9 +209,9 @@ TYPED_TEST(AccelerationGrid, FarSearchesMakeTheTableOfPlaces) {
     default:
       tree.sortIntoMortonOrder();
     }
-    EXPECT_NE(Access::data(copy).m_lookup.load(), nullptr) << "what a copy has stays";
+    EXPECT_NE(Access::data(copy).m_lookup.loadAcquire(), nullptr) << "what a copy has stays";
   }
-  EXPECT_EQ(data.m_lookup.load(), nullptr);
+  EXPECT_EQ(data.m_lookup.loadAcquire(), nullptr);
 }
 
 // requirement: whoever searches meanwhile, on any thread, gets the same answers
@@ -240,7 +240,7 @@ TYPED_TEST(AccelerationGrid, ThreadsSearchWhileTheTableOfPlacesIsMade) {
     });
   for (auto& thread : threads) thread.join();
   EXPECT_EQ(wrong, 0);
-  EXPECT_NE(Access::data(tree).m_lookup.load(), nullptr);
+  EXPECT_NE(Access::data(tree).m_lookup.loadAcquire(), nullptr);
 }
 
 // regression: a cell of the grid without a tile of its depth may still hold a deeper root

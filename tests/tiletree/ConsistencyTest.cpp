@@ -4,6 +4,7 @@
 #include "support/Print.h"
 #include "support/Shapes.h"
 
+#include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/core/Streaming.h"
 
 #include <gmock/gmock.h>

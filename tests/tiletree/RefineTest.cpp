@@ -1,5 +1,6 @@
 // Refinement of a tree by others, and bulk addition.
 #include "GeometryVolume/core/Canceller.h"
+#include "GeometryVolume/core/Parallel.h"
 #include "Ostil/Job.h"
 #include "Velorn/ExceptionMessage.h"
 #include "support/Shapes.h"

@@ -1,4 +1,5 @@
 // Removal of tiles, with and without compaction.
+#include "GeometryVolume/core/Parallel.h"
 #include "support/Shapes.h"
 #include "support/TreeModel.h"
 

@@ -2,6 +2,7 @@
 #include "support/Shapes.h"
 #include "support/TreeModel.h"
 
+#include "GeometryVolume/core/Parallel.h"
 #include <array>
 
 using namespace Support;

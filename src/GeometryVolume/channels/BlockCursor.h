@@ -1,11 +1,7 @@
-// BlockCursor: the last block of ReadTables that was read from, and tables that several readers make
-// together.
+// BlockCursor: the last block of ReadTables that was read from.
 #pragma once
 
 #include "GeometryVolume/channels/ReadTables.h"
-
-#include <atomic>
-#include <memory>
 
 namespace VLN::TileTree3D::Internal {
 
@@ -71,12 +67,7 @@ private:
   int3 m_corner{TraitsT::kMinTileCoord, TraitsT::kMinTileCoord, TraitsT::kMinTileCoord};
 };
 
-/// Made by the first of several readers of a channel for which they pay.
-template <class TraitsT> struct SharedReadTables {
-  std::atomic<ReadTables<TraitsT> const*> ready{nullptr};
-  std::atomic<std::int64_t> tileChanges{0}; ///< reads that went to another tile than the one before
-  std::atomic_flag begun{};
-  std::unique_ptr<ReadTables<TraitsT> const> tables;
-};
+/// Tables that several readers make together: see SharedReadTablesImpl.h.
+template <class TraitsT> struct SharedReadTables;
 
 } // namespace VLN::TileTree3D::Internal

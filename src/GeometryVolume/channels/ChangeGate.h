@@ -8,44 +8,25 @@
 // the change may last, and may itself wait for locks that the measuring thread holds.
 #pragma once
 
-#include <atomic>
+#include "GeometryVolume/core/Export.h"
 
 namespace VLN::TileTree3D {
 
-class ChangeGate {
+class VLN_API ChangeGate {
 public:
   ChangeGate() = default;
   /// Copies of what the gate guards have gates of their own.
   ChangeGate(ChangeGate const&) {}
   ChangeGate& operator=(ChangeGate const&) { return *this; }
 
-  void beginChange() {
-    for (int state = m_state.load(std::memory_order_relaxed);;) {
-      if (state < 0) {
-        m_state.wait(state, std::memory_order_relaxed);
-        state = m_state.load(std::memory_order_relaxed);
-      } else if (m_state.compare_exchange_weak(state, state + 1, std::memory_order_acquire,
-                                               std::memory_order_relaxed)) {
-        return;
-      }
-    }
-  }
-  void endChange() { m_state.fetch_sub(1, std::memory_order_release); }
+  void beginChange();
+  void endChange();
 
   /// Keeps changes out while it lives, when it is true.
-  class Measurement {
+  class VLN_API Measurement {
   public:
-    explicit Measurement(ChangeGate& gate)
-        : m_gate(gate) {
-      int atRest = 0;
-      m_open = m_gate.m_state.compare_exchange_strong(atRest, -1, std::memory_order_acquire,
-                                                      std::memory_order_relaxed);
-    }
-    ~Measurement() {
-      if (!m_open) return;
-      m_gate.m_state.store(0, std::memory_order_release);
-      m_gate.m_state.notify_all();
-    }
+    explicit Measurement(ChangeGate& gate);
+    ~Measurement();
     Measurement(Measurement const&) = delete;
     Measurement& operator=(Measurement const&) = delete;
     explicit operator bool() const { return m_open; }
@@ -56,7 +37,7 @@ public:
   };
 
 private:
-  std::atomic<int> m_state{0};
+  alignas(int) int m_state = 0; ///< read and written as an atomic
 };
 
 } // namespace VLN::TileTree3D

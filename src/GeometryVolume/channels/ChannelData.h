@@ -11,20 +11,19 @@
 #include "GeometryVolume/channels/ChannelPlan.h"
 #include "GeometryVolume/channels/ChannelTypes.h"
 #include "GeometryVolume/core/Export.h"
+#include "GeometryVolume/core/FixedArray.h"
 #include "GeometryVolume/core/FunctionRef.h"
 #include "GeometryVolume/pools/TileDataAllocator.h"
 #include "Ostil/Array.h"
 #include "Ostil/Ptr.h"
 
-#include <algorithm>
-#include <array>
 #include <cstdint>
 #include <vector>
 
 namespace VLN::TileTree3D {
 
 /// Element vectors by depth and tile. Both tree shapes have 29 depths here.
-template <class T> using TileArrays = std::array<std::vector<TileVector<T>>, kChannelDepths>;
+template <class T> using TileArrays = PerDepth<std::vector<TileVector<T>>, kChannelDepths>;
 
 template <class T> class TileStorage : public TileArrays<T> {
 public:
@@ -85,13 +84,12 @@ public:
   int elementCount(TreeIndex const& tile) const { return static_cast<int>(vector(tile).size()); }
   std::int64_t treeIndexToIndex(TreeIndex const& tile) const {
     std::int64_t flat = tile.index;
-    for (int d = 0; d < tile.depth; ++d) flat += m_tileCounts[static_cast<std::size_t>(d)];
+    for (int d = 0; d < tile.depth; ++d) flat += m_tileCounts[d];
     return flat;
   }
   TreeIndex indexToTreeIndex(std::int64_t flat) const {
     int d = 0;
-    for (; d < kChannelDepths - 1 && flat >= m_tileCounts[static_cast<std::size_t>(d)]; ++d)
-      flat -= m_tileCounts[static_cast<std::size_t>(d)];
+    for (; d < kChannelDepths - 1 && flat >= m_tileCounts[d]; ++d) flat -= m_tileCounts[d];
     return {flat, d};
   }
 
@@ -99,7 +97,7 @@ public:
   TileArrays<T>* dataPtr() const { return m_data.get(); }
   Ostil::Ptr<TileStorage<T>> const& storage() const { return m_data; }
   Vector& vector(TreeIndex const& tile) const {
-    return (*m_data)[static_cast<std::size_t>(tile.depth)][static_cast<std::size_t>(tile.index)];
+    return (*m_data)[tile.depth][static_cast<std::size_t>(tile.index)];
   }
   bool storageIsShared() const { return m_data && !m_data.unique(); }
 
@@ -165,11 +163,11 @@ private:
   /// Gives the values for a tile of new storage.
   using TileValues = FunctionRef<T const*(int depth, std::int64_t tile)>;
 
-  int firstDepth() const { return std::max(0, m_minDepth); }
-  int lastDepth() const { return std::min(kChannelDepths - 1, m_depth); }
-  std::int64_t& count(int d) { return m_tileCounts[static_cast<std::size_t>(d)]; }
-  std::int64_t count(int d) const { return m_tileCounts[static_cast<std::size_t>(d)]; }
-  std::vector<Vector>& depthTiles(int d) const { return (*m_data)[static_cast<std::size_t>(d)]; }
+  int firstDepth() const { return m_minDepth > 0 ? m_minDepth : 0; }
+  int lastDepth() const { return m_depth < kChannelDepths ? m_depth : kChannelDepths - 1; }
+  std::int64_t& count(int d) { return m_tileCounts[d]; }
+  std::int64_t count(int d) const { return m_tileCounts[d]; }
+  std::vector<Vector>& depthTiles(int d) const { return (*m_data)[d]; }
   std::int64_t slotElements(std::size_t size) const;
   std::size_t tileBytes() const { return static_cast<std::size_t>(m_layout.size) * sizeof(T); }
   void sumCounts();

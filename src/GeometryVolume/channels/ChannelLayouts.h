@@ -6,7 +6,7 @@
 
 #include "GeometryVolume/tiletree/Traits.h"
 
-#include <algorithm>
+#include <initializer_list>
 
 /// Expands X(extended, halo, more...) for each layout that commands make, pools hold, and coarse values fill.
 #define VLN_FOR_EACH_MADE_LAYOUT(X, ...)                                                                     \
@@ -37,9 +37,12 @@ inline constexpr int kMadeLayoutCount = 0 VLN_FOR_EACH_MADE_LAYOUT(VLN_COUNT);
 #undef VLN_COUNT
 
 /// Samples along the widest tile of any layout and shape, halo included.
+inline constexpr int kLargestChannelTileWidth = [] {
+  int added = 0;
 #define VLN_ADDED_WIDTH(extended, halo) , extended + 2 * halo
-inline constexpr int kLargestChannelTileWidth =
-    std::max(PowerOfTwoTraits::kTDW, OddTraits::kTDW) + std::max({0 VLN_FOR_EACH_LAYOUT(VLN_ADDED_WIDTH)});
+  for (int const width : {0 VLN_FOR_EACH_LAYOUT(VLN_ADDED_WIDTH)}) added = width > added ? width : added;
 #undef VLN_ADDED_WIDTH
+  return added + (PowerOfTwoTraits::kTDW > OddTraits::kTDW ? PowerOfTwoTraits::kTDW : OddTraits::kTDW);
+}();
 
 } // namespace VLN::TileTree3D

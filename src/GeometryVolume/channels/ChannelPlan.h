@@ -2,11 +2,11 @@
 #pragma once
 
 #include "GeometryVolume/core/Export.h"
+#include "GeometryVolume/core/FixedArray.h"
 #include "GeometryVolume/core/FunctionRef.h"
 #include "GeometryVolume/tiletree/Traits.h"
 #include "GeometryVolume/tiletree/TreeComponent.h"
 
-#include <array>
 #include <cstddef>
 #include <cstdint>
 #include <list>
@@ -14,7 +14,7 @@
 
 namespace VLN::TileTree3D::Internal {
 
-using DepthCounts = std::array<std::int64_t, kChannelDepths>;
+using DepthCounts = PerDepth<std::int64_t, kChannelDepths>;
 
 /// Elements from one tile's slot to the next in a static block: `elements` padded to whole cache lines. Slots
 /// start on a cache line when the element size divides 64; other slots are only spaced apart.
@@ -86,7 +86,7 @@ private:
 
 /// Where tiles lie in a static block, in elements from its start.
 struct TileSlots {
-  std::array<std::vector<std::int64_t>, kChannelDepths> offsets;
+  PerDepth<std::vector<std::int64_t>, kChannelDepths> offsets;
   std::int64_t total = 0;
 
   std::int64_t at(int depth, std::int64_t tile) const {

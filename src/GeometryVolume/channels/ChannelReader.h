@@ -5,8 +5,6 @@
 #include "GeometryVolume/channels/BlockCursor.h"
 #include "GeometryVolume/channels/Channel.h"
 
-#include <memory>
-
 namespace VLN::TileTree3D {
 
 /// Remembers the last block of tiles, and finds others through tables of its own, which copies share.
@@ -22,10 +20,10 @@ public:
   using value_type = typename ChannelT::value_type;
 
   ChannelReader(Container<TraitsT> const& tree, ChannelT const& channel)
-      : m_tables(std::make_shared<Tables const>(tree,
-                                                [&](std::int64_t n) -> void const* {
-                                                  return elements(channel, {n, TraitsT::kMaxDepth});
-                                                }))
+      : m_tables(Ostil::makePtr<Tables>(tree,
+                                        [&](std::int64_t n) -> void const* {
+                                          return elements(channel, {n, TraitsT::kMaxDepth});
+                                        }))
       , m_channel(&channel)
       , m_tiles(tree.tileAccessor())
       , m_blocks(*m_tables) {}
@@ -69,7 +67,7 @@ private:
     return m_channel->defaultValue();
   }
 
-  std::shared_ptr<Tables const> m_tables;
+  Ostil::Ptr<Tables> m_tables;
   ChannelT const* m_channel;
   ConstTileAccessorOf<TraitsT> m_tiles;
   mutable Internal::BlockCursor<TraitsT> m_blocks;

@@ -7,7 +7,7 @@
 
 #include <cstddef>
 #include <cstdint>
-#include <iterator>
+#include <string> // what brings iterator tags, at no cost beside the strings of every component
 
 namespace VLN::TileTree3D {
 

@@ -13,6 +13,7 @@
 #include "GeometryVolume/channels/HaloKernels.h"
 #include "GeometryVolume/tiletree/TreeIndex.h"
 
+#include <algorithm>
 #include <array>
 
 namespace VLN::TileTree3D::Internal {

@@ -1,5 +1,6 @@
 #include "GeometryVolume/channels/ReadTables.h"
 
+#include <algorithm>
 #include <limits>
 #include <stdexcept>
 

@@ -17,7 +17,6 @@
 #include "GeometryVolume/pools/TileDataAllocator.h"
 #include "Velorn/Math.h"
 
-#include <algorithm>
 #include <cstdint>
 #include <utility>
 
@@ -162,7 +161,7 @@ public:
   /// Copies size() elements.
   /// @pre `src` holds as many.
   void set(ConstTileData<T, E, H> const& src) {
-    if (src.data() != this->vector()) std::copy_n(src.data()->data(), this->size(), elements());
+    if (src.data() != this->vector()) copyRun(src.data()->data(), this->size(), elements());
   }
   /// Takes over the elements of `src` and the state of its allocator; the tile behind `src` is then empty.
   void set(TileData&& src) {
@@ -178,7 +177,7 @@ public:
   void setHalo(ConstTileData<T, E, H> const& src) {
     if (src.data() == this->vector()) return;
     T const* const from = src.data()->data();
-    forEachHaloRun([&](int at, int count) { std::copy_n(from + at, count, elements() + at); });
+    forEachHaloRun([&](int at, int count) { copyRun(from + at, count, elements() + at); });
   }
   /// The corners and edges of the outermost shell: the elements with two coordinates or more at an end.
   void setHaloEdges(T const& value) {
@@ -223,9 +222,10 @@ public:
   /// whichever end comes first. An overlapping copy sees its own earlier writes.
   void copyRange(int i0, int i1, int j0, int j1, int k0, int k1, int di0, int di1, int dj0, int dj1, int dk0,
                  int dk1) {
-    int const ni = std::min(i1 - i0, di1 - di0);
-    int const nj = std::min(j1 - j0, dj1 - dj0);
-    int const nk = std::min(k1 - k0, dk1 - dk0);
+    auto const shorter = [](int a, int b) { return a < b ? a : b; };
+    int const ni = shorter(i1 - i0, di1 - di0);
+    int const nj = shorter(j1 - j0, dj1 - dj0);
+    int const nk = shorter(k1 - k0, dk1 - dk0);
     T* const p = elements();
     for (int k = 0; k < nk; ++k)
       for (int j = 0; j < nj; ++j) {
@@ -242,6 +242,9 @@ protected:
 private:
   T* elements() { return this->vector()->data(); }
 
+  static void copyRun(T const* from, int n, T* to) {
+    for (int i = 0; i < n; ++i) to[i] = from[i];
+  }
   static void fillRun(T* p, int n, T const& value) {
     T const v = value;
     int i = 0;

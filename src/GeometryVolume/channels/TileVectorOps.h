@@ -6,7 +6,6 @@
 
 #include "GeometryVolume/pools/TileDataAllocator.h"
 
-#include <algorithm>
 #include <cstddef>
 #include <stdexcept>
 
@@ -40,8 +39,9 @@ template <class T> void reserveVector(TileVector<T>& v, std::size_t wanted) {
 /// Makes room for `wanted` elements in all: by half the capacity, or to what is wanted.
 /// @pre `wanted` exceeds the capacity and is at most the largest size.
 template <class T> void growCapacity(TileVector<T>& v, std::size_t wanted) {
-  std::size_t const next = std::max(wanted, std::min(v.capacity() + v.capacity() / 2, v.max_size()));
-  reserveVector(v, next);
+  std::size_t next = v.capacity() + v.capacity() / 2;
+  if (next > v.max_size()) next = v.max_size();
+  reserveVector(v, next > wanted ? next : wanted);
 }
 
 /// Room for one more element.
@@ -63,7 +63,7 @@ template <class T> void resizeVector(TileVector<T>& v, std::size_t n, T value) {
 /// Room for `n` elements in all: a static vector that has none moves out of its block.
 template <class T> void growOutOfBlock(TileVector<T>& v, std::size_t n) {
   if (n > v.max_size())
-    rebuffer(v, std::max(n, v.capacity() + v.capacity() / 2));
+    rebuffer(v, n > v.capacity() + v.capacity() / 2 ? n : v.capacity() + v.capacity() / 2);
   else if (n > v.capacity())
     growCapacity(v, n);
 }

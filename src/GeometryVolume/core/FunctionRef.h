@@ -2,7 +2,6 @@
 // passed to.
 #pragma once
 
-#include <memory>
 #include <type_traits>
 #include <utility>
 
@@ -15,7 +14,7 @@ public:
   template <class F>
   requires(!std::is_same_v<std::remove_cvref_t<F>, FunctionRef> && std::is_invocable_r_v<R, F&, Args...>)
       FunctionRef(F&& f)
-      : m_object(const_cast<void*>(static_cast<void const*>(std::addressof(f))))
+      : m_object(const_cast<void*>(static_cast<void const*>(__builtin_addressof(f))))
       , m_call([](void* object, Args... args) -> R {
         return (*static_cast<std::remove_reference_t<F>*>(object))(std::forward<Args>(args)...);
       }) {}

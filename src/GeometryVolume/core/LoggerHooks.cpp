@@ -2,6 +2,6 @@
 
 namespace VLN::Internal {
 
-constinit std::atomic<LoggerHooks const*> g_loggerHooks{nullptr};
+constinit Ostil::Atomic<LoggerHooks const*> g_loggerHooks{nullptr};
 
 } // namespace VLN::Internal

@@ -4,8 +4,7 @@
 #pragma once
 
 #include "GeometryVolume/core/Export.h"
-
-#include <atomic>
+#include "Ostil/Atomic.h"
 
 namespace VLN {
 
@@ -28,11 +27,11 @@ struct LoggerHooks {
 
 namespace Internal {
 /// Null until logging is first turned on. Readers only test and call: the table is never freed.
-extern VLN_API std::atomic<LoggerHooks const*> g_loggerHooks;
+extern VLN_API Ostil::Atomic<LoggerHooks const*> g_loggerHooks;
 } // namespace Internal
 
 namespace Internal {
-inline LoggerHooks const* anyLoggerHooks() { return g_loggerHooks.load(std::memory_order_relaxed); }
+inline LoggerHooks const* anyLoggerHooks() { return g_loggerHooks.loadRelaxed(); }
 } // namespace Internal
 
 /// Null while logging is off.

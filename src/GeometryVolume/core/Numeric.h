@@ -1,14 +1,12 @@
 // Small numeric helpers that hold everywhere in the library.
 #pragma once
 
-#include <cmath>
 #include <cstdint>
-#include <limits>
 
 namespace VLN {
 
 /// Tile-space coordinate for what no int32 holds: out of every tree's domain.
-inline constexpr std::int32_t kOutOfDomain = std::numeric_limits<std::int32_t>::min();
+inline constexpr std::int32_t kOutOfDomain = INT32_MIN;
 
 /// floor(v) as int32; kOutOfDomain for NaN, infinities and values that no int32 holds.
 template <class Real> inline std::int32_t toIntFloor(Real v) {

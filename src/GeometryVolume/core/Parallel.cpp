@@ -2,6 +2,7 @@
 
 #include "GeometryVolume/core/ThreadNotesImpl.h"
 
+#include <algorithm>
 #include <array>
 #include <limits>
 #include <utility>

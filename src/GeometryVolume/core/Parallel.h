@@ -4,9 +4,8 @@
 #include "GeometryVolume/core/Export.h"
 #include "GeometryVolume/core/FunctionRef.h"
 
-#include <algorithm>
 #include <cstdint>
-#include <memory>
+#include <utility>
 #include <vector>
 
 namespace VLN {
@@ -27,7 +26,7 @@ public:
   Impl& impl() const { return *m_impl; }
 
 private:
-  std::unique_ptr<Impl> m_impl;
+  Impl* m_impl;
 };
 
 enum class Cancellation : bool { kPoll, kSuppress };

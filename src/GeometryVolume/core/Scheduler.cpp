@@ -26,8 +26,8 @@ struct AffinityPartitioner::Impl {
 };
 
 AffinityPartitioner::AffinityPartitioner()
-    : m_impl(std::make_unique<Impl>()) {}
-AffinityPartitioner::~AffinityPartitioner() = default;
+    : m_impl(new Impl) {}
+AffinityPartitioner::~AffinityPartitioner() { delete m_impl; }
 
 namespace {
 

@@ -2,6 +2,7 @@
 
 #include "GeometryVolume/core/Parallel.h"
 
+#include <algorithm>
 #include <array>
 #include <bit>
 #include <cstring>

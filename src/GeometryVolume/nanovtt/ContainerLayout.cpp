@@ -3,6 +3,7 @@
 #include "GeometryVolume/channels/Channel.h"
 
 #include <algorithm>
+#include <cmath>
 #include <stdexcept>
 
 namespace nanovtt::Internal {

@@ -2,6 +2,7 @@
 #pragma once
 
 #include "GeometryVolume/core/FunctionRef.h"
+#include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/tiletree/Container.h"
 
 #include <chrono>

@@ -369,10 +369,10 @@ constexpr LoggerHooks kOffHooks{
 
 void BaseLogger::enable() {
   state();
-  Internal::g_loggerHooks.store(&kHooks, std::memory_order_release);
+  Internal::g_loggerHooks.storeRelease(&kHooks);
 }
 void BaseLogger::disable() {
-  if (enabled()) Internal::g_loggerHooks.store(&kOffHooks, std::memory_order_release);
+  if (enabled()) Internal::g_loggerHooks.storeRelease(&kOffHooks);
 }
 bool BaseLogger::enabled() { return loggingEnabled(); }
 

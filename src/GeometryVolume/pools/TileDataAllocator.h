@@ -10,11 +10,10 @@
 #pragma once
 
 #include "GeometryVolume/pools/Jemalloc.h"
+#include "Ostil/Atomic.h"
 
-#include <atomic>
 #include <cstddef>
 #include <cstdint>
-#include <limits>
 #include <new>
 #include <type_traits>
 #include <utility>
@@ -57,7 +56,7 @@ public:
     m_static = b.m_static;
     m_construct = b.m_construct;
     m_base = b.m_base;
-    m_used.store(b.used(), std::memory_order_relaxed);
+    m_used.storeRelaxed(b.used());
     m_limit = b.m_limit;
     return *this;
   }
@@ -65,7 +64,7 @@ public:
   /// @error std::bad_alloc when the bulk allocator has no memory. A block is not checked against its limit.
   /// @threads Lock-free: threads may carve from one block at once.
   T* allocate(std::size_t n) {
-    if (m_static) return m_base + m_used.fetch_add(static_cast<std::int64_t>(n), std::memory_order_relaxed);
+    if (m_static) return m_base + m_used.addRelaxed(static_cast<std::int64_t>(n));
     void* const block = allocate_jemalloc(n, sizeof(T));
     if (!block) throw std::bad_alloc();
     return static_cast<T*>(block);
@@ -75,8 +74,7 @@ public:
   }
   /// Largest size that a vector on this allocator may reach.
   std::size_t max_size() const noexcept {
-    return m_static ? static_cast<std::size_t>(m_limit)
-                    : static_cast<std::size_t>(std::numeric_limits<std::ptrdiff_t>::max()) / sizeof(T);
+    return m_static ? static_cast<std::size_t>(m_limit) : static_cast<std::size_t>(PTRDIFF_MAX) / sizeof(T);
   }
   /// Leaves the element as the memory held it when the construct flag is clear.
   template <class... Args> void construct(T* p, Args&&... args) {
@@ -100,14 +98,14 @@ public:
   bool isStatic() const { return m_static; }
   bool constructs() const { return m_construct; }
   T* base() const { return m_base; }
-  std::int64_t used() const { return m_used.load(std::memory_order_relaxed); }
+  std::int64_t used() const { return m_used.loadRelaxed(); }
   std::int64_t limit() const { return m_limit; }
 
 private:
   bool m_static = false;
   bool m_construct = true;
   T* m_base = nullptr;
-  std::atomic<std::int64_t> m_used{0};
+  Ostil::Atomic<std::int64_t> m_used;
   std::int64_t m_limit = 0;
 };
 

@@ -14,7 +14,6 @@
 #include "GeometryVolume/tiletree/Container.h"
 #include "GeometryVolume/topology/VoxelTopology.h"
 
-#include <algorithm>
 #include <array>
 
 namespace VLN::TileTree3D {
@@ -108,7 +107,7 @@ protected:
     m_leafDepth = -1;
     if (m_found.depth < 0) return false;
     m_foundCorner = Internal::lanesOf(m_accessor.cursorCorner());
-    if (m_found.depth < std::min(depth, TraitsT::kMaxDepth)) {
+    if (m_found.depth < (depth < TraitsT::kMaxDepth ? depth : TraitsT::kMaxDepth)) {
       m_leafDepth = depth;
       m_leafCorner = Internal::lanesOf(TraitsT::align(Internal::toInt3(c), m_found.depth + 1));
       m_leafWidth = Internal::UnsignedLanes{} + static_cast<std::uint32_t>(TraitsT::width(m_found.depth + 1));

@@ -1,5 +1,7 @@
 #include "GeometryVolume/sampling/VoxelSamplerLinear.h"
 
+#include "GeometryVolume/channels/SharedReadTablesImpl.h"
+
 #include "GeometryVolume/channels/Halo.h"
 #include "GeometryVolume/channels/HaloRegions.h"
 
@@ -87,7 +89,7 @@ VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::bind(CoreChannel const* core, WideChannel
   else
     take(*wide);
   if (m_maxDepth == TraitsT::kMaxDepth) {
-    m_shared = std::make_shared<Internal::SharedReadTables<TraitsT>>();
+    m_shared = Ostil::makePtr<Internal::SharedReadTables<TraitsT>>();
     m_tablesArrays = tileArrays();
   }
   forgetTiles();

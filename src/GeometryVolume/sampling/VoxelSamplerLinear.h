@@ -17,7 +17,6 @@
 #include "GeometryVolume/tiletree/Voxel.h"
 
 #include <cstdint>
-#include <memory>
 #include <utility>
 #include <vector>
 
@@ -190,13 +189,13 @@ private:
   template <class Tile> using Cache = std::vector<CacheEntry<Tile>>;
 
   bool covers(TreeIndex const& tile) const {
-    return tile.index >= 0 && tile.depth >= std::max(m_minDepth, 0);
+    return tile.index >= 0 && tile.depth >= (m_minDepth > 0 ? m_minDepth : 0);
   }
   // The cell of a position and its corners.
   // @return false where it takes the default value.
   bool cornersAt(Position const& position, int depth, SamplerSpace space, SampleCell& cell,
                  CellCorners& corners) const {
-    depth = std::min(depth, m_maxDepth);
+    if (depth > m_maxDepth) depth = m_maxDepth;
     auto const p = this->toTileSpace(position, space);
     auto const c = Internal::floorLanesAnywhere(p);
     if (depth == TraitsT::kMaxDepth && m_blocks.isOpen() && !this->inLeafVoxel(c, depth) &&
@@ -311,7 +310,7 @@ private:
   // What leads from positions straight to samples of the deepest depth: made by the first copy of the sampler
   // for which it pays.
   static constexpr int kTileChangesTold = 64;
-  std::shared_ptr<Internal::SharedReadTables<TraitsT>> m_shared;
+  Ostil::Ptr<Internal::SharedReadTables<TraitsT>> m_shared;
   mutable Internal::BlockCursor<TraitsT> m_blocks, m_blocksBeside;
   mutable TileArrays<float> const* m_tablesArrays = nullptr; ///< of the channel when they were made
   mutable std::int64_t m_tileBefore = -1;

@@ -1,4 +1,4 @@
-#include "GeometryVolume/tiletree/Consistency.h"
+#include "GeometryVolume/tiletree/ConsistencyImpl.h"
 
 #include <iostream>
 

@@ -4,16 +4,19 @@
 #include "GeometryVolume/core/Const.h"
 #include "GeometryVolume/core/LoggerHooks.h"
 #include "GeometryVolume/core/Streaming.h"
-#include "GeometryVolume/tiletree/Consistency.h"
+#include "GeometryVolume/tiletree/ConsistencyImpl.h"
+#include "GeometryVolume/tiletree/ContainerAddImpl.h"
 #include "GeometryVolume/tiletree/ContainerBulkImpl.h"
 #include "GeometryVolume/tiletree/ContainerRefineImpl.h"
 #include "GeometryVolume/tiletree/ContainerRemoveImpl.h"
 #include "GeometryVolume/tiletree/ContainerScratchImpl.h"
 #include "GeometryVolume/tiletree/ContainerTilesImpl.h"
-#include "GeometryVolume/tiletree/DerivedCaches.h"
+#include "GeometryVolume/tiletree/DerivedCachesImpl.h"
 #include "GeometryVolume/tiletree/TileHalo.h"
-#include "GeometryVolume/tiletree/TraversalEngine.h"
+#include "GeometryVolume/tiletree/TraversalEngineImpl.h"
 
+#include <bit>
+#include <limits>
 #include <ostream>
 
 namespace VLN::TileTree3D {
@@ -57,7 +60,7 @@ Container<TraitsT>::Container(Container const& other)
 
 template <class TraitsT> Container<TraitsT>& Container<TraitsT>::operator=(Container const& other) {
   if (this == &other) return *this;
-  auto data = Ostil::makePtr<Data>(*other.m_data);
+  auto data = Ostil::makePtr<Data>(other.data());
   ObjectChange const change(this);
   Component::operator=(other);
   m_data = std::move(data);
@@ -67,14 +70,14 @@ template <class TraitsT> Container<TraitsT>& Container<TraitsT>::operator=(Conta
 template <class TraitsT> Container<TraitsT>::~Container() { objectIncomplete(this); }
 
 template <class TraitsT> void Container<TraitsT>::cloneData() {
-  if (!m_data.unique()) m_data = Ostil::makePtr<Data>(*m_data);
+  if (!m_data.unique()) m_data = Ostil::makePtr<Data>(data());
 }
 
 template <class TraitsT> void Container<TraitsT>::copyTo(Ostil::Ptr<VLN::Component>& target) const {
   if (target.get() == this) return;
   auto copy = Ostil::makePtr<Container>(name(), voxelSize());
   ObjectChange const change(copy.get());
-  copy->m_data = Ostil::makePtr<Data>(*m_data);
+  copy->m_data = Ostil::makePtr<Data>(data());
   target = copy;
   Component::copyTo(target);
 }
@@ -96,14 +99,14 @@ void Container<TraitsT>::memUse(std::uint64_t& used, std::uint64_t& allocated, b
   Component::memUse(used, allocated, notShared);
   used += sizeof(m_data), allocated += sizeof(m_data);
   std::uint64_t dataUsed = 0, dataAllocated = 0;
-  m_data->memUse(dataUsed, dataAllocated);
+  data().memUse(dataUsed, dataAllocated);
   auto const sharers = notShared ? std::uint64_t(1) : static_cast<std::uint64_t>(m_data.useCount());
   used += dataUsed / sharers, allocated += dataAllocated / sharers;
 }
 
 template <class TraitsT> std::uint64_t Container<TraitsT>::memUsage() const {
   std::int64_t records = rootCount() + 1 + tileCount(-1);
-  for (int d = 0; d <= kMaxDepth; ++d) records += m_data->tiles(d).capacity() - m_data->tiles(d).size();
+  for (int d = 0; d <= kMaxDepth; ++d) records += data().tiles(d).capacity() - data().tiles(d).size();
   return static_cast<std::uint64_t>(records) * sizeof(TileType);
 }
 
@@ -127,7 +130,7 @@ template <class TraitsT> void Container<TraitsT>::dump(std::ostream& os) const {
     }
     os << "}\n";
   };
-  for (auto const& root : m_data->m_roots) writeTile("root[", root.second);
+  for (auto const& root : data().m_roots) writeTile("root[", root.second);
   for (int d = 0; d <= kMaxDepth; ++d) {
     for (std::int64_t n = 0; n < tileCount(d); ++n) {
       if (tile(n, d).valid()) writeTile("tile[", {n, d});
@@ -136,13 +139,13 @@ template <class TraitsT> void Container<TraitsT>::dump(std::ostream& os) const {
 }
 
 template <class TraitsT> void Container<TraitsT>::setVoxelSize(float size) {
-  if (m_data->m_voxelSize == size) return;
-  m_data->m_voxelSize = size;
-  m_data->m_voxelSizeInv = size > 0 ? 1.0f / size : 1.0f;
+  if (data().m_voxelSize == size) return;
+  data().m_voxelSize = size;
+  data().m_voxelSizeInv = size > 0 ? 1.0f / size : 1.0f;
 }
 
 template <class TraitsT> void Container<TraitsT>::setMaxRelativeRefinementError(float error) {
-  m_data->m_maxRelativeRefinementError = error < 0 ? 0.0f : error;
+  data().m_maxRelativeRefinementError = error < 0 ? 0.0f : error;
 }
 
 template <class TraitsT> float Container<TraitsT>::worldSpaceTileVoxelDiagonal(int d) const {
@@ -151,12 +154,12 @@ template <class TraitsT> float Container<TraitsT>::worldSpaceTileVoxelDiagonal(i
 
 template <class TraitsT> void Container<TraitsT>::tileSpaceBounds(bbox<int3, int>& box) const {
   box = {};
-  for (auto const& root : m_data->m_roots) tile(root.second).tileSpaceBounds(box);
+  for (auto const& root : data().m_roots) tile(root.second).tileSpaceBounds(box);
 }
 
 template <class TraitsT> void Container<TraitsT>::tileSpaceBounds(int d, bbox<int3, int>& box) const {
   using Box = bbox<int3, int>;
-  auto const& tiles = m_data->tiles(d);
+  auto const& tiles = data().tiles(d);
   box = parallelReduce(
       0, tiles.size(), 16384, Box{},
       [&](std::int64_t begin, std::int64_t end) {
@@ -195,6 +198,48 @@ template <class TraitsT> void Container<TraitsT>::worldSpaceBounds(int d, bbox<d
   toWorld(bounds, voxelSize(), box);
 }
 
+// --- Roots and sharing ---
+
+template <class TraitsT> std::int64_t Container<TraitsT>::rootCount() const {
+  return static_cast<std::int64_t>(data().m_roots.size());
+}
+template <class TraitsT> RootIterator Container<TraitsT>::cbeginRoots() const {
+  return RootIterator(std::bit_cast<void const*>(data().m_roots.cbegin()));
+}
+template <class TraitsT> RootIterator Container<TraitsT>::cendRoots() const {
+  return RootIterator(std::bit_cast<void const*>(data().m_roots.cend()));
+}
+template <class TraitsT> bool Container<TraitsT>::sharesTiles(Container const& other) const {
+  return data().m_tiles == other.data().m_tiles;
+}
+template <class TraitsT> auto Container<TraitsT>::getData() const -> Data const* {
+  return m_data ? &data() : nullptr;
+}
+template <class TraitsT> void Container<TraitsT>::detachTiles() { data().detachTiles(); }
+template <class TraitsT> AffinityPartitioner& Container<TraitsT>::affinityPartitioner(int d) const {
+  return *data().m_affinityPartitioners[d];
+}
+template <class TraitsT> int Container<TraitsT>::incrementAffinityPartitionerUseCount() const {
+  return const_cast<Data&>(data()).m_affinityUseCount.fetch_add(1);
+}
+template <class TraitsT> int Container<TraitsT>::decrementAffinityPartitionerUseCount() const {
+  return const_cast<Data&>(data()).m_affinityUseCount.fetch_sub(1);
+}
+
+// --- Addition of tiles ---
+
+template <class TraitsT> TreeIndex Container<TraitsT>::addTile(int i, int j, int k, int depth) {
+  return ContainerBuilder<TraitsT>(*this).addTile(i, j, k, depth);
+}
+template <class TraitsT>
+TreeIndex Container<TraitsT>::addTileBelow(TreeIndex above, int i, int j, int k, int depth) {
+  return ContainerBuilder<TraitsT>(*this).addTileBelow(above, i, j, k, depth);
+}
+template <class TraitsT>
+void Container<TraitsT>::addTilesInBulk(TileLists const& corners, TileLists* newTiles) {
+  ContainerBuilder<TraitsT>(*this).addTilesInBulk(corners, newTiles);
+}
+
 // --- Traversal ---
 
 template <class TraitsT>
@@ -214,33 +259,8 @@ template <class TraitsT>
 void Container<TraitsT>::reduce(VisitorType& visitor, TraversalMode mode, TraversalRange const& range) {
   TraversalEngine<false, TraitsT>::run(*this, visitor, mode, range, VisitorResults::kJoin);
 }
-template <class TraitsT> void Container<TraitsT>::setBranchSizes(Cancellation cancellation) {
-  // What a bottom-up traversal would do, as one loop over each array: nothing but sums of children.
-  Canceller::cancelID(Canceller::kTraverse);
-  m_data->detachTiles();
-  for (int d = kMaxDepth; d >= 0; --d) {
-    auto& tiles = m_data->editTiles(d);
-    auto const* const below = d < kMaxDepth ? m_data->tiles(d + 1).begin() : nullptr;
-    bool const belowIsDeepest = d + 1 == kMaxDepth; // whose sizes are known
-    parallelFor(0, tiles.size(),
-                [&](std::int64_t begin, std::int64_t end) {
-                  for (std::int64_t n = begin; n < end; ++n) {
-                    TileType& t = tiles[n];
-                    if (!t.valid()) continue;
-                    std::int64_t size = TraitsT::kTileSize;
-                    if (below) {
-                      for (int slot = 0; slot < TraitsT::kTileSize; ++slot) {
-                        std::int64_t const child = t.childIndex(slot);
-                        if (child >= 0)
-                          size += belowIsDeepest ? TraitsT::kTileSize : below[child].branchSize();
-                      }
-                    }
-                    if (t.branchSize() != size) t.setBranchSize(size);
-                  }
-                },
-                {.grain = 1024, .cancellation = cancellation});
-    Canceller::cancelID(Canceller::kTraverse);
-  }
+template <class TraitsT> void Container<TraitsT>::setBranchSizes() {
+  ContainerBuilder<TraitsT>(*this).setBranchSizes(Cancellation::kPoll);
 }
 template <class TraitsT> bool Container<TraitsT>::checkBranchSizes(bool verbose) const {
   return TileTree3D::checkBranchSizes(*this, verbose);
@@ -254,27 +274,27 @@ template <class TraitsT> bool Container<TraitsT>::checkConsistency(bool verbose)
 template <class TraitsT> void Container<TraitsT>::buildAccessorAccelerationStructure(int maxDepth) {
   // First: where no depth qualifies, an older grid must not stay.
   clearAccessorAccelerationStructure();
-  m_data->m_lookupBusy.test_and_set();
+  data().m_lookupBusy.test_and_set();
   try {
-    buildAccelerationGrid(*this, *m_data, maxDepth);
+    buildAccelerationGrid(*this, data(), maxDepth);
   } catch (...) {
     clearAccessorAccelerationStructure();
-    m_data->m_lookupBusy.clear();
+    data().m_lookupBusy.clear();
     throw;
   }
-  m_data->m_lookupBusy.clear();
+  data().m_lookupBusy.clear();
 }
 template <class TraitsT> void Container<TraitsT>::countLongSearches(std::int64_t n) const {
   // A search takes 0.1 to 0.4 us; the table 1 to 2 ms, and 30 ns for each tile.
   constexpr std::int64_t kFewSearches = 16384, kTilesPerSearch = 8;
-  Data& data = *m_data;
-  if (data.m_lookup.load(std::memory_order_relaxed)) return;
+  auto& data = const_cast<Data&>(this->data()); // what follows changes no tile
+  if (data.m_lookup.loadRelaxed()) return;
   std::int64_t const searches = data.m_longSearches.fetch_add(n) + n;
   if (searches < kFewSearches + data.m_tileCountTotal / kTilesPerSearch) return;
   if (data.m_lookupBusy.test_and_set()) return; // another thread builds, or this one, which searches for it
   std::shared_ptr<TileLookupTable<TraitsT> const> table;
   try {
-    if (!data.m_lookup.load()) table = buildLookupTable(*this);
+    if (!data.m_lookup.loadAcquire()) table = buildLookupTable(*this);
   } catch (std::bad_alloc const&) {}
   if (table)
     data.setLookupTable(std::move(table));
@@ -282,24 +302,28 @@ template <class TraitsT> void Container<TraitsT>::countLongSearches(std::int64_t
     data.m_longSearches = std::numeric_limits<std::int64_t>::min() / 2;
   data.m_lookupBusy.clear();
 }
+template <class TraitsT> auto Container<TraitsT>::neighborData() const -> NeighborTable const* {
+  return data().m_neighbors.get();
+}
+template <class TraitsT> int Container<TraitsT>::gridDepth() const { return data().m_gridDepth; }
 template <class TraitsT> void Container<TraitsT>::precomputeTileNeighbors() {
-  m_data->m_neighbors = computeTileNeighbors(*this);
+  data().m_neighbors = computeTileNeighbors(*this);
 }
 template <class TraitsT> void Container<TraitsT>::precomputeTileHalos() {
-  m_data->m_halos = computeTileHalos(*this);
+  data().m_halos = computeTileHalos(*this);
 }
 template <class TraitsT> void Container<TraitsT>::precomputeCompressedTileHalos() {
-  m_data->m_compressedHalos = computeCompressedTileHalos(*this);
+  data().m_compressedHalos = computeCompressedTileHalos(*this);
 }
 template <class TraitsT> TileHalo<TraitsT> const* Container<TraitsT>::tileHalo(TreeIndex const& at) const {
-  if (!m_data->m_halos) return nullptr;
-  return &(*m_data->m_halos)[static_cast<std::size_t>(at.depth)][static_cast<std::size_t>(at.index)];
+  if (!data().m_halos) return nullptr;
+  return &(*data().m_halos)[at.depth][static_cast<std::size_t>(at.index)];
 }
 template <class TraitsT>
 TileHaloVisitor<TraitsT> Container<TraitsT>::tileHaloVisitor(TreeIndex const& at) const {
-  if (!m_data->m_compressedHalos) return {};
-  auto const& records = m_data->m_compressedHalos->records[static_cast<std::size_t>(at.depth)];
-  return {records[static_cast<std::size_t>(at.index)], m_data->m_haloCompression};
+  if (!data().m_compressedHalos) return {};
+  auto const& records = data().m_compressedHalos->records[at.depth];
+  return {records[at.index], data().m_haloCompression};
 }
 template <class TraitsT> int Container<TraitsT>::tileSpaceMaxTileDistance() const {
   return maxTileDistance(*this);

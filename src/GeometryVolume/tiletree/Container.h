@@ -10,10 +10,21 @@
 // A container holds no field values: channels hang off it and are told of changes by the update protocol.
 #pragma once
 
-#include "GeometryVolume/tiletree/ContainerData.h"
+#include "GeometryVolume/core/FixedArray.h"
+#include "GeometryVolume/tiletree/RootIterator.h"
 #include "GeometryVolume/tiletree/TreeComponent.h"
 #include "GeometryVolume/tiletree/Visitor.h"
+#include "GeometryVolume/tiletree/detail/ContainerTiles.h"
 #include "Ostil/Array.h"
+#include "Ostil/Ptr.h"
+
+#include <cstdint>
+#include <utility>
+#include <vector>
+
+namespace VLN {
+class AffinityPartitioner;
+} // namespace VLN
 
 namespace VLN::TileTree3D {
 
@@ -22,8 +33,9 @@ template <class TraitsT> class TileAccessorOf;
 template <class Reference, class Pointer, class ContainerT> class TileIteratorBase;
 template <class TraitsT> class ConstVoxelIterator;
 template <class TraitsT> class TileHaloVisitor;
-template <class TraitsT> class NeighborSearch;
-template <bool IsConst, class TraitsT> class TraversalEngine;
+template <class TraitsT> struct ContainerData;
+template <class TraitsT> class ContainerBuilder;
+template <class TraitsT> struct TileHalo;
 
 /// For each depth, indices of tiles.
 using TileIndexLists = std::vector<std::vector<std::int64_t>>;
@@ -36,16 +48,18 @@ public:
   using TraitsType = TraitsT;
   using TileType = Tile<TraitsT, TraitsT::kTileSize>;
   using Data = ContainerData<TraitsT>;
-  using Roots = typename Data::Roots;
   using ConstTileAccessor = ConstTileAccessorOf<TraitsT>;
   using TileAccessor = TileAccessorOf<TraitsT>;
   using VisitorType = Visitor<Container>;
   using TileIterator = TileIteratorBase<TileType&, TileType*, Container>;
   using ConstTileIterator = TileIteratorBase<TileType const&, TileType const*, Container const>;
   using VoxelIterator = ConstVoxelIterator<TraitsT>;
-  using Counts = typename Data::Counts;
+  using Counts = typename ContainerTiles<TraitsT>::Counts;
   /// Corners of tiles by depth.
-  using TileLists = Dense1D::FixedArray<Ostil::Array<int3>, static_cast<std::size_t>(TraitsT::kDepths)>;
+  using TileLists = PerDepth<Ostil::Array<int3>, TraitsT::kDepths>;
+  /// For each depth and tile, the tiles around it.
+  using NeighborTable =
+      PerDepth<std::vector<Dense1D::FixedArray<TreeIndex, kNeighborCount>>, TraitsT::kDepths>;
 
   static constexpr int kTW = TraitsT::kTW;
   static constexpr int kTileWidth = TraitsT::kTW;
@@ -78,7 +92,7 @@ public:
   int elementCount(TreeIndex const& tile) const override;
   std::int64_t tileCount(int depth) const override {
     if (depth == -1) return m_data->m_tileCountTotal;
-    return TraitsT::isDepth(depth) ? m_data->m_tileCounts[static_cast<std::size_t>(depth)] : 0;
+    return TraitsT::isDepth(depth) ? m_data->m_tileCounts[depth] : 0;
   }
   /// A quick estimate of the memory of the tile records. @cost Constant.
   std::uint64_t memUsage() const;
@@ -96,10 +110,10 @@ public:
   ConstTileAccessor tileAccessor() const;
   TileAccessor tileAccessor();
 
-  std::int64_t rootCount() const { return static_cast<std::int64_t>(m_data->m_roots.size()); }
-  std::int64_t rootCount(int depth) const { return m_data->m_rootCounts[static_cast<std::size_t>(depth)]; }
-  typename Roots::const_iterator cbeginRoots() const { return m_data->m_roots.cbegin(); }
-  typename Roots::const_iterator cendRoots() const { return m_data->m_roots.cend(); }
+  std::int64_t rootCount() const;
+  std::int64_t rootCount(int depth) const { return m_data->m_rootCounts[depth]; }
+  RootIterator cbeginRoots() const;
+  RootIterator cendRoots() const;
 
   // Shape
   static constexpr int depth() { return kMaxDepth; }
@@ -158,8 +172,8 @@ public:
 
   // Derived caches: built on demand, dropped by every change of the tree. Where one finds no memory it is not
   // built: the grid is off, the tables are those of before. Beside them, accessors that look for tiles far
-  // from each other, thousands of times, make themselves a table of places, which takes about as long as
-  // those searches and a small part of the tree's memory.
+  // from each other, thousands of times, make the lookup table that goes with the grid, which takes about as
+  // long as those searches and a small part of the tree's memory.
   /// Dense grid of tile indices for fast entry: at the deepest depth up to `maxDepth` whose tiles span at
   /// most 64 cells on each axis. @cost Linear in the tiles of the depths tried.
   void buildAccessorAccelerationStructure(int maxDepth);
@@ -168,7 +182,7 @@ public:
   void precomputeTileNeighbors();
   void clearPrecomputedTileNeighbors();
   /// Null without the table.
-  typename Data::NeighborTable const* neighborData() const { return m_data->m_neighbors.get(); }
+  NeighborTable const* neighborData() const;
   void precomputeTileHalos();
   void clearTileHalos();
   TileHalo<TraitsT> const* tileHalo(TreeIndex const& at) const;
@@ -225,21 +239,17 @@ public:
   std::int64_t dataUseCount() const { return m_data.useCount(); }
   /// Makes the data exclusive to this container.
   void cloneData();
-  bool sharesTiles(Container const& other) const { return m_data->m_tiles == other.m_data->m_tiles; }
+  bool sharesTiles(Container const& other) const;
 
 protected:
   friend class ConstTileAccessorOf<TraitsT>;
   friend class TileAccessorOf<TraitsT>;
-  friend class NeighborSearch<TraitsT>;
-  friend class TraversalEngine<false, TraitsT>;
-  friend class TraversalEngine<true, TraitsT>;
+  friend class ContainerBuilder<TraitsT>;
   friend struct ContainerTestAccess;
 
-  Data const* getData() const { return m_data.get(); }
+  Data const* getData() const;
   /// What leads from positions to tiles, or null.
-  TileLookupTable<TraitsT> const* lookupTable() const {
-    return m_data->m_lookup.load(std::memory_order_acquire);
-  }
+  TileLookupTable<TraitsT> const* lookupTable() const { return m_data->m_lookup.loadAcquire(); }
   /// Adds to the number of searches that led over many levels. Where the table would have paid for itself
   /// since the tree changed, it is built. @threads Any, while nothing changes.
   void countLongSearches(std::int64_t n) const;
@@ -256,20 +266,19 @@ protected:
   /// Where a search begins: the tile of the acceleration grid, or the root, that holds the point at or above
   /// `depth`; invalid when there is none.
   TreeIndex entry(int i, int j, int k, int depth) const;
+  /// Depth of the acceleration grid; -1 without one.
+  int gridDepth() const;
 
   // Change. Tiles are named by index, since growth moves the records.
   TileType& editTile(TreeIndex const& at) { return m_data->editTiles(at.depth)[at.index]; }
   TreeIndex addTile(VoxelCoord const& at) { return addTile(at.i, at.j, at.k, at.depth); }
   TreeIndex addTile(int i, int j, int k, int depth);
-  /// Hangs `child` below `parent`, making the tiles between; returns the size of the branch that the parent
-  /// gained, 0 when it went below an existing child.
-  std::int64_t insertChild(TreeIndex parent, TreeIndex child);
   /// A tile below an existing one, with those between.
   TreeIndex addTileBelow(TreeIndex above, int i, int j, int k, int depth);
-  /// A new live tile without parent at the aligned corner.
-  TreeIndex makeTile(int i, int j, int k, int depth);
   std::int64_t allocateTile(int depth, TileType*& out);
   void allocateTiles(int depth, std::int64_t n);
+  /// Makes the tile arrays this container's alone, before they are changed.
+  void detachTiles();
   /// Sets the count of the depth. The caller restores the total.
   void resize(std::int64_t n, int depth);
   std::int64_t tileCapacity(int depth) const { return m_data->tiles(depth).capacity(); }
@@ -280,7 +289,7 @@ protected:
   void tilesAdded();
   /// Drops them after tiles went; `moves` names, for each depth, what compaction did.
   void tilesRemoved(TileMoves const* moves);
-  void setBranchSizes(Cancellation cancellation = Cancellation::kPoll);
+  void setBranchSizes();
   void refineInternal(Container const& source, bool last, TileLists* newTiles);
   /// Removes one tile or its branch. A root without its branch goes only when no two of its children are
   /// adjacent; another tile always goes with its branch. Dead and unknown tiles are left alone.
@@ -290,49 +299,18 @@ protected:
   /// Adds the tiles of many corners and those between, and sets all branch sizes.
   void addTilesInBulk(TileLists const& corners, TileLists* newTiles);
 
-  AffinityPartitioner& affinityPartitioner(int d) const {
-    return *m_data->m_affinityPartitioners[static_cast<std::size_t>(d)];
-  }
-  int incrementAffinityPartitionerUseCount() const { return m_data->m_affinityUseCount.fetch_add(1); }
-  int decrementAffinityPartitionerUseCount() const { return m_data->m_affinityUseCount.fetch_sub(1); }
+  AffinityPartitioner& affinityPartitioner(int d) const;
+  int incrementAffinityPartitionerUseCount() const;
+  int decrementAffinityPartitionerUseCount() const;
 
 private:
-  class Growth;
+  template <bool, class> friend class TraversalEngine;
 
-  /// A new tile without parent: a root, or one that hangs below a coarser tile with tiles between.
-  struct DetachedTile {
-    std::int64_t index;
-    TreeIndex above;
-  };
-  /// A tile where there is none above.
-  TreeIndex addRootTile(int i, int j, int k, int depth, Growth& growth);
-  /// Grows a depth by `n` tiles, of which the caller runs initLinkedTile() for each index.
-  void allocateUninitialised(int depth, std::int64_t n);
-  /// Makes the tile of a new index and links it to its parent, when that is known (not -1) or found.
-  /// @return false when it has none; `detached` then tells where it belongs.
-  /// @threads Tiles of one depth are made in parallel: each slot belongs to exactly one tile.
-  bool initLinkedTile(std::int64_t index, int depth, int3 const& corner, std::int64_t parent,
-                      ConstTileAccessor const& accessor, DetachedTile& detached);
-  /// Links what initLinkedTile() could not, and lists what is new since the counts were `before`.
-  void linkDetached(int depth, std::vector<std::vector<DetachedTile>> const& parts, Growth& growth,
-                    TileLists* newTiles);
-  /// Appends the corners of all tiles made since the counts were `before`.
-  void listNewTiles(Counts const& before, TileLists* newTiles) const;
-  /// Hangs roots deeper than `depth` below roots of `depth` that hold them.
-  void adoptDeeperRoots(int depth, Growth& growth);
-  /// Adds the tiles of a branch to the counts of their depths, until `budget` of them are counted.
-  void countBranch(TreeIndex const& at, Counts& counts, std::int64_t& budget) const;
-  /// Takes a tile or its branch out of the tree; returns how many tiles died.
-  /// @param removed With room for what dies. @param spareRoots With room for each child that becomes a root.
-  std::int64_t unlinkTile(TreeIndex const& at, bool withBranch, TileIndexLists& removed, Roots& spareRoots);
-  std::int64_t invalidateBranch(TreeIndex const& at, TileIndexLists& removed);
-  /// Room in `moves` for each entry of `lists`, so that compact() needs no memory.
-  static void reserveMoves(TileIndexLists const& lists, TileMoves& moves);
-  void compact(TileIndexLists& lists, TileMoves& moves);
-  void truncate(int depth);
-  void returnThreadLocal(int fromDepth);
+  Data& data();
+  Data const& data() const;
 
-  Ostil::Ptr<Data> m_data;
+  /// The tiles of a Data.
+  Ostil::Ptr<ContainerTiles<TraitsT>> m_data;
 };
 
 } // namespace VLN::TileTree3D

@@ -5,7 +5,7 @@
 // between are added from the bottom up, and all are made from the top down.
 #pragma once
 
-#include "GeometryVolume/tiletree/ContainerGrowthImpl.h"
+#include "GeometryVolume/tiletree/ContainerBuilderImpl.h"
 #include "GeometryVolume/tiletree/Morton.h"
 
 #include <algorithm>
@@ -34,7 +34,7 @@ public:
   explicit WantedTiles(typename Container<TraitsT>::TileLists const& points) {
     for (int3 const& p : points[0]) m_domain = m_domain || TraitsT::inDomain(p);
     for (int d = 1; d <= kMaxDepth; ++d) {
-      for (int3 const& p : points[static_cast<std::size_t>(d)]) {
+      for (int3 const& p : points[d]) {
         if (TraitsT::inDomain(p)) add(p, d);
       }
       join(groups(d));
@@ -44,8 +44,8 @@ public:
   /// Whether the tile of depth 0 is wanted.
   bool domain() const { return m_domain; }
   /// By the Morton order of the parents.
-  Groups& groups(int depth) { return m_groups[static_cast<std::size_t>(depth)]; }
-  Groups const& groups(int depth) const { return m_groups[static_cast<std::size_t>(depth)]; }
+  Groups& groups(int depth) { return m_groups[depth]; }
+  Groups const& groups(int depth) const { return m_groups[depth]; }
 
   /// Adds the tiles between a wanted one and the next coarser one above, wanted or there.
   void addBetween(ConstTileAccessorOf<TraitsT> const& accessor) {
@@ -132,20 +132,21 @@ private:
   }
 
   bool m_domain = false;
-  std::array<Groups, static_cast<std::size_t>(TraitsT::kDepths)> m_groups;
+  PerDepth<Groups, TraitsT::kDepths> m_groups;
 };
 
 } // namespace Internal
 
 template <class TraitsT>
-void Container<TraitsT>::addTilesInBulk(TileLists const& corners, TileLists* newTiles) {
+void ContainerBuilder<TraitsT>::addTilesInBulk(TileLists const& corners, TileLists* newTiles) {
   using Group = Internal::Siblings<TraitsT>;
-  tilesAdded();
+  m_tree.tilesAdded();
   Internal::WantedTiles<TraitsT> wanted(corners);
-  wanted.addBetween(growthAccessor());
-  Growth growth(*this, newTiles);
-  if (wanted.domain() && !tileIndex(kMinTileCoord, kMinTileCoord, kMinTileCoord, 0).valid()) {
-    addRootTile(kMinTileCoord, kMinTileCoord, kMinTileCoord, 0, growth);
+  wanted.addBetween(m_tree.growthAccessor());
+  Growth growth(data(), newTiles);
+  constexpr int kLow = TraitsT::kMinTileCoord;
+  if (wanted.domain() && !m_tree.tileIndex(kLow, kLow, kLow, 0).valid()) {
+    addRootTile(kLow, kLow, kLow, 0, growth);
     listNewTiles(growth.before(), newTiles);
   }
   constexpr std::int64_t kGrain = 128;
@@ -163,8 +164,7 @@ void Container<TraitsT>::addTilesInBulk(TileLists const& corners, TileLists* new
     std::vector<std::int64_t> parents(groups.size());
     std::vector<std::int64_t> starts(static_cast<std::size_t>(chunkCount(0, count, kGrain)));
     parallelChunks(0, count, kGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-      Container const& tree = *this;
-      auto const accessor = tree.growthAccessor();
+      auto const accessor = m_tree.growthAccessor();
       std::size_t missing = 0;
       for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
         Group& group = groups[n];
@@ -176,7 +176,7 @@ void Container<TraitsT>::addTilesInBulk(TileLists const& corners, TileLists* new
           if (!group.slots[slot]) continue;
           bool there;
           if (hasParent) {
-            there = !tree.tile(above).isLeaf(static_cast<int>(slot));
+            there = !tile(above).isLeaf(static_cast<int>(slot));
           } else {
             int3 const corner = cornerOf(group, slot);
             there = accessor.treeIndex(corner.x, corner.y, corner.z, d, false).depth == d;
@@ -187,13 +187,13 @@ void Container<TraitsT>::addTilesInBulk(TileLists const& corners, TileLists* new
       }
       starts[static_cast<std::size_t>(chunk)] = static_cast<std::int64_t>(missing);
     });
-    Counts const before = m_data->m_tileCounts;
+    Counts const before = data().m_tileCounts;
     std::int64_t next = tileCount(d);
     for (std::int64_t& start : starts) next += std::exchange(start, next);
     if (next == tileCount(d)) continue;
     allocateUninitialised(d, next - tileCount(d));
-    auto& tiles = m_data->editTiles(d);
-    auto* const above = &m_data->editTiles(d - 1);
+    auto& tiles = data().editTiles(d);
+    auto* const above = &data().editTiles(d - 1);
     std::vector<std::vector<std::int64_t>> roots(starts.size());
     parallelChunks(0, count, kGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
       std::int64_t index = starts[static_cast<std::size_t>(chunk)];
@@ -216,13 +216,13 @@ void Container<TraitsT>::addTilesInBulk(TileLists const& corners, TileLists* new
     });
     bool anyRoot = false;
     for (auto const& part : roots) {
-      for (std::int64_t const index : part) addRoot(tile(index, d)), anyRoot = true;
+      for (std::int64_t const index : part) m_tree.addRoot(tile({index, d})), anyRoot = true;
     }
     if (anyRoot) adoptDeeperRoots(d, growth);
     listNewTiles(before, newTiles);
   }
   growth.keep();
-  setBranchSizes();
+  setBranchSizes(Cancellation::kPoll);
 }
 
 } // namespace VLN::TileTree3D

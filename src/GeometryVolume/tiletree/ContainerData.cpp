@@ -1,7 +1,4 @@
-#include "GeometryVolume/tiletree/ContainerData.h"
-
-#include "GeometryVolume/tiletree/Container.h"
-#include "GeometryVolume/tiletree/TileHalo.h"
+#include "GeometryVolume/tiletree/ContainerDataImpl.h"
 
 #include <iostream>
 
@@ -17,26 +14,27 @@ ContainerData<TraitsT>::ContainerData()
 
 template <class TraitsT>
 ContainerData<TraitsT>::ContainerData(ContainerData const& b)
-    : m_tiles(b.m_tiles)
+    : Base()
+    , m_tiles(b.m_tiles)
     , m_tilesMaxDepth(b.m_tilesMaxDepth)
     , m_neighbors(b.m_neighbors)
     , m_halos(b.m_halos)
     , m_compressedHalos(b.m_compressedHalos)
     , m_roots(b.m_roots)
-    , m_rootCounts(b.m_rootCounts)
-    , m_tileCounts(b.m_tileCounts)
-    , m_tileCountTotal(b.m_tileCountTotal)
     , m_gridSize(b.m_gridSize)
     , m_gridTable(b.m_gridTable)
     , m_gridOrigin(b.m_gridOrigin)
     , m_gridExtent(b.m_gridExtent)
     , m_gridDepth(b.m_gridDepth)
-    , m_gridCellWidth(b.m_gridCellWidth)
-    , m_voxelSize(b.m_voxelSize)
-    , m_voxelSizeInv(b.m_voxelSizeInv)
-    , m_maxRelativeRefinementError(b.m_maxRelativeRefinementError)
-    , m_compactOnRemoval(b.m_compactOnRemoval) {
+    , m_gridCellWidth(b.m_gridCellWidth) {
   for (auto& partitioner : m_affinityPartitioners) partitioner = std::make_unique<AffinityPartitioner>();
+  this->m_rootCounts = b.m_rootCounts;
+  this->m_tileCounts = b.m_tileCounts;
+  this->m_tileCountTotal = b.m_tileCountTotal;
+  this->m_voxelSize = b.m_voxelSize;
+  this->m_voxelSizeInv = b.m_voxelSizeInv;
+  this->m_maxRelativeRefinementError = b.m_maxRelativeRefinementError;
+  this->m_compactOnRemoval = b.m_compactOnRemoval;
   setLookupTable(b.lookupTable());
   linkArrays();
 }
@@ -46,13 +44,13 @@ template <class TraitsT> ContainerData<TraitsT>::~ContainerData() = default;
 template <class TraitsT>
 void ContainerData<TraitsT>::setLookupTable(std::shared_ptr<TileLookupTable<TraitsT> const> table) {
   std::lock_guard const lock(m_lookupMutex);
-  m_lookup.store(table.get(), std::memory_order_release);
+  this->m_lookup.storeRelease(table.get());
   m_lookupTable = std::move(table);
 }
 
 template <class TraitsT> void ContainerData<TraitsT>::linkArrays() {
-  for (std::size_t d = 0; d < kMaxDepth; ++d) m_arrays[d] = &(*m_tiles)[d];
-  m_arrays[kMaxDepth] = m_tilesMaxDepth.get();
+  for (int d = 0; d < kMaxDepth; ++d) this->m_arrays[d] = &(*m_tiles)[d];
+  this->m_arrays[kMaxDepth] = m_tilesMaxDepth.get();
 }
 
 template <class TraitsT> void ContainerData<TraitsT>::cloneTiles() {
@@ -75,7 +73,7 @@ void ContainerData<TraitsT>::memUse(std::uint64_t& used, std::uint64_t& allocate
 
   used = allocated = sizeof(ContainerData);
   for (int d = 0; d < kDepths; ++d) {
-    Array const& array = tiles(d);
+    Array const& array = this->tiles(d);
     std::uint64_t bytes = sizeof(Array);
     for (TileType const& tile : array) {
       std::uint64_t record = 0, same = 0;

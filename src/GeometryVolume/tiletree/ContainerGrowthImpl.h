@@ -1,9 +1,8 @@
-// Growth that is taken back where it cannot be finished. Included by Container.cpp alone.
+// Growth that is taken back where it cannot be finished.
 #pragma once
 
-#include "GeometryVolume/tiletree/Container.h"
+#include "GeometryVolume/tiletree/ContainerDataImpl.h"
 
-#include <array>
 #include <iterator>
 #include <optional>
 #include <utility>
@@ -13,42 +12,46 @@ namespace VLN::TileTree3D {
 
 /// Tiles that are being added. Without keep() they are taken back when it ends: links that lead to them, and
 /// roots that were hung below them. That needs no memory.
-template <class TraitsT> class Container<TraitsT>::Growth {
+template <class TraitsT> class ContainerGrowth {
+  using Data = ContainerData<TraitsT>;
+  using Counts = typename Data::Counts;
+  using TileType = typename Data::TileType;
+  using TileLists = typename Container<TraitsT>::TileLists;
+  static constexpr int kMaxDepth = TraitsT::kMaxDepth, kTileSize = TraitsT::kTileSize;
+
 public:
-  explicit Growth(Container& tree, TileLists* newTiles = nullptr)
-      : m_data(*tree.m_data)
-      , m_before(tree.m_data->m_tileCounts)
+  explicit ContainerGrowth(Data& data, TileLists* newTiles = nullptr)
+      : m_data(data)
+      , m_before(data.m_tileCounts)
       , m_newTiles(newTiles) {
     if (!newTiles) return;
     auto& listed = m_listed.emplace();
     for (std::size_t d = 0; d < listed.size(); ++d) listed[d] = (*newTiles)[d].size();
   }
-  ~Growth() {
+  ~ContainerGrowth() {
     if (!m_kept) rollBack();
   }
-  Growth(Growth const&) = delete;
-  Growth& operator=(Growth const&) = delete;
+  ContainerGrowth(ContainerGrowth const&) = delete;
+  ContainerGrowth& operator=(ContainerGrowth const&) = delete;
 
   Counts const& before() const { return m_before; }
   void keep() { m_kept = true; }
   /// Room for so many roots more that stop being ones.
   void reserve(std::size_t roots) { m_adopted.reserve(m_adopted.size() + roots); }
-  void adopt(typename Roots::iterator root) {
-    --m_data.m_rootCounts[static_cast<std::size_t>(root->second.depth)];
+  void adopt(RootTable::iterator root) {
+    --m_data.m_rootCounts[root->second.depth];
     m_adopted.push_back(m_data.m_roots.extract(root));
   }
 
 private:
-  bool isNew(std::int64_t index, int depth) const {
-    return index >= m_before[static_cast<std::size_t>(depth)];
-  }
+  bool isNew(std::int64_t index, int depth) const { return index >= m_before[depth]; }
   void rollBack() {
     if (m_data.m_tileCounts == m_before) return;
     for (auto root = m_data.m_roots.begin(); root != m_data.m_roots.end();) {
       auto const next = std::next(root);
       TreeIndex const at = root->second;
       if (isNew(at.index, at.depth)) {
-        --m_data.m_rootCounts[static_cast<std::size_t>(at.depth)];
+        --m_data.m_rootCounts[at.depth];
         m_data.m_roots.erase(root);
       }
       root = next;
@@ -56,14 +59,14 @@ private:
     for (auto& root : m_adopted) {
       TreeIndex const at = root.mapped();
       if (isNew(at.index, at.depth)) continue;
-      ++m_data.m_rootCounts[static_cast<std::size_t>(at.depth)];
+      ++m_data.m_rootCounts[at.depth];
       m_data.m_roots.insert(std::move(root));
     }
     for (int d = 0; d <= kMaxDepth; ++d) {
       auto& tiles = m_data.editTiles(d);
-      std::int64_t const before = m_before[static_cast<std::size_t>(d)];
-      m_data.m_tileCountTotal -= m_data.m_tileCounts[static_cast<std::size_t>(d)] - before;
-      m_data.m_tileCounts[static_cast<std::size_t>(d)] = before;
+      std::int64_t const before = m_before[d];
+      m_data.m_tileCountTotal -= m_data.m_tileCounts[d] - before;
+      m_data.m_tileCounts[d] = before;
       if (d == kMaxDepth)
         tiles.shrinkRaw(before); // some may not have been made
       else if (tiles.size() > before)
@@ -82,8 +85,8 @@ private:
   Counts m_before;
   TileLists* m_newTiles;
   /// How long the lists were. Not there for the addition of single tiles, which is to be quick.
-  std::optional<std::array<std::uint64_t, static_cast<std::size_t>(TraitsT::kDepths)>> m_listed;
-  std::vector<typename Roots::node_type> m_adopted;
+  std::optional<PerDepth<std::uint64_t, TraitsT::kDepths>> m_listed;
+  std::vector<RootTable::node_type> m_adopted;
   bool m_kept = false;
 };
 

@@ -2,7 +2,7 @@
 #pragma once
 
 #include "GeometryVolume/core/Canceller.h"
-#include "GeometryVolume/tiletree/ContainerGrowthImpl.h"
+#include "GeometryVolume/tiletree/ContainerBuilderImpl.h"
 #include "Ostil/Job.h"
 #include "Velorn/ExceptionMessage.h"
 
@@ -52,19 +52,20 @@ inline void refineCheckpoint() {
 
 } // namespace Internal
 
-template <class TraitsT> void Container<TraitsT>::allocateUninitialised(int depth, std::int64_t n) {
+template <class TraitsT> void ContainerBuilder<TraitsT>::allocateUninitialised(int depth, std::int64_t n) {
   // At the deepest depth nothing is allocated for a tile, so that no record can stay unmade.
-  if (depth < kMaxDepth) return allocateTiles(depth, n);
-  m_data->detachTiles();
-  auto& tiles = m_data->editTiles(depth);
+  if (depth < kMaxDepth) return m_tree.allocateTiles(depth, n);
+  data().detachTiles();
+  auto& tiles = data().editTiles(depth);
   tiles.growRaw(tiles.size() + n);
-  m_data->m_tileCounts[static_cast<std::size_t>(depth)] += n;
-  m_data->m_tileCountTotal += n;
+  data().m_tileCounts[depth] += n;
+  data().m_tileCountTotal += n;
 }
 
 template <class TraitsT>
-bool Container<TraitsT>::initLinkedTile(std::int64_t index, int depth, int3 const& p, std::int64_t parent,
-                                        ConstTileAccessor const& accessor, DetachedTile& detached) {
+bool ContainerBuilder<TraitsT>::initLinkedTile(std::int64_t index, int depth, int3 const& p,
+                                               std::int64_t parent, ConstTileAccessor const& accessor,
+                                               DetachedTile& detached) {
   TreeIndex nearest;
   if (parent < 0 && depth > 0) {
     nearest = accessor.treeIndex(p.x, p.y, p.z, depth - 1, false);
@@ -74,7 +75,7 @@ bool Container<TraitsT>::initLinkedTile(std::int64_t index, int depth, int3 cons
     TileType& above = editTile({parent, depth - 1});
     above.childIndex(Internal::slotOfCorner(above, p)) = index;
   }
-  auto* const tile = &m_data->editTiles(depth)[index];
+  auto* const tile = &data().editTiles(depth)[index];
   if (depth == kMaxDepth) new (static_cast<void*>(tile)) TileType;
   tile->init(parent, p.x, p.y, p.z, depth, index);
   detached = {index, nearest};
@@ -82,52 +83,24 @@ bool Container<TraitsT>::initLinkedTile(std::int64_t index, int depth, int3 cons
 }
 
 template <class TraitsT>
-void Container<TraitsT>::linkDetached(int depth, std::vector<std::vector<DetachedTile>> const& parts,
-                                      Growth& growth, TileLists* newTiles) {
+void ContainerBuilder<TraitsT>::linkDetached(int depth, std::vector<std::vector<DetachedTile>> const& parts,
+                                             Growth& growth, TileLists* newTiles) {
   bool anyRoot = false;
   for (auto const& part : parts) {
     for (DetachedTile const& made : part) {
       if (made.above.valid())
         insertChild(made.above, {made.index, depth});
       else
-        addRoot(tile(made.index, depth)), anyRoot = true;
+        m_tree.addRoot(tile({made.index, depth})), anyRoot = true;
     }
   }
   if (anyRoot) adoptDeeperRoots(depth, growth);
   listNewTiles(growth.before(), newTiles);
 }
 
-template <class TraitsT>
-void Container<TraitsT>::listNewTiles(Counts const& before, TileLists* newTiles) const {
-  for (int d = 0; newTiles && d <= kMaxDepth; ++d) {
-    for (std::int64_t n = before[static_cast<std::size_t>(d)]; n < tileCount(d); ++n)
-      (*newTiles)[static_cast<std::size_t>(d)].append(tile(n, d).tijk());
-  }
-}
-
-template <class TraitsT> void Container<TraitsT>::adoptDeeperRoots(int depth, Growth& growth) {
-  bool deeper = false;
-  for (int d = depth + 1; d <= kMaxDepth; ++d) deeper |= rootCount(d) > 0;
-  if (!deeper) return;
-  // Roots never overlap, so a root of this depth that holds a deeper one is new.
-  auto& roots = m_data->m_roots;
-  std::vector<std::pair<TreeIndex, typename Roots::iterator>> adoptions;
-  for (auto root = roots.begin(); root != roots.end(); ++root) {
-    VoxelCoord const& at = root->first;
-    if (at.depth <= depth) continue;
-    auto const above = roots.find(
-        {TraitsT::align(at.i, depth), TraitsT::align(at.j, depth), TraitsT::align(at.k, depth), depth});
-    if (above != roots.end()) adoptions.emplace_back(above->second, root);
-  }
-  growth.reserve(adoptions.size());
-  for (auto const& [parent, root] : adoptions) insertChild(parent, root->second);
-  for (auto const& adoption : adoptions) growth.adopt(adoption.second);
-}
-
-template <class TraitsT>
-void Container<TraitsT>::refineInternal(Container const& source, bool last, TileLists* newTiles) {
-  if (&source != this) {
-    tilesAdded();
+template <class TraitsT> void ContainerBuilder<TraitsT>::refine(Tree const& source, TileLists* newTiles) {
+  if (&source != &m_tree) {
+    m_tree.tilesAdded();
     constexpr std::int64_t kDead = -1, kMissing = -2;
     // For each source tile of the depth above, and of this one, the index of its counterpart here. A tile
     // with a parent in the source is found through the parent's counterpart, without a search.
@@ -142,8 +115,7 @@ void Container<TraitsT>::refineInternal(Container const& source, bool last, Tile
       // For each chunk, how many are missing; then, where its first one goes.
       std::vector<std::int64_t> starts(static_cast<std::size_t>(Internal::refineChunks(count)));
       Internal::refinePass(count, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-        Container const& tree = *this;
-        auto const accessor = tree.growthAccessor();
+        auto const accessor = m_tree.growthAccessor();
         std::int64_t missing = 0;
         for (std::int64_t n = begin; n < end; ++n) {
           TileType const& wanted = tiles[n];
@@ -153,7 +125,7 @@ void Container<TraitsT>::refineInternal(Container const& source, bool last, Tile
               TreeIndex const at = accessor.treeIndex(wanted.ti(), wanted.tj(), wanted.tk(), d, false);
               if (at.depth == d) found = at.index;
             } else {
-              TileType const& over = tree.tile(parentHere(wanted), d - 1);
+              TileType const& over = tile({parentHere(wanted), d - 1});
               found = over.childIndex(Internal::slotOfCorner(over, wanted.tijk()));
             }
             if (found < 0) found = kMissing, ++missing;
@@ -167,11 +139,11 @@ void Container<TraitsT>::refineInternal(Container const& source, bool last, Tile
       std::int64_t next = tileCount(d);
       for (std::int64_t& start : starts) next += std::exchange(start, next);
       if (next > tileCount(d)) {
-        Growth growth(*this, newTiles);
+        Growth growth(data(), newTiles);
         allocateUninitialised(d, next - tileCount(d));
         std::vector<std::vector<DetachedTile>> parts(starts.size());
         auto const make = [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-          auto const accessor = this->growthAccessor();
+          auto const accessor = m_tree.growthAccessor();
           std::int64_t index = starts[static_cast<std::size_t>(chunk)];
           DetachedTile detached;
           for (std::int64_t n = begin; n < end; ++n) {
@@ -182,7 +154,7 @@ void Container<TraitsT>::refineInternal(Container const& source, bool last, Tile
             here[static_cast<std::size_t>(n)] = index++;
           }
         };
-        Internal::refinePass(count, make, next - growth.before()[static_cast<std::size_t>(d)]);
+        Internal::refinePass(count, make, next - growth.before()[d]);
         linkDetached(d, parts, growth, newTiles);
         growth.keep();
       }
@@ -190,6 +162,11 @@ void Container<TraitsT>::refineInternal(Container const& source, bool last, Tile
       above.swap(here);
     }
   }
+}
+
+template <class TraitsT>
+void Container<TraitsT>::refineInternal(Container const& source, bool last, TileLists* newTiles) {
+  ContainerBuilder<TraitsT>(*this).refine(source, newTiles);
   if (last) setBranchSizes();
 }
 
@@ -200,7 +177,7 @@ void Container<TraitsT>::refine(std::vector<Container const*> const& sources, Ti
     for (std::size_t n = 0; n < sources.size(); ++n)
       refineInternal(*sources[n], setBranchSizesAtEnd && n + 1 == sources.size(), newTiles);
   } catch (std::bad_alloc const&) {
-    if (setBranchSizesAtEnd) setBranchSizes(Cancellation::kSuppress);
+    if (setBranchSizesAtEnd) ContainerBuilder<TraitsT>(*this).setBranchSizes(Cancellation::kSuppress);
     throw;
   }
 }

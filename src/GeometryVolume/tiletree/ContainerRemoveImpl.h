@@ -4,9 +4,10 @@
 //   | a | d | b | c |              holes are filled from the end of the array; every referrer is told
 #pragma once
 
-#include "GeometryVolume/tiletree/Container.h"
+#include "GeometryVolume/tiletree/ContainerBuilderImpl.h"
 #include "GeometryVolume/tiletree/Morton.h"
 
+#include <cstdlib>
 #include <utility>
 #include <vector>
 
@@ -28,16 +29,16 @@ template <class TileType> bool hasAdjacentChildren(TileType const& tile) {
 } // namespace Internal
 
 template <class TraitsT>
-void Container<TraitsT>::countBranch(TreeIndex const& at, Counts& counts, std::int64_t& budget) const {
+void ContainerBuilder<TraitsT>::countBranch(TreeIndex const& at, Counts& counts, std::int64_t& budget) const {
   if (--budget < 0) return;
-  ++counts[static_cast<std::size_t>(at.depth)];
+  ++counts[at.depth];
   TileType const& t = tile(at);
   if (t.atMaxDepth()) return;
   for (auto child = t.begin(); child != t.end(); ++child) countBranch(child.treeIndex(), counts, budget);
 }
 
 template <class TraitsT>
-std::int64_t Container<TraitsT>::invalidateBranch(TreeIndex const& at, TileIndexLists& removed) {
+std::int64_t ContainerBuilder<TraitsT>::invalidateBranch(TreeIndex const& at, TileIndexLists& removed) {
   std::int64_t count = 1;
   TileType& t = editTile(at);
   if (!t.atMaxDepth())
@@ -49,22 +50,22 @@ std::int64_t Container<TraitsT>::invalidateBranch(TreeIndex const& at, TileIndex
 }
 
 template <class TraitsT>
-std::int64_t Container<TraitsT>::unlinkTile(TreeIndex const& at, bool withBranch, TileIndexLists& removed,
-                                            Roots& spareRoots) {
+std::int64_t ContainerBuilder<TraitsT>::unlinkTile(TreeIndex const& at, bool withBranch,
+                                                   TileIndexLists& removed, RootTable& spareRoots) {
   if (!TraitsT::isDepth(at.depth) || at.index < 0 || at.index >= tileCount(at.depth) || !tile(at).valid())
     return 0;
   TileType& t = editTile(at);
   if (t.isRoot()) {
     if (!withBranch && Internal::hasAdjacentChildren(t)) return 0;
-    removeRoot(t);
+    m_tree.removeRoot(t);
     if (!withBranch) {
       for (auto child = t.begin(); child != t.end(); ++child) {
         TileType& c = editTile(child.treeIndex());
         c.setParentIndex(-1);
         auto node = spareRoots.extract(spareRoots.begin());
         node.key() = c.voxelCoord(), node.mapped() = c.treeIndex();
-        m_data->m_roots.insert(std::move(node));
-        ++m_data->m_rootCounts[static_cast<std::size_t>(c.depth())];
+        data().m_roots.insert(std::move(node));
+        ++data().m_rootCounts[c.depth()];
       }
       t.invalidate();
       removed[static_cast<std::size_t>(at.depth)].push_back(at.index);
@@ -81,25 +82,18 @@ std::int64_t Container<TraitsT>::unlinkTile(TreeIndex const& at, bool withBranch
 }
 
 template <class TraitsT>
-void Container<TraitsT>::removeTile(TreeIndex const& at, bool withBranch, TileMoves* moves) {
-  TileIndexLists lists(static_cast<std::size_t>(kMaxDepth) + 1);
-  if (TraitsT::isDepth(at.depth)) lists[static_cast<std::size_t>(at.depth)].push_back(at.index);
-  removeTiles(lists, withBranch, moves);
-}
-
-template <class TraitsT>
-void Container<TraitsT>::reserveMoves(TileIndexLists const& lists, TileMoves& moves) {
+void ContainerBuilder<TraitsT>::reserveMoves(TileIndexLists const& lists, TileMoves& moves) {
   moves.assign(static_cast<std::size_t>(kMaxDepth) + 1, {});
   for (std::size_t d = 0; d < lists.size(); ++d) moves[d].reserve(lists[d].capacity());
 }
 
 template <class TraitsT>
-void Container<TraitsT>::removeTiles(TileIndexLists& lists, bool withBranch, TileMoves* moves) {
+void ContainerBuilder<TraitsT>::removeTiles(TileIndexLists& lists, bool withBranch, TileMoves* moves) {
   // All memory that is needed comes first. Branches of listed tiles may hold listed ones: where more would be
   // counted than there are tiles, room is made for all.
   Counts counts{};
-  Roots spareRoots;
-  std::int64_t budget = m_data->m_tileCountTotal;
+  RootTable spareRoots;
+  std::int64_t budget = data().m_tileCountTotal;
   auto const live = [&](TreeIndex const& at) {
     return at.index >= 0 && at.index < tileCount(at.depth) && tile(at).valid();
   };
@@ -114,11 +108,11 @@ void Container<TraitsT>::removeTiles(TileIndexLists& lists, bool withBranch, Til
   }
   TileIndexLists removed(static_cast<std::size_t>(kMaxDepth) + 1);
   for (std::size_t d = 0; d < removed.size(); ++d)
-    removed[d].reserve(static_cast<std::size_t>(budget < 0 ? m_data->m_tileCounts[d] : counts[d]));
+    removed[d].reserve(static_cast<std::size_t>(budget < 0 ? data().m_tileCounts[d] : counts[d]));
   TileMoves ownMoves;
   TileMoves& made = moves ? *moves : ownMoves;
   reserveMoves(removed, made);
-  m_data->detachTiles();
+  data().detachTiles();
 
   std::int64_t count = 0;
   for (int d = 0; d <= kMaxDepth && d < static_cast<int>(lists.size()); ++d) {
@@ -128,33 +122,33 @@ void Container<TraitsT>::removeTiles(TileIndexLists& lists, bool withBranch, Til
   // Refused and dead entries have left the lists; branches have joined them.
   lists = std::move(removed);
   if (count == 0) return;
-  m_data->m_tileCountTotal -= count;
-  if (compactOnRemoval()) compact(lists, made);
-  tilesRemoved(&made);
+  data().m_tileCountTotal -= count;
+  if (m_tree.compactOnRemoval()) fillHoles(lists, made);
+  m_tree.tilesRemoved(&made);
 }
 
-template <class TraitsT> void Container<TraitsT>::compact(TileMoves* moves) {
+template <class TraitsT> void ContainerBuilder<TraitsT>::compact(TileMoves* moves) {
   TileIndexLists dead(static_cast<std::size_t>(kMaxDepth) + 1);
   for (int d = 0; d <= kMaxDepth; ++d) {
     for (std::int64_t n = 0; n < tileCount(d); ++n) {
-      if (!tile(n, d).valid()) dead[static_cast<std::size_t>(d)].push_back(n);
+      if (!tile({n, d}).valid()) dead[static_cast<std::size_t>(d)].push_back(n);
     }
   }
   TileMoves ownMoves;
   TileMoves& made = moves ? *moves : ownMoves;
   reserveMoves(dead, made);
-  m_data->detachTiles();
-  compact(dead, made);
-  tilesRemoved(&made);
+  data().detachTiles();
+  fillHoles(dead, made);
+  m_tree.tilesRemoved(&made);
 }
 
-template <class TraitsT> void Container<TraitsT>::compact(TileIndexLists& lists, TileMoves& moves) {
+template <class TraitsT> void ContainerBuilder<TraitsT>::fillHoles(TileIndexLists& lists, TileMoves& moves) {
   for (int d = 0; d <= kMaxDepth; ++d) {
     auto& holes = lists[static_cast<std::size_t>(d)];
     if (holes.empty()) continue;
     std::sort(holes.begin(), holes.end());
     holes.erase(std::unique(holes.begin(), holes.end()), holes.end());
-    auto const& tiles = m_data->tiles(d);
+    auto const& tiles = data().tiles(d);
     auto& made = moves[static_cast<std::size_t>(d)];
     // Dead tiles at the very end go without a move, also those that an earlier removal left behind.
     std::int64_t last = tiles.size() - 1;
@@ -172,7 +166,7 @@ template <class TraitsT> void Container<TraitsT>::compact(TileIndexLists& lists,
     parallelFor(0, static_cast<std::int64_t>(made.size()), [&](std::int64_t begin, std::int64_t end) {
       for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
         auto const [dst, src] = made[n];
-        m_data->editTiles(d).relocate(dst, src);
+        data().editTiles(d).relocate(dst, src);
         TileType& t = editTile({dst, d});
         t.setIndex(dst);
         if (!t.isRoot()) editTile(t.parentTreeIndex()).childIndex(t) = dst;
@@ -180,17 +174,32 @@ template <class TraitsT> void Container<TraitsT>::compact(TileIndexLists& lists,
           editTile(child.treeIndex()).setParentIndex(dst);
       }
     });
-    resize(last + 1, d);
+    m_tree.resize(last + 1, d);
     for (auto const& [dst, src] : made) {
-      TileType const& t = tile(dst, d);
-      if (t.isRoot()) m_data->m_roots.find(t.voxelCoord())->second = {dst, d};
+      TileType const& t = tile({dst, d});
+      if (t.isRoot()) data().m_roots.find(t.voxelCoord())->second = {dst, d};
     }
   }
 }
 
+template <class TraitsT>
+void Container<TraitsT>::removeTile(TreeIndex const& at, bool withBranch, TileMoves* moves) {
+  TileIndexLists lists(static_cast<std::size_t>(kMaxDepth) + 1);
+  if (TraitsT::isDepth(at.depth)) lists[static_cast<std::size_t>(at.depth)].push_back(at.index);
+  removeTiles(lists, withBranch, moves);
+}
+
+template <class TraitsT>
+void Container<TraitsT>::removeTiles(TileIndexLists& lists, bool withBranch, TileMoves* moves) {
+  ContainerBuilder<TraitsT>(*this).removeTiles(lists, withBranch, moves);
+}
+template <class TraitsT> void Container<TraitsT>::compact(TileMoves* moves) {
+  ContainerBuilder<TraitsT>(*this).compact(moves);
+}
+
 template <class TraitsT> void Container<TraitsT>::permute(std::vector<std::int64_t> const* perms) {
   tilesAdded();
-  m_data->detachTiles();
+  data().detachTiles();
   auto const mapped = [&](std::int64_t index, int d) {
     auto const& perm = perms[static_cast<std::size_t>(d)];
     return index < 0 || perm.empty() ? index : perm[static_cast<std::size_t>(index)];
@@ -198,17 +207,15 @@ template <class TraitsT> void Container<TraitsT>::permute(std::vector<std::int64
   auto const permuted = [&](int d) {
     return TraitsT::isDepth(d) && !perms[static_cast<std::size_t>(d)].empty();
   };
-  std::vector<typename Data::Array::Room> rooms(static_cast<std::size_t>(kMaxDepth) + 1);
+  PerDepth<typename Data::Array::Room, TraitsT::kDepths> rooms;
   for (int d = 0; d <= kMaxDepth; ++d)
-    if (permuted(d)) rooms[static_cast<std::size_t>(d)] = m_data->tiles(d).roomToPermute();
+    if (permuted(d)) rooms[d] = data().tiles(d).roomToPermute();
   // Each depth rewrites only its own records, from the permutations of the depths above and below.
   parallelFor(0, kMaxDepth + 1, [&](std::int64_t firstDepth, std::int64_t lastDepth) {
     for (int d = static_cast<int>(firstDepth); d < static_cast<int>(lastDepth); ++d) {
       if (!permuted(d - 1) && !permuted(d) && !permuted(d + 1)) continue;
-      auto& tiles = m_data->editTiles(d);
-      if (permuted(d))
-        tiles.permute(perms[static_cast<std::size_t>(d)].data(),
-                      std::move(rooms[static_cast<std::size_t>(d)]));
+      auto& tiles = data().editTiles(d);
+      if (permuted(d)) tiles.permute(perms[static_cast<std::size_t>(d)].data(), rooms[d]);
       parallelFor(0, tiles.size(),
                   [&](std::int64_t begin, std::int64_t end) {
                     for (std::int64_t n = begin; n < end; ++n) {
@@ -223,7 +230,7 @@ template <class TraitsT> void Container<TraitsT>::permute(std::vector<std::int64
                   {.grain = 1024});
     }
   });
-  for (auto& [at, index] : m_data->m_roots) index.index = mapped(index.index, index.depth);
+  for (auto& [at, index] : data().m_roots) index.index = mapped(index.index, index.depth);
 }
 
 template <class TraitsT>
@@ -231,7 +238,7 @@ void Container<TraitsT>::computeMortonPermutations(std::vector<std::vector<std::
   perms.assign(static_cast<std::size_t>(kMaxDepth) + 1, {});
   parallelFor(0, kMaxDepth + 1, [&](std::int64_t firstDepth, std::int64_t lastDepth) {
     for (int d = static_cast<int>(firstDepth); d < static_cast<int>(lastDepth); ++d) {
-      auto const& tiles = m_data->tiles(d);
+      auto const& tiles = data().tiles(d);
       std::vector<SortRecord> order(static_cast<std::size_t>(tiles.size()));
       parallelFor(0, tiles.size(),
                   [&](std::int64_t begin, std::int64_t end) {

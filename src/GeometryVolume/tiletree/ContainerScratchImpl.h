@@ -2,7 +2,7 @@
 // alone.
 #pragma once
 
-#include "GeometryVolume/tiletree/Container.h"
+#include "GeometryVolume/tiletree/ContainerBuilderImpl.h"
 
 #include <utility>
 
@@ -14,27 +14,27 @@ inline constexpr VoxelCoord kScratchStart{0, 0, 0, 0};
 template <class TraitsT> Container<TraitsT>* Container<TraitsT>::threadLocalContainer(int keepEmpty) {
   Container* scratch = nullptr;
   {
-    std::lock_guard const lock(m_data->m_threadLocalFreeMutex);
-    auto& idle = m_data->m_freeThreadLocal;
+    std::lock_guard const lock(data().m_threadLocalFreeMutex);
+    auto& idle = data().m_freeThreadLocal;
     if (!idle.empty()) scratch = idle.front(), idle.erase(idle.begin());
   }
   if (!scratch) {
     auto made = Ostil::makePtr<Container>("voxel_tile_tree_thread_local", voxelSize());
     scratch = made.get();
     if (keepEmpty == 0) scratch->addTile(kScratchStart);
-    std::lock_guard const lock(m_data->m_threadLocalFreeMutex);
+    std::lock_guard const lock(data().m_threadLocalFreeMutex);
     // Those that come back find room.
-    m_data->m_freeThreadLocal.reserve(m_data->m_allThreadLocal.size() + 1);
-    m_data->m_allThreadLocal.push_back(std::move(made));
+    data().m_freeThreadLocal.reserve(data().m_allThreadLocal.size() + 1);
+    data().m_allThreadLocal.push_back(std::move(made));
   }
   Counts counts{};
-  for (int d = 0; d <= kMaxDepth; ++d) counts[static_cast<std::size_t>(d)] = scratch->tileCount(d);
+  for (int d = 0; d <= kMaxDepth; ++d) counts[d] = scratch->tileCount(d);
   try {
-    std::lock_guard const lock(m_data->m_threadLocalMapMutex);
-    m_data->m_threadLocalCounts[scratch] = counts;
+    std::lock_guard const lock(data().m_threadLocalMapMutex);
+    data().m_threadLocalCounts[scratch] = counts;
   } catch (...) {
-    std::lock_guard const lock(m_data->m_threadLocalFreeMutex);
-    m_data->m_freeThreadLocal.push_back(scratch);
+    std::lock_guard const lock(data().m_threadLocalFreeMutex);
+    data().m_freeThreadLocal.push_back(scratch);
     throw;
   }
   return scratch;
@@ -46,7 +46,7 @@ namespace Internal {
 template <class ContainerT>
 int firstChangedDepth(ContainerT const& scratch, typename ContainerT::Counts const& counts) {
   for (int d = 0; d <= ContainerT::kMaxDepth; ++d) {
-    if (scratch.tileCount(d) != counts[static_cast<std::size_t>(d)]) return d;
+    if (scratch.tileCount(d) != counts[d]) return d;
   }
   return -1;
 }
@@ -56,45 +56,45 @@ int firstChangedDepth(ContainerT const& scratch, typename ContainerT::Counts con
 template <class TraitsT> void Container<TraitsT>::freeThreadLocalContainer(Container* scratch) {
   Counts counts{};
   {
-    std::lock_guard const lock(m_data->m_threadLocalMapMutex);
-    auto const entry = m_data->m_threadLocalCounts.find(scratch);
-    if (entry == m_data->m_threadLocalCounts.end()) return;
+    std::lock_guard const lock(data().m_threadLocalMapMutex);
+    auto const entry = data().m_threadLocalCounts.find(scratch);
+    if (entry == data().m_threadLocalCounts.end()) return;
     counts = entry->second;
-    m_data->m_threadLocalCounts.erase(entry);
+    data().m_threadLocalCounts.erase(entry);
   }
   int const changed = Internal::firstChangedDepth(*scratch, counts);
-  if (changed >= 0) scratch->truncate(changed);
-  std::lock_guard const lock(m_data->m_threadLocalFreeMutex);
-  m_data->m_freeThreadLocal.push_back(scratch);
+  if (changed >= 0) ContainerBuilder<TraitsT>(*scratch).truncate(changed);
+  std::lock_guard const lock(data().m_threadLocalFreeMutex);
+  data().m_freeThreadLocal.push_back(scratch);
 }
 
 template <class TraitsT> void Container<TraitsT>::clearThreadLocalData(TileLists const* lists) {
   int from = -1;
   for (int d = 0; lists && from < 0 && d <= kMaxDepth; ++d) {
-    if (!(*lists)[static_cast<std::size_t>(d)].empty()) from = d;
+    if (!(*lists)[d].empty()) from = d;
   }
-  returnThreadLocal(from);
+  ContainerBuilder<TraitsT>(*this).returnThreadLocal(from);
 }
 
-template <class TraitsT> void Container<TraitsT>::returnThreadLocal(int fromDepth) {
-  std::map<Container*, Counts> handedOut;
+template <class TraitsT> void ContainerBuilder<TraitsT>::returnThreadLocal(int fromDepth) {
+  std::map<Tree*, Counts> handedOut;
   {
-    std::lock_guard const lock(m_data->m_threadLocalMapMutex);
-    handedOut.swap(m_data->m_threadLocalCounts);
+    std::lock_guard const lock(data().m_threadLocalMapMutex);
+    handedOut.swap(data().m_threadLocalCounts);
   }
   for (auto const& [scratch, counts] : handedOut) {
     int const from = fromDepth >= 0 ? fromDepth : Internal::firstChangedDepth(*scratch, counts);
-    if (from >= 0) scratch->truncate(from);
-    std::lock_guard const lock(m_data->m_threadLocalFreeMutex);
-    m_data->m_freeThreadLocal.push_back(scratch);
+    if (from >= 0) ContainerBuilder(*scratch).truncate(from);
+    std::lock_guard const lock(data().m_threadLocalFreeMutex);
+    data().m_freeThreadLocal.push_back(scratch);
   }
 }
 
-template <class TraitsT> void Container<TraitsT>::truncate(int depth) {
-  m_data->detachTiles();
-  tilesAdded();
+template <class TraitsT> void ContainerBuilder<TraitsT>::truncate(int depth) {
+  data().detachTiles();
+  m_tree.tilesAdded();
   if (depth > 0) {
-    auto& parents = m_data->editTiles(depth - 1);
+    auto& parents = data().editTiles(depth - 1);
     parallelFor(0, parents.size(),
                 [&](std::int64_t begin, std::int64_t end) {
                   for (std::int64_t n = begin; n < end; ++n) {
@@ -104,13 +104,12 @@ template <class TraitsT> void Container<TraitsT>::truncate(int depth) {
                 {.grain = 4096});
   }
   for (int d = depth; d <= kMaxDepth; ++d) {
-    auto const at = static_cast<std::size_t>(d);
-    m_data->m_tileCountTotal -= m_data->m_tileCounts[at];
-    m_data->m_tileCounts[at] = 0;
-    m_data->editTiles(d).clear();
-    if (m_data->m_rootCounts[at] > 0) {
-      m_data->m_rootCounts[at] = 0;
-      std::erase_if(m_data->m_roots, [&](auto const& root) { return root.first.depth == d; });
+    data().m_tileCountTotal -= data().m_tileCounts[d];
+    data().m_tileCounts[d] = 0;
+    data().editTiles(d).clear();
+    if (data().m_rootCounts[d] > 0) {
+      data().m_rootCounts[d] = 0;
+      std::erase_if(data().m_roots, [&](auto const& root) { return root.first.depth == d; });
     }
   }
 }

@@ -1,4 +1,4 @@
-#include "GeometryVolume/tiletree/DerivedCaches.h"
+#include "GeometryVolume/tiletree/DerivedCachesImpl.h"
 
 #include "GeometryVolume/tiletree/TileHalo.h"
 
@@ -151,8 +151,8 @@ template <class TraitsT> Grid computeGrid(Container<TraitsT> const& tree, int ma
 }
 
 template <class TraitsT>
-std::shared_ptr<TileLookupTable<TraitsT> const> computePlaces(Container<TraitsT> const& tree,
-                                                              Grid const& grid) {
+std::shared_ptr<TileLookupTable<TraitsT> const> computeLookupTable(Container<TraitsT> const& tree,
+                                                                   Grid const& grid) {
   using Table = TileLookupTable<TraitsT>;
   int const g = grid.depth, last = std::min(g + Table::kLevels, TraitsT::kMaxDepth);
   for (int d = g; d <= last; ++d) {
@@ -225,7 +225,7 @@ template <class TraitsT>
 void buildAccelerationGrid(Container<TraitsT> const& tree, ContainerData<TraitsT>& data, int maxDepth) {
   Grid grid = computeGrid(tree, maxDepth);
   if (grid.depth < 0) return;
-  auto table = computePlaces(tree, grid);
+  auto table = computeLookupTable(tree, grid);
   data.m_gridOrigin = grid.origin;
   data.m_gridCellWidth = grid.cellWidth;
   data.m_gridExtent = grid.extent;
@@ -238,7 +238,7 @@ void buildAccelerationGrid(Container<TraitsT> const& tree, ContainerData<TraitsT
 template <class TraitsT>
 std::shared_ptr<TileLookupTable<TraitsT> const> buildLookupTable(Container<TraitsT> const& tree) {
   Grid const grid = computeGrid(tree, TraitsT::kMaxDepth);
-  return grid.depth < 0 ? nullptr : computePlaces(tree, grid);
+  return grid.depth < 0 ? nullptr : computeLookupTable(tree, grid);
 }
 
 template <class TraitsT>
@@ -246,7 +246,7 @@ std::shared_ptr<typename ContainerData<TraitsT>::NeighborTable const>
 computeTileNeighbors(Container<TraitsT> const& tree) {
   auto table = std::make_shared<typename ContainerData<TraitsT>::NeighborTable>();
   for (int d = 0; d <= TraitsT::kMaxDepth; ++d) {
-    auto& records = (*table)[static_cast<std::size_t>(d)];
+    auto& records = (*table)[d];
     records.resize(static_cast<std::size_t>(tree.tileCount(d)));
     forEachLiveTile(tree, d, [&](auto const& tile, auto const& accessor) {
       records[static_cast<std::size_t>(tile.index())] = haloOf<TraitsT>(tile, accessor).neighbors;
@@ -260,7 +260,7 @@ std::shared_ptr<typename ContainerData<TraitsT>::HaloTable const>
 computeTileHalos(Container<TraitsT> const& tree) {
   auto table = std::make_shared<typename ContainerData<TraitsT>::HaloTable>();
   for (int d = 0; d <= TraitsT::kMaxDepth; ++d) {
-    auto& records = (*table)[static_cast<std::size_t>(d)];
+    auto& records = (*table)[d];
     records.resize(static_cast<std::size_t>(tree.tileCount(d)));
     forEachLiveTile(tree, d, [&](auto const& tile, auto const& accessor) {
       records[static_cast<std::size_t>(tile.index())] = haloOf<TraitsT>(tile, accessor);
@@ -270,13 +270,13 @@ computeTileHalos(Container<TraitsT> const& tree) {
 }
 
 template <class TraitsT>
-std::shared_ptr<typename ContainerData<TraitsT>::CompressedHaloTable const>
+std::shared_ptr<CompressedHaloTable<TraitsT> const>
 computeCompressedTileHalos(Container<TraitsT> const& tree) {
   constexpr std::int64_t kChunk = 1024; // tiles whose records share one block of bytes
-  auto table = std::make_shared<typename ContainerData<TraitsT>::CompressedHaloTable>();
+  auto table = std::make_shared<CompressedHaloTable<TraitsT>>();
   HaloCompression const compression;
   for (int d = 0; d <= TraitsT::kMaxDepth; ++d) {
-    auto& records = table->records[static_cast<std::size_t>(d)];
+    auto& records = table->records[d];
     std::int64_t const count = tree.tileCount(d);
     records.resize(static_cast<std::size_t>(count));
     std::size_t const firstBlock = table->storage.size();
@@ -297,8 +297,7 @@ computeCompressedTileHalos(Container<TraitsT> const& tree) {
       starts.push_back(block.size());
       for (std::int64_t n = begin; n < end; ++n) {
         auto const at = static_cast<std::size_t>(n - begin);
-        records[static_cast<std::size_t>(n)] = {block.data() + starts[at],
-                                                static_cast<std::uint32_t>(starts[at + 1] - starts[at])};
+        records[n] = {block.data() + starts[at], static_cast<std::uint32_t>(starts[at + 1] - starts[at])};
       }
     });
   }
@@ -325,8 +324,7 @@ template <class TraitsT> int maxTileDistance(Container<TraitsT> const& tree) {
       Container<T> const&);                                                                                  \
   template std::shared_ptr<typename ContainerData<T>::HaloTable const> computeTileHalos(                     \
       Container<T> const&);                                                                                  \
-  template std::shared_ptr<typename ContainerData<T>::CompressedHaloTable const> computeCompressedTileHalos( \
-      Container<T> const&);                                                                                  \
+  template std::shared_ptr<CompressedHaloTable<T> const> computeCompressedTileHalos(Container<T> const&);    \
   template int maxTileDistance(Container<T> const&);
 VLN_FOR_EACH_SHAPE(VLN_INSTANTIATE)
 

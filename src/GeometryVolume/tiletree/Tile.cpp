@@ -1,5 +1,6 @@
 #include "GeometryVolume/tiletree/Tile.h"
 
+#include <algorithm>
 #include <ostream>
 
 namespace VLN::TileTree3D {

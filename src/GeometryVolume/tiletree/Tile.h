@@ -10,7 +10,7 @@
 #include "GeometryVolume/tiletree/Traits.h"
 #include "GeometryVolume/tiletree/TreeIndex.h"
 
-#include <algorithm>
+#include <cstdint>
 #include <iosfwd>
 #include <utility>
 
@@ -36,7 +36,7 @@ public:
       , m_valid(b.m_valid) {
     if (b.m_children) {
       m_children = new std::int64_t[N];
-      std::copy_n(b.m_children, N, m_children);
+      for (int n = 0; n < N; ++n) m_children[n] = b.m_children[n];
     }
   }
   TileBinaryNonCompatible& operator=(TileBinaryNonCompatible b) {
@@ -54,7 +54,7 @@ public:
   /// Makes the child table, all entries -1.
   void initData() {
     if (!m_children) m_children = new std::int64_t[N];
-    std::fill_n(m_children, N, std::int64_t(-1));
+    for (int n = 0; n < N; ++n) m_children[n] = -1;
   }
   /// Marks the tile as dead and frees its child table; the other fields stay readable.
   void invalidate() {
@@ -284,6 +284,8 @@ public:
 
 protected:
   template <class> friend class Container;
+  template <class> friend class ContainerBuilder;
+  template <class> friend class ContainerGrowth;
 
   /// Makes this record a live tile.
   void init(std::int64_t parent, int i, int j, int k, int depth, std::int64_t index) {

@@ -1,7 +1,8 @@
 #include "GeometryVolume/tiletree/TileAccessor.h"
 
-#include "GeometryVolume/tiletree/NeighborSearch.h"
+#include "GeometryVolume/tiletree/NeighborSearchImpl.h"
 
+#include <algorithm>
 #include <bit>
 
 namespace VLN::TileTree3D {
@@ -25,8 +26,7 @@ TreeIndex ConstTileAccessorOf<TraitsT>::findNear(int i, int j, int k, int depth)
     auto const side = [w](int c, int corner) { return c < corner ? 0 : distance(c, corner) < w ? 1 : 2; };
     auto const entry =
         static_cast<std::size_t>(9 * side(i, m_corner.x) + 3 * side(j, m_corner.y) + side(k, m_corner.z));
-    TreeIndex const next =
-        (*table)[static_cast<std::size_t>(m_depth)][static_cast<std::size_t>(m_index)][entry];
+    TreeIndex const next = (*table)[m_depth][static_cast<std::size_t>(m_index)][entry];
     if (next.depth >= 0 && next.depth <= depth && m_container->tile(next).contains(i, j, k)) {
       setCursor(m_container->tile(next));
       return next;
@@ -49,21 +49,20 @@ TreeIndex ConstTileAccessorOf<TraitsT>::findNear(int i, int j, int k, int depth)
   }
   if (common < m_pathTop) {
     // Above the known path: the acceleration grid is the shorter way in; else complete the path upwards.
-    if (m_container->m_data->m_gridDepth >= 0 && depth >= m_container->m_data->m_gridDepth) return {};
+    if (int const grid = m_container->gridDepth(); grid >= 0 && depth >= grid) return {};
     while (m_pathTop > common) {
-      std::int64_t const parent =
-          m_container->tile(m_path[static_cast<std::size_t>(m_pathTop)], m_pathTop).parentIndex();
+      std::int64_t const parent = m_container->tile(m_path[m_pathTop], m_pathTop).parentIndex();
       if (parent < 0) return {};
-      m_path[static_cast<std::size_t>(--m_pathTop)] = parent;
+      m_path[--m_pathTop] = parent;
     }
   }
-  return {m_path[static_cast<std::size_t>(common)], common};
+  return {m_path[common], common};
 }
 
 template <class TraitsT>
 TreeIndex ConstTileAccessorOf<TraitsT>::descend(TreeIndex at, int i, int j, int k, int depth) const {
   if (at.depth < m_pathTop || m_depth < 0) m_pathTop = at.depth;
-  m_path[static_cast<std::size_t>(at.depth)] = at.index;
+  m_path[at.depth] = at.index;
   at = m_container->descend(at, i, j, k, depth, m_path.data());
   m_depth = at.depth, m_index = at.index;
   m_corner = TraitsT::align(int3{i, j, k}, at.depth);
@@ -98,8 +97,7 @@ auto ConstTileAccessorOf<TraitsT>::tileNeighbor(TileType const& t, NeighborDirec
     -> TileType const& {
   if (t.depth() < 0 || t.index() < 0) return invalidTile();
   if (auto const* table = m_container->neighborData()) {
-    TreeIndex const at = (*table)[static_cast<std::size_t>(t.depth())][static_cast<std::size_t>(t.index())]
-                                 [static_cast<std::size_t>(n)];
+    TreeIndex const at = (*table)[t.depth()][static_cast<std::size_t>(t.index())][n];
     return at.valid() ? m_container->tile(at) : m_container->invalidTile();
   }
   return tileNeighbor(t, neighborOffset(n), t.depth(), false);

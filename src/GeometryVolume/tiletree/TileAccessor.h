@@ -97,7 +97,7 @@ public:
 
 protected:
   friend class Container<TraitsT>;
-  friend class NeighborSearch<TraitsT>;
+  template <class> friend class NeighborSearch;
 
   explicit ConstTileAccessorOf(ContainerT const& container, bool countsSearches = true)
       : m_container(&container)
@@ -119,14 +119,14 @@ protected:
   /// Puts the cursor on a tile whose ancestors are not known.
   TileType const& setCursor(TileType const& t) const {
     m_corner = t.tijk(), m_depth = m_pathTop = t.depth(), m_index = t.index();
-    if (m_depth >= 0) m_path[static_cast<std::size_t>(m_depth)] = m_index;
+    if (m_depth >= 0) m_path[m_depth] = m_index;
     return t;
   }
   /// The same for the tile that holds a point.
   void setCursor(TreeIndex const& at, int i, int j, int k) const {
     m_corner = TraitsT::align(int3{i, j, k}, at.depth);
     m_depth = m_pathTop = at.depth, m_index = at.index;
-    m_path[static_cast<std::size_t>(at.depth)] = at.index;
+    m_path[at.depth] = at.index;
   }
   void resetCursor() const { m_corner = {0, 0, 0}, m_depth = m_pathTop = kNoDepth, m_index = -1; }
   /// A tile at or above `depth` that holds the point, from the cursor's neighbours or its path; invalid when
@@ -148,7 +148,7 @@ protected:
   mutable std::int32_t m_pathTop = kNoDepth;
   mutable std::int32_t m_longSearches = 0;
   bool m_countsSearches = true;
-  mutable std::array<std::int64_t, static_cast<std::size_t>(TraitsT::kDepths)> m_path;
+  mutable PerDepth<std::int64_t, TraitsT::kDepths> m_path;
 };
 
 /// Adds tiles as well.

@@ -10,6 +10,7 @@
 #pragma once
 
 #include "GeometryVolume/tiletree/Container.h"
+#include "GeometryVolume/tiletree/HaloWeights.h"
 
 namespace VLN::TileTree3D {
 
@@ -17,7 +18,7 @@ namespace VLN::TileTree3D {
 template <class TraitsT> struct TileHalo {
   TileHalo() { levelDifference.fill(-1); }
 
-  std::array<TreeIndex, kNeighborCount> neighbors;
+  Dense1D::FixedArray<TreeIndex, kNeighborCount> neighbors;
   std::array<std::int8_t, kNeighborCount> levelDifference; ///< 0 same depth, -1 no tile
 };
 
@@ -25,11 +26,6 @@ template <class TraitsT> struct TileHalo {
 struct CompressedTileHalo {
   std::uint8_t const* bytes = nullptr;
   std::uint32_t size = 0;
-};
-
-template <class TraitsT> struct ContainerData<TraitsT>::CompressedHaloTable {
-  std::array<std::vector<CompressedTileHalo>, kDepths> records;
-  std::vector<std::vector<std::uint8_t>> storage;
 };
 
 /// Weight of the coarse sample that holds the first sample of a halo region, in the trilinear read of a

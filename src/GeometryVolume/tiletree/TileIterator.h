@@ -5,7 +5,8 @@
 #include "GeometryVolume/tiletree/Voxel.h"
 
 #include <cstddef>
-#include <iterator>
+#include <cstdint>
+#include <type_traits>
 
 namespace VLN::TileTree3D {
 
@@ -159,7 +160,7 @@ typename Container<TraitsT>::ConstTileIterator Container<TraitsT>::cendTiles() c
 }
 template <class TraitsT>
 typename Container<TraitsT>::TileIterator Container<TraitsT>::beginTiles(std::int64_t n) {
-  m_data->detachTiles();
+  detachTiles();
   TileIterator it(*this);
   it.init(true);
   if (n > 0) it.increment(n);

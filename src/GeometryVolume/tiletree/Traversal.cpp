@@ -1,6 +1,7 @@
-#include "GeometryVolume/tiletree/TraversalEngine.h"
+#include "GeometryVolume/tiletree/TraversalEngineImpl.h"
 
 #include "GeometryVolume/core/Canceller.h"
+#include "GeometryVolume/core/Parallel.h"
 
 #include <deque>
 #include <stdexcept>
@@ -18,7 +19,7 @@ template <class ContainerT> struct Visitor<ContainerT>::Copies {
 };
 
 template <class ContainerT> void Visitor<ContainerT>::initVisitorCopies() {
-  if (!m_copies) m_copies = std::make_shared<Copies>();
+  if (!m_copies) m_copies = Ostil::makePtr<Copies>();
 }
 
 template <class ContainerT> Visitor<ContainerT>* Visitor<ContainerT>::visitorCopy() {
@@ -77,7 +78,7 @@ template <bool IsConst, class TraitsT>
 void TraversalEngine<IsConst, TraitsT>::run(ContainerRef container, VisitorType& visitor, TraversalMode mode,
                                             TraversalRange const& range, VisitorResults results) {
   Canceller::cancelID(Canceller::kTraverse);
-  if constexpr (!IsConst) container.m_data->detachTiles();
+  if constexpr (!IsConst) container.detachTiles();
   if (static_cast<int>(mode) == 9) mode = kBreadthFirst;
   visitor.beginTraverse();
   TraversalEngine(container, visitor, range, results).dispatch(mode);

@@ -3,8 +3,7 @@
 
 #include "GeometryVolume/core/FunctionRef.h"
 #include "GeometryVolume/tiletree/Tile.h"
-
-#include <memory>
+#include "Ostil/Ptr.h"
 
 namespace VLN::TileTree3D {
 
@@ -101,7 +100,7 @@ protected:
 private:
   struct Copies;
 
-  std::shared_ptr<Copies> m_copies;
+  Ostil::Ptr<Copies> m_copies;
   bool m_beginTileOverridden = true;
   bool m_endTileOverridden = true;
 };

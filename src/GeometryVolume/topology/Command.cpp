@@ -2,6 +2,8 @@
 
 #include "GeometryVolume/core/ScopedExtraction.h"
 
+#include <algorithm>
+
 namespace VLN::TileTree3D::Command {
 
 template <int kTW, int kTDW, int A>

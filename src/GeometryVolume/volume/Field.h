@@ -9,6 +9,7 @@
 #pragma once
 
 #include "GeometryVolume/channels/Channel.h"
+#include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/sampling/VoxelSampler.h"
 #include "GeometryVolume/volume/VolumeData.h"
 

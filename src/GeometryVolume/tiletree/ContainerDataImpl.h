@@ -2,15 +2,13 @@
 // changed.
 #pragma once
 
-#include "GeometryVolume/core/FixedArray.h"
 #include "GeometryVolume/core/Parallel.h"
+#include "GeometryVolume/tiletree/Container.h"
 #include "GeometryVolume/tiletree/HaloWeights.h"
-#include "GeometryVolume/tiletree/Tile.h"
-#include "GeometryVolume/tiletree/TileArray.h"
-#include "GeometryVolume/tiletree/TileLookupTable.h"
+#include "GeometryVolume/tiletree/TileArrayImpl.h"
+#include "GeometryVolume/tiletree/TileHalo.h"
 #include "Ostil/Ptr.h"
 
-#include <array>
 #include <atomic>
 #include <map>
 #include <memory>
@@ -19,22 +17,23 @@
 
 namespace VLN::TileTree3D {
 
-template <class TraitsT> class Container;
-template <class TraitsT> struct TileHalo;
-struct CompressedTileHalo;
+/// Packed halos of all tiles, and the bytes that they lie in.
+template <class TraitsT> struct CompressedHaloTable {
+  PerDepth<std::vector<CompressedTileHalo>, TraitsT::kDepths> records;
+  std::vector<std::vector<std::uint8_t>> storage;
+};
 
-template <class TraitsT> struct VLN_API ContainerData {
-  static constexpr int kMaxDepth = TraitsT::kMaxDepth;
-  static constexpr int kDepths = TraitsT::kDepths;
+/// The roots by corner and depth; they never overlap. A point is looked up by aligning it to each depth that
+/// has roots.
+using RootTable = std::map<VoxelCoord, TreeIndex>;
 
-  using TileType = Tile<TraitsT, TraitsT::kTileSize>;
-  using Array = TileArray<TileType>;
-  using UpperArrays = std::array<Array, kMaxDepth>;
-  using Roots = std::map<VoxelCoord, TreeIndex>;
-  using Counts = std::array<std::int64_t, kDepths>;
-  using NeighborTable = std::array<std::vector<Dense1D::FixedArray<TreeIndex, kNeighborCount>>, kDepths>;
-  using HaloTable = std::array<std::vector<TileHalo<TraitsT>>, kDepths>;
-  struct CompressedHaloTable;
+template <class TraitsT> struct VLN_API ContainerData : ContainerTiles<TraitsT> {
+  using Base = ContainerTiles<TraitsT>;
+  using Base::kDepths, Base::kMaxDepth;
+  using typename Base::Array, typename Base::Counts, typename Base::TileType;
+  using UpperArrays = PerDepth<Array, kMaxDepth>;
+  using NeighborTable = typename Container<TraitsT>::NeighborTable;
+  using HaloTable = PerDepth<std::vector<TileHalo<TraitsT>>, kDepths>;
 
   ContainerData();
   /// Shares the tile arrays and the derived caches; scratch containers, mutexes and partitioners start fresh.
@@ -42,9 +41,6 @@ template <class TraitsT> struct VLN_API ContainerData {
   ContainerData& operator=(ContainerData const&) = delete;
   ~ContainerData();
 
-  Array const& tiles(int depth) const { return *m_arrays[static_cast<std::size_t>(depth)]; }
-  /// @pre tilesUnique() holds.
-  Array& editTiles(int depth) { return *m_arrays[static_cast<std::size_t>(depth)]; }
   bool tilesUnique() const { return m_tiles.unique() && m_tilesMaxDepth.unique(); }
   /// Makes the tile arrays private to this data. Every change of a tile goes through it.
   /// @cost Two loads when they are private already.
@@ -65,15 +61,9 @@ template <class TraitsT> struct VLN_API ContainerData {
   Ostil::Ptr<Array> m_tilesMaxDepth; // apart, because these have no child tables
   std::shared_ptr<NeighborTable const> m_neighbors;
   std::shared_ptr<HaloTable const> m_halos;
-  std::shared_ptr<CompressedHaloTable const> m_compressedHalos;
+  std::shared_ptr<CompressedHaloTable<TraitsT> const> m_compressedHalos;
   HaloCompression m_haloCompression;
-
-  /// Roots by corner and depth; they never overlap. A point is looked up by aligning it to each depth that
-  /// has roots.
-  Roots m_roots;
-  Counts m_rootCounts{};
-  Counts m_tileCounts{};
-  std::int64_t m_tileCountTotal = 0;
+  RootTable m_roots;
 
   // Acceleration grid: a dense box of tile indices at one depth.
   std::array<std::int32_t, 3> m_gridSize{0, 0, 0};
@@ -83,22 +73,14 @@ template <class TraitsT> struct VLN_API ContainerData {
   std::int32_t m_gridDepth = -1;
   std::int32_t m_gridCellWidth = 1;
 
-  /// Built with the grid, or by lookups that go far; null where it does not fit. The mutex guards the owner,
-  /// which readers of the tree may set; lookups read the pointer.
+  /// The owner of what m_lookup points to. Readers of the tree may set it; lookups read the pointer alone.
   std::shared_ptr<TileLookupTable<TraitsT> const> m_lookupTable;
-  std::atomic<TileLookupTable<TraitsT> const*> m_lookup{nullptr};
   mutable std::mutex m_lookupMutex;
   /// Long searches since the tree changed; far below 0 where a table has been tried in vain.
   std::atomic<std::int64_t> m_longSearches{0};
   std::atomic_flag m_lookupBusy{};
 
-  float m_voxelSize = 1.0f;
-  float m_voxelSizeInv = 1.0f;
-  float m_maxRelativeRefinementError = 0.0f;
-  bool m_compactOnRemoval = true;
-  TileType m_invalidTile;
-
-  std::array<std::unique_ptr<AffinityPartitioner>, kDepths> m_affinityPartitioners;
+  PerDepth<std::unique_ptr<AffinityPartitioner>, kDepths> m_affinityPartitioners;
   std::atomic<std::int32_t> m_affinityUseCount{0};
 
   // Scratch containers. The first mutex guards the free list and the list of all, the second the bookkeeping;
@@ -111,8 +93,13 @@ template <class TraitsT> struct VLN_API ContainerData {
 
 private:
   void linkArrays();
-
-  std::array<Array*, kDepths> m_arrays;
 };
+
+template <class TraitsT> ContainerData<TraitsT>& Container<TraitsT>::data() {
+  return static_cast<Data&>(*m_data);
+}
+template <class TraitsT> ContainerData<TraitsT> const& Container<TraitsT>::data() const {
+  return static_cast<Data const&>(*m_data);
+}
 
 } // namespace VLN::TileTree3D

@@ -2,15 +2,15 @@
 // the tree.
 #pragma once
 
-#include "GeometryVolume/tiletree/Container.h"
+#include "GeometryVolume/tiletree/ContainerDataImpl.h"
 
 namespace VLN::TileTree3D {
 
-/// The grid, and the table of places with it.
+/// The grid, and the lookup table with it.
 template <class TraitsT>
 void buildAccelerationGrid(Container<TraitsT> const& tree, ContainerData<TraitsT>& data, int maxDepth);
 
-/// The table of places alone; null where no grid or no table fits.
+/// The lookup table alone; null where no grid or no table fits.
 template <class TraitsT>
 std::shared_ptr<TileLookupTable<TraitsT> const> buildLookupTable(Container<TraitsT> const& tree);
 
@@ -23,7 +23,7 @@ std::shared_ptr<typename ContainerData<TraitsT>::HaloTable const>
 computeTileHalos(Container<TraitsT> const& tree);
 
 template <class TraitsT>
-std::shared_ptr<typename ContainerData<TraitsT>::CompressedHaloTable const>
+std::shared_ptr<CompressedHaloTable<TraitsT> const>
 computeCompressedTileHalos(Container<TraitsT> const& tree);
 
 template <class TraitsT> int maxTileDistance(Container<TraitsT> const& tree);

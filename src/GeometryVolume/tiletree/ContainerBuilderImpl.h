@@ -1,0 +1,88 @@
+// ContainerBuilder: the steps by which a container's tiles come and go.
+#pragma once
+
+#include "GeometryVolume/tiletree/ContainerGrowthImpl.h"
+
+#include <vector>
+
+namespace VLN::TileTree3D {
+
+/// @threads As the container's own changes: one thread.
+template <class TraitsT> class ContainerBuilder {
+public:
+  using Tree = Container<TraitsT>;
+  using Data = ContainerData<TraitsT>;
+  using Growth = ContainerGrowth<TraitsT>;
+  using TileType = typename Tree::TileType;
+  using TileLists = typename Tree::TileLists;
+  using Counts = typename Tree::Counts;
+  using ConstTileAccessor = typename Tree::ConstTileAccessor;
+
+  static constexpr int kMaxDepth = TraitsT::kMaxDepth, kTileSize = TraitsT::kTileSize;
+
+  explicit ContainerBuilder(Tree& tree)
+      : m_tree(tree) {}
+
+  TreeIndex addTile(int i, int j, int k, int depth);
+  /// A tile below an existing one, with those between.
+  TreeIndex addTileBelow(TreeIndex above, int i, int j, int k, int depth);
+  void addTilesInBulk(TileLists const& corners, TileLists* newTiles);
+  void refine(Tree const& source, TileLists* newTiles);
+  /// @param lists Becomes what went, sorted.
+  void removeTiles(TileIndexLists& lists, bool withBranch, TileMoves* moves);
+  /// Fills the holes of all dead tiles.
+  void compact(TileMoves* moves);
+  /// Drops the tiles of a depth and of all below.
+  void truncate(int depth);
+  /// Takes all scratch containers back, truncated from a depth on; for -1, from where each gained tiles.
+  void returnThreadLocal(int fromDepth);
+  void setBranchSizes(Cancellation cancellation);
+
+private:
+  /// A new tile without parent: a root, or one that hangs below a coarser tile with tiles between.
+  struct DetachedTile {
+    std::int64_t index;
+    TreeIndex above;
+  };
+  /// A new live tile without parent at the aligned corner.
+  TreeIndex makeTile(int i, int j, int k, int depth);
+  /// Hangs `child` below `parent`, making the tiles between; returns the size of the branch that the parent
+  /// gained, 0 when it went below an existing child.
+  std::int64_t insertChild(TreeIndex parent, TreeIndex child);
+  /// A tile where there is none above.
+  TreeIndex addRootTile(int i, int j, int k, int depth, Growth& growth);
+  /// Grows a depth by `n` tiles, of which the caller runs initLinkedTile() for each index.
+  void allocateUninitialised(int depth, std::int64_t n);
+  /// Makes the tile of a new index and links it to its parent, when that is known (not -1) or found.
+  /// @return false when it has none; `detached` then tells where it belongs.
+  /// @threads Tiles of one depth are made in parallel: each slot belongs to exactly one tile.
+  bool initLinkedTile(std::int64_t index, int depth, int3 const& corner, std::int64_t parent,
+                      ConstTileAccessor const& accessor, DetachedTile& detached);
+  /// Links what initLinkedTile() could not, and lists what is new since the counts were `before`.
+  void linkDetached(int depth, std::vector<std::vector<DetachedTile>> const& parts, Growth& growth,
+                    TileLists* newTiles);
+  /// Appends the corners of all tiles made since the counts were `before`.
+  void listNewTiles(Counts const& before, TileLists* newTiles) const;
+  /// Hangs roots deeper than `depth` below roots of `depth` that hold them.
+  void adoptDeeperRoots(int depth, Growth& growth);
+  /// Adds the tiles of a branch to the counts of their depths, until `budget` of them are counted.
+  void countBranch(TreeIndex const& at, Counts& counts, std::int64_t& budget) const;
+  /// Takes a tile or its branch out of the tree; returns how many tiles died.
+  /// @param removed With room for what dies. @param spareRoots With room for each child that becomes a root.
+  std::int64_t unlinkTile(TreeIndex const& at, bool withBranch, TileIndexLists& removed,
+                          RootTable& spareRoots);
+  std::int64_t invalidateBranch(TreeIndex const& at, TileIndexLists& removed);
+  /// Room in `moves` for each entry of `lists`, so that fillHoles() needs no memory.
+  static void reserveMoves(TileIndexLists const& lists, TileMoves& moves);
+  void fillHoles(TileIndexLists& lists, TileMoves& moves);
+
+  // The tree, as the steps name its parts.
+  Data& data() const { return m_tree.data(); }
+  TileType const& tile(TreeIndex const& at) const { return m_tree.data().tiles(at.depth)[at.index]; }
+  TileType& editTile(TreeIndex const& at) const { return m_tree.data().editTiles(at.depth)[at.index]; }
+  std::int64_t tileCount(int depth) const { return m_tree.tileCount(depth); }
+
+  Tree& m_tree;
+};
+
+} // namespace VLN::TileTree3D
