@@ -2,8 +2,7 @@
 // run. "New" begins with an empty volume, "again" writes into tiles that exist.
 #include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/volume/ForEach.h"
-
-#include <openvdb/openvdb.h>
+#include "Interop/VdbTypesImpl.h"
 
 #include <benchmark/benchmark.h>
 

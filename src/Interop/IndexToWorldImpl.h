@@ -1,8 +1,7 @@
 #pragma once
 
 #include "Interop/IndexToWorld.h"
-
-#include <openvdb/openvdb.h>
+#include "Interop/VdbTypesImpl.h"
 
 namespace VLN::Interop {
 

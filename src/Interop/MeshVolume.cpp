@@ -1,6 +1,7 @@
 #include "Interop/FileError.h"
 #include "Interop/Mesh.h"
 #include "Interop/OutputFile.h"
+#include "Interop/VdbExportImpl.h"
 #include "Interop/VdbImportImpl.h"
 
 #include "GeometryVolume/pools/ChannelPool.h"

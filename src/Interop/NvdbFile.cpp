@@ -13,6 +13,7 @@
 #include "Interop/GuardedReadImpl.h"
 #include "Interop/OutputFile.h"
 #include "Interop/RegularFileImpl.h"
+#include "Interop/VdbExportImpl.h"
 #include "Interop/VdbImportImpl.h"
 
 #define NANOVDB_USE_TBB

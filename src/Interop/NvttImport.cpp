@@ -110,9 +110,9 @@ private:
           throw FileError(m_path, "its volume needs more than " + std::to_string(memoryBytes / 1000000) +
                                       " MB of memory");
         for (int n = 0; n < across * across * across; ++n)
-          m_corners[static_cast<std::size_t>(tile.depth + level)].append(
-              int3{tile.corner.x + n % across * width, tile.corner.y + n / across % across * width,
-                   tile.corner.z + n / across / across * width});
+          m_corners[tile.depth + level].append(int3{tile.corner.x + n % across * width,
+                                                    tile.corner.y + n / across % across * width,
+                                                    tile.corner.z + n / across / across * width});
       }
     });
   }

@@ -78,7 +78,7 @@ Placement placePoints(std::vector<float3> const& positions) {
   if (box.empty()) return result;
   // The roots; what lies between comes with the bulk addition.
   int const top = rootDepthOf(box);
-  auto& roots = result.corners[static_cast<std::size_t>(top)];
+  auto& roots = result.corners[top];
   for (std::size_t n = 0; top < kDeepest && n < deepest.size(); ++n) {
     int3 const& p = deepest[n];
     int3 const root{PointTraits::align(p.x, top), PointTraits::align(p.y, top), PointTraits::align(p.z, top)};

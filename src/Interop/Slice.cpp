@@ -275,7 +275,7 @@ struct CoarsenedVolume {
     for (auto it = from.cbeginRoots(); it != from.cendRoots(); ++it) {
       int3 const p = it->first.ijk();
       if (it->second.depth > depth)
-        corners[static_cast<std::size_t>(depth)].append(
+        corners[depth].append(
             {VdbTraits::align(p.x, depth), VdbTraits::align(p.y, depth), VdbTraits::align(p.z, depth)});
     }
     tree.tileAccessor().addTiles(corners);

@@ -2,7 +2,7 @@
 
 #include "Interop/ChannelValues.h"
 #include "Interop/IndexToWorldImpl.h"
-#include "Interop/VdbGridImpl.h"
+#include "Interop/VdbGridSourceImpl.h"
 #include "Interop/VdbRecord.h"
 
 #include <sstream>

@@ -1,8 +1,8 @@
 #include "Interop/VdbExport.h"
 
 #include "Interop/IndexToWorldImpl.h"
-#include "Interop/VdbGridImpl.h"
-#include "Interop/VdbImportImpl.h"
+#include "Interop/VdbExportImpl.h"
+#include "Interop/VdbGridMakeImpl.h"
 #include "Interop/VdbMaskImpl.h"
 #include "Interop/VdbRecord.h"
 #include "Interop/VdbWriteImpl.h"
@@ -25,6 +25,11 @@ void readMetadata(std::string const& bytes, openvdb::MetaMap& into) {
   try {
     into.readMeta(in);
   } catch (std::exception const&) { throw std::runtime_error("stored metadata cannot be read"); }
+}
+
+openvdb::GridBase::Ptr makeGrid(std::string const& type, GridToWrite const& from) {
+  auto grid = makeScalarGrid(type, from);
+  return grid ? grid : makeVectorGrid(type, from);
 }
 
 openvdb::GridBase::Ptr toGrid(Object const& object, VdbGridRecord const& record) {

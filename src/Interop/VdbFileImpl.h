@@ -2,8 +2,7 @@
 #pragma once
 
 #include "Interop/VdbFile.h"
-
-#include <openvdb/openvdb.h>
+#include "Interop/VdbTypesImpl.h"
 
 #include <vector>
 

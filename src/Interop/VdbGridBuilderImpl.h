@@ -2,6 +2,7 @@
 #pragma once
 
 #include "GeometryVolume/core/Parallel.h"
+#include "Interop/VdbGridMakeImpl.h"
 #include "Interop/VdbGridNodesImpl.h"
 
 #include <algorithm>

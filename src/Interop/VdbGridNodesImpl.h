@@ -1,7 +1,8 @@
 // The values and the nodes of a file's tree, as import and export see them.
 #pragma once
 
-#include "Interop/VdbGridImpl.h"
+#include "Interop/VdbRecord.h"
+#include "Interop/VdbTreeImpl.h"
 
 #include <cmath>
 #include <cstring>
@@ -95,11 +96,6 @@ inline bool fitsTheTree(Coord const& corner, int width) {
     if (!VdbTraits::inDomain(corner[a]) || (corner[a] & (width - 1)) != 0) return false;
   }
   return true;
-}
-
-inline void growBy(IndexBox& box, Coord const& corner, int width) {
-  box.grow(toInt3(corner));
-  box.grow(toInt3(corner.offsetBy(width)));
 }
 
 inline int3 alignTo(int3 const& c, int depth) {

@@ -2,6 +2,7 @@
 #pragma once
 
 #include "GeometryVolume/core/Parallel.h"
+#include "Interop/VdbGridSourceImpl.h"
 #include "Interop/VdbLeafImpl.h"
 
 #include <algorithm>
@@ -47,7 +48,7 @@ public:
   }
 
   void collectTiles(int rootDepth, std::uint64_t mostTiles, TileCorners& corners) const override {
-    auto at = [&](int depth) -> std::vector<int3>& { return corners[static_cast<std::size_t>(depth)]; };
+    auto at = [&](int depth) -> std::vector<int3>& { return corners[depth]; };
     constexpr int kWidestDepth = depthOfSamples(kNodeWidths[2]);
     bool const leavesHaveTile = rootDepth < VdbTraits::kMaxDepth;
 

@@ -127,6 +127,42 @@ std::string metadataBytes(openvdb::MetaMap const& metadata) {
   return out.str();
 }
 
+// Makes and fills the channels of a volume, and tells of each in it; returns what the way back needs.
+Ostil::Array<VdbGridRecord> addChannels(Group const& group, VLN::Object& object, Container const& container,
+                                        Topology const& topology, VdbVolume& volume,
+                                        VLN::FunctionRef<void(double share)> filledShare) {
+  // Components and plain properties share one set of names.
+  std::set<std::string> taken{kVdbContainerName, kVdbTopologyName, kVdbGridsProperty, kVdbTransformProperty,
+                              kVdbMetadataProperty};
+  double const tilesToFill = double(container.tileCount(-1)) * double(group.grids.size());
+  double filled = 0;
+  // Grids come first to their names, channels of states after them.
+  std::vector<std::string> names;
+  for (auto const& source : group.grids) names.push_back(freeName(source->grid().getName(), taken));
+  Ostil::Array<VdbGridRecord> records;
+  for (std::size_t n = 0; n < group.grids.size(); ++n) {
+    GridSource const& source = *group.grids[n];
+    openvdb::GridBase const& grid = source.grid();
+    GridSummary const& summary = group.summaries[n];
+    std::string const& name = names[n];
+    object.addComponent(source.makeChannel(name, container, topology, [&](std::int64_t tiles) {
+      filled += double(tiles);
+      filledShare(filled / tilesToFill);
+    }));
+    VdbGridRecord record{name, group.types[n], source.activeRule(), "", metadataBytes(grid)};
+    if (record.rule == VdbActiveRule::kChannel) {
+      record.stateChannel = freeName(name + "_active", taken);
+      object.addComponent(source.makeStateChannel(record.stateChannel, container, topology));
+    }
+    records.append(record);
+    volume.channels.push_back({name, grid.getName(), group.types[n], 4, 0, summary.activeVoxels,
+                               summary.minimum, summary.maximum, summary.hasRange, summary.active});
+    if (!summary.active.empty())
+      volume.activeBox.grow(summary.active.min), volume.activeBox.grow(summary.active.max);
+  }
+  return records;
+}
+
 // `memoryLeft` falls by what the volume takes.
 VdbVolume buildVolume(VdbFile const& file, Group const& group, std::uint64_t& memoryLeft,
                       Progress const& progress, double from, double to) {
@@ -139,7 +175,7 @@ VdbVolume buildVolume(VdbFile const& file, Group const& group, std::uint64_t& me
   std::uint64_t const mostTiles = memoryLeft / 2 / bytesFor(1, group);
   for (auto const& grid : group.grids) grid->collectTiles(root, mostTiles, corners);
   completeCorners(corners, root);
-  addRootsBeyond(corners[static_cast<std::size_t>(root)], group, root);
+  addRootsBeyond(corners[root], group, root);
   std::uint64_t const bytes = bytesFor(countOf(corners), group);
   checkMemory(file, bytes, memoryLeft);
   memoryLeft -= bytes;
@@ -158,36 +194,11 @@ VdbVolume buildVolume(VdbFile const& file, Group const& group, std::uint64_t& me
   auto topology = object->extractComponent<Topology>(kVdbTopologyName);
   topology->update(*container);
 
-  // Components and plain properties share one set of names.
-  std::set<std::string> taken{kVdbContainerName, kVdbTopologyName, kVdbGridsProperty, kVdbTransformProperty,
-                              kVdbMetadataProperty};
-  double const tilesToFill = double(container->tileCount(-1)) * double(group.grids.size());
-  double filled = 0;
-  // Grids come first to their names, channels of states after them.
-  std::vector<std::string> names;
-  for (auto const& source : group.grids) names.push_back(freeName(source->grid().getName(), taken));
-  Ostil::Array<VdbGridRecord> records;
-  for (std::size_t n = 0; n < group.grids.size(); ++n) {
-    GridSource const& source = *group.grids[n];
-    openvdb::GridBase const& grid = source.grid();
-    GridSummary const& summary = group.summaries[n];
-    std::string const& name = names[n];
-    object->addComponent(source.makeChannel(name, *container, *topology, [&](std::int64_t tiles) {
-      filled += double(tiles);
-      report(progress, "filling the channels", from + (to - from) * filled / tilesToFill);
-    }));
-    VdbGridRecord record{name, group.types[n], source.activeRule(), "", metadataBytes(grid)};
-    if (record.rule == VdbActiveRule::kChannel) {
-      record.stateChannel = freeName(name + "_active", taken);
-      object->addComponent(source.makeStateChannel(record.stateChannel, *container, *topology));
-    }
-    records.append(record);
-    volume.channels.push_back({name, grid.getName(), group.types[n], 4, 0, summary.activeVoxels,
-                               summary.minimum, summary.maximum, summary.hasRange, summary.active});
-    if (!summary.active.empty())
-      volume.activeBox.grow(summary.active.min), volume.activeBox.grow(summary.active.max);
-  }
-  object->setProperty(kVdbGridsProperty, Ostil::Any(std::move(records)));
+  object->setProperty(
+      kVdbGridsProperty,
+      Ostil::Any(addChannels(group, *object, *container, *topology, volume, [&](double share) {
+        report(progress, "filling the channels", from + (to - from) * share);
+      })));
   object->setProperty(kVdbTransformProperty, Ostil::Any(Ostil::String(volume.indexToWorld.bytes())));
   if (file.metadata)
     object->setProperty(kVdbMetadataProperty, Ostil::Any(Ostil::String(metadataBytes(*file.metadata))));

@@ -2,7 +2,7 @@
 #pragma once
 
 #include "Interop/VdbFileImpl.h"
-#include "Interop/VdbGridImpl.h"
+#include "Interop/VdbGridSourceImpl.h"
 #include "Interop/VdbImport.h"
 
 namespace VLN::Interop {
@@ -14,13 +14,9 @@ VLN_API VdbImport importGrids(VdbFile const& file, Progress const& progress = {}
 /// @error FileError for a filter that is none.
 VdbImport importGrids(VdbFile& file, VdbReadLimits const& limits, Progress const& progress);
 
-/// The grids of volumes that importGrids() made, points aside, as they are written.
-openvdb::GridPtrVec exportedGrids(VdbImport const& content, Progress const& progress = {});
-
 /// A volume for each points grid of the file. Those that cannot come in are named as skipped.
 std::vector<PointVolume> importPointGrids(VdbFile const& file, std::vector<SkippedGrid>& skipped);
 bool isPointGrid(openvdb::GridBase const& grid);
-openvdb::GridBase::Ptr makePointsGrid(PointSet const& points, std::string const& name);
 
 /// Empty when the transform is one uniform scale along the axes; otherwise what it is, on one line.
 std::string transformBesidesScale(openvdb::math::Transform const& transform);

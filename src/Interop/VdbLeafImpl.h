@@ -5,6 +5,7 @@
 #pragma once
 
 #include "Interop/VdbGridNodesImpl.h"
+#include "Interop/VdbImport.h"
 
 #include <algorithm>
 #include <bit>
@@ -13,6 +14,11 @@
 namespace VLN::Interop {
 
 inline constexpr int kLeafWidth = 8, kBlockWidth = 4;
+
+inline void growBy(IndexBox& box, Coord const& corner, int width) {
+  box.grow(toInt3(corner));
+  box.grow(toInt3(corner.offsetBy(width)));
+}
 
 /// The voxels of a leaf as an array. Those of a bool leaf, which are bits, are copied for it.
 template <class LeafT> class LeafValues {

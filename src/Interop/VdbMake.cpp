@@ -3,9 +3,9 @@
 #include "GeometryVolume/core/Parallel.h"
 #include "Interop/FileError.h"
 #include "Interop/NoiseImpl.h"
+#include "Interop/VdbTypesImpl.h"
 #include "Interop/VdbWriteImpl.h"
 
-#include <openvdb/openvdb.h>
 #include <openvdb/tools/SignedFloodFill.h>
 
 #include <algorithm>

@@ -1,7 +1,7 @@
 // Grids of masks travel as grids of bools whose active values are true.
 #pragma once
 
-#include <openvdb/openvdb.h>
+#include "Interop/VdbTypesImpl.h"
 
 #include <string>
 

@@ -2,6 +2,7 @@
 
 #include "Interop/FileError.h"
 #include "Interop/OutputFile.h"
+#include "Interop/VdbExportImpl.h"
 #include "Interop/VdbFileImpl.h"
 #include "Interop/VdbImportImpl.h"
 #include "Interop/VdbWriteImpl.h"

@@ -6,9 +6,8 @@
 #include "Interop/Flatten.h"
 #include "Interop/NvttWrite.h"
 #include "Interop/VdbRecord.h"
+#include "Interop/VdbTypesImpl.h"
 #include "Interop/VolumeExport.h"
-
-#include <openvdb/openvdb.h>
 
 #include <algorithm>
 #include <sstream>

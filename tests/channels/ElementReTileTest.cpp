@@ -60,15 +60,19 @@ TYPED_TEST(ReTile, AnObjectWithoutPointsIsLeftAlone) {
 
 TYPED_TEST(ReTile, NegativePositionsRoundDown) {
   PointCloud<TypeParam> cloud(1.0f);
-  VoxelCoord const home = this->deepest(100, 100, 100), below = this->deepest(-1, -1, -1),
-                   above = this->deepest(0, 0, 0);
+  // A border of tiles at or below 0, where truncation would round up: 0 in one shape, -2 in the other.
+  VoxelCoord const home = this->deepest(100, 100, 100), above = this->deepest(0, 0, 0);
+  VoxelCoord const below = this->deepest(above.i - 1, above.j - 1, above.k - 1);
+  ASSERT_LE(above.i, 0);
   cloud.addTiles({home, below, above});
-  cloud.addPoint(home, {-0.5f, -0.5f, -0.5f});
-  cloud.addPoint(home, {0.5f, 0.5f, 0.5f});
+  auto const corner = static_cast<float>(above.i);
+  cloud.addPoint(home, {corner - 0.5f, corner - 0.5f, corner - 0.5f});
+  cloud.addPoint(home, {corner + 0.5f, corner + 0.5f, corner + 0.5f});
   cloud.counted();
   cloud.reTile(false);
   cloud.check();
-  EXPECT_EQ(cloud.points[below].size(), TypeParam::kTW == 2 ? 1u : cloud.points[below].size());
+  EXPECT_EQ(cloud.points[below].size(), 1u);
+  EXPECT_EQ(cloud.points[above].size(), 1u);
   EXPECT_EQ(cloud.pointCount(), 2u);
 }
 

@@ -2,10 +2,10 @@
 #include "Interop/FileError.h"
 #include "Interop/VdbExport.h"
 #include "Interop/VdbMake.h"
+#include "Interop/VdbTypesImpl.h"
 #include "support/TempFolder.h"
 
 #include <gtest/gtest.h>
-#include <openvdb/openvdb.h>
 
 namespace {
 

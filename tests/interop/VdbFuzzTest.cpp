@@ -1,10 +1,9 @@
 // Replays the fuzzer's .vdb files without the fuzzer: small files of every type of grid, and mutations of
 // them. They are not compressed, so that a changed byte is a changed number.
 #include "Interop/VdbPoints.h"
+#include "Interop/VdbTypesImpl.h"
 #include "support/FuzzReplay.h"
 #include "support/VdbCase.h"
-
-#include <openvdb/openvdb.h>
 
 namespace {
 

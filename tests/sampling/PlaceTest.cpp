@@ -114,6 +114,30 @@ TYPED_TEST(PlaceTest, NothingThere) {
   EXPECT_FALSE(place(empty, {0, 0, 0}).found);
 }
 
+// regression: what a sampler remembers of a coarse tile answers no request above the tree
+TYPED_TEST(PlaceTest, RegressionNothingIsRememberedAboveTheTree) {
+  using Traits = TypeParam;
+  SamplerVolume<Traits> volume;
+  constexpr int kCoarse = Traits::kMaxDepth - 2;
+  volume.add({0, 0, 0}, kCoarse, kCoarse);
+  auto const& coarse = std::as_const(volume.tree).tile(0, kCoarse);
+  int3 const low = coarse.tijk(), high = coarse.childTIJK({Traits::kTW - 1, 0, 0});
+  volume.add(high, Traits::kMaxDepth, Traits::kMaxDepth);
+  VoxelSampler<Traits, float, float3> const sampler(volume.tree, volume.topology);
+  auto const find = [&](int3 const& p, int depth) {
+    TreeIndex at;
+    int3 ijk;
+    float3 weights;
+    sampler.prepareToSample({float(p.x), float(p.y), float(p.z)}, kSamplerTileSpace, at, ijk, weights, depth,
+                            nullptr);
+    return at;
+  };
+  ASSERT_EQ(find(low, Traits::kMaxDepth).depth, kCoarse);
+  ASSERT_EQ(find(high, Traits::kMaxDepth).depth, Traits::kMaxDepth);
+  for (int const depth : {-1, std::numeric_limits<int>::min()})
+    EXPECT_EQ(find(low, depth), TreeIndex{}) << depth;
+}
+
 // requirement: world space is scaled, any other is tile space; a voxel size of 0 maps all to the origin
 TYPED_TEST(PlaceTest, Spaces) {
   using Traits = TypeParam;

@@ -2,7 +2,7 @@
 // every sample and gradient is known.
 #pragma once
 
-#include <openvdb/openvdb.h>
+#include "Interop/VdbTypesImpl.h"
 
 namespace VLN::Test {
 

@@ -1,7 +1,7 @@
 // Compares two OpenVDB grids by OpenVDB alone: what differs, in words; empty when nothing does.
 #pragma once
 
-#include <openvdb/openvdb.h>
+#include "Interop/VdbTypesImpl.h"
 
 #include <cstring>
 #include <sstream>

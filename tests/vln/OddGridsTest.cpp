@@ -1,8 +1,8 @@
 // Files with grids beyond those of floats.
+#include "Interop/VdbTypesImpl.h"
 #include "support/VdbCompare.h"
 #include "support/VlnProgram.h"
 
-#include <openvdb/openvdb.h>
 #include <openvdb/points/PointConversion.h>
 
 namespace {

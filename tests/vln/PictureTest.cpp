@@ -1,9 +1,8 @@
 // Pictures of grids as people have them, judged by their pixels.
+#include "Interop/VdbTypesImpl.h"
 #include "support/PngReader.h"
 #include "support/TurnedRamp.h"
 #include "support/VlnProgram.h"
-
-#include <openvdb/openvdb.h>
 
 #include <cmath>
 #include <limits>

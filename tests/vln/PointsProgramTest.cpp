@@ -1,8 +1,7 @@
 // The commands on points, run as processes.
 #include "Interop/Ply.h"
+#include "Interop/VdbTypesImpl.h"
 #include "support/VlnProgram.h"
-
-#include <openvdb/openvdb.h>
 
 #include <algorithm>
 #include <cmath>

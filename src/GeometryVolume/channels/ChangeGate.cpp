@@ -1,4 +1,4 @@
-#include "GeometryVolume/channels/ChangeGate.h"
+#include "GeometryVolume/channels/detail/ChangeGate.h"
 
 #include <atomic>
 

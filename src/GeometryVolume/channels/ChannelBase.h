@@ -1,10 +1,10 @@
 // ChannelBase: a channel without its element type, as objects and the update protocol handle it.
 #pragma once
 
-#include "GeometryVolume/channels/ChangeGate.h"
 #include "GeometryVolume/channels/ChannelTypes.h"
 #include "GeometryVolume/channels/ElementMoves.h"
 #include "GeometryVolume/channels/TileDataElementAccessor.h"
+#include "GeometryVolume/channels/detail/ChangeGate.h"
 #include "Ostil/Any.h"
 #include "Ostil/Ptr.h"
 

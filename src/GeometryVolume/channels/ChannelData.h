@@ -8,8 +8,8 @@
 // the storage that lives in them: whoever leaves a storage that others still hold leaves its blocks there.
 #pragma once
 
-#include "GeometryVolume/channels/ChannelPlan.h"
 #include "GeometryVolume/channels/ChannelTypes.h"
+#include "GeometryVolume/channels/detail/ChannelPlan.h"
 #include "GeometryVolume/core/Export.h"
 #include "GeometryVolume/core/FixedArray.h"
 #include "GeometryVolume/core/FunctionRef.h"

@@ -160,7 +160,7 @@ template <class T> void ChannelData<T>::separateWithout(int skipFirst, int skipL
   auto const old = m_data;
   auto const counts = m_tileCounts;
   auto const values = [&](int d, std::int64_t i) -> T const* {
-    return (*old)[static_cast<std::size_t>(d)][static_cast<std::size_t>(i)].data();
+    return (*old)[d][static_cast<std::size_t>(i)].data();
   };
   rebuild(*old, counts, values, skipFirst, skipLast);
 }
@@ -176,7 +176,7 @@ template <class T> void ChannelData<T>::deepCopy(ChannelData const& source) {
     return replaceStorage(nullptr, none);
   }
   auto const values = [&](int d, std::int64_t i) -> T const* {
-    return (*old)[static_cast<std::size_t>(d)][static_cast<std::size_t>(i)].data();
+    return (*old)[d][static_cast<std::size_t>(i)].data();
   };
   rebuild(*old, Counts(source.m_tileCounts), values, 0, -1);
 }

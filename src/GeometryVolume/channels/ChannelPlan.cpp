@@ -1,4 +1,4 @@
-#include "GeometryVolume/channels/ChannelPlan.h"
+#include "GeometryVolume/channels/detail/ChannelPlan.h"
 
 #include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/pools/ChannelMemoryPool.h"
@@ -85,7 +85,7 @@ TileSlots planSlots(int first, int last, DepthCounts const& counts,
                     FunctionRef<std::int64_t(std::size_t)> slotOf) {
   TileSlots slots;
   for (int d = first; d <= last; ++d) {
-    auto& list = slots.offsets[static_cast<std::size_t>(d)];
+    auto& list = slots.offsets[d];
     std::int64_t const n = counts[static_cast<std::size_t>(d)];
     list.reserve(static_cast<std::size_t>(n));
     for (std::int64_t i = 0; i < n; ++i) {

@@ -2,8 +2,8 @@
 // it is.
 #pragma once
 
-#include "GeometryVolume/channels/BlockCursor.h"
 #include "GeometryVolume/channels/Channel.h"
+#include "GeometryVolume/channels/detail/BlockCursor.h"
 
 namespace VLN::TileTree3D {
 
@@ -51,7 +51,7 @@ private:
   /// Null for a tile that the channel lacks, or that has fewer elements than a whole one.
   static value_type const* elements(ChannelT const& channel, TreeIndex const& at) {
     if (!channel.tileArrays() || at.depth < channel.minDepth() || at.depth > channel.depth()) return nullptr;
-    auto const& tiles = (*channel.tileArrays())[static_cast<std::size_t>(at.depth)];
+    auto const& tiles = (*channel.tileArrays())[at.depth];
     auto const n = static_cast<std::size_t>(at.index);
     return n < tiles.size() && tiles[n].size() >= std::size_t(ChannelT::kSize) ? tiles[n].data() : nullptr;
   }

@@ -2,7 +2,7 @@
 #pragma once
 
 #include "GeometryVolume/channels/ChannelData.h"
-#include "GeometryVolume/channels/TileVectorOps.h"
+#include "GeometryVolume/channels/detail/TileVectorOps.h"
 #include "GeometryVolume/core/Parallel.h"
 
 #include <algorithm>
@@ -178,14 +178,38 @@ void ChannelData<T>::moveTiles(TileRemovalList const& removed, FunctionRef<std::
   });
 }
 
+namespace Internal {
+
+/// The tiles of a storage in a new order. Where the order names no tile there is an empty one.
+template <class T> class PermutedTiles {
+public:
+  PermutedTiles(TileArrays<T>& tiles, TilePermutation const& newToOld, int lastDepth)
+      : m_tiles(tiles)
+      , m_newToOld(newToOld)
+      , m_lastDepth(lastDepth) {}
+
+  TileVector<T>& operator()(int depth, std::int64_t n) const {
+    static TileVector<T> const none;
+    auto at = static_cast<std::size_t>(n);
+    if (depth <= m_lastDepth) {
+      auto const& list = m_newToOld[static_cast<std::size_t>(depth)];
+      if (at < list.size()) at = static_cast<std::size_t>(list[at]); // below 0: beyond every tile
+    }
+    auto& tiles = m_tiles[depth];
+    return at < tiles.size() ? tiles[at] : const_cast<TileVector<T>&>(none);
+  }
+
+private:
+  TileArrays<T>& m_tiles;
+  TilePermutation const& m_newToOld;
+  int m_lastDepth;
+};
+
+} // namespace Internal
+
 template <class T> bool ChannelData<T>::permuteTiles(TilePermutation const& newToOld) {
   if (!m_data) return false;
   int const last = std::min(lastDepth(), static_cast<int>(newToOld.size()) - 1);
-  auto const oldIndex = [&](int d, std::int64_t i) -> std::int64_t {
-    if (d > last) return i;
-    auto const& list = newToOld[static_cast<std::size_t>(d)];
-    return i < static_cast<std::int64_t>(list.size()) ? list[static_cast<std::size_t>(i)] : i;
-  };
   bool const any = std::any_of(newToOld.begin(), newToOld.begin() + std::max(0, last + 1),
                                [](auto const& list) { return !list.empty(); });
   if (!any && !m_useStaticAllocation) return false;
@@ -196,13 +220,7 @@ template <class T> bool ChannelData<T>::permuteTiles(TilePermutation const& newT
                      Internal::isPermutation(newToOld, firstDepth(), last, m_tileCounts);
 
   auto const old = m_data;
-  auto const source = [&](int d, std::int64_t i) -> Vector& {
-    static Vector const none;
-    std::int64_t const at = oldIndex(d, i);
-    auto& tiles = (*old)[static_cast<std::size_t>(d)];
-    return at >= 0 && at < static_cast<std::int64_t>(tiles.size()) ? tiles[static_cast<std::size_t>(at)]
-                                                                   : const_cast<Vector&>(none);
-  };
+  Internal::PermutedTiles<T> const source(*old, newToOld, last);
   Internal::TileSlots slots;
   if (m_useStaticAllocation)
     slots = Internal::planSlots(
@@ -213,14 +231,12 @@ template <class T> bool ChannelData<T>::permuteTiles(TilePermutation const& newT
   if (slots.total > 0 && !block) return false;
 
   auto fresh = Ostil::makePtr<TileStorage<T>>();
-  Internal::forEachDepth(firstDepth(), lastDepth(), [&](int d) {
-    (*fresh)[static_cast<std::size_t>(d)].resize(static_cast<std::size_t>(count(d)));
-  });
+  Internal::forEachDepth(firstDepth(), lastDepth(),
+                         [&](int d) { (*fresh)[d].resize(static_cast<std::size_t>(count(d))); });
   allTiles().forEach(Internal::tileGrain(tileBytes()), [&](int d, std::int64_t begin, std::int64_t end) {
-    auto const depth = static_cast<std::size_t>(d);
     for (auto i = begin; i < end; ++i) {
       Vector& from = source(d, i);
-      Vector& to = (*fresh)[depth][static_cast<std::size_t>(i)];
+      Vector& to = (*fresh)[d][static_cast<std::size_t>(i)];
       if (steal) {
         to.swap(from);
       } else if (!from.empty()) {

@@ -3,7 +3,7 @@
 
 #include "GeometryVolume/channels/ChannelData.h"
 #include "GeometryVolume/channels/ElementMoves.h"
-#include "GeometryVolume/channels/TileVectorOps.h"
+#include "GeometryVolume/channels/detail/TileVectorOps.h"
 #include "GeometryVolume/core/Parallel.h"
 
 #include <algorithm>

@@ -2,9 +2,9 @@
 #pragma once
 
 #include "GeometryVolume/channels/ChannelData.h"
-#include "GeometryVolume/channels/ElementOps.h"
+#include "GeometryVolume/channels/ElementOpsTableImpl.h"
 #include "GeometryVolume/channels/ElementTraits.h"
-#include "GeometryVolume/core/SimdLanes.h"
+#include "GeometryVolume/core/detail/SimdLanes.h"
 
 #include <algorithm>
 #include <cstring>

@@ -106,10 +106,10 @@ void collectTiles(Container<TraitsT>& scratch, typename Container<TraitsT>::Tile
     return std::tie(a.x, a.y, a.z) < std::tie(b.x, b.y, b.z);
   };
   for (int d = TraitsT::kMaxDepth; d > 0; --d) {
-    auto& list = corners[static_cast<std::size_t>(d)];
+    auto& list = corners[d];
     std::sort(list.begin(), list.end(), less);
     list.resize(static_cast<std::uint64_t>(std::unique(list.begin(), list.end()) - list.begin()));
-    auto& above = corners[static_cast<std::size_t>(d - 1)];
+    auto& above = corners[d - 1];
     for (int3 const& p : list) {
       int3 const corner = TraitsT::align(p, d - 1);
       if (above.empty() || above.back() != corner) above.append(corner);

@@ -1,4 +1,4 @@
-#include "GeometryVolume/channels/HaloDriver.h"
+#include "GeometryVolume/channels/HaloDriverImpl.h"
 
 #include <algorithm>
 #include <bit>

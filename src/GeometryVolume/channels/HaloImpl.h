@@ -2,7 +2,7 @@
 #pragma once
 
 #include "GeometryVolume/channels/Halo.h"
-#include "GeometryVolume/channels/HaloDriver.h"
+#include "GeometryVolume/channels/HaloDriverImpl.h"
 #include "GeometryVolume/channels/UntypedTilesImpl.h"
 
 namespace VLN::TileTree3D {

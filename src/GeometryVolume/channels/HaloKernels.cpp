@@ -1,4 +1,4 @@
-#include "GeometryVolume/channels/HaloKernels.h"
+#include "GeometryVolume/channels/HaloKernelsImpl.h"
 
 #include <algorithm>
 #include <cassert>

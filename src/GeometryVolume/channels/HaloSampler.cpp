@@ -1,4 +1,4 @@
-#include "GeometryVolume/channels/HaloSampler.h"
+#include "GeometryVolume/channels/HaloSamplerImpl.h"
 
 #include <algorithm>
 #include <cmath>

@@ -1,4 +1,4 @@
-#include "GeometryVolume/channels/NonLeafDriver.h"
+#include "GeometryVolume/channels/NonLeafDriverImpl.h"
 
 #include "GeometryVolume/core/Parallel.h"
 

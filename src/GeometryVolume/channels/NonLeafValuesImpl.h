@@ -1,7 +1,7 @@
 // Definitions of the non-leaf functions. Only the generated sources include this.
 #pragma once
 
-#include "GeometryVolume/channels/NonLeafDriver.h"
+#include "GeometryVolume/channels/NonLeafDriverImpl.h"
 #include "GeometryVolume/channels/NonLeafValues.h"
 #include "GeometryVolume/channels/UntypedTilesImpl.h"
 

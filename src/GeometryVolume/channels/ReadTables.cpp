@@ -1,4 +1,4 @@
-#include "GeometryVolume/channels/ReadTables.h"
+#include "GeometryVolume/channels/detail/ReadTables.h"
 
 #include <algorithm>
 #include <limits>

@@ -1,7 +1,7 @@
 // SharedReadTables: made by the first of several readers of a channel for which they pay.
 #pragma once
 
-#include "GeometryVolume/channels/ReadTables.h"
+#include "GeometryVolume/channels/detail/ReadTables.h"
 
 #include <atomic>
 #include <memory>

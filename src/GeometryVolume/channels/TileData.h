@@ -12,7 +12,7 @@
 // its vector and copies it.
 #pragma once
 
-#include "GeometryVolume/channels/TileVectorOps.h"
+#include "GeometryVolume/channels/detail/TileVectorOps.h"
 #include "GeometryVolume/core/Export.h"
 #include "GeometryVolume/pools/TileDataAllocator.h"
 #include "Velorn/Math.h"
@@ -98,7 +98,7 @@ public:
   std::uint64_t memUsage() const { return m_data->capacity() * sizeof(T) + sizeof(Vector); }
 
 protected:
-  T& at(int flat) const { return (*m_data)[static_cast<std::size_t>(flat)]; }
+  T& at(int flat) const { return (*m_data)[flat]; }
   void release() {
     if (m_owner) delete m_data;
     m_owner = false;

@@ -1,4 +1,4 @@
-#include "GeometryVolume/core/LogPath.h"
+#include "GeometryVolume/core/LogPathImpl.h"
 
 #include "Velorn/FileUtils.h"
 

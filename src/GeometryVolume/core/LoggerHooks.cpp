@@ -2,6 +2,6 @@
 
 namespace VLN::Internal {
 
-constinit Ostil::Atomic<LoggerHooks const*> g_loggerHooks{nullptr};
+constinit VLN::Internal::Atomic<LoggerHooks const*> g_loggerHooks{nullptr};
 
 } // namespace VLN::Internal

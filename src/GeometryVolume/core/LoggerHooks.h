@@ -4,7 +4,7 @@
 #pragma once
 
 #include "GeometryVolume/core/Export.h"
-#include "Ostil/Atomic.h"
+#include "GeometryVolume/core/detail/Atomic.h"
 
 namespace VLN {
 
@@ -27,7 +27,7 @@ struct LoggerHooks {
 
 namespace Internal {
 /// Null until logging is first turned on. Readers only test and call: the table is never freed.
-extern VLN_API Ostil::Atomic<LoggerHooks const*> g_loggerHooks;
+extern VLN_API VLN::Internal::Atomic<LoggerHooks const*> g_loggerHooks;
 } // namespace Internal
 
 namespace Internal {

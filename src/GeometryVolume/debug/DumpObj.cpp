@@ -1,7 +1,7 @@
 #include "GeometryVolume/debug/DumpObj.h"
 
 #include "GeometryVolume/core/ElementTypes.h"
-#include "GeometryVolume/core/ObjText.h"
+#include "GeometryVolume/core/ObjTextImpl.h"
 
 #if VLN_HAS_ELEMENT_FLOAT3
 

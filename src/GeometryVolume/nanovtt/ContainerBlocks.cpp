@@ -11,11 +11,11 @@ namespace nanovtt::Internal {
 
 void ContainerLayout::findBlocks() {
   for (int d = m_rootDepth; d <= m_maxDepth; ++d)
-    m_coalesced[static_cast<std::size_t>(d)].resize(static_cast<std::size_t>(m_tree.tileCount(d)));
+    m_coalesced[d].resize(static_cast<std::size_t>(m_tree.tileCount(d)));
 
   // Children before parents.
   for (int d = m_maxDepth - 1; d >= m_rootDepth; --d) {
-    CoalescedTiles& here = m_coalesced[static_cast<std::size_t>(d)];
+    CoalescedTiles& here = m_coalesced[d];
     CoalescedTiles& below = m_coalesced[static_cast<std::size_t>(d) + 1];
     bool const last = d == m_maxDepth - 1;
     forEachTile(m_tree, d, [&](TileType const& tile, std::int64_t index) {

@@ -17,7 +17,7 @@ using FloatChannel = VLN::TileTree3D::Channel<Traits, float, 4, 0>;
 float const* samples(FloatChannel const* channel, TreeIndex const& at) {
   if (!channel || !channel->tileArrays() || at.depth < channel->minDepth() || at.depth > channel->depth())
     return nullptr;
-  auto const& tiles = (*channel->tileArrays())[static_cast<std::size_t>(at.depth)];
+  auto const& tiles = (*channel->tileArrays())[at.depth];
   auto const n = static_cast<std::size_t>(at.index);
   return n < tiles.size() && tiles[n].size() >= std::size_t(kTileSamples) ? tiles[n].data() : nullptr;
 }
@@ -150,7 +150,7 @@ void ContainerLayout::countTiles() {
   std::uint64_t total = 0;
   for (int d = 0; d < kTileCountAccumEntries; ++d) {
     m_tileCountAccum[static_cast<std::size_t>(d)] = static_cast<std::uint32_t>(total);
-    if (d >= m_rootDepth && d <= m_maxDepth) total += m_counts[static_cast<std::size_t>(d)];
+    if (d >= m_rootDepth && d <= m_maxDepth) total += m_counts[d];
     if (total >= kNoTile) throw std::runtime_error("VTTToNanoVTT: too many tiles to number");
   }
   std::atomic<std::uint64_t> live = 0;

@@ -56,7 +56,7 @@ public:
 
   /// The number of a tile that is not inside a block.
   std::uint32_t number(int depth, std::int64_t index) const {
-    auto const& order = m_order[static_cast<std::size_t>(depth)];
+    auto const& order = m_order[depth];
     return m_tileCountAccum[static_cast<std::size_t>(depth)] +
            (order.empty() ? static_cast<std::uint32_t>(index) : order[static_cast<std::size_t>(index)]);
   }
@@ -71,8 +71,7 @@ public:
   // Coalescing
   bool coalesced() const { return m_settings.coalesce; }
   bool inBlock(int depth, std::int64_t index) const {
-    return coalesced() &&
-           m_coalesced[static_cast<std::size_t>(depth)].inBlock[static_cast<std::size_t>(index)];
+    return coalesced() && m_coalesced[depth].inBlock[static_cast<std::size_t>(index)];
   }
   /// Levels of the block that the tile heads; 0 for a tile that heads none.
   int blockLevels(TileType const& tile) const;
@@ -90,10 +89,10 @@ private:
     return m_tileCountAccum[d + 1] - m_tileCountAccum[d];
   }
   int fullLevels(TreeIndex const& at) const {
-    return m_coalesced[static_cast<std::size_t>(at.depth)].full[static_cast<std::size_t>(at.index)];
+    return m_coalesced[at.depth].full[static_cast<std::size_t>(at.index)];
   }
   int height(TileType const& tile) const {
-    return m_coalesced[static_cast<std::size_t>(tile.depth())].height[static_cast<std::size_t>(tile.index())];
+    return m_coalesced[tile.depth()].height[static_cast<std::size_t>(tile.index())];
   }
   /// Whether the tile's children are found by number: it has some, of a depth that is converted, and they are
   /// not all inside its own block.
@@ -138,9 +137,9 @@ private:
 
   std::array<std::uint32_t, kTileCountAccumEntries> m_tileCountAccum{};
   /// By depth: numbers within the depth by index; empty where they are the indices.
-  std::array<std::vector<std::uint32_t>, Traits::kDepths> m_order;
-  std::array<CoalescedTiles, Traits::kDepths> m_coalesced;
-  std::array<std::uint32_t, Traits::kDepths> m_counts{}; ///< numbers given at each depth
+  VLN::PerDepth<std::vector<std::uint32_t>, Traits::kDepths> m_order;
+  VLN::PerDepth<CoalescedTiles, Traits::kDepths> m_coalesced;
+  VLN::PerDepth<std::uint32_t, Traits::kDepths> m_counts{}; ///< numbers given at each depth
   std::uint64_t m_deadTiles = 0;
 
   std::uint64_t m_notFinest = 0; ///< numbers of tiles that may have children

@@ -146,7 +146,7 @@ Ostil::Ptr<ChannelBase> withCoarser(ChannelBase const& channel, Tree const& tree
   if (!copy)
     copy = Ostil::makePtr<ChannelOf<T>>(source.name(), &defaultValue, kInitializeDefaultValue, false, true,
                                         source.minDepth(), source.depth());
-  std::array<std::int64_t, kChannelDepths> counts;
+  VLN::PerDepth<std::int64_t, kChannelDepths> counts;
   for (int d = 0; d < kChannelDepths; ++d) counts[static_cast<std::size_t>(d)] = tree.tileCount(d);
   copy->resize(counts.data(), kTileSamples);
 

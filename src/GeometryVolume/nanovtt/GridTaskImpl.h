@@ -2,7 +2,7 @@
 // follows from the tile's number alone, except inside coalesced blocks.
 #pragma once
 
-#include "GeometryVolume/channels/ElementOps.h"
+#include "GeometryVolume/channels/ElementOpsTableImpl.h"
 #include "GeometryVolume/nanovtt/ContainerLayoutImpl.h"
 #include "GeometryVolume/nanovtt/QuantiseImpl.h"
 

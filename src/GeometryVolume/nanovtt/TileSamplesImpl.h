@@ -1,7 +1,7 @@
 // TileSamples: the samples that a flat buffer stores for a tile.
 #pragma once
 
-#include "GeometryVolume/channels/HaloDriver.h"
+#include "GeometryVolume/channels/HaloDriverImpl.h"
 #include "GeometryVolume/nanovtt/GridTaskImpl.h"
 
 #include <memory>

@@ -9,8 +9,8 @@
 // Static storage is carved off by an atomic counter and never given back by the vector.
 #pragma once
 
+#include "GeometryVolume/core/detail/Atomic.h"
 #include "GeometryVolume/pools/Jemalloc.h"
-#include "Ostil/Atomic.h"
 
 #include <cstddef>
 #include <cstdint>
@@ -105,7 +105,7 @@ private:
   bool m_static = false;
   bool m_construct = true;
   T* m_base = nullptr;
-  Ostil::Atomic<std::int64_t> m_used;
+  VLN::Internal::Atomic<std::int64_t> m_used;
   std::int64_t m_limit = 0;
 };
 

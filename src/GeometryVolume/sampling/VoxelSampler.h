@@ -10,11 +10,9 @@
 // Beyond the last sample the weight reaches and passes 1; before the first, with an offset, i is -1.
 #pragma once
 
-#include "GeometryVolume/core/SimdLanes.h"
+#include "GeometryVolume/sampling/detail/SampleCell.h"
 #include "GeometryVolume/tiletree/Container.h"
 #include "GeometryVolume/topology/VoxelTopology.h"
-
-#include <array>
 
 namespace VLN::TileTree3D {
 
@@ -67,96 +65,35 @@ public:
 
 protected:
   static constexpr int D = TraitsT::kTDW;
+  using SampleCell = Internal::SampleCell;
 
-  /// What prepareToSample() gives, in lanes.
-  struct SampleCell {
-    TreeIndex tile;
-    float invVoxelWidth;
-    Internal::IntLanes ijk;
-    Internal::FloatLanes weights;
-  };
   Internal::FloatLanes toTileSpace(Position const& position, SamplerSpace space) const {
     auto const p = Internal::lanesOf(position);
     return space == kSamplerWorldSpace ? p * m_worldToTile : p;
   }
   /// @return false without a tile: of `cell` the tile alone is then set, and invalid.
   bool locate(Position const& position, SamplerSpace space, int depth, SampleCell& cell) const {
-    using namespace Internal;
-    FloatLanes const p = toTileSpace(position, space);
-    return locate(p, floorLanesAnywhere(p), depth, cell);
+    auto const p = toTileSpace(position, space);
+    return locate(p, Internal::floorLanesAnywhere(p), depth, cell);
   }
   /// The same for a position in tile space and its floor.
   bool locate(Internal::FloatLanes p, Internal::IntLanes c, int depth, SampleCell& cell) const {
-    if (!inLeafVoxel(c, depth) && !searchTile(c, depth)) {
-      cell.tile = {};
-      return false;
-    }
-    cell.tile = m_found;
-    place(p, m_foundCorner, cell);
+    if (!m_last.holds(c, depth)) searchTile(c, depth);
+    cell.tile = m_last.tile();
+    if (cell.tile.depth < 0) return false;
+    Internal::placeInCell<TraitsT>(p, m_last.corner(), m_offset, cell);
     return true;
   }
-  /// Whether the tile found last is that of the point too, because it has no child there.
-  bool inLeafVoxel(Internal::IntLanes c, int depth) const {
-    using Internal::UnsignedLanes;
-    auto const from = reinterpret_cast<UnsignedLanes>(c) - reinterpret_cast<UnsignedLanes>(m_leafCorner);
-    auto const inside = from < m_leafWidth;
-    return depth == m_leafDepth && (inside[0] & inside[1] & inside[2]);
-  }
-  bool searchTile(Internal::IntLanes c, int depth) const {
-    m_found = depth < 0 ? TreeIndex{} : m_accessor.treeIndex(c[0], c[1], c[2], depth, false);
-    m_leafDepth = -1;
-    if (m_found.depth < 0) return false;
-    m_foundCorner = Internal::lanesOf(m_accessor.cursorCorner());
-    if (m_found.depth < (depth < TraitsT::kMaxDepth ? depth : TraitsT::kMaxDepth)) {
-      m_leafDepth = depth;
-      m_leafCorner = Internal::lanesOf(TraitsT::align(Internal::toInt3(c), m_found.depth + 1));
-      m_leafWidth = Internal::UnsignedLanes{} + static_cast<std::uint32_t>(TraitsT::width(m_found.depth + 1));
-    }
-    return true;
-  }
-  /// The cell of a position in tile space, within the tile of `cell`.
-  void place(Internal::FloatLanes p, Internal::IntLanes tileCorner, SampleCell& cell) const {
-    using namespace Internal;
-    Scale const& scale = kScales[static_cast<std::size_t>(cell.tile.depth)];
-    cell.invVoxelWidth = scale.invVoxelWidth;
-    auto const corner = __builtin_convertvector(tileCorner, FloatLanes);
-    FloatLanes l = (p - corner) * scale.samples - lanesOf(m_offset);
-    FloatLanes const zero = {};
-    // Up to 1e-5 below the first sample counts as on it.
-    l = (l > zero) | (l <= lanesOf(-1e-5f)) ? l : zero;
-    // In reach of int: the tile holds p.
-    IntLanes const i = floorLanes(l), last = IntLanes{} + (D - 1);
-    cell.ijk = i < last ? i : last;
-    cell.weights = l - __builtin_convertvector(cell.ijk, FloatLanes);
+  void searchTile(Internal::IntLanes c, int depth) const {
+    TreeIndex const at = depth < 0 ? TreeIndex{} : m_accessor.treeIndex(c[0], c[1], c[2], depth, false);
+    m_last.set(at, m_accessor.cursorCorner(), c, depth);
   }
 
   Accessor m_accessor;
-  // The tile found last. Where it is coarser than asked for, the voxel without a child that holds the point.
-  mutable TreeIndex m_found;
-  mutable Internal::IntLanes m_foundCorner{};
-  mutable Internal::IntLanes m_leafCorner{};
-  mutable Internal::UnsignedLanes m_leafWidth{};
-  mutable int m_leafDepth = -1; ///< what was asked for; -1: none
+  mutable Internal::LastTile<TraitsT> m_last;
   Real m_worldToTile = 1.0f;
   Position m_offset{0.0f, 0.0f, 0.0f};
   VoxelOffsetType m_offsetType = kVoxelOffsetCorner;
-
-private:
-  struct Scale {
-    float invVoxelWidth; // kTW / W
-    float samples;       // D / W
-  };
-  static constexpr auto kScales = [] {
-    std::array<Scale, static_cast<std::size_t>(TraitsT::kDepths)> scales{};
-    for (int d = 0; d < TraitsT::kDepths; ++d) {
-      auto const r = static_cast<float>(double(TraitsT::kTW) / TraitsT::width(d));
-      scales[static_cast<std::size_t>(d)] = {
-          r, TraitsT::kTDW == 2 * TraitsT::kTW
-                 ? r + r
-                 : static_cast<float>(double(TraitsT::kTDW) / TraitsT::width(d))};
-    }
-    return scales;
-  }();
 };
 
 } // namespace VLN::TileTree3D

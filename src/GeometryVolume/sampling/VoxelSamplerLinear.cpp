@@ -3,7 +3,7 @@
 #include "GeometryVolume/channels/SharedReadTablesImpl.h"
 
 #include "GeometryVolume/channels/Halo.h"
-#include "GeometryVolume/channels/HaloRegions.h"
+#include "GeometryVolume/channels/HaloRegionsImpl.h"
 
 namespace VLN::TileTree3D {
 
@@ -41,8 +41,8 @@ VLN_SAMPLER_TEMPLATE VLN_SAMPLER::VoxelSamplerLinear(ContainerT const& container
     : Base(container, topology)
     , m_tileAccessor(container.tileAccessor())
     , m_offsetTypeLinear(topology.offsetType())
-    , m_cacheOneSided(kDepths)
-    , m_cacheTwoSided(kDepths)
+    , m_cacheOneSided(static_cast<std::size_t>(TraitsT::kDepths))
+    , m_cacheTwoSided(static_cast<std::size_t>(TraitsT::kDepths))
     , m_container(&container)
     , m_topology(&topology)
     , m_invVoxelSize(1.0f / container.voxelSize()) {
@@ -245,7 +245,7 @@ VLN_SAMPLER_TEMPLATE float const* VLN_SAMPLER::highSide(TreeIndex const& tile, H
                                                         unsigned direction) const {
   if (sides.known >> direction & 1) return sides.data[direction];
   int3 const corner =
-      this->m_found == tile ? Internal::toInt3(this->m_foundCorner) : m_container->tile(tile).tijk();
+      this->m_last.tile() == tile ? Internal::toInt3(this->m_last.corner()) : m_container->tile(tile).tijk();
   int const w = TraitsT::width(tile.depth);
   auto const on = [&](unsigned bit) { return direction & bit ? w : 0; };
   TreeIndex const at =
@@ -279,7 +279,7 @@ VLN_SAMPLER_TEMPLATE unsigned VLN_SAMPLER::readEdge(int3 const& low, unsigned ed
 // @return false where that takes more than `budget` cells of ancestors.
 VLN_SAMPLER_TEMPLATE bool VLN_SAMPLER::edgeCorners(TreeIndex const& tile, int3 const& low, float* corners,
                                                    int& budget) const {
-  auto& sides = m_highSides[static_cast<std::size_t>(tile.depth)];
+  auto& sides = m_highSides[tile.depth];
   if (sides.tile != tile.index) {
     sides.tile = tile.index, sides.known = 1, sides.gaps = 0;
     sides.data[0] = dataOf(*m_channelCore, tile);
@@ -354,8 +354,8 @@ auto VLN_SAMPLER::keep(std::int64_t tile, int depth, int slot, Cache<Tile>& cach
     -> CacheEntry<Tile>& {
   auto& entry = cache[static_cast<std::size_t>(slot)];
   entry.tile = tile;
-  m_lastTile[static_cast<std::size_t>(depth)] = tile;
-  m_lastSlot[static_cast<std::size_t>(depth)] = slot;
+  m_lastTile[depth] = tile;
+  m_lastSlot[depth] = slot;
   return entry;
 }
 

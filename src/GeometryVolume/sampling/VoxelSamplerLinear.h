@@ -11,9 +11,10 @@
 // the core channel where it changes often or memory is short, and walk through space in order.
 #pragma once
 
-#include "GeometryVolume/channels/BlockCursor.h"
 #include "GeometryVolume/channels/Channel.h"
+#include "GeometryVolume/channels/detail/BlockCursor.h"
 #include "GeometryVolume/sampling/VoxelSampler.h"
+#include "GeometryVolume/sampling/detail/CellCorners.h"
 #include "GeometryVolume/tiletree/Voxel.h"
 
 #include <cstdint>
@@ -93,7 +94,7 @@ public:
   }
   /// Many positions: values[n] = sample(positions[n], depth, space).
   /// @shape `count` positions and values.
-  /// @cost At random places a third to a half of as many single calls: what the next ones need is fetched
+  /// @cost At random places about half of as many single calls: what the next ones need is fetched
   /// ahead. In order about the same.
   void sample(Position const* positions, float* values, std::int64_t count, int depth = TraitsT::kMaxDepth,
               SamplerSpace space = kSamplerWorldSpace) const;
@@ -154,38 +155,12 @@ protected:
   CacheEntry<TwoSidedTile>& updateCache(std::int64_t tile, int depth,
                                         std::vector<CacheEntry<TwoSidedTile>>& cache) const;
 
-  // Eight samples and the weights between them.
-  struct CellCorners {
-    float const* low;
-    int width;
-    Internal::FloatLanes weights;
-
-    static float lerp(float a, float b, float t) { return (b - a) * t + a; }
-    // The four samples of an edge of the cell along x, in the order (0,0) (1,0) (0,1) (1,1) of y and z.
-    Internal::FloatLanes samples(int x) const {
-      float const* const p = low + x;
-      int const w = width;
-      return Internal::FloatLanes{p[0], p[w], p[w * w], p[w * w + w]};
-    }
-    float value() const { return value(samples(0), samples(1)); }
-    float value(Internal::FloatLanes low4, Internal::FloatLanes high4) const {
-      auto const v = Internal::lerpLanes(low4, high4, Internal::lanesOf(weights[0]));
-      float const y = weights[1];
-      return lerp(lerp(v[0], v[1], y), lerp(v[2], v[3], y), weights[2]);
-    }
-    /// Derivatives by the weights.
-    Position slope() const {
-      auto const a = samples(0), b = samples(1), d = b - a;
-      float const x = weights[0], y = weights[1], z = weights[2];
-      return {lerp(lerp(d[0], d[1], y), lerp(d[2], d[3], y), z),
-              lerp(lerp(a[1] - a[0], b[1] - b[0], x), lerp(a[3] - a[2], b[3] - b[2], x), z),
-              lerp(lerp(a[2] - a[0], b[2] - b[0], x), lerp(a[3] - a[1], b[3] - b[1], x), y)};
-    }
-  };
+  using CellCorners = Internal::CellCorners;
 
   std::uint64_t accessCount() const { return m_accessCount; }
 
 private:
+  using HighSides = Internal::HighSides;
   template <class Tile> using Cache = std::vector<CacheEntry<Tile>>;
 
   bool covers(TreeIndex const& tile) const {
@@ -198,7 +173,7 @@ private:
     if (depth > m_maxDepth) depth = m_maxDepth;
     auto const p = this->toTileSpace(position, space);
     auto const c = Internal::floorLanesAnywhere(p);
-    if (depth == TraitsT::kMaxDepth && m_blocks.isOpen() && !this->inLeafVoxel(c, depth) &&
+    if (depth == TraitsT::kMaxDepth && m_blocks.isOpen() && !this->m_last.holds(c, depth) &&
         finestCorners(p, c, cell, corners))
       return true;
     if (!this->locate(p, c, depth, cell) || !covers(cell.tile)) return false;
@@ -219,7 +194,7 @@ private:
     auto const* const data = static_cast<float const*>(at.elements);
     cell.tile = {-1, TraitsT::kMaxDepth};
     IntLanes const corner = c - IntLanes{int(at.i), int(at.j), int(at.k), 0};
-    this->place(p, corner, cell);
+    placeInCell<TraitsT>(p, corner, this->m_offset, cell);
     if (m_channelWide) {
       corners = wideCorners(data, cell);
       return true;
@@ -252,15 +227,6 @@ private:
               cell.weights};
     return cachedCorners(cell.tile, Internal::toInt3(cell.ijk), Internal::toFloat3(cell.weights));
   }
-  // What lies on the high sides of a tile, as far as it was asked for.
-  struct HighSides {
-    std::int64_t tile = -1;
-    std::uint32_t known = 0; ///< bits of the directions below that were looked up
-    std::uint32_t gaps = 0;  ///< cells that needed a coarser tile
-    std::array<float const*, 8>
-        data; ///< of the tile itself, and at 1, 2 and 4 on along x, y and z; null: none
-  };
-
   CellCorners wideCorners(float const* data, SampleCell const& cell) const {
     constexpr int w = D + 1;
     // Below the first sample: extrapolate from the first cell, as the last one does at the top.
@@ -270,7 +236,7 @@ private:
     return {data + at[0] + w * (at[1] + w * at[2]), w, weights};
   }
   template <class ChannelT> static float const* dataOf(ChannelT const& channel, TreeIndex const& tile) {
-    auto const& tiles = (*channel.tileArrays())[static_cast<std::size_t>(tile.depth)];
+    auto const& tiles = (*channel.tileArrays())[tile.depth];
     return tiles[static_cast<std::size_t>(tile.index)].data();
   }
   float sampleAbove(TreeIndex const& tile, int3 const& ijk, Position const& weights) const;
@@ -296,16 +262,14 @@ private:
                     TwoSidedTile& out) const;
   void fillTwoSidedRoot(typename ContainerT::TileType const& tile, TwoSidedTile& out) const;
 
-  static constexpr std::size_t kDepths = static_cast<std::size_t>(TraitsT::kDepths);
-
   Accessor m_tileAccessor;
   VoxelOffsetType m_offsetTypeLinear = kVoxelOffsetCorner;
   mutable Cache<OneSidedTile> m_cacheOneSided;
   mutable Cache<TwoSidedTile> m_cacheTwoSided;
   mutable std::uint64_t m_accessCount = 0;
-  mutable std::array<std::int64_t, kDepths> m_lastTile;
-  mutable std::array<std::int32_t, kDepths> m_lastSlot;
-  mutable std::array<HighSides, kDepths> m_highSides;
+  mutable PerDepth<std::int64_t, TraitsT::kDepths> m_lastTile;
+  mutable PerDepth<std::int32_t, TraitsT::kDepths> m_lastSlot;
+  mutable PerDepth<HighSides, TraitsT::kDepths> m_highSides;
   mutable std::array<float, 8> m_corners;
   // What leads from positions straight to samples of the deepest depth: made by the first copy of the sampler
   // for which it pays.

@@ -7,6 +7,10 @@
 
 namespace VLN::TileTree3D {
 
+namespace Internal {
+template <class TraitsT> struct Siblings;
+}
+
 /// @threads As the container's own changes: one thread.
 template <class TraitsT> class ContainerBuilder {
 public:
@@ -39,6 +43,10 @@ public:
   void setBranchSizes(Cancellation cancellation);
 
 private:
+  using Siblings = Internal::Siblings<TraitsT>;
+  /// In place of the index of a source tile's counterpart.
+  static constexpr std::int64_t kDeadSource = -1, kNotThere = -2;
+
   /// A new tile without parent: a root, or one that hangs below a coarser tile with tiles between.
   struct DetachedTile {
     std::int64_t index;
@@ -63,6 +71,19 @@ private:
                     TileLists* newTiles);
   /// Appends the corners of all tiles made since the counts were `before`.
   void listNewTiles(Counts const& before, TileLists* newTiles) const;
+  /// Finds the counterpart of each tile of a source's depth; `above` has those of the depth above.
+  /// @return How many are not there, for each chunk of a refining pass.
+  std::vector<std::int64_t> findCounterparts(TileArray<TileType> const& wanted, int depth,
+                                             std::vector<std::int64_t> const& above,
+                                             std::vector<std::int64_t>& here) const;
+  /// Takes the tiles that are there out of groups, and finds the groups' parents; -1 for none.
+  /// @return How many tiles are left, for each chunk of groups.
+  std::vector<std::int64_t> dropExisting(std::vector<Siblings>& groups, int depth,
+                                         std::vector<std::int64_t>& parents) const;
+  /// Makes the tiles of groups, those of a chunk from its start on; returns those without a parent, by chunk.
+  TileIndexLists makeSiblings(std::vector<Siblings> const& groups, int depth,
+                              std::vector<std::int64_t> const& parents,
+                              std::vector<std::int64_t> const& starts);
   /// Hangs roots deeper than `depth` below roots of `depth` that hold them.
   void adoptDeeperRoots(int depth, Growth& growth);
   /// Adds the tiles of a branch to the counts of their depths, until `budget` of them are counted.

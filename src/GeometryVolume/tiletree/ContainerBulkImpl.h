@@ -17,11 +17,22 @@ namespace VLN::TileTree3D {
 
 namespace Internal {
 
+/// Groups that one task takes.
+inline constexpr std::int64_t kGroupGrain = 128;
+
 /// Tiles of one depth with a common parent, which need not exist.
 template <class TraitsT> struct Siblings {
   SortRecord key; ///< of the parent's corner
   int3 parent;
   std::bitset<static_cast<std::size_t>(TraitsT::kTileSize)> slots;
+
+  /// @param depth Of the siblings.
+  int3 corner(std::size_t slot, int depth) const {
+    int3 const at = Tile<TraitsT, TraitsT::kTileSize>::childIJK(static_cast<int>(slot));
+    std::int64_t const w = TraitsT::width(depth);
+    return {static_cast<int>(parent.x + w * at.x), static_cast<int>(parent.y + w * at.y),
+            static_cast<int>(parent.z + w * at.z)};
+  }
 };
 
 template <class TraitsT> class WantedTiles {
@@ -139,7 +150,6 @@ private:
 
 template <class TraitsT>
 void ContainerBuilder<TraitsT>::addTilesInBulk(TileLists const& corners, TileLists* newTiles) {
-  using Group = Internal::Siblings<TraitsT>;
   m_tree.tilesAdded();
   Internal::WantedTiles<TraitsT> wanted(corners);
   wanted.addBetween(m_tree.growthAccessor());
@@ -149,73 +159,17 @@ void ContainerBuilder<TraitsT>::addTilesInBulk(TileLists const& corners, TileLis
     addRootTile(kLow, kLow, kLow, 0, growth);
     listNewTiles(growth.before(), newTiles);
   }
-  constexpr std::int64_t kGrain = 128;
   for (int d = 1; d <= kMaxDepth; ++d) {
-    auto& groups = wanted.groups(d);
-    auto const count = static_cast<std::int64_t>(groups.size());
-    if (count == 0) continue;
-    std::int64_t const w = TraitsT::width(d);
-    auto const cornerOf = [w](Group const& group, std::size_t slot) {
-      int3 const at = TileType::childIJK(static_cast<int>(slot));
-      return int3{static_cast<int>(group.parent.x + w * at.x), static_cast<int>(group.parent.y + w * at.y),
-                  static_cast<int>(group.parent.z + w * at.z)};
-    };
-    // The parents, and what is missing below them. Then, where each chunk's first tile goes.
-    std::vector<std::int64_t> parents(groups.size());
-    std::vector<std::int64_t> starts(static_cast<std::size_t>(chunkCount(0, count, kGrain)));
-    parallelChunks(0, count, kGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-      auto const accessor = m_tree.growthAccessor();
-      std::size_t missing = 0;
-      for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
-        Group& group = groups[n];
-        int3 const& p = group.parent;
-        TreeIndex const above = accessor.treeIndex(p.x, p.y, p.z, d - 1, false);
-        bool const hasParent = above.depth == d - 1;
-        parents[n] = hasParent ? above.index : -1;
-        for (std::size_t slot = 0; slot < group.slots.size(); ++slot) {
-          if (!group.slots[slot]) continue;
-          bool there;
-          if (hasParent) {
-            there = !tile(above).isLeaf(static_cast<int>(slot));
-          } else {
-            int3 const corner = cornerOf(group, slot);
-            there = accessor.treeIndex(corner.x, corner.y, corner.z, d, false).depth == d;
-          }
-          if (there) group.slots.reset(slot);
-        }
-        missing += group.slots.count();
-      }
-      starts[static_cast<std::size_t>(chunk)] = static_cast<std::int64_t>(missing);
-    });
+    if (wanted.groups(d).empty()) continue;
+    std::vector<std::int64_t> parents;
+    std::vector<std::int64_t> starts = dropExisting(wanted.groups(d), d, parents);
     Counts const before = data().m_tileCounts;
     std::int64_t next = tileCount(d);
     for (std::int64_t& start : starts) next += std::exchange(start, next);
     if (next == tileCount(d)) continue;
     allocateUninitialised(d, next - tileCount(d));
-    auto& tiles = data().editTiles(d);
-    auto* const above = &data().editTiles(d - 1);
-    std::vector<std::vector<std::int64_t>> roots(starts.size());
-    parallelChunks(0, count, kGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-      std::int64_t index = starts[static_cast<std::size_t>(chunk)];
-      for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
-        Group const& group = groups[n];
-        for (std::size_t slot = 0; slot < group.slots.size(); ++slot) {
-          if (!group.slots[slot]) continue;
-          int3 const corner = cornerOf(group, slot);
-          auto* const tile = &tiles[index];
-          if (d == kMaxDepth) new (static_cast<void*>(tile)) TileType;
-          tile->init(parents[n], corner.x, corner.y, corner.z, d, index);
-          // Each group has its parent to itself.
-          if (parents[n] >= 0)
-            (*above)[parents[n]].childIndex(static_cast<int>(slot)) = index;
-          else
-            roots[static_cast<std::size_t>(chunk)].push_back(index);
-          ++index;
-        }
-      }
-    });
     bool anyRoot = false;
-    for (auto const& part : roots) {
+    for (auto const& part : makeSiblings(wanted.groups(d), d, parents, starts)) {
       for (std::int64_t const index : part) m_tree.addRoot(tile({index, d})), anyRoot = true;
     }
     if (anyRoot) adoptDeeperRoots(d, growth);
@@ -223,6 +177,70 @@ void ContainerBuilder<TraitsT>::addTilesInBulk(TileLists const& corners, TileLis
   }
   growth.keep();
   setBranchSizes(Cancellation::kPoll);
+}
+
+template <class TraitsT>
+std::vector<std::int64_t> ContainerBuilder<TraitsT>::dropExisting(std::vector<Siblings>& groups, int depth,
+                                                                  std::vector<std::int64_t>& parents) const {
+  auto const count = static_cast<std::int64_t>(groups.size());
+  parents.resize(groups.size());
+  std::vector<std::int64_t> left(static_cast<std::size_t>(chunkCount(0, count, Internal::kGroupGrain)));
+  parallelChunks(
+      0, count, Internal::kGroupGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+        auto const accessor = m_tree.growthAccessor();
+        std::size_t missing = 0;
+        for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+          Siblings& group = groups[n];
+          int3 const& p = group.parent;
+          TreeIndex const above = accessor.treeIndex(p.x, p.y, p.z, depth - 1, false);
+          bool const hasParent = above.depth == depth - 1;
+          parents[n] = hasParent ? above.index : -1;
+          for (std::size_t slot = 0; slot < group.slots.size(); ++slot) {
+            if (!group.slots[slot]) continue;
+            bool there;
+            if (hasParent) {
+              there = !tile(above).isLeaf(static_cast<int>(slot));
+            } else {
+              int3 const corner = group.corner(slot, depth);
+              there = accessor.treeIndex(corner.x, corner.y, corner.z, depth, false).depth == depth;
+            }
+            if (there) group.slots.reset(slot);
+          }
+          missing += group.slots.count();
+        }
+        left[static_cast<std::size_t>(chunk)] = static_cast<std::int64_t>(missing);
+      });
+  return left;
+}
+
+template <class TraitsT>
+TileIndexLists ContainerBuilder<TraitsT>::makeSiblings(std::vector<Siblings> const& groups, int depth,
+                                                       std::vector<std::int64_t> const& parents,
+                                                       std::vector<std::int64_t> const& starts) {
+  auto& tiles = data().editTiles(depth);
+  auto& above = data().editTiles(depth - 1);
+  TileIndexLists roots(starts.size());
+  parallelChunks(0, static_cast<std::int64_t>(groups.size()), Internal::kGroupGrain,
+                 [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+                   std::int64_t index = starts[static_cast<std::size_t>(chunk)];
+                   for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+                     Siblings const& group = groups[n];
+                     for (std::size_t slot = 0; slot < group.slots.size(); ++slot) {
+                       if (!group.slots[slot]) continue;
+                       int3 const corner = group.corner(slot, depth);
+                       auto* const tile = &tiles[index];
+                       if (depth == kMaxDepth) new (static_cast<void*>(tile)) TileType;
+                       tile->init(parents[n], corner.x, corner.y, corner.z, depth, index);
+                       // Each group has its parent to itself.
+                       if (parents[n] >= 0)
+                         above[parents[n]].childIndex(static_cast<int>(slot)) = index;
+                       else
+                         roots[static_cast<std::size_t>(chunk)].push_back(index);
+                       ++index;
+                     }
+                   }
+                 });
+  return roots;
 }
 
 } // namespace VLN::TileTree3D

@@ -1,4 +1,4 @@
-#include "GeometryVolume/core/ObjText.h"
+#include "GeometryVolume/core/ObjTextImpl.h"
 #include "GeometryVolume/tiletree/Container.h"
 
 #include <fstream>

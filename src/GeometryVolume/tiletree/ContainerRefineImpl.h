@@ -98,69 +98,73 @@ void ContainerBuilder<TraitsT>::linkDetached(int depth, std::vector<std::vector<
   listNewTiles(growth.before(), newTiles);
 }
 
-template <class TraitsT> void ContainerBuilder<TraitsT>::refine(Tree const& source, TileLists* newTiles) {
-  if (&source != &m_tree) {
-    m_tree.tilesAdded();
-    constexpr std::int64_t kDead = -1, kMissing = -2;
-    // For each source tile of the depth above, and of this one, the index of its counterpart here. A tile
-    // with a parent in the source is found through the parent's counterpart, without a search.
-    std::vector<std::int64_t> above, here;
-    for (int d = 0; d <= kMaxDepth; ++d) {
-      auto const& tiles = source.m_data->tiles(d);
-      std::int64_t const count = tiles.size();
-      here.resize(static_cast<std::size_t>(count));
-      auto const parentHere = [&](TileType const& wanted) {
-        return wanted.isRoot() ? -1 : above[static_cast<std::size_t>(wanted.parentIndex())];
-      };
-      // For each chunk, how many are missing; then, where its first one goes.
-      std::vector<std::int64_t> starts(static_cast<std::size_t>(Internal::refineChunks(count)));
-      Internal::refinePass(count, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-        auto const accessor = m_tree.growthAccessor();
-        std::int64_t missing = 0;
-        for (std::int64_t n = begin; n < end; ++n) {
-          TileType const& wanted = tiles[n];
-          std::int64_t found = kDead;
-          if (wanted.valid()) {
-            if (wanted.isRoot()) {
-              TreeIndex const at = accessor.treeIndex(wanted.ti(), wanted.tj(), wanted.tk(), d, false);
-              if (at.depth == d) found = at.index;
-            } else {
-              TileType const& over = tile({parentHere(wanted), d - 1});
-              found = over.childIndex(Internal::slotOfCorner(over, wanted.tijk()));
-            }
-            if (found < 0) found = kMissing, ++missing;
-          }
-          here[static_cast<std::size_t>(n)] = found;
+template <class TraitsT>
+std::vector<std::int64_t> ContainerBuilder<TraitsT>::findCounterparts(TileArray<TileType> const& wanted,
+                                                                      int depth,
+                                                                      std::vector<std::int64_t> const& above,
+                                                                      std::vector<std::int64_t>& here) const {
+  std::int64_t const count = wanted.size();
+  here.resize(static_cast<std::size_t>(count));
+  std::vector<std::int64_t> missing(static_cast<std::size_t>(Internal::refineChunks(count)));
+  Internal::refinePass(count, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+    auto const accessor = m_tree.growthAccessor();
+    std::int64_t notThere = 0;
+    for (std::int64_t n = begin; n < end; ++n) {
+      TileType const& t = wanted[n];
+      std::int64_t found = kDeadSource;
+      if (t.valid()) {
+        if (t.isRoot()) {
+          TreeIndex const at = accessor.treeIndex(t.ti(), t.tj(), t.tk(), depth, false);
+          if (at.depth == depth) found = at.index;
+        } else {
+          TileType const& over = tile({above[static_cast<std::size_t>(t.parentIndex())], depth - 1});
+          found = over.childIndex(Internal::slotOfCorner(over, t.tijk()));
         }
-        starts[static_cast<std::size_t>(chunk)] = missing;
-      });
-      Internal::refineCheckpoint();
-      // Chunks are consecutive: new tiles lie in the order of the source.
-      std::int64_t next = tileCount(d);
-      for (std::int64_t& start : starts) next += std::exchange(start, next);
-      if (next > tileCount(d)) {
-        Growth growth(data(), newTiles);
-        allocateUninitialised(d, next - tileCount(d));
-        std::vector<std::vector<DetachedTile>> parts(starts.size());
-        auto const make = [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-          auto const accessor = m_tree.growthAccessor();
-          std::int64_t index = starts[static_cast<std::size_t>(chunk)];
-          DetachedTile detached;
-          for (std::int64_t n = begin; n < end; ++n) {
-            if (here[static_cast<std::size_t>(n)] != kMissing) continue;
-            TileType const& wanted = tiles[n];
-            if (!initLinkedTile(index, d, wanted.tijk(), parentHere(wanted), accessor, detached))
-              parts[static_cast<std::size_t>(chunk)].push_back(detached);
-            here[static_cast<std::size_t>(n)] = index++;
-          }
-        };
-        Internal::refinePass(count, make, next - growth.before()[d]);
-        linkDetached(d, parts, growth, newTiles);
-        growth.keep();
+        if (found < 0) found = kNotThere, ++notThere;
       }
-      Internal::refineCheckpoint();
-      above.swap(here);
+      here[static_cast<std::size_t>(n)] = found;
     }
+    missing[static_cast<std::size_t>(chunk)] = notThere;
+  });
+  return missing;
+}
+
+template <class TraitsT> void ContainerBuilder<TraitsT>::refine(Tree const& source, TileLists* newTiles) {
+  if (&source == &m_tree) return;
+  m_tree.tilesAdded();
+  // For each source tile of the depth above, and of this one, the index of its counterpart here. A tile with
+  // a parent in the source is found through the parent's counterpart, without a search.
+  std::vector<std::int64_t> above, here;
+  for (int d = 0; d <= kMaxDepth; ++d) {
+    auto const& tiles = source.m_data->tiles(d);
+    std::vector<std::int64_t> starts = findCounterparts(tiles, d, above, here);
+    Internal::refineCheckpoint();
+    // Chunks are consecutive: new tiles lie in the order of the source.
+    std::int64_t next = tileCount(d);
+    for (std::int64_t& start : starts) next += std::exchange(start, next);
+    if (next > tileCount(d)) {
+      Growth growth(data(), newTiles);
+      allocateUninitialised(d, next - tileCount(d));
+      std::vector<std::vector<DetachedTile>> parts(starts.size());
+      auto const make = [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+        auto const accessor = m_tree.growthAccessor();
+        std::int64_t index = starts[static_cast<std::size_t>(chunk)];
+        DetachedTile detached;
+        for (std::int64_t n = begin; n < end; ++n) {
+          if (here[static_cast<std::size_t>(n)] != kNotThere) continue;
+          TileType const& t = tiles[n];
+          std::int64_t const parent = t.isRoot() ? -1 : above[static_cast<std::size_t>(t.parentIndex())];
+          if (!initLinkedTile(index, d, t.tijk(), parent, accessor, detached))
+            parts[static_cast<std::size_t>(chunk)].push_back(detached);
+          here[static_cast<std::size_t>(n)] = index++;
+        }
+      };
+      Internal::refinePass(tiles.size(), make, next - growth.before()[d]);
+      linkDetached(d, parts, growth, newTiles);
+      growth.keep();
+    }
+    Internal::refineCheckpoint();
+    above.swap(here);
   }
 }
 

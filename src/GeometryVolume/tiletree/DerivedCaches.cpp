@@ -150,6 +150,68 @@ template <class TraitsT> Grid computeGrid(Container<TraitsT> const& tree, int ma
   return grid;
 }
 
+/// Marks the cells that hold roots deeper than the grid: those are to be asked of the tree.
+template <class TraitsT>
+void markDeeperRoots(Container<TraitsT> const& tree, TileLookupTable<TraitsT>& table) {
+  for (auto it = tree.cbeginRoots(); it != tree.cendRoots(); ++it) {
+    if (it->second.depth <= table.gridDepth) continue;
+    std::size_t cell = 0;
+    bool inside = true;
+    for (int a = 2; a >= 0; --a) {
+      std::uint32_t const c = TraitsT::quotient(TraitsT::offset(it->first.ijk()[a]), table.gridDepth) -
+                              table.first[static_cast<std::size_t>(a)];
+      inside = inside && c < table.size[static_cast<std::size_t>(a)];
+      cell = cell * table.size[static_cast<std::size_t>(a)] + c;
+    }
+    if (inside) table.cells[cell] = table.kUnknown;
+  }
+}
+
+/// The deepest tile at or above the grid's depth, for each cell.
+template <class TraitsT>
+void fillCells(Container<TraitsT> const& tree, Grid const& grid, TileLookupTable<TraitsT>& table) {
+  std::int64_t const rows = std::int64_t(grid.size[1]) * grid.size[2];
+  parallelFor(0, rows, [&](std::int64_t begin, std::int64_t end) {
+    auto accessor = tree.tileAccessor();
+    for (std::int64_t row = begin; row < end; ++row)
+      for (int i = 0; i < grid.size[0]; ++i) {
+        auto const cell = static_cast<std::size_t>(row * grid.size[0] + i);
+        TreeIndex at{grid.tiles[cell], grid.depth};
+        if (at.index < 0) {
+          int const w = grid.cellWidth;
+          at = accessor.treeIndex(
+              grid.origin.x + i * w, grid.origin.y + static_cast<int>(row % grid.size[1]) * w,
+              grid.origin.z + static_cast<int>(row / grid.size[1]) * w, grid.depth, false);
+        }
+        if (at.index >= 0) table.cells[cell] = at.index * table.kDepthUnit + at.depth;
+      }
+  });
+}
+
+/// The deepest tile down to the table's last depth, for each place below a tile of the grid's depth.
+template <class TraitsT> void fillPlaces(Container<TraitsT> const& tree, TileLookupTable<TraitsT>& table) {
+  int const g = table.gridDepth, width = static_cast<int>(table.placeWidth);
+  auto const size = static_cast<int>(table.blockSize);
+  table.places.resize(static_cast<std::size_t>(tree.tileCount(g) * size));
+  parallelFor(0, tree.tileCount(g), [&](std::int64_t begin, std::int64_t end) {
+    for (std::int64_t n = begin; n < end; ++n) {
+      if (!tree.tile(n, g).valid()) continue;
+      auto* const block = &table.places[static_cast<std::size_t>(n * size)];
+      for (int place = 0; place < size; ++place) {
+        int const p[3] = {place % width, place / width % width, place / (width * width)};
+        TreeIndex at{n, g};
+        for (int divisor = width / TraitsT::kTW; at.depth < table.lastDepth; divisor /= TraitsT::kTW) {
+          auto const digit = [&](int a) { return p[a] / divisor % TraitsT::kTW; };
+          TreeIndex const child = tree.tile(at).childTreeIndex(digit(0), digit(1), digit(2));
+          if (child.index < 0) break;
+          at = child;
+        }
+        block[place] = static_cast<std::int32_t>(at.index * std::int64_t(table.kLevelUnit) + (at.depth - g));
+      }
+    }
+  });
+}
+
 template <class TraitsT>
 std::shared_ptr<TileLookupTable<TraitsT> const> computeLookupTable(Container<TraitsT> const& tree,
                                                                    Grid const& grid) {
@@ -161,61 +223,17 @@ std::shared_ptr<TileLookupTable<TraitsT> const> computeLookupTable(Container<Tra
   auto table = std::make_shared<Table>();
   table->gridDepth = g, table->lastDepth = last;
   table->levels = static_cast<std::uint32_t>(last - g);
-  int const width = TraitsT::width(g) / TraitsT::width(last), size = width * width * width;
-  table->placeWidth = static_cast<std::uint32_t>(width), table->blockSize = static_cast<std::uint32_t>(size);
+  table->placeWidth = static_cast<std::uint32_t>(TraitsT::width(g) / TraitsT::width(last));
+  table->blockSize = table->placeWidth * table->placeWidth * table->placeWidth;
   for (int a = 0; a < 3; ++a) {
     auto const axis = static_cast<std::size_t>(a);
     table->first[axis] = TraitsT::quotient(TraitsT::offset(grid.origin[a]), g);
     table->size[axis] = static_cast<std::uint32_t>(grid.size[axis]);
   }
   table->cells.assign(grid.tiles.size(), Table::kNoTile);
-  // Below the grid's depth lie tiles of the grid's, and deeper roots.
-  for (auto it = tree.cbeginRoots(); it != tree.cendRoots(); ++it) {
-    if (it->second.depth <= g) continue;
-    std::size_t cell = 0;
-    bool inside = true;
-    for (int a = 2; a >= 0; --a) {
-      std::uint32_t const c = TraitsT::quotient(TraitsT::offset(it->first.ijk()[a]), g) -
-                              table->first[static_cast<std::size_t>(a)];
-      inside = inside && c < table->size[static_cast<std::size_t>(a)];
-      cell = cell * table->size[static_cast<std::size_t>(a)] + c;
-    }
-    if (inside) table->cells[cell] = Table::kUnknown;
-  }
-  std::int64_t const rows = std::int64_t(grid.size[1]) * grid.size[2];
-  parallelFor(0, rows, [&](std::int64_t begin, std::int64_t end) {
-    auto accessor = tree.tileAccessor();
-    for (std::int64_t row = begin; row < end; ++row)
-      for (int i = 0; i < grid.size[0]; ++i) {
-        auto const cell = static_cast<std::size_t>(row * grid.size[0] + i);
-        TreeIndex at{grid.tiles[cell], g};
-        if (at.index < 0) {
-          int const w = grid.cellWidth;
-          at = accessor.treeIndex(grid.origin.x + i * w,
-                                  grid.origin.y + static_cast<int>(row % grid.size[1]) * w,
-                                  grid.origin.z + static_cast<int>(row / grid.size[1]) * w, g, false);
-        }
-        if (at.index >= 0) table->cells[cell] = at.index * Table::kDepthUnit + at.depth;
-      }
-  });
-  table->places.resize(static_cast<std::size_t>(tree.tileCount(g) * size));
-  parallelFor(0, tree.tileCount(g), [&](std::int64_t begin, std::int64_t end) {
-    for (std::int64_t n = begin; n < end; ++n) {
-      if (!tree.tile(n, g).valid()) continue;
-      auto* const block = &table->places[static_cast<std::size_t>(n * size)];
-      for (int place = 0; place < size; ++place) {
-        int const p[3] = {place % width, place / width % width, place / (width * width)};
-        TreeIndex at{n, g};
-        for (int divisor = width / TraitsT::kTW; at.depth < last; divisor /= TraitsT::kTW) {
-          auto const digit = [&](int a) { return p[a] / divisor % TraitsT::kTW; };
-          TreeIndex const child = tree.tile(at).childTreeIndex(digit(0), digit(1), digit(2));
-          if (child.index < 0) break;
-          at = child;
-        }
-        block[place] = static_cast<std::int32_t>(at.index * std::int64_t(Table::kLevelUnit) + (at.depth - g));
-      }
-    }
-  });
+  markDeeperRoots(tree, *table);
+  fillCells(tree, grid, *table);
+  fillPlaces(tree, *table);
   return table;
 }
 

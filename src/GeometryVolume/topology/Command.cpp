@@ -66,7 +66,7 @@ template <class TraitsT>
 void initializeTileData(Container<TraitsT> const& container,
                         typename Container<TraitsT>::TileLists const& newTiles, VLN::Object& object) {
   // Look the tiles up once for all channels.
-  std::array<std::vector<std::int64_t>, TraitsT::kDepths> tiles;
+  PerDepth<std::vector<std::int64_t>, TraitsT::kDepths> tiles;
   auto accessor = container.tileAccessor();
   for (int d = 0; d < TraitsT::kDepths; ++d) {
     for (int3 const& corner : newTiles[static_cast<std::size_t>(d)]) {

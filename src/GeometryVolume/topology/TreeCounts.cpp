@@ -11,7 +11,7 @@ namespace VLN::TileTree3D {
 template <int Depths> void TreeCounts<Depths>::countTiles(Component const& tree, std::uint32_t newElements) {
   // Room first: either all depths follow or none.
   for (int d = 0; d < Depths; ++d) {
-    auto& tiles = elementsPerTile[static_cast<std::size_t>(d)];
+    auto& tiles = elementsPerTile[d];
     auto const n = static_cast<std::size_t>(tree.tileCount(d));
     if (n > tiles.capacity()) tiles.reserve(std::max(n, 2 * tiles.size()));
   }

@@ -1,9 +1,9 @@
 // TreeCounts: what a topology records of a tree, by depth and by tile.
 #pragma once
 
+#include "GeometryVolume/core/FixedArray.h"
 #include "GeometryVolume/tiletree/TreeComponent.h"
 
-#include <array>
 #include <cstdint>
 #include <iosfwd>
 #include <vector>
@@ -12,20 +12,19 @@ namespace VLN::TileTree3D {
 
 /// Counts of tiles and elements for a shape of `Depths` depths.
 template <int Depths> struct TreeCounts {
-  using PerDepth = std::array<std::int64_t, static_cast<std::size_t>(Depths)>;
+  using Counts = PerDepth<std::int64_t, Depths>;
 
-  PerDepth tileCounts{};
+  Counts tileCounts{};
   std::int64_t tileCountTotal = 0;
-  std::array<std::vector<std::uint32_t>, static_cast<std::size_t>(Depths)> elementsPerTile;
-  PerDepth elementCounts{};
+  PerDepth<std::vector<std::uint32_t>, Depths> elementsPerTile;
+  Counts elementCounts{};
   std::int64_t elementCountTotal = 0;
 
   /// Counts of one depth; -1 gives the total, depths that the shape lacks 0.
   std::int64_t tileCount(int depth) const { return at(tileCounts, tileCountTotal, depth); }
   std::int64_t elementCount(int depth) const { return at(elementCounts, elementCountTotal, depth); }
   int elementCount(TreeIndex const& tile) const {
-    return static_cast<int>(
-        elementsPerTile[static_cast<std::size_t>(tile.depth)][static_cast<std::size_t>(tile.index)]);
+    return static_cast<int>(elementsPerTile[tile.depth][static_cast<std::size_t>(tile.index)]);
   }
 
   /// Takes the tile counts of a tree. Tiles that are new get `newElements` elements.
@@ -35,7 +34,7 @@ template <int Depths> struct TreeCounts {
   void addMemory(std::uint64_t& used, std::uint64_t& allocated) const;
 
 private:
-  static std::int64_t at(PerDepth const& counts, std::int64_t total, int depth) {
+  static std::int64_t at(Counts const& counts, std::int64_t total, int depth) {
     if (depth == -1) return total;
     return depth >= 0 && depth < Depths ? counts[static_cast<std::size_t>(depth)] : 0;
   }

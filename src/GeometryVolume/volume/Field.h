@@ -11,13 +11,17 @@
 #include "GeometryVolume/channels/Channel.h"
 #include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/sampling/VoxelSampler.h"
-#include "GeometryVolume/volume/VolumeData.h"
+#include "GeometryVolume/volume/detail/VolumeData.h"
 
 #include <memory>
 #include <span>
 #include <string>
 
 namespace VLN::TileTree3D {
+
+/// What is blended between elements: see sample().
+template <class T>
+concept SampledElement = std::is_same_v<T, float>;
 
 /// Elements of a tile of the deepest depth with one layer of what lies round it.
 ///
@@ -107,15 +111,15 @@ public:
   /// @cost A sampler is made when the field has changed since the last call: write first, then sample. See
   /// VoxelSamplerLinear for the rest.
   float sample(float3 const& position,
-               SamplerSpace space = kSamplerWorldSpace) const requires std::is_same_v<T, float>;
+               SamplerSpace space = kSamplerWorldSpace) const requires SampledElement<T>;
   /// Many positions: values[n] = sample(positions[n], space). @shape As many values as positions.
   /// @cost At random places half of as many single calls, or less.
   /// @error std::invalid_argument where there are not as many values as positions.
   void sample(std::span<float3 const> positions, std::span<float> values,
-              SamplerSpace space = kSamplerWorldSpace) const requires std::is_same_v<T, float>;
+              SamplerSpace space = kSamplerWorldSpace) const requires SampledElement<T>;
   /// In world space, whatever the position is given in.
   float3 gradient(float3 const& position,
-                  SamplerSpace space = kSamplerWorldSpace) const requires std::is_same_v<T, float>;
+                  SamplerSpace space = kSamplerWorldSpace) const requires SampledElement<T>;
 
   // The parts
   /// The channel, in step with the tree.

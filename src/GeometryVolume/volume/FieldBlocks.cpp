@@ -1,4 +1,4 @@
-#include "GeometryVolume/volume/FieldBlocks.h"
+#include "GeometryVolume/volume/detail/FieldBlocks.h"
 
 namespace VLN::TileTree3D::Internal {
 

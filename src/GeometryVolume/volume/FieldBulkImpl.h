@@ -1,7 +1,7 @@
 // BulkRuns: many positions, grouped so that threads may write their elements without meeting.
 #pragma once
 
-#include "GeometryVolume/volume/VolumeData.h"
+#include "GeometryVolume/volume/detail/VolumeData.h"
 
 #include <cstdint>
 #include <span>

@@ -294,14 +294,14 @@ template <class T> void const* Field<T>::sampler() const {
 }
 
 template <class T>
-float Field<T>::sample(float3 const& position, SamplerSpace space) const requires std::is_same_v<T, float> {
+float Field<T>::sample(float3 const& position, SamplerSpace space) const requires SampledElement<T> {
   return static_cast<FloatVoxelSamplerLinear<Internal::VolumeShape> const*>(sampler())->sample(position,
                                                                                                space);
 }
 
 template <class T>
 void Field<T>::sample(std::span<float3 const> positions, std::span<float> values,
-                      SamplerSpace space) const requires std::is_same_v<T, float> {
+                      SamplerSpace space) const requires SampledElement<T> {
   if (positions.size() != values.size())
     throw std::invalid_argument("field \"" + m_slot->name + "\": " + std::to_string(positions.size()) +
                                 " positions with " + std::to_string(values.size()) + " values");
@@ -311,8 +311,7 @@ void Field<T>::sample(std::span<float3 const> positions, std::span<float> values
 }
 
 template <class T>
-float3 Field<T>::gradient(float3 const& position,
-                          SamplerSpace space) const requires std::is_same_v<T, float> {
+float3 Field<T>::gradient(float3 const& position, SamplerSpace space) const requires SampledElement<T> {
   float3 out;
   static_cast<FloatVoxelSamplerLinear<Internal::VolumeShape> const*>(sampler())->sampleGradient(position,
                                                                                                 space, &out);

@@ -1,4 +1,4 @@
-#include "GeometryVolume/volume/VolumeData.h"
+#include "GeometryVolume/volume/detail/VolumeData.h"
 
 #include "GeometryVolume/channels/UpdateDispatch.h"
 #include "GeometryVolume/channels/UpdateTopologies.h"

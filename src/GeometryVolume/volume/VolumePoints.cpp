@@ -38,7 +38,7 @@ std::int64_t Volume::addPoints(std::string const& name, std::span<float3 const> 
     int3 at{0, 0, 0};
     if (!sampleOf(m_data->tree->toTileSpace(p), at)) continue;
     kept.emplace_back(at, p);
-    lists[static_cast<std::size_t>(kFinest)].append(at);
+    lists[kFinest].append(at);
   }
   m_data->makeTiles(lists);
   m_data->sync();

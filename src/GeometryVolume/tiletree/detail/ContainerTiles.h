@@ -2,10 +2,10 @@
 #pragma once
 
 #include "GeometryVolume/core/FixedArray.h"
+#include "GeometryVolume/core/detail/Atomic.h"
 #include "GeometryVolume/tiletree/Tile.h"
 #include "GeometryVolume/tiletree/detail/TileArray.h"
 #include "GeometryVolume/tiletree/detail/TileLookupTable.h"
-#include "Ostil/Atomic.h"
 
 namespace VLN::TileTree3D {
 
@@ -26,7 +26,7 @@ template <class TraitsT> struct ContainerTiles {
   Counts m_tileCounts{};
   std::int64_t m_tileCountTotal = 0;
   /// Made with the acceleration grid, or by lookups that go far; null where it does not fit.
-  Ostil::Atomic<TileLookupTable<TraitsT> const*> m_lookup;
+  VLN::Internal::Atomic<TileLookupTable<TraitsT> const*> m_lookup;
   float m_voxelSize = 1.0f;
   float m_voxelSizeInv = 1.0f;
   float m_maxRelativeRefinementError = 0.0f;

@@ -1,15 +1,11 @@
 // GridSource: a grid of any supported type, as the importer sees it.
 #pragma once
 
-#include "GeometryVolume/channels/Channel.h"
 #include "GeometryVolume/core/FunctionRef.h"
-#include "GeometryVolume/tiletree/Container.h"
 #include "GeometryVolume/tiletree/Morton.h"
-#include "GeometryVolume/topology/VoxelTopology.h"
 #include "Interop/VdbImport.h"
 #include "Interop/VdbRecord.h"
-
-#include <openvdb/openvdb.h>
+#include "Interop/VdbTreeImpl.h"
 
 #include <array>
 #include <memory>
@@ -19,24 +15,6 @@
 #include <vector>
 
 namespace VLN::Interop {
-
-using VdbTraits = TileTree3D::PowerOfTwoTraits;
-using VdbContainer = TileTree3D::Container<VdbTraits>;
-using VdbTopology = TileTree3D::VoxelTopology<VdbTraits>;
-using StateChannel = TileTree3D::Channel<VdbTraits, unsigned char, 4, 0>;
-
-/// Width of a node of the file's tree, of 8 (leaf), 128 and 4096 voxels, and what goes with it here.
-inline constexpr int kNodeWidths[3] = {8, 128, 4096};
-
-/// Depth of the tiles whose samples are `width` wide.
-constexpr int depthOfSamples(int width) {
-  int depth = VdbTraits::kMaxDepth;
-  for (; width > 1; width /= 2) --depth;
-  return depth;
-}
-/// Depth of the tiles that are `width` wide.
-constexpr int depthOfTiles(int width) { return depthOfSamples(width / VdbTraits::kTDW); }
-static_assert(depthOfSamples(8) == 25 && depthOfSamples(128) == 21 && depthOfSamples(4096) == 16);
 
 /// What one grid holds, in the measures of the tree.
 struct GridSummary {
@@ -50,7 +28,7 @@ struct GridSummary {
 };
 
 /// Corners of tiles by depth.
-using TileCorners = std::array<std::vector<Velorn::Math::int3>, VdbTraits::kDepths>;
+using TileCorners = VLN::PerDepth<std::vector<Velorn::Math::int3>, VdbTraits::kDepths>;
 
 /// Reports tiles as they are filled.
 using FilledTiles = FunctionRef<void(std::int64_t tiles)>;
@@ -90,22 +68,9 @@ public:
 /// Null for a type that is not supported; `type` then tells its name.
 std::unique_ptr<GridSource> makeGridSource(openvdb::GridBase::ConstPtr const& grid, std::string& type);
 
-/// What export reads of one grid.
-struct GridToWrite {
-  VdbContainer const& container;
-  TileTree3D::ChannelBase const& channel;
-  StateChannel const* state; ///< null unless the rule is kChannel
-  VdbActiveRule rule;
-};
-
-/// A grid with the values and the active states of a channel; null for an unsupported type name.
-openvdb::GridBase::Ptr makeGrid(std::string const& type, GridToWrite const& from);
-
-// The two halves of makeGridSource() and makeGrid(), compiled apart.
+// Its two halves, compiled apart.
 std::unique_ptr<GridSource> makeScalarSource(openvdb::GridBase::ConstPtr const& grid);
 std::unique_ptr<GridSource> makeVectorSource(openvdb::GridBase::ConstPtr const& grid);
-openvdb::GridBase::Ptr makeScalarGrid(std::string const& type, GridToWrite const& from);
-openvdb::GridBase::Ptr makeVectorGrid(std::string const& type, GridToWrite const& from);
 
 /// The deepest depth at which all roots for grids with these summaries may lie.
 int rootDepth(std::vector<GridSummary> const& grids);

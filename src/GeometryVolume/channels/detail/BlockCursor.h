@@ -1,7 +1,7 @@
 // BlockCursor: the last block of ReadTables that was read from.
 #pragma once
 
-#include "GeometryVolume/channels/ReadTables.h"
+#include "GeometryVolume/channels/detail/ReadTables.h"
 
 namespace VLN::TileTree3D::Internal {
 

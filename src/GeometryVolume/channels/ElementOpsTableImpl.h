@@ -2,8 +2,8 @@
 // moves bytes is shared by element size instead (HaloKernels).
 #pragma once
 
-#include "GeometryVolume/channels/HaloKernels.h"
-#include "GeometryVolume/channels/HaloRegions.h"
+#include "GeometryVolume/channels/HaloKernelsImpl.h"
+#include "GeometryVolume/channels/HaloRegionsImpl.h"
 #include "GeometryVolume/core/Export.h"
 #include "GeometryVolume/tiletree/TreeIndex.h"
 

@@ -10,7 +10,7 @@
 
 #include "GeometryVolume/channels/ChannelLayouts.h"
 #include "GeometryVolume/channels/ChannelTypes.h"
-#include "GeometryVolume/channels/HaloKernels.h"
+#include "GeometryVolume/channels/HaloKernelsImpl.h"
 #include "GeometryVolume/tiletree/TreeIndex.h"
 
 #include <algorithm>
@@ -102,7 +102,7 @@ constexpr HaloTable makeHaloTable(ChannelLayout const& source, ChannelLayout con
       r.source += (r.low[a] - steps[a] * w) * sourceStride;
       targetStride *= t.targetWidth, sourceStride *= t.sourceWidth;
     }
-    t.offsets[static_cast<std::size_t>(r.direction)] = r.source;
+    t.offsets[r.direction] = r.source;
     t.regions[static_cast<std::size_t>(t.regionCount++)] = r;
   };
   for (int3 const step : {int3{1, 0, 0}, int3{0, 1, 0}, int3{0, 0, 1}, int3{1, 1, 0}, int3{1, 0, 1},

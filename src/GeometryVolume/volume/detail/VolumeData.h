@@ -14,7 +14,7 @@
 #include "GeometryVolume/core/Object.h"
 #include "GeometryVolume/tiletree/Container.h"
 #include "GeometryVolume/topology/VoxelTopology.h"
-#include "GeometryVolume/volume/FieldBlocks.h"
+#include "GeometryVolume/volume/detail/FieldBlocks.h"
 
 #include <atomic>
 #include <cstdint>

@@ -90,7 +90,7 @@ struct TileSlots {
   std::int64_t total = 0;
 
   std::int64_t at(int depth, std::int64_t tile) const {
-    return offsets[static_cast<std::size_t>(depth)][static_cast<std::size_t>(tile)];
+    return offsets[depth][static_cast<std::size_t>(tile)];
   }
 };
 /// Slots one behind the other for the first `counts[d]` tiles of each depth. Tiles without elements take

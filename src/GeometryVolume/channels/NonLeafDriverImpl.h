@@ -2,7 +2,7 @@
 #pragma once
 
 #include "GeometryVolume/channels/ChannelTypes.h"
-#include "GeometryVolume/channels/ElementOps.h"
+#include "GeometryVolume/channels/ElementOpsTableImpl.h"
 #include "GeometryVolume/tiletree/Container.h"
 #include "GeometryVolume/topology/VoxelOffsetType.h"
 

@@ -1,4 +1,4 @@
-#include "Interop/VdbGridImpl.h"
+#include "Interop/VdbGridSourceImpl.h"
 
 #include <algorithm>
 #include <iterator>
@@ -37,11 +37,6 @@ std::unique_ptr<GridSource> makeGridSource(openvdb::GridBase::ConstPtr const& gr
   // A grid of another node configuration has the value type, but none of the nodes.
   auto source = makeScalarSource(grid);
   return source ? std::move(source) : makeVectorSource(grid);
-}
-
-openvdb::GridBase::Ptr makeGrid(std::string const& type, GridToWrite const& from) {
-  auto grid = makeScalarGrid(type, from);
-  return grid ? grid : makeVectorGrid(type, from);
 }
 
 int rootDepth(std::vector<GridSummary> const& grids) {
@@ -105,7 +100,7 @@ void joinSorted(std::vector<int3>& corners, std::size_t known, std::vector<int3>
 }
 
 void completeCorners(TileCorners& corners, int rootDepth) {
-  auto at = [&](int depth) -> std::vector<int3>& { return corners[static_cast<std::size_t>(depth)]; };
+  auto at = [&](int depth) -> std::vector<int3>& { return corners[depth]; };
   // From the bottom up, each tile brings its parent.
   std::vector<int3> parents, all;
   for (int depth = kMaxDepth; depth >= rootDepth; --depth) {

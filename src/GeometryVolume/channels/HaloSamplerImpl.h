@@ -1,7 +1,7 @@
 // HaloSampler: linear samples of a channel at places of the tree, through neighbours and coarser tiles.
 #pragma once
 
-#include "GeometryVolume/channels/ElementOps.h"
+#include "GeometryVolume/channels/ElementOpsTableImpl.h"
 #include "GeometryVolume/channels/HaloTypes.h"
 #include "GeometryVolume/tiletree/Container.h"
 #include "GeometryVolume/topology/VoxelOffsetType.h"

@@ -2,7 +2,7 @@
 // costs every file that includes them a tenth of what it has to read.
 #pragma once
 
-namespace Ostil {
+namespace VLN::Internal {
 
 /// An integer or a pointer. Not copied: each has a meaning where it lies.
 template <class T> class Atomic {
@@ -24,4 +24,4 @@ private:
   T m_value;
 };
 
-} // namespace Ostil
+} // namespace VLN::Internal

@@ -2,7 +2,7 @@
 // behind ElementOps. One instantiation for each tree shape.
 #pragma once
 
-#include "GeometryVolume/channels/HaloSampler.h"
+#include "GeometryVolume/channels/HaloSamplerImpl.h"
 
 namespace VLN::TileTree3D::Internal {
 
@@ -77,7 +77,7 @@ private:
     std::array<OwnerTile, kNeighborCount> around;
   };
   NeighborCache& cacheOf(TreeIndex const& at) {
-    NeighborCache& cache = m_caches[static_cast<std::size_t>(at.depth)];
+    NeighborCache& cache = m_caches[at.depth];
     if (cache.tile != at) cache.tile = at, cache.known = 0;
     return cache;
   }
@@ -154,7 +154,7 @@ private:
   NeighborCache* m_parentCache = nullptr; ///< of the tile's parent; null for a root
   int m_blockSlot = blockSlot({0, 0, 0}); ///< of the tile among the parent's children and those round them
   // One for each depth. The coarser, the more seldom it changes.
-  std::array<NeighborCache, static_cast<std::size_t>(TraitsT::kDepths)> m_caches;
+  PerDepth<NeighborCache, TraitsT::kDepths> m_caches;
 };
 
 /// A pass over the tiles of a range of depths, coarse to fine.

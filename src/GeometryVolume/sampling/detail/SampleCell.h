@@ -1,0 +1,82 @@
+// SampleCell: where a position lies among the samples of its tile, and what a sampler remembers of the tile
+// that it found last.
+#pragma once
+
+#include "GeometryVolume/core/FixedArray.h"
+#include "GeometryVolume/core/detail/SimdLanes.h"
+#include "GeometryVolume/tiletree/TreeIndex.h"
+
+namespace VLN::TileTree3D::Internal {
+
+/// The low sample of the cell that holds a position, and the weights of the next ones, in lanes.
+struct SampleCell {
+  TreeIndex tile;
+  float invVoxelWidth;
+  IntLanes ijk;
+  FloatLanes weights;
+};
+
+/// Puts a position of tile space into the cell of a tile, by the tile's depth and corner.
+/// @pre The tile holds the position.
+template <class TraitsT>
+void placeInCell(FloatLanes p, IntLanes tileCorner, Velorn::Math::float3 const& offset, SampleCell& cell) {
+  constexpr int D = TraitsT::kTDW;
+  struct Scale {
+    float invVoxelWidth; // kTW / W
+    float samples;       // D / W
+  };
+  static constexpr auto kScales = [] {
+    PerDepth<Scale, TraitsT::kDepths> scales{};
+    for (int d = 0; d < TraitsT::kDepths; ++d) {
+      auto const r = static_cast<float>(double(TraitsT::kTW) / TraitsT::width(d));
+      scales[d] = {r, D == 2 * TraitsT::kTW ? r + r : static_cast<float>(double(D) / TraitsT::width(d))};
+    }
+    return scales;
+  }();
+  Scale const& scale = kScales[cell.tile.depth];
+  cell.invVoxelWidth = scale.invVoxelWidth;
+  auto const corner = __builtin_convertvector(tileCorner, FloatLanes);
+  FloatLanes l = (p - corner) * scale.samples - lanesOf(offset);
+  FloatLanes const zero = {};
+  // Up to 1e-5 below the first sample counts as on it.
+  l = (l > zero) | (l <= lanesOf(-1e-5f)) ? l : zero;
+  // In reach of int: the tile holds p.
+  IntLanes const i = floorLanes(l), last = IntLanes{} + (D - 1);
+  cell.ijk = i < last ? i : last;
+  cell.weights = l - __builtin_convertvector(cell.ijk, FloatLanes);
+}
+
+/// The tile found last. Where it is coarser than was asked for, the voxel without a child that held the
+/// point: whatever lies there has the same tile.
+template <class TraitsT> class LastTile {
+public:
+  TreeIndex const& tile() const { return m_tile; }
+  IntLanes corner() const { return m_corner; }
+
+  bool holds(IntLanes c, int depth) const {
+    auto const from = reinterpret_cast<UnsignedLanes>(c) - reinterpret_cast<UnsignedLanes>(m_leafCorner);
+    auto const inside = from < m_leafWidth;
+    return depth == m_depth && (inside[0] & inside[1] & inside[2]);
+  }
+  /// @param depth What was asked for.
+  void set(TreeIndex const& tile, Velorn::Math::int3 const& corner, IntLanes c, int depth) {
+    m_tile = tile;
+    m_leafWidth = UnsignedLanes{}; // which holds nothing
+    if (tile.depth < 0) return;
+    m_corner = lanesOf(corner);
+    if (tile.depth < (depth < TraitsT::kMaxDepth ? depth : TraitsT::kMaxDepth)) {
+      m_depth = depth;
+      m_leafCorner = lanesOf(TraitsT::align(toInt3(c), tile.depth + 1));
+      m_leafWidth = UnsignedLanes{} + static_cast<std::uint32_t>(TraitsT::width(tile.depth + 1));
+    }
+  }
+
+private:
+  TreeIndex m_tile;
+  IntLanes m_corner{};
+  IntLanes m_leafCorner{};
+  UnsignedLanes m_leafWidth{};
+  int m_depth = 0;
+};
+
+} // namespace VLN::TileTree3D::Internal

@@ -1,0 +1,3 @@
+#include "Interop/VdbTypesImpl.h"
+
+VLN_FOR_EACH_VDB_OTHER_GRID(VLN_VDB_INSTANTIATE)
