@@ -13,6 +13,9 @@ template <GridType kType> struct TypedSamples {
   using Value = typename SampleOf<kType>::Value;
   using Blend = typename SampleOf<kType>::Blend;
 
+  NANOVTT_HD static TileBlock block(GridReader const& grid, std::uint32_t tile) {
+    return grid.blockAs(kType, tile);
+  }
   NANOVTT_HD static Value get(TileBlock const& block, std::uint64_t n) {
     if constexpr (kType == GridType::kFp4) {
       return of(block, block.samples[n >> 1] >> (4 * (n & 1)) & 15u);
@@ -37,6 +40,7 @@ private:
 struct AnyFloatSamples {
   using Value = float;
   using Blend = float;
+  NANOVTT_HD static TileBlock block(GridReader const& grid, std::uint32_t tile) { return grid.block(tile); }
   NANOVTT_HD static float get(TileBlock const& block, std::uint64_t n) { return block.getFloat(n); }
 };
 
@@ -156,7 +160,7 @@ private:
     // Samples of a merged block are those of the tiles at its bottom.
     TileRef const there = m_grid.container().find(px, py, pz, m_grid.sampleDepth(m_block, m_tile));
     if (!there.valid()) return blend(m_default);
-    TileBlock const b = m_grid.block(there.number);
+    TileBlock const b = Samples::block(m_grid, there.number);
     return blend(Samples::get(b, GridReader::sampleAt(b, there, px, py, pz)));
   }
   NANOVTT_HD static std::int32_t floorOf(float v) {
@@ -181,7 +185,7 @@ private:
     TileRef const tile = m_path.tile();
     if (tile.number != m_tile.number) {
       m_tile = tile;
-      m_block = m_grid.block(tile.number);
+      m_block = Samples::block(m_grid, tile.number);
       m_shift = kTileSpaceBits - m_grid.sampleDepth(m_block, tile) - 2;
     }
     // Of a tile above a refined place only the part is kept that has no deeper one.

@@ -346,23 +346,25 @@ public:
   NANOVTT_HD unsigned char const* textureData() const { return m_bytes + kTileTableOffset + tableBytes(); }
 
   /// The samples of a tile.
-  NANOVTT_HD TileBlock block(std::uint32_t tile) const {
+  NANOVTT_HD TileBlock block(std::uint32_t tile) const { return blockAs(m_type, tile); }
+  /// The same where the type is known when it is compiled. @pre It is the grid's.
+  NANOVTT_HD TileBlock blockAs(GridType type, std::uint32_t tile) const {
     std::uint64_t const e = entry(tile);
     TileBlock block;
-    block.type = m_type;
+    block.type = type;
     block.samples = m_bytes + kTileTableOffset + (e & kOffsetMask);
-    if (isQuantised(m_type)) {
+    if (isQuantised(type)) {
       block.minimum = load<float>(block.samples + kQuantisedMinimumOffset);
       block.quantum = load<float>(block.samples + kQuantisedQuantumOffset);
       bool halo = false;
-      if (m_type == GridType::kFpN) {
+      if (type == GridType::kFpN) {
         int const logBits = block.samples[kFpNLogBitsOffset];
         block.bits = 1 << logBits;
         halo = load<std::uint16_t>(block.samples + kFpNPayloadOffset) == (kFpNHaloCodes / 8) << logBits;
         block.samples += kFpNRecordBytes;
       } else {
-        block.bits = codeBits(m_type);
-        halo = (entry(tile + 1) & kOffsetMask) - (e & kOffsetMask) == tileBytes(m_type, true);
+        block.bits = codeBits(type);
+        halo = (entry(tile + 1) & kOffsetMask) - (e & kOffsetMask) == tileBytes(type, true);
         block.samples += kQuantisedCodesOffset;
       }
       block.width = halo ? kHaloTileWidth : kTileWidth;
@@ -374,7 +376,7 @@ public:
     if (isTexture()) {
       block.strideJ = m_textureWidth;
       std::uint64_t const x = e & 0xFFFF, y = e >> 16 & 0xFFFF, z = e >> 32 & 0xFFFF;
-      block.samples = textureData() + (x + m_textureWidth * (y + m_textureWidth * z)) * elementBytes(m_type);
+      block.samples = textureData() + (x + m_textureWidth * (y + m_textureWidth * z)) * elementBytes(type);
     }
     block.strideK = block.strideJ * (isTexture() ? m_textureWidth : static_cast<std::uint64_t>(block.width));
     return block;

@@ -45,7 +45,7 @@ struct Scene {
   Affine toLocal;
   Vec3d eye;       ///< local
   Vec3d light;     ///< world, unit
-  double diagonal; ///< of the field's box, world length
+  double diagonal; ///< of the field's box, world length; set with the depth
 
   bool start(double u, double v, Start& s) const {
     s.world = camera.ray(u, v);
@@ -233,7 +233,7 @@ double stepOf(Scene const& scene, double voxel) {
 }
 
 /// Rays end at the depth whose samples are about as wide as a pixel where the camera is nearest.
-void limitDepth(Field& field, Scene const& scene, RenderOptions const& options, double voxel) {
+void limitDepth(Field& field, Scene& scene, RenderOptions const& options, double voxel) {
   int depth = options.depth;
   if (depth < 0) {
     Vec3d nearest = scene.eye; // of the box, local
@@ -245,7 +245,8 @@ void limitDepth(Field& field, Scene const& scene, RenderOptions const& options, 
     depth = nanovtt::kMaxDepth - (voxels >= 2 ? static_cast<int>(std::floor(std::log2(voxels))) : 0);
   }
   int const root = nanovtt::kTileSpaceBits - field.view().rootShift;
-  field.limitDepth(std::clamp(depth, root, nanovtt::kMaxDepth));
+  field.limitDepth(std::clamp(depth, root, nanovtt::kMaxDepth), options.threads);
+  scene.diagonal = length(scene.toWorld.vector((field.view().high - field.view().low).as<double>()));
 }
 
 Scene sceneOf(Field const& field, Affine const& tileToWorld, Camera const& camera,
@@ -256,7 +257,6 @@ Scene sceneOf(Field const& field, Affine const& tileToWorld, Camera const& camer
   Affine toWorld = tileToWorld;
   toWorld.shift = tileToWorld.point(field.origin());
   Scene scene{field, camera, options, toWorld, toWorld.inverse(), {}, {}, {}};
-  scene.diagonal = length(tileToWorld.vector((field.view().high - field.view().low).as<double>()));
   scene.eye = scene.toLocal.point(camera.position);
   scene.light = length(options.light) > 0
                     ? normalized(options.light)
@@ -432,7 +432,7 @@ void colorValues(Picture& picture, RenderOptions const& options, Transfer transf
 
 double opacityUnit(Field& field, Affine const& tileToWorld, Camera const& camera,
                    RenderOptions const& options) {
-  Scene const scene = sceneOf(field, tileToWorld, camera, options);
+  Scene scene = sceneOf(field, tileToWorld, camera, options);
   Transfer const transfer(options.transfer);
   double const voxel = voxelOf(tileToWorld);
   limitDepth(field, scene, options, voxel);
@@ -444,7 +444,7 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
                std::function<void(double)> const& watch) {
   if (options.width < 1 || options.height < 1 || options.width > 32768 || options.height > 32768)
     throw std::invalid_argument("a picture has 1 to 32768 pixels an axis");
-  Scene const scene = sceneOf(field, tileToWorld, camera, options);
+  Scene scene = sceneOf(field, tileToWorld, camera, options);
 
   bool const isFinal = options.quality == Quality::kFinal;
   double const voxel = voxelOf(tileToWorld);
