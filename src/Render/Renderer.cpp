@@ -454,6 +454,7 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
   // Surfaces have no colours of their own: their values may span what a transfer function cannot.
   Transfer const transfer(options.mode == Mode::kSurface ? TransferOptions() : options.transfer);
   limitDepth(field, scene, options, voxel);
+  picture.deepest = field.view().maxDepth, picture.light = scene.light;
   FogScene fog;
   if (options.mode == Mode::kFog) {
     fog = prepareFog(field, scene, transfer, tileToWorld);

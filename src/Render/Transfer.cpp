@@ -49,6 +49,29 @@ float between(Points const& points, float v) {
   return points.back().second;
 }
 
+// What is narrower than a step of the table is as wide as one, and not lost: the entry next to a point that
+// is higher, or lower, than both its neighbours takes its opacity. Of both in one entry the higher.
+void keepExtremes(TransferView& view, Points const& points) {
+  for (bool isPeak : {false, true})
+    for (std::size_t n = 0; n < points.size(); ++n) {
+      float const own = points[n].second;
+      auto const rises = [&](std::size_t other) {
+        return isPeak ? own > points[other].second : own < points[other].second;
+      };
+      auto const isLevel = [&](std::size_t other) { return own == points[other].second; };
+      bool const left = n > 0 && rises(n - 1), right = n + 1 < points.size() && rises(n + 1);
+      // One of two points at the same height is an end of a plateau.
+      bool const leftLevel = n > 0 && isLevel(n - 1), rightLevel = n + 1 < points.size() && isLevel(n + 1);
+      if (!(left && right) && !(left && rightLevel) && !(leftLevel && right)) continue;
+      float const place =
+          (view.isLog ? std::log(std::max(points[n].first, 1e-30f)) : points[n].first) - view.low;
+      float const at = place * view.scale * (kTransferSize - 1);
+      if (!(at >= 0 && at <= kTransferSize - 1)) continue;
+      float& entry = view.opacity[static_cast<int>(at + 0.5f)];
+      entry = isPeak ? std::max(entry, own) : std::min(entry, own);
+    }
+}
+
 using Shape = float (*)(float);
 struct Named {
   char const* name;
@@ -105,6 +128,7 @@ Transfer::Transfer(TransferOptions const& options) {
                             ? named->shape(std::min(1.0f, std::abs(value - options.from) / farthest))
                             : named->shape(t);
   }
+  keepExtremes(m_view, points);
   std::copy_n(m_view.opacity, kTransferSize, m_largest[0].begin());
   for (std::size_t n = 1; n < m_largest.size(); ++n)
     for (std::size_t i = 0; i + (std::size_t(1) << n) <= kTransferSize; ++i)
