@@ -50,23 +50,28 @@ float between(Points const& points, float v) {
 }
 
 // What is narrower than a step of the table is as wide as one, and not lost: the entry next to a point that
-// is higher, or lower, than both its neighbours takes its opacity. Of both in one entry the higher.
+// is higher, or lower, than what stands on both its sides takes its opacity. Of both in one entry the higher.
 void keepExtremes(TransferView& view, Points const& points) {
+  auto const entryOf = [&](std::size_t n) {
+    float const v = view.isLog ? std::log(std::max(points[n].first, 1e-30f)) : points[n].first;
+    return (v - view.low) * view.scale * (kTransferSize - 1);
+  };
   for (bool isPeak : {false, true})
     for (std::size_t n = 0; n < points.size(); ++n) {
       float const own = points[n].second;
-      auto const rises = [&](std::size_t other) {
-        return isPeak ? own > points[other].second : own < points[other].second;
+      // The next point of another opacity on a side; none behind a plateau that is as wide as a step.
+      auto const isBeyond = [&](std::ptrdiff_t way) {
+        auto at = static_cast<std::ptrdiff_t>(n);
+        do at += way;
+        while (at >= 0 && at < static_cast<std::ptrdiff_t>(points.size()) &&
+               points[static_cast<std::size_t>(at)].second == own);
+        if (at < 0 || at >= static_cast<std::ptrdiff_t>(points.size())) return false;
+        auto const last = static_cast<std::size_t>(at - way);
+        float const other = points[static_cast<std::size_t>(at)].second;
+        return std::abs(entryOf(last) - entryOf(n)) < 1 && (isPeak ? own > other : own < other);
       };
-      auto const isLevel = [&](std::size_t other) { return own == points[other].second; };
-      bool const left = n > 0 && rises(n - 1), right = n + 1 < points.size() && rises(n + 1);
-      // One of two points at the same height is an end of a plateau.
-      bool const leftLevel = n > 0 && isLevel(n - 1), rightLevel = n + 1 < points.size() && isLevel(n + 1);
-      if (!(left && right) && !(left && rightLevel) && !(leftLevel && right)) continue;
-      float const place =
-          (view.isLog ? std::log(std::max(points[n].first, 1e-30f)) : points[n].first) - view.low;
-      float const at = place * view.scale * (kTransferSize - 1);
-      if (!(at >= 0 && at <= kTransferSize - 1)) continue;
+      float const at = entryOf(n);
+      if (!(at >= 0 && at <= kTransferSize - 1) || !isBeyond(-1) || !isBeyond(1)) continue;
       float& entry = view.opacity[static_cast<int>(at + 0.5f)];
       entry = isPeak ? std::max(entry, own) : std::min(entry, own);
     }
