@@ -288,7 +288,7 @@ void weighField(Field& field, RenderOptions const& options) {
 struct FogScene {
   FogView view;
   double unit = 0; ///< of opacity
-  LightLattice direct, above;
+  LightLattice lights;
 };
 
 /// World lengths between the points of a lattice of light, in samples.
@@ -338,9 +338,8 @@ FogScene prepareFog(Field& field, Scene const& scene, Transfer const& transfer, 
   if (options.quality == Quality::kFinal) return result;
   Vec3 const spacing = latticeSpacing(fog.field, tileToWorld);
   Vec3 const up = scene.toLocal.vector(scene.camera.viewUp).as<float>();
-  result.direct = sweepLight(fog, fog.lightLocal, spacing, options.threads);
-  result.above = sweepLight(fog, up, spacing, options.threads);
-  fog.direct = result.direct.view, fog.above = result.above.view;
+  result.lights = sweepLights(fog, fog.lightLocal, up, spacing, options.threads);
+  fog.lights = result.lights.view;
   return result;
 }
 
