@@ -72,7 +72,7 @@ void keepExtremes(TransferView& view, Points const& points) {
       };
       float const at = entryOf(n);
       if (!(at >= 0 && at <= kTransferSize - 1) || !isBeyond(-1) || !isBeyond(1)) continue;
-      float& entry = view.opacity[static_cast<int>(at + 0.5f)];
+      float& entry = view.opacity[std::lround(at)];
       entry = isPeak ? std::max(entry, own) : std::min(entry, own);
     }
 }
