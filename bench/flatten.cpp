@@ -164,6 +164,12 @@ void addReads(Subject const* subject) {
       readBench(state, *subject, random,
                 [&](openvdb::Coord const& c) { return cursor.value(c.x(), c.y(), c.z()); });
     });
+    add("read/" + tail + "ours, type known", [=](benchmark::State& state) {
+      auto const flat = flatten<void>(*subject);
+      nanovtt::Cursor<nanovtt::GridType::kFloat> cursor(nanovtt::BufferReader(flat.data()).grid(0));
+      readBench(state, *subject, random,
+                [&](openvdb::Coord const& c) { return cursor.value(c.x(), c.y(), c.z()); });
+    });
     add("trilinear/" + tail + "NanoVDB", [=](benchmark::State& state) {
       auto const flat = nanoFlatten<void>(*subject);
       auto const accessor = flat.grid<float>()->getAccessor();
@@ -175,6 +181,13 @@ void addReads(Subject const* subject) {
     add("trilinear/" + tail + "ours, halo tiles", [=](benchmark::State& state) {
       auto const flat = flatten<void>(*subject, 1.0f);
       nanovtt::GridCursor cursor(nanovtt::BufferReader(flat.data()).grid(0));
+      readBench(state, *subject, random, [&](openvdb::Coord const& c) {
+        return cursor.trilinear(float(c.x()) + 0.25f, float(c.y()) + 0.5f, float(c.z()) + 0.75f);
+      });
+    });
+    add("trilinear/" + tail + "ours, halo tiles, type known", [=](benchmark::State& state) {
+      auto const flat = flatten<void>(*subject, 1.0f);
+      nanovtt::Cursor<nanovtt::GridType::kFloat> cursor(nanovtt::BufferReader(flat.data()).grid(0));
       readBench(state, *subject, random, [&](openvdb::Coord const& c) {
         return cursor.trilinear(float(c.x()) + 0.25f, float(c.y()) + 0.5f, float(c.z()) + 0.75f);
       });

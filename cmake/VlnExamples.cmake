@@ -29,4 +29,12 @@ if(VLN_BUILD_TESTS AND VLN_PYTHON3)
   add_test(NAME examples.documents
     COMMAND "${VLN_PYTHON3}" "${PROJECT_SOURCE_DIR}/scripts/check_snippets")
   set_tests_properties(examples.documents PROPERTIES LABELS examples TIMEOUT 60)
+  if(TARGET example_reading_flat) # reads the file that the example leaves in its folder
+    add_test(NAME examples.read_nvtt
+      COMMAND "${VLN_PYTHON3}" "${PROJECT_SOURCE_DIR}/examples/python/read_nvtt.py" flat.nvtt density 3 4 5
+      WORKING_DIRECTORY "${PROJECT_BINARY_DIR}/examples/reading_flat")
+    set_tests_properties(examples.reading_flat PROPERTIES FIXTURES_SETUP flat_file)
+    set_tests_properties(examples.read_nvtt PROPERTIES LABELS examples TIMEOUT 60 FIXTURES_REQUIRED flat_file
+      PASS_REGULAR_EXPRESSION "^31.0")
+  endif()
 endif()

@@ -2,6 +2,7 @@
 
 #include "GeometryVolume/core/Parallel.h"
 #include "Interop/FileError.h"
+#include "Reader/NanoVTTBounds.h"
 #include "Reader/NanoVTTValidate.h"
 
 #include <algorithm>
@@ -63,6 +64,17 @@ std::uint64_t firstDamagedPage(nanovtt::NvttFile const& file) {
   return first;
 }
 
+void checkBounds(std::string const& path, nanovtt::NvttFile const& file,
+                 nanovtt::ContainerReader const& tree) {
+  for (std::uint32_t n = 0; n < file.sectionCount(); ++n) {
+    auto const s = file.section(n);
+    if (s.type != nanovtt::NvttSectionType::kBounds) continue;
+    if (!file.isIntact(s)) throw FileError(path, reason({"bounds differ from their hash", s.offset}));
+    auto const answer = nanovtt::BoundsReader::check(file.data(s), s.length, tree);
+    if (!answer.ok()) throw FileError(path, reason(answer, s.offset));
+  }
+}
+
 } // namespace
 
 MappedNvtt::MappedNvtt(std::string const& path, NvttCheck check) {
@@ -93,11 +105,17 @@ MappedNvtt::MappedNvtt(std::string const& path, NvttCheck check) {
     auto const start =
         static_cast<std::uint64_t>(m_file.buffer() - static_cast<unsigned char const*>(m_bytes));
     if (!answer.ok()) throw FileError(path, reason(answer, start));
+    m_reader = nanovtt::BufferReader(m_file.buffer());
+    checkBounds(path, m_file, m_reader.container());
   } catch (...) {
     munmap(m_bytes, m_length);
     throw;
   }
-  m_reader = nanovtt::BufferReader(m_file.buffer());
+}
+
+void const* MappedNvtt::bounds(std::uint32_t grid) const {
+  std::uint32_t const n = m_file.find(nanovtt::NvttSectionType::kBounds, grid);
+  return n < m_file.sectionCount() ? m_file.data(m_file.section(n)) : nullptr;
 }
 
 MappedNvtt::~MappedNvtt() { munmap(m_bytes, m_length); }

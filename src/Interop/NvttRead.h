@@ -30,6 +30,9 @@ public:
 
   nanovtt::NvttFile const& file() const { return m_file; }
   nanovtt::BufferReader const& reader() const { return m_reader; }
+  /// The bounds of a grid's tiles, for Reader/NanoVTTBounds.h; null where the file has none. They have been
+  /// checked, with their hash.
+  void const* bounds(std::uint32_t grid) const;
   std::uint64_t bufferLength() const { return m_file.bufferLength(); }
 
 private:

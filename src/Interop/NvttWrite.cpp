@@ -3,7 +3,7 @@
 #include "GeometryVolume/core/Parallel.h"
 #include "Interop/FileError.h"
 #include "Interop/OutputFile.h"
-#include "Reader/NanoVTTReader.h"
+#include "Reader/NanoVTTBounds.h"
 #include "Reader/NvttFile.h"
 
 #include <algorithm>
@@ -35,7 +35,7 @@ public:
     bool const traversal = content.traversalLength, neighbors = content.neighborsLength;
 
     m_header.resize(kNvttHeaderBytes);
-    m_directory.resize((1 + grids + traversal + neighbors) * kNvttEntryBytes);
+    m_directory.resize((1 + grids + traversal + neighbors + content.bounds.size()) * kNvttEntryBytes);
     // Where the data begin depends on the number of pages, and that on where the last section ends; from the
     // start of the data on.
     std::uint64_t end = content.bufferLength;
@@ -43,6 +43,11 @@ public:
     if (traversal) end = traversalAt + content.traversalLength;
     std::uint64_t const neighborsAt = align(end, kNvttSectionAlignment);
     if (neighbors) end = neighborsAt + content.neighborsLength;
+    std::vector<std::uint64_t> boundsAt;
+    for (auto const& bounds : content.bounds) {
+      boundsAt.push_back(align(end, kNvttSectionAlignment));
+      end = boundsAt.back() + bounds.length;
+    }
     m_pages.resize(align(end, kNvttPageBytes) / kNvttPageBytes * 8);
     m_data = align(m_header.size() + m_directory.size() + m_pages.size(), kNvttDataAlignment);
     m_length = m_data + end;
@@ -56,6 +61,9 @@ public:
       add(NvttSectionType::kTraversal, m_data + traversalAt, content.traversal, content.traversalLength);
     if (neighbors)
       add(NvttSectionType::kNeighbors, m_data + neighborsAt, content.neighbors, content.neighborsLength);
+    for (std::size_t n = 0; n < boundsAt.size(); ++n)
+      add(NvttSectionType::kBounds, m_data + boundsAt[n], content.bounds[n].bytes, content.bounds[n].length,
+          content.bounds[n].grid);
   }
 
   void write(OutputFile& file) {
@@ -75,9 +83,10 @@ public:
   }
 
 private:
-  void add(NvttSectionType type, std::uint64_t offset, void const* bytes, std::uint64_t length) {
+  void add(NvttSectionType type, std::uint64_t offset, void const* bytes, std::uint64_t length,
+           std::uint32_t index = 0) {
     m_runs.push_back({offset, static_cast<unsigned char const*>(bytes), length});
-    m_sections.push_back({type, 0, offset, length, 0});
+    m_sections.push_back({type, index, offset, length, 0});
   }
 
   unsigned char const* at(std::uint64_t offset) const {
@@ -162,6 +171,13 @@ void writeNvtt(std::string const& path, NvttContent const& content) {
   if (!answer.ok())
     throw FileError(path, "what is to be written is not a flat buffer: " + std::string(answer.message) +
                               " at byte " + std::to_string(answer.position));
+  BufferReader const reader(content.buffer);
+  for (auto const& bounds : content.bounds) {
+    auto const fault = BoundsReader::check(bounds.bytes, bounds.length, reader.container());
+    if (!fault.ok() || bounds.grid >= reader.gridCount())
+      throw FileError(path, "what is to be written has bounds of other tiles: " +
+                                std::string(fault.ok() ? "no such grid" : fault.message));
+  }
   OutputFile file(path);
   Writer(content).write(file);
   file.commit();

@@ -5,6 +5,7 @@
 
 #include <cstdint>
 #include <string>
+#include <vector>
 
 namespace VLN::Interop {
 
@@ -16,10 +17,17 @@ struct NvttContent {
   std::uint64_t traversalLength = 0;
   void const* neighbors = nullptr;
   std::uint64_t neighborsLength = 0;
+  /// Bounds of a grid's tiles, as Reader/NanoVTTBounds.h has them.
+  struct Bounds {
+    std::uint32_t grid = 0;
+    void const* bytes = nullptr;
+    std::uint64_t length = 0;
+  };
+  std::vector<Bounds> bounds = {};
 };
 
 /// Writes the file whole or not at all.
-/// @error FileError; also for a buffer that is none.
+/// @error FileError; also for a buffer that is none, and for bounds that are not those of its tiles.
 /// @numeric The same bytes for any number of threads.
 /// @cost Reads the content twice, for the hashes of pages and of sections, in parallel.
 VLN_API void writeNvtt(std::string const& path, NvttContent const& content);

@@ -1,95 +1,168 @@
-// GridCursor: many reads of one float grid, near each other. It remembers the last tile.
+// Many reads of one grid, near each other: cursors remember the way to the last tile.
+//
+//   Cursor<GridType::kFp8>   the type and the build known when it is compiled: no switch in a read
+//   GridCursor               float grids of every build, told apart in each read
 #pragma once
 
-#include "Reader/NanoVTTReader.h"
+#include "Reader/NanoVTTPath.h"
 
 namespace nanovtt {
 
-/// @pre A grid of float samples, of any build.
+/// Samples of one type and build.
+template <GridType kType> struct TypedSamples {
+  using Value = typename SampleOf<kType>::Value;
+  using Blend = typename SampleOf<kType>::Blend;
+
+  NANOVTT_HD static TileBlock block(GridReader const& grid, std::uint32_t tile) {
+    return grid.blockAs(kType, tile);
+  }
+  NANOVTT_HD static Value get(TileBlock const& block, std::uint64_t n) {
+    if constexpr (kType == GridType::kFp4) {
+      return of(block, block.samples[n >> 1] >> (4 * (n & 1)) & 15u);
+    } else if constexpr (kType == GridType::kFp8) {
+      return of(block, block.samples[n]);
+    } else if constexpr (kType == GridType::kFp16) {
+      return of(block, load<std::uint16_t>(block.samples + 2 * n));
+    } else if constexpr (kType == GridType::kFpN) {
+      return of(block, block.code(n));
+    } else {
+      return block.template get<Value>(n);
+    }
+  }
+
+private:
+  NANOVTT_HD static float of(TileBlock const& block, std::uint32_t code) {
+    return block.minimum + static_cast<float>(code) * block.quantum;
+  }
+};
+
+/// Samples of float grids of any build.
+struct AnyFloatSamples {
+  using Value = float;
+  using Blend = float;
+  NANOVTT_HD static TileBlock block(GridReader const& grid, std::uint32_t tile) { return grid.block(tile); }
+  NANOVTT_HD static float get(TileBlock const& block, std::uint64_t n) { return block.getFloat(n); }
+};
+
+/// @pre A grid whose samples are such.
 /// @threads One for each thread.
-class GridCursor {
+template <class Samples> class CursorOf {
 public:
+  using Value = typename Samples::Value;
+  using Blend = typename Samples::Blend;
+
   /// @param maxDepth Deeper tiles are not read: a coarse picture of the same field.
-  NANOVTT_HD explicit GridCursor(GridReader const& grid, int maxDepth = kMaxDepth)
+  NANOVTT_HD explicit CursorOf(GridReader const& grid, int maxDepth = kMaxDepth)
       : m_grid(grid)
-      , m_default(grid.defaultValue().getFloat(0))
-      , m_maxDepth(maxDepth) {}
+      , m_path(grid.container(), maxDepth)
+      , m_default(load<Value>(grid.defaultValue().samples)) {}
 
   /// The sample that holds the position, of the deepest tile there; the default value where there is none.
   /// @space Tile space.
-  /// @cost In the tile of the read before: one test and one load. Else a search from the root table.
-  NANOVTT_HD float value(std::int32_t x, std::int32_t y, std::int32_t z) {
+  /// @cost In the tile of the read before: one test and one load. Else up the tree as far as need be, and
+  /// down.
+  NANOVTT_HD Value value(std::int32_t x, std::int32_t y, std::int32_t z) {
     if (!holds(x, y, z) && !moveTo(x, y, z)) return m_default;
-    return m_block.getFloat(
-        m_block.index(at(x, m_tile.corner.x), at(y, m_tile.corner.y), at(z, m_tile.corner.z)));
+    return Samples::get(
+        m_block, m_block.index(at(x, m_tile.corner.x), at(y, m_tile.corner.y), at(z, m_tile.corner.z)));
   }
 
   /// The blend of the eight samples round a position, samples on the low corners of their voxels.
-  /// @formula (b - a) * f + a along x, then y, then z.
-  /// @edges Without a halo, samples beyond the tile are those of the deepest tiles that hold their places.
+  /// @formula (b - a) * f + a along x, then y, then z; f is the position in the tile, in samples, less a
+  /// whole number.
+  /// @numeric Bit for bit what VoxelSamplerLinear gives of float channels with corner samples, where the
+  /// buffer holds its eight samples.
+  /// @edges Without a halo, samples beyond the tile are those of the tiles of its depth, and of coarser ones
+  /// where there is none.
   /// @cost In a tile with halo: no other tile is looked at.
-  NANOVTT_HD float trilinear(float x, float y, float z) {
+  NANOVTT_HD Blend trilinear(float x, float y, float z) {
     Cell c;
-    return cellAt(x, y, z, c) ? c.value() : m_default;
+    return cellAt(x, y, z, c) ? c.value() : blend(m_default);
   }
-  /// The blend, and its derivative in the cell about the position.
+  /// The blend, and its derivative in the cell about the position along x, y and z.
   /// @units Of the derivative: per unit of tile space.
   /// @edges Where there is no tile all three are 0.
-  NANOVTT_HD float trilinear(float x, float y, float z, float gradient[3]) {
+  NANOVTT_HD Blend trilinear(float x, float y, float z, Blend gradient[3]) {
     Cell c;
     if (!cellAt(x, y, z, c)) {
-      gradient[0] = gradient[1] = gradient[2] = 0;
-      return m_default;
+      gradient[0] = gradient[1] = gradient[2] = Blend{};
+      return blend(m_default);
     }
     c.slope(gradient);
     float const perUnit = 1 / static_cast<float>(std::int32_t(1) << m_shift);
-    for (int a = 0; a < 3; ++a) gradient[a] *= perUnit;
+    for (int a = 0; a < 3; ++a) gradient[a] = gradient[a] * perUnit;
     return c.value();
   }
+
+  /// The tile that was read last. @pre The read before found one.
+  NANOVTT_HD TileRef const& tile() const { return m_tile; }
 
 private:
   /// Eight samples, and where the position lies between them.
   struct Cell {
-    float v[8];
+    Blend v[8];
     float fx, fy, fz;
 
-    NANOVTT_HD float value() const {
-      float const y0 = lerp(lerp(v[0], v[1], fx), lerp(v[2], v[3], fx), fy);
-      float const y1 = lerp(lerp(v[4], v[5], fx), lerp(v[6], v[7], fx), fy);
+    NANOVTT_HD Blend value() const {
+      Blend const y0 = lerp(lerp(v[0], v[1], fx), lerp(v[2], v[3], fx), fy);
+      Blend const y1 = lerp(lerp(v[4], v[5], fx), lerp(v[6], v[7], fx), fy);
       return lerp(y0, y1, fz);
     }
-    NANOVTT_HD void slope(float g[3]) const {
+    NANOVTT_HD void slope(Blend g[3]) const {
       g[0] = lerp(lerp(v[1] - v[0], v[3] - v[2], fy), lerp(v[5] - v[4], v[7] - v[6], fy), fz);
       g[1] = lerp(lerp(v[2] - v[0], v[3] - v[1], fx), lerp(v[6] - v[4], v[7] - v[5], fx), fz);
       g[2] = lerp(lerp(v[4] - v[0], v[5] - v[1], fx), lerp(v[6] - v[2], v[7] - v[3], fx), fy);
     }
   };
+  NANOVTT_HD static Blend lerp(Blend const& a, Blend const& b, float f) { return (b - a) * f + a; }
+  NANOVTT_HD static Blend blend(Value const& v) { return static_cast<Blend>(v); }
+
   NANOVTT_HD bool cellAt(float x, float y, float z, Cell& cell) {
     std::int32_t const px = floorOf(x), py = floorOf(y), pz = floorOf(z);
     if (!holds(px, py, pz) && !moveTo(px, py, pz)) return false;
-    float const width = static_cast<float>(std::int32_t(1) << m_shift);
-    int const i = at(px, m_tile.corner.x), j = at(py, m_tile.corner.y), k = at(pz, m_tile.corner.z);
-    cell.fx = (x - static_cast<float>(m_tile.corner.x + (i << m_shift))) / width;
-    cell.fy = (y - static_cast<float>(m_tile.corner.y + (j << m_shift))) / width;
-    cell.fz = (z - static_cast<float>(m_tile.corner.z + (k << m_shift))) / width;
-    float* const v = cell.v;
+    int i = at(px, m_tile.corner.x), j = at(py, m_tile.corner.y), k = at(pz, m_tile.corner.z);
+    float const perSample = 1 / static_cast<float>(std::int32_t(1) << m_shift);
+    cell.fx = place(x, m_tile.corner.x, perSample, i);
+    cell.fy = place(y, m_tile.corner.y, perSample, j);
+    cell.fz = place(z, m_tile.corner.z, perSample, k);
+    Blend* const v = cell.v;
     if (i + 1 < m_block.width && j + 1 < m_block.width && k + 1 < m_block.width) {
       std::uint64_t const n = m_block.index(i, j, k), dj = m_block.strideJ, dk = m_block.strideK;
-      v[0] = m_block.getFloat(n), v[1] = m_block.getFloat(n + 1);
-      v[2] = m_block.getFloat(n + dj), v[3] = m_block.getFloat(n + dj + 1);
-      v[4] = m_block.getFloat(n + dk), v[5] = m_block.getFloat(n + dk + 1);
-      v[6] = m_block.getFloat(n + dj + dk), v[7] = m_block.getFloat(n + dj + dk + 1);
+      v[0] = sample(n), v[1] = sample(n + 1), v[2] = sample(n + dj), v[3] = sample(n + dj + 1);
+      v[4] = sample(n + dk), v[5] = sample(n + dk + 1);
+      v[6] = sample(n + dj + dk), v[7] = sample(n + dj + dk + 1);
     } else {
-      std::int32_t const step = std::int32_t(1) << m_shift;
-      std::int32_t const cx = m_tile.corner.x + (i << m_shift), cy = m_tile.corner.y + (j << m_shift),
-                         cz = m_tile.corner.z + (k << m_shift);
-      for (int c = 0; c < 8; ++c)
-        v[c] = static_cast<float>(m_grid.valueAt(cx + (c & 1 ? step : 0), cy + (c & 2 ? step : 0),
-                                                 cz + (c & 4 ? step : 0), 0, m_maxDepth));
+      for (int c = 0; c < 8; ++c) v[c] = sampleBeside(i + (c & 1), j + (c >> 1 & 1), k + (c >> 2));
     }
     return true;
   }
-  NANOVTT_HD static float lerp(float a, float b, float f) { return (b - a) * f + a; }
+  /// Where a position lies between samples n and n + 1 of its tile.
+  /// @param n In: the sample that holds its floor. As floats tell it, it may be the next one.
+  NANOVTT_HD float place(float p, std::int32_t corner, float perSample, int& n) const {
+    // From the corner of the tile of four samples: a merged block has many.
+    std::int32_t const part =
+        static_cast<std::int32_t>(static_cast<std::uint32_t>(n / kTileWidth * kTileWidth) << m_shift);
+    float const l = (p - static_cast<float>(corner + part)) * perSample;
+    int const low = l > 0 ? static_cast<int>(l) : 0, inPart = low < kTileWidth - 1 ? low : kTileWidth - 1;
+    n = n / kTileWidth * kTileWidth + inPart;
+    return l - static_cast<float>(inPart);
+  }
+  NANOVTT_HD Blend sample(std::uint64_t n) const { return blend(Samples::get(m_block, n)); }
+  /// A sample of the tile, or beyond it on the high side.
+  NANOVTT_HD Blend sampleBeside(int i, int j, int k) const {
+    if (i < m_block.width && j < m_block.width && k < m_block.width) return sample(m_block.index(i, j, k));
+    std::int64_t const x = m_tile.corner.x + (std::int64_t(i) << m_shift),
+                       y = m_tile.corner.y + (std::int64_t(j) << m_shift),
+                       z = m_tile.corner.z + (std::int64_t(k) << m_shift);
+    if (x > INT32_MAX || y > INT32_MAX || z > INT32_MAX) return blend(m_default);
+    auto const px = static_cast<std::int32_t>(x), py = static_cast<std::int32_t>(y),
+               pz = static_cast<std::int32_t>(z);
+    // Samples of a merged block are those of the tiles at its bottom.
+    TileRef const there = m_grid.container().find(px, py, pz, m_grid.sampleDepth(m_block, m_tile));
+    if (!there.valid()) return blend(m_default);
+    TileBlock const b = Samples::block(m_grid, there.number);
+    return blend(Samples::get(b, GridReader::sampleAt(b, there, px, py, pz)));
+  }
   NANOVTT_HD static std::int32_t floorOf(float v) {
     // What no coordinate reaches lies out of every tree.
     if (!(v >= -2147483648.0f && v <= 2147483520.0f)) return INT32_MIN;
@@ -97,8 +170,8 @@ private:
     return cut - (static_cast<float>(cut) > v);
   }
   NANOVTT_HD bool holds(std::int32_t x, std::int32_t y, std::int32_t z) const {
-    return distance(x, m_tile.corner.x) < m_width && distance(y, m_tile.corner.y) < m_width &&
-           distance(z, m_tile.corner.z) < m_width;
+    return distance(x, m_alike.x) < m_width && distance(y, m_alike.y) < m_width &&
+           distance(z, m_alike.z) < m_width;
   }
   NANOVTT_HD static std::uint32_t distance(std::int32_t c, std::int32_t corner) {
     return static_cast<std::uint32_t>(c) - static_cast<std::uint32_t>(corner);
@@ -107,32 +180,36 @@ private:
     return static_cast<int>(distance(c, corner) >> m_shift);
   }
   NANOVTT_HD bool moveTo(std::int32_t x, std::int32_t y, std::int32_t z) {
-    m_tile = m_grid.container().find(x, y, z, m_maxDepth);
     m_width = 0;
-    if (!m_tile.valid()) return false;
-    // A tile found above a refined place holds that place no longer than to its next child: only tiles
-    // without children are kept whole.
-    m_block = m_grid.block(m_tile.number);
-    m_shift = kTileSpaceBits - m_tile.depth - 2;
-    for (int core = m_block.core; core > kTileWidth; core /= 2) --m_shift;
-    bool const leaf = m_tile.depth == m_maxDepth || m_tile.depth == kMaxDepth || isChildless(m_tile.number);
-    m_width = leaf ? static_cast<std::uint32_t>(m_tile.width()) : 0;
+    if (!m_path.moveTo(x, y, z)) return false;
+    TileRef const tile = m_path.tile();
+    if (tile.number != m_tile.number) {
+      m_tile = tile;
+      m_block = Samples::block(m_grid, tile.number);
+      m_shift = kTileSpaceBits - m_grid.sampleDepth(m_block, tile) - 2;
+    }
+    // Of a tile above a refined place only the part is kept that has no deeper one.
+    int const shift = m_path.alikeShift();
+    m_width = 1u << shift;
+    m_alike = {part(x, tile.corner.x, shift), part(y, tile.corner.y, shift), part(z, tile.corner.z, shift)};
     return true;
   }
-  NANOVTT_HD bool isChildless(std::uint32_t tile) const {
-    auto const list = m_grid.container().children(tile);
-    for (std::uint32_t n = 0; n < list.count(); ++n)
-      if (list[n] != kNoTile) return false;
-    return true;
+  NANOVTT_HD static std::int32_t part(std::int32_t c, std::int32_t corner, int shift) {
+    return static_cast<std::int32_t>(static_cast<std::uint32_t>(corner) +
+                                     (distance(c, corner) >> shift << shift));
   }
 
   GridReader m_grid;
-  float m_default;
-  int m_maxDepth;
+  TilePath m_path;
+  Value m_default;
   TileRef m_tile;
   TileBlock m_block;
-  std::uint32_t m_width = 0; ///< of what may be read without a search; 0: nothing
+  Coord m_alike;             ///< corner of what may be read without a search
+  std::uint32_t m_width = 0; ///< its width; 0: nothing may
   int m_shift = 0;           ///< log2 of the width of a sample
 };
+
+template <GridType kType> using Cursor = CursorOf<TypedSamples<kType>>;
+using GridCursor = CursorOf<AnyFloatSamples>;
 
 } // namespace nanovtt

@@ -94,6 +94,15 @@ public:
     return {m_bytes + kChildOffsetsBase + (entry & kOffsetMask),
             static_cast<int>(entry >> kChildLevelsShift)};
   }
+  /// Whether any entry of children() is a tile.
+  /// @pre The tile is not at the deepest depth.
+  NANOVTT_HD bool hasChildren(std::uint32_t tile) const {
+    // The parent table follows the last entry, which names the table that all tiles without children share.
+    std::uint64_t const last = load<std::uint64_t>(m_bytes + kParentTableOffset) - 8;
+    return children(tile).table !=
+           m_bytes + kChildOffsetsBase +
+               (load<std::uint64_t>(m_bytes + kChildOffsetsBase + last) & kOffsetMask);
+  }
 
   /// The deepest tile at or above `maxDepth` that holds the point.
   /// @edges Not valid when there is none. Tiles inside a coalesced block are found as the block's tile.
@@ -120,6 +129,18 @@ public:
     }
     std::int64_t const inside = (std::int64_t(1) << (kTileSpaceBits - depth)) - 1;
     return {number, depth, {at(m_llc.x, dx & ~inside), at(m_llc.y, dy & ~inside), at(m_llc.z, dz & ~inside)}};
+  }
+
+  /// The finest tile, no deeper than this one, at an offset of so many of its widths on each axis.
+  /// @edges Not valid where there is none. NeighborReader answers the same by one read, for offsets of -1 to
+  /// 1, where its structure was made.
+  NANOVTT_HD TileRef neighbor(TileRef const& tile, int dx, int dy, int dz) const {
+    std::int64_t const w = tile.width(), x = tile.corner.x + dx * w, y = tile.corner.y + dy * w,
+                       z = tile.corner.z + dz * w;
+    auto const isOut = [](std::int64_t c) { return c < INT32_MIN || c > INT32_MAX; };
+    if (isOut(x) || isOut(y) || isOut(z)) return {};
+    return find(static_cast<std::int32_t>(x), static_cast<std::int32_t>(y), static_cast<std::int32_t>(z),
+                tile.depth);
   }
 
   /// Calls f(TileRef) for every tile: each before its children.
@@ -228,6 +249,48 @@ struct TileBlock {
   }
 };
 
+/// A vector as a grid holds it.
+template <class C, int N> struct Vec {
+  C v[N];
+
+  NANOVTT_HD friend Vec operator+(Vec a, Vec const& b) {
+    for (int n = 0; n < N; ++n) a.v[n] += b.v[n];
+    return a;
+  }
+  NANOVTT_HD friend Vec operator-(Vec a, Vec const& b) {
+    for (int n = 0; n < N; ++n) a.v[n] -= b.v[n];
+    return a;
+  }
+  NANOVTT_HD friend Vec operator*(Vec a, float f) {
+    for (int n = 0; n < N; ++n) a.v[n] *= static_cast<C>(f);
+    return a;
+  }
+};
+
+/// What a sample of a grid type is, and what samples are blended in: float for 16 bits and less, double for
+/// more.
+template <GridType> struct SampleOf {
+  using Value = float; // also of all quantised builds
+  using Blend = float;
+};
+#define NANOVTT_SAMPLE(type, value, blend)                                                                   \
+  template <> struct SampleOf<GridType::type> {                                                              \
+    using Value = value;                                                                                     \
+    using Blend = blend;                                                                                     \
+  };
+NANOVTT_SAMPLE(kDouble, double, double)
+NANOVTT_SAMPLE(kInt16, std::int16_t, float)
+NANOVTT_SAMPLE(kInt32, std::int32_t, double)
+NANOVTT_SAMPLE(kInt64, std::int64_t, double)
+NANOVTT_SAMPLE(kUInt32, std::uint32_t, double)
+using Float3 = Vec<float, 3>;
+using Float4 = Vec<float, 4>;
+using Double3 = Vec<double, 3>;
+NANOVTT_SAMPLE(kFloat3, Float3, Float3)
+NANOVTT_SAMPLE(kFloat4, Float4, Float4)
+NANOVTT_SAMPLE(kDouble3, Double3, Double3)
+#undef NANOVTT_SAMPLE
+
 /// Components of one sample.
 NANOVTT_HD constexpr int componentCount(GridType type) {
   return type == GridType::kFloat3 || type == GridType::kDouble3 ? 3 : type == GridType::kFloat4 ? 4 : 1;
@@ -283,23 +346,25 @@ public:
   NANOVTT_HD unsigned char const* textureData() const { return m_bytes + kTileTableOffset + tableBytes(); }
 
   /// The samples of a tile.
-  NANOVTT_HD TileBlock block(std::uint32_t tile) const {
+  NANOVTT_HD TileBlock block(std::uint32_t tile) const { return blockAs(m_type, tile); }
+  /// The same where the type is known when it is compiled. @pre It is the grid's.
+  NANOVTT_HD TileBlock blockAs(GridType type, std::uint32_t tile) const {
     std::uint64_t const e = entry(tile);
     TileBlock block;
-    block.type = m_type;
+    block.type = type;
     block.samples = m_bytes + kTileTableOffset + (e & kOffsetMask);
-    if (isQuantised(m_type)) {
+    if (isQuantised(type)) {
       block.minimum = load<float>(block.samples + kQuantisedMinimumOffset);
       block.quantum = load<float>(block.samples + kQuantisedQuantumOffset);
       bool halo = false;
-      if (m_type == GridType::kFpN) {
+      if (type == GridType::kFpN) {
         int const logBits = block.samples[kFpNLogBitsOffset];
         block.bits = 1 << logBits;
         halo = load<std::uint16_t>(block.samples + kFpNPayloadOffset) == (kFpNHaloCodes / 8) << logBits;
         block.samples += kFpNRecordBytes;
       } else {
-        block.bits = codeBits(m_type);
-        halo = (entry(tile + 1) & kOffsetMask) - (e & kOffsetMask) == tileBytes(m_type, true);
+        block.bits = codeBits(type);
+        halo = (entry(tile + 1) & kOffsetMask) - (e & kOffsetMask) == tileBytes(type, true);
         block.samples += kQuantisedCodesOffset;
       }
       block.width = halo ? kHaloTileWidth : kTileWidth;
@@ -311,17 +376,23 @@ public:
     if (isTexture()) {
       block.strideJ = m_textureWidth;
       std::uint64_t const x = e & 0xFFFF, y = e >> 16 & 0xFFFF, z = e >> 32 & 0xFFFF;
-      block.samples = textureData() + (x + m_textureWidth * (y + m_textureWidth * z)) * elementBytes(m_type);
+      block.samples = textureData() + (x + m_textureWidth * (y + m_textureWidth * z)) * elementBytes(type);
     }
     block.strideK = block.strideJ * (isTexture() ? m_textureWidth : static_cast<std::uint64_t>(block.width));
     return block;
   }
 
+  /// The depth whose tiles have samples as fine as the block: that of the tile, or of a merged block's
+  /// bottom.
+  NANOVTT_HD static int sampleDepth(TileBlock const& block, TileRef const& tile) {
+    int depth = tile.depth;
+    for (std::int32_t core = block.core; core > kTileWidth; core >>= 1) ++depth;
+    return depth;
+  }
   /// Index, in the block of the tile, of the sample that holds a point of the tile.
   NANOVTT_HD static std::uint64_t sampleAt(TileBlock const& block, TileRef const& tile, std::int32_t x,
                                            std::int32_t y, std::int32_t z) {
-    int shift = kMaxDepth - tile.depth;
-    for (std::int32_t core = block.core; core > kTileWidth; core >>= 1) --shift;
+    int const shift = kMaxDepth - sampleDepth(block, tile);
     return block.index((x - tile.corner.x) >> shift, (y - tile.corner.y) >> shift,
                        (z - tile.corner.z) >> shift);
   }

@@ -1,7 +1,7 @@
 // NvttFile: the envelope of a .nvtt file, which holds a NanoVTT buffer as it stands in memory.
 //
 //   │ header 128 │ directory │ page hashes │ 0 │ buffer: container, grids │ 0 │ traversal │ 0 │ neighbours │
-//   └────────────────────────────────────────┘ ^ multiple of 4096           ^ multiples of 64
+//   0 │ bounds │ └────────────────────────────────────────┘ ^ multiple of 4096           ^ multiples of 64
 //
 // docs/flat_buffer.md has the byte tables. What a later version adds is skipped here: sections of unknown
 // types, and what headers and directory entries hold beyond the bytes known here. A file says itself which
@@ -55,7 +55,13 @@ inline constexpr std::uint64_t kNvttEntryStartOffset = 8;   // u64, from the sta
 inline constexpr std::uint64_t kNvttEntryLengthOffset = 16; // u64
 inline constexpr std::uint64_t kNvttEntryHashOffset = 24;   // u64
 
-enum class NvttSectionType : std::uint32_t { kContainer = 1, kGrid = 2, kTraversal = 3, kNeighbors = 4 };
+enum class NvttSectionType : std::uint32_t {
+  kContainer = 1,
+  kGrid = 2,
+  kTraversal = 3,
+  kNeighbors = 4,
+  kBounds = 5
+};
 
 struct NvttSection {
   NvttSectionType type = {};
@@ -185,6 +191,7 @@ private:
         break;
       case NvttSectionType::kTraversal:
       case NvttSectionType::kNeighbors:
+      case NvttSectionType::kBounds:
         inside = inside && s.offset % kNvttSectionAlignment == 0;
         break;
       default:

@@ -24,7 +24,7 @@ struct Item {
 class Packer {
 public:
   Packer(Field const& field, PackOptions const& options)
-      : m_view(field.view())
+      : m_view(field.wholeView())
       , m_tiles(field.tiles())
       , m_options(options) {
     // Coarse samples are means of those of the next depth, where there is one.

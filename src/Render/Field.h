@@ -1,25 +1,25 @@
 // Field: what rays need of a grid beside its buffer, made once and in parallel.
 #pragma once
 
+#include "Reader/NanoVTTBounds.h"
 #include "Render/Export.h"
 #include "Render/FieldView.h"
 
 #include <functional>
+#include <utility>
 #include <vector>
 
 namespace VLN::Render {
 
-/// Smallest and largest value of a tile and of all below it, the layer beyond its high sides included: no
-/// blend that begins in the tile lies outside. Codes of 16 bits between the bounds of the field, rounded
-/// outward.
-struct TileBounds {
-  std::uint16_t low, high;
-};
-
 struct FieldOptions {
   int component = -1; ///< of vectors; -1 for their length
   int threads = 0;    ///< 0: one for each processor
+  /// Bounds that BoundsReader::check() found sound, of a .nvtt file or made by makeBounds(), which live
+  /// longer than the field; null to make them. Those of one component are made in any case.
+  void const* bounds = nullptr;
 };
+
+class Scalar;
 
 class VLN_RENDER_API Field {
 public:
@@ -33,19 +33,15 @@ public:
   explicit Field(nanovtt::GridReader const& grid, FieldOptions const& options = {});
 
   /// Of all samples. Both 0 without tiles.
-  float low() const { return m_low; }
-  float high() const { return m_high; }
+  float low() const { return m_bounds.low(); }
+  float high() const { return m_bounds.high(); }
   float background() const { return m_view.background; }
-  std::uint32_t tileCount() const { return static_cast<std::uint32_t>(m_bounds.size()); }
+  std::uint32_t tileCount() const { return static_cast<std::uint32_t>(m_tiles.size()); }
   /// By number; not valid where a merged block has the samples.
   std::vector<nanovtt::TileRef> const& tiles() const { return m_tiles; }
-  TileBounds bounds(std::uint32_t tile) const { return m_bounds[tile]; }
-  /// What a code stands for. @numeric value(bounds.low) <= each sample <= value(bounds.high).
-  float value(std::uint16_t code) const;
-
-  /// Mean of the values below a tile, each by the volume that it stands for; of the tile's own where it has
-  /// no children.
-  float mean(std::uint32_t tile) const { return m_means[tile]; }
+  /// Smallest and largest value of a tile and of all below it, the layer beyond its high sides included: no
+  /// blend that begins in the tile lies outside. Means are those of the finest samples in the tile.
+  nanovtt::BoundsReader const& bounds() const { return m_bounds; }
 
   /// Tile-space position of local (0, 0, 0).
   Vec3d origin() const { return m_origin; }
@@ -64,8 +60,12 @@ public:
   /// @pre `weight` of a range is no less than that of a range inside it.
   void weigh(Weight const& weight, int threads = 0);
   FieldView const& view() const { return m_view; }
-  /// Rays stop at tiles of this depth.
-  void limitDepth(int depth) { m_view.maxDepth = depth; }
+  /// Rays stop at tiles of this depth. Samples of those that have deeper ones are then means: of the finest
+  /// samples about their places, as far as the next one on each side.
+  /// @cost For each such tile 216 means, most of them of tiles.
+  void limitDepth(int depth, int threads = 0);
+  /// All depths, and samples as they are stored, whatever limitDepth() was given.
+  FieldView wholeView() const;
 
   /// Values that differ from the background, of the deepest tiles, sorted: each n-th one, so that at most
   /// about `count` come.
@@ -74,21 +74,28 @@ public:
 private:
   /// Whether the samples are one apart: of a tile of the deepest depth, or of a merged block of such.
   bool isFinest(std::uint32_t n) const;
-  struct Gather;
+  void fillBricks(Scalar const& scalar, bool isAllFinite, int threads);
+  void makeMeans(int depth, int threads);
   void place(double const lowest[3], double const highest[3]);
+  /// Of a tile, as rays see it.
+  std::pair<float, float> range(std::uint32_t n) const {
+    return n < m_limitedRanges.size() ? m_limitedRanges[n] : std::pair(m_bounds.low(n), m_bounds.high(n));
+  }
 
   nanovtt::GridReader m_grid;
   FieldView m_view;
-  float m_low = 0, m_high = 0;
-  double m_quantum = 0;
   Vec3d m_origin;
   Vec3 m_activeLow, m_activeHigh;
   bool m_isEmpty = true;
   std::vector<nanovtt::TileRef> m_tiles;
   std::vector<std::uint64_t> m_bricks;
   std::vector<float> m_beside;
-  std::vector<TileBounds> m_bounds;
-  std::vector<float> m_means;
+  std::vector<unsigned char> m_madeBounds;
+  nanovtt::BoundsReader m_bounds;
+  std::uint64_t m_gathered = 0; ///< floats beside the buffer, which bricks of means follow
+  // Of tiles down to a limited depth.
+  std::vector<std::uint64_t> m_limitedBricks;
+  std::vector<std::pair<float, float>> m_limitedRanges;
   std::vector<float> m_weights, m_rootWeights;
   std::vector<std::uint64_t> m_cells;
 };

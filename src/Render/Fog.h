@@ -9,13 +9,17 @@
 
 namespace VLN::Render {
 
-/// Light that arrives at the points of a coarse lattice over the field's box, by a sweep from plane to plane.
+/// Shares of light that arrive at the points of a coarse lattice over the field's box: from the light, and
+/// from above.
 struct LightView {
-  float const* values = nullptr; ///< 0 to 1, x fastest
+  struct Shares {
+    float direct, above;
+  };
+  Shares const* values = nullptr; ///< 0 to 1, x fastest
   int size[3] = {1, 1, 1};
   Vec3 low, scale; ///< lattice = (local - low) * scale
 
-  NANOVTT_HD float at(Vec3 p) const {
+  NANOVTT_HD Shares at(Vec3 p) const {
     int n[3];
     float f[3];
     for (int a = 0; a < 3; ++a) {
@@ -27,10 +31,15 @@ struct LightView {
     }
     std::int64_t const dx = size[0] > 1, dy = size[1] > 1 ? size[0] : 0,
                        dz = size[2] > 1 ? std::int64_t(size[0]) * size[1] : 0;
-    float const* const v = values + (std::int64_t(n[2]) * size[1] + n[1]) * size[0] + n[0];
-    float const y0 = lerp(lerp(v[0], v[dx], f[0]), lerp(v[dy], v[dy + dx], f[0]), f[1]);
-    float const y1 = lerp(lerp(v[dz], v[dz + dx], f[0]), lerp(v[dz + dy], v[dz + dy + dx], f[0]), f[1]);
-    return lerp(y0, y1, f[2]);
+    Shares const* const v = values + (std::int64_t(n[2]) * size[1] + n[1]) * size[0] + n[0];
+    Shares const y0 = mix(mix(v[0], v[dx], f[0]), mix(v[dy], v[dy + dx], f[0]), f[1]);
+    Shares const y1 = mix(mix(v[dz], v[dz + dx], f[0]), mix(v[dz + dy], v[dz + dy + dx], f[0]), f[1]);
+    return mix(y0, y1, f[2]);
+  }
+
+private:
+  NANOVTT_HD static Shares mix(Shares a, Shares b, float f) {
+    return {lerp(a.direct, b.direct, f), lerp(a.above, b.above, f)};
   }
 };
 
@@ -44,10 +53,10 @@ struct FogView {
   Vec3 light;      ///< world, unit length, to the light
   Vec3 lightLocal; ///< the same in local space
   Vec3 lightColor, sky, ground;
-  Vec3 worldToLocal[3];    ///< rows
-  Vec3 viewUp;             ///< world; the sky is on that side
-  LightView direct, above; ///< of previews
-  float step = 1;          ///< of previews, in world length
+  Vec3 worldToLocal[3]; ///< rows
+  Vec3 viewUp;          ///< world; the sky is on that side
+  LightView lights;     ///< of previews
+  float step = 1;       ///< of previews, in world length
   int bounces = 1;
 
   NANOVTT_HD float extinction(float value, float& place) const {
@@ -136,7 +145,7 @@ NANOVTT_HD inline FogSample marchFog(FogView const& fog, Ray const& ray, Vec3 wo
       float const sigma = fog.extinction(trilinear(s.brick, u), place);
       if (!(sigma > 0)) continue;
       float const alpha = 1 - std::exp(-sigma * fog.step);
-      float const lit = fog.direct.at(p), open = fog.above.at(p);
+      auto const [lit, open] = fog.lights.at(p);
       float const root = std::sqrt(std::sqrt(lit));
       Vec3 const light = fog.lightColor * (0.65f * phase * lit + 0.35f * root * root * 0.5f + 0.1f * root) +
                          fog.ground * (0.35f + 0.25f * root) + fog.sky * open;

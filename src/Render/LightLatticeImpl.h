@@ -8,14 +8,14 @@
 namespace VLN::Render {
 
 struct LightLattice {
-  std::vector<float> values;
+  std::vector<LightView::Shares> values;
   LightView view;
 };
 
-/// Sweeps from plane to plane, from the side of the light on: what a point gets is what the place toward the
-/// light got on the plane before, less what the fog between takes.
-/// @param toLight Local, of world length 1. @param spacing Local distances of the points.
+/// Sweeps, for each of the two lights, from plane to plane, from the side of the light on: what a point gets
+/// is what the place toward the light got on the plane before, less what the fog between takes.
+/// @param toLight, up Local, of world length 1. @param spacing Local distances of the points.
 /// @cost One blend of the field for each point; in parallel within a plane.
-LightLattice sweepLight(FogView const& fog, Vec3 toLight, Vec3 spacing, int threads);
+LightLattice sweepLights(FogView const& fog, Vec3 toLight, Vec3 up, Vec3 spacing, int threads);
 
 } // namespace VLN::Render

@@ -45,7 +45,7 @@ struct Scene {
   Affine toLocal;
   Vec3d eye;       ///< local
   Vec3d light;     ///< world, unit
-  double diagonal; ///< of the field's box, world length
+  double diagonal; ///< of the field's box, world length; set with the depth
 
   bool start(double u, double v, Start& s) const {
     s.world = camera.ray(u, v);
@@ -233,7 +233,7 @@ double stepOf(Scene const& scene, double voxel) {
 }
 
 /// Rays end at the depth whose samples are about as wide as a pixel where the camera is nearest.
-void limitDepth(Field& field, Scene const& scene, RenderOptions const& options, double voxel) {
+void limitDepth(Field& field, Scene& scene, RenderOptions const& options, double voxel) {
   int depth = options.depth;
   if (depth < 0) {
     Vec3d nearest = scene.eye; // of the box, local
@@ -245,7 +245,8 @@ void limitDepth(Field& field, Scene const& scene, RenderOptions const& options, 
     depth = nanovtt::kMaxDepth - (voxels >= 2 ? static_cast<int>(std::floor(std::log2(voxels))) : 0);
   }
   int const root = nanovtt::kTileSpaceBits - field.view().rootShift;
-  field.limitDepth(std::clamp(depth, root, nanovtt::kMaxDepth));
+  field.limitDepth(std::clamp(depth, root, nanovtt::kMaxDepth), options.threads);
+  scene.diagonal = length(scene.toWorld.vector((field.view().high - field.view().low).as<double>()));
 }
 
 Scene sceneOf(Field const& field, Affine const& tileToWorld, Camera const& camera,
@@ -256,7 +257,6 @@ Scene sceneOf(Field const& field, Affine const& tileToWorld, Camera const& camer
   Affine toWorld = tileToWorld;
   toWorld.shift = tileToWorld.point(field.origin());
   Scene scene{field, camera, options, toWorld, toWorld.inverse(), {}, {}, {}};
-  scene.diagonal = length(tileToWorld.vector((field.view().high - field.view().low).as<double>()));
   scene.eye = scene.toLocal.point(camera.position);
   scene.light = length(options.light) > 0
                     ? normalized(options.light)
@@ -288,7 +288,7 @@ void weighField(Field& field, RenderOptions const& options) {
 struct FogScene {
   FogView view;
   double unit = 0; ///< of opacity
-  LightLattice direct, above;
+  LightLattice lights;
 };
 
 /// World lengths between the points of a lattice of light, in samples.
@@ -338,9 +338,8 @@ FogScene prepareFog(Field& field, Scene const& scene, Transfer const& transfer, 
   if (options.quality == Quality::kFinal) return result;
   Vec3 const spacing = latticeSpacing(fog.field, tileToWorld);
   Vec3 const up = scene.toLocal.vector(scene.camera.viewUp).as<float>();
-  result.direct = sweepLight(fog, fog.lightLocal, spacing, options.threads);
-  result.above = sweepLight(fog, up, spacing, options.threads);
-  fog.direct = result.direct.view, fog.above = result.above.view;
+  result.lights = sweepLights(fog, fog.lightLocal, up, spacing, options.threads);
+  fog.lights = result.lights.view;
   return result;
 }
 
@@ -432,7 +431,7 @@ void colorValues(Picture& picture, RenderOptions const& options, Transfer transf
 
 double opacityUnit(Field& field, Affine const& tileToWorld, Camera const& camera,
                    RenderOptions const& options) {
-  Scene const scene = sceneOf(field, tileToWorld, camera, options);
+  Scene scene = sceneOf(field, tileToWorld, camera, options);
   Transfer const transfer(options.transfer);
   double const voxel = voxelOf(tileToWorld);
   limitDepth(field, scene, options, voxel);
@@ -444,7 +443,7 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
                std::function<void(double)> const& watch) {
   if (options.width < 1 || options.height < 1 || options.width > 32768 || options.height > 32768)
     throw std::invalid_argument("a picture has 1 to 32768 pixels an axis");
-  Scene const scene = sceneOf(field, tileToWorld, camera, options);
+  Scene scene = sceneOf(field, tileToWorld, camera, options);
 
   bool const isFinal = options.quality == Quality::kFinal;
   double const voxel = voxelOf(tileToWorld);
@@ -454,6 +453,7 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
   // Surfaces have no colours of their own: their values may span what a transfer function cannot.
   Transfer const transfer(options.mode == Mode::kSurface ? TransferOptions() : options.transfer);
   limitDepth(field, scene, options, voxel);
+  picture.deepest = field.view().maxDepth, picture.light = scene.light;
   FogScene fog;
   if (options.mode == Mode::kFog) {
     fog = prepareFog(field, scene, transfer, tileToWorld);

@@ -49,6 +49,8 @@ struct Picture {
 
   int samples = 0;         ///< of each pixel
   double opacityUnit = 0;  ///< that was used
+  int deepest = 0;         ///< depth of the deepest tiles drawn
+  Vec3d light;             ///< world direction to the light that was used
   float low = 0, high = 0; ///< range of the colours that was used
   double seconds = 0;      ///< of the rays alone
   std::int64_t rays = 0;   ///< from the camera

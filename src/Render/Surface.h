@@ -28,15 +28,23 @@ NANOVTT_HD inline void cubicAlong(float const* p, int stride, Vec3 o, Vec3 d, fl
 
 /// The first place in [0, end] where c[0] + ... + c[3] s^3 goes from below 0 to not below it, or back; below
 /// 0 when there is none.
-/// @formula Between the extrema, where the derivative's roots are, the cubic is monotonic; there regula falsi
-/// with the Illinois rule, to a part in a million of `end`.
+/// @formula The cubic stays between its Bernstein coefficients; where they do not rise or fall it may have
+/// extrema. Between those, where the derivative's roots are, the cubic is monotonic; there regula falsi with
+/// the Illinois rule, to a part in a million of `end`.
 /// @source G. Marmitt and others, "Fast and Accurate Ray-Voxel Intersection Techniques for Iso-Surface Ray
 /// Tracing", VMV 2004.
 NANOVTT_HD inline float firstRoot(float const c[4], float end) {
   auto const f = [&](float s) { return c[0] + s * (c[1] + s * (c[2] + s * c[3])); };
+  // Between its Bernstein coefficients the cubic stays. Where they rise or fall it has no extremum.
+  float const third = end / 3, b1 = c[0] + third * c[1], b2 = c[0] + third * (2 * c[1] + end * c[2]),
+              last = f(end);
+  bool const isBelow = c[0] < 0;
+  if ((b1 < 0) == isBelow && (b2 < 0) == isBelow && (last < 0) == isBelow) return -1;
+  bool const isMonotonic =
+      isBelow ? c[0] <= b1 && b1 <= b2 && b2 <= last : c[0] >= b1 && b1 >= b2 && b2 >= last;
   float stops[3];
   int count = 0;
-  float const a = 3 * c[3], b = 2 * c[2], root = b * b - 4 * a * c[1];
+  float const a = 3 * c[3], b = 2 * c[2], root = isMonotonic ? 0 : b * b - 4 * a * c[1];
   if (root > 0) {
     // The form without cancellation.
     float const q = -0.5f * (b + (b < 0 ? -std::sqrt(root) : std::sqrt(root)));

@@ -49,6 +49,34 @@ float between(Points const& points, float v) {
   return points.back().second;
 }
 
+// What is narrower than a step of the table is as wide as one, and not lost: the entry next to a point that
+// is higher, or lower, than what stands on both its sides takes its opacity. Of both in one entry the higher.
+void keepExtremes(TransferView& view, Points const& points) {
+  auto const entryOf = [&](std::size_t n) {
+    float const v = view.isLog ? std::log(std::max(points[n].first, 1e-30f)) : points[n].first;
+    return (v - view.low) * view.scale * (kTransferSize - 1);
+  };
+  for (bool isPeak : {false, true})
+    for (std::size_t n = 0; n < points.size(); ++n) {
+      float const own = points[n].second;
+      // The next point of another opacity on a side; none behind a plateau that is as wide as a step.
+      auto const isBeyond = [&](std::ptrdiff_t way) {
+        auto at = static_cast<std::ptrdiff_t>(n);
+        do at += way;
+        while (at >= 0 && at < static_cast<std::ptrdiff_t>(points.size()) &&
+               points[static_cast<std::size_t>(at)].second == own);
+        if (at < 0 || at >= static_cast<std::ptrdiff_t>(points.size())) return false;
+        auto const last = static_cast<std::size_t>(at - way);
+        float const other = points[static_cast<std::size_t>(at)].second;
+        return std::abs(entryOf(last) - entryOf(n)) < 1 && (isPeak ? own > other : own < other);
+      };
+      float const at = entryOf(n);
+      if (!(at >= 0 && at <= kTransferSize - 1) || !isBeyond(-1) || !isBeyond(1)) continue;
+      float& entry = view.opacity[std::lround(at)];
+      entry = isPeak ? std::max(entry, own) : std::min(entry, own);
+    }
+}
+
 using Shape = float (*)(float);
 struct Named {
   char const* name;
@@ -105,6 +133,7 @@ Transfer::Transfer(TransferOptions const& options) {
                             ? named->shape(std::min(1.0f, std::abs(value - options.from) / farthest))
                             : named->shape(t);
   }
+  keepExtremes(m_view, points);
   std::copy_n(m_view.opacity, kTransferSize, m_largest[0].begin());
   for (std::size_t n = 1; n < m_largest.size(); ++n)
     for (std::size_t i = 0; i + (std::size_t(1) << n) <= kTransferSize; ++i)

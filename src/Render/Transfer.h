@@ -39,7 +39,7 @@ struct TransferOptions {
   bool log = false;        ///< equal factors of the value in place of equal steps
   std::string colors = "viridis";
   /// "linear", "linear_r", "sigmoid", "geom", "geom_r", "constant", or pairs "value:opacity,value:opacity"
-  /// with straight lines between.
+  /// with straight lines between. What is narrower than a step of the table is as wide as one.
   std::string opacity = "linear";
   /// Opacity grows with the distance from this value in place of that from `low`.
   bool awayFrom = false;

@@ -5,6 +5,7 @@
 #include "Interop/NvttWrite.h"
 #include "Interop/Slice.h"
 #include "Interop/VolumeFile.h"
+#include "Reader/NanoVTTBounds.h"
 #include "support/FlatVolume.h"
 #include "support/TempFolder.h"
 
@@ -37,8 +38,13 @@ struct Converted {
     handle = Support::flatten<>(*volume.object, options, &traversal, &neighbors);
   }
   NvttContent content() const {
-    return {handle.data(),    handle.size(),    traversal.data(),
-            traversal.size(), neighbors.data(), neighbors.size()};
+    return {handle.data(),
+            handle.size(),
+            traversal.data(),
+            traversal.size(),
+            neighbors.data(),
+            neighbors.size(),
+            {}};
   }
 
   nanovtt::GridHandle<AlignedHostBuffer> handle;
@@ -185,6 +191,58 @@ TEST(Nvtt, BoundaryABufferAlone) {
   EXPECT_EQ(mapped.file().sectionCount(), 1u);
   EXPECT_EQ(mapped.file().find(NvttSectionType::kTraversal), 1u);
   EXPECT_EQ(mapped.reader().gridCount(), 0u);
+}
+
+// Of tiles that are all alike: from the first code to the last.
+std::vector<unsigned char> widestBounds(std::uint32_t tiles) {
+  std::vector<unsigned char> bytes(nanovtt::boundsBytes(tiles, 8));
+  nanovtt::store(bytes.data() + nanovtt::kBoundsTilesOffset, tiles);
+  nanovtt::store(bytes.data() + nanovtt::kBoundsBitsOffset, std::uint32_t(8));
+  nanovtt::store(bytes.data() + nanovtt::kBoundsLowOffset, -1.0f);
+  nanovtt::store(bytes.data() + nanovtt::kBoundsHighOffset, 1.0f);
+  for (std::uint32_t n = 0; n < tiles; ++n) bytes[nanovtt::kBoundsRowsOffset + 3 * n + 1] = 255;
+  return bytes;
+}
+
+TEST(Nvtt, RequirementBoundsLieBesideTheBuffer) {
+  TempFolder const folder;
+  Converted const volume;
+  std::uint32_t const tiles = nanovtt::ContainerReader(volume.handle.data()).tileCount();
+  auto bounds = widestBounds(tiles);
+  std::string const path = folder / "a.nvtt";
+  auto content = volume.content();
+  content.bounds.push_back({1, bounds.data(), bounds.size()});
+  writeNvtt(path, content);
+  MappedNvtt const mapped(path, NvttCheck::kPages);
+  EXPECT_EQ(mapped.bounds(0), nullptr);
+  ASSERT_NE(mapped.bounds(1), nullptr);
+  EXPECT_EQ(std::memcmp(mapped.bounds(1), bounds.data(), bounds.size()), 0);
+  EXPECT_EQ(mapped.file().find(NvttSectionType::kTraversal), 3u) << "what was there before lies where it lay";
+
+  bounds[0] ^= 1;
+  EXPECT_THROW(writeNvtt(path, content), FileError);
+  bounds[0] ^= 1;
+  content.bounds[0].grid = 2;
+  EXPECT_THROW(writeNvtt(path, content), FileError);
+}
+
+TEST(Nvtt, NegativeDamagedBounds) {
+  TempFolder const folder;
+  Converted const volume;
+  auto const bounds = widestBounds(nanovtt::ContainerReader(volume.handle.data()).tileCount());
+  std::string const path = folder / "a.nvtt";
+  auto content = volume.content();
+  content.bounds.push_back({0, bounds.data(), bounds.size()});
+  writeNvtt(path, content);
+  std::uint64_t start = 0;
+  {
+    MappedNvtt const mapped(path);
+    start = mapped.file().section(mapped.file().find(NvttSectionType::kBounds)).offset;
+  }
+  std::string bytes = readAll(path);
+  bytes[start + 50] = static_cast<char>(bytes[start + 50] ^ 4);
+  writeAll(path, bytes);
+  EXPECT_EQ(refusal(path), "bounds differ from their hash (at byte " + std::to_string(start) + ")");
 }
 
 TEST(Nvtt, NegativeNothingIsWrittenForWhatIsNoBuffer) {

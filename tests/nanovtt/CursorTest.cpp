@@ -11,6 +11,7 @@
 #include <cmath>
 #include <limits>
 #include <random>
+#include <string>
 
 namespace {
 
@@ -75,11 +76,31 @@ TEST(Cursor, RequirementReadsWhatLookupsRead) {
     }
 }
 
-// requirement: in halo tiles the blend is the library's own
+// requirement: where the buffer holds the samples, blend and gradient are the library's own, bit for bit
+template <class ChannelT>
+void expectSamplers(Ball const& ball, nanovtt::GridCursor cursor, ChannelT const& channel,
+                    std::string const& label) {
+  auto const tree = ball.object->component<Container<Shape>>("voxel_tile_tree");
+  auto const topology = ball.object->component<VoxelTopology<Shape>>("voxel_component");
+  FloatVoxelSamplerLinear<Shape> const sampler(*tree, *topology, channel);
+  std::mt19937 random(4);
+  std::uniform_real_distribution<float> within(0.0f, 1.0f);
+  for (int n = 0; n < 40000; ++n) {
+    // Of the box of the deepest tiles, whose high sides are left out: what lies beyond is coarser.
+    float3 p{-20 + 19 * within(random), -8 + 24 * within(random), -20 + 28 * within(random)};
+    if (n % 4 == 0) p[n / 4 % 3] = std::floor(p[n / 4 % 3]);                           // on samples
+    if (n % 5 == 0) p[n / 5 % 3] = std::nextafter(std::floor(p[n / 5 % 3]), -1000.0f); // just below them
+    float3 wanted;
+    float got[3];
+    float const value = sampler.sampleGradient(p, kSamplerTileSpace, &wanted);
+    ASSERT_EQ(cursor.trilinear(p.x, p.y, p.z, got), value) << label << p.x << ' ' << p.y << ' ' << p.z;
+    for (int a = 0; a < 3; ++a)
+      ASSERT_EQ(got[a], wanted[a]) << label << p.x << ' ' << p.y << ' ' << p.z << " axis " << a;
+    ASSERT_EQ(cursor.trilinear(p.x, p.y, p.z), sampler.sample(p, kSamplerTileSpace)) << label;
+  }
+}
 TEST(Cursor, RequirementBlendsAsTheSampler) {
   Ball const ball;
-  auto const flat = ball.flatten(1.0f, false);
-  nanovtt::GridCursor cursor(nanovtt::BufferReader(flat.data()).grid(0));
   auto const tree = ball.object->component<Container<Shape>>("voxel_tile_tree");
   auto const topology = ball.object->component<VoxelTopology<Shape>>("voxel_component");
   auto const field = ball.object->component<Channel<Shape, float, 4, 0>>("density");
@@ -87,16 +108,45 @@ TEST(Cursor, RequirementBlendsAsTheSampler) {
   Channel<Shape, float, 5, 0> wide("wide", &zero, kInitializeDefaultValue, false, true, 0, Shape::kMaxDepth);
   wide.update(*topology);
   computeHalo<Shape, float, 0, 0, 1, 0>(*field, *tree, wide, -1, -1);
-  FloatVoxelSamplerLinear<Shape> const sampler(*tree, *topology, wide);
-  std::mt19937 random(4);
-  std::uniform_real_distribution<float> inside(-18.0f, 1.0f);
-  float worst = 0;
+  for (float halo : {0.0f, 0.5f, 1.0f})
+    for (bool coalesce : {false, true}) {
+      auto const flat = ball.flatten(halo, coalesce);
+      nanovtt::GridCursor const cursor(nanovtt::BufferReader(flat.data()).grid(0));
+      auto const label = "halo " + std::to_string(halo) + (coalesce ? ", coalesced: " : ": ");
+      expectSamplers(ball, cursor, wide, label);
+      expectSamplers(ball, cursor, *field, label);
+    }
+}
+
+// requirement: a cursor that knows its type blends as the one that does not, of every build
+template <nanovtt::GridType kType, class BuildT> void expectTypedBlends(Ball const& ball, float halo) {
+  Buffer const pool;
+  auto const flat = nanovtt::vttToNanoVTT<Buffer, BuildT, nanovdb::AbsDiff, true>(
+      *ball.object, "density", nanovdb::StatsMode(0), nanovdb::ChecksumMode(0), 0, 0.01f, false, halo,
+      ball.rootLevel, 0, false, false, false, 1, false, false, 0.0f, false, false, nullptr, nullptr, nullptr,
+      pool);
+  auto const grid = nanovtt::BufferReader(flat.data()).grid(0);
+  ASSERT_EQ(grid.type(), kType);
+  nanovtt::GridCursor any(grid);
+  nanovtt::Cursor<kType> typed(grid);
+  std::mt19937 random(8);
+  std::uniform_real_distribution<float> inside(-70.0f, 70.0f);
   for (int n = 0; n < 20000; ++n) {
-    // Where tiles of the deepest depth are surrounded by their like.
-    float3 const p{inside(random), std::abs(inside(random)) - 8.0f, inside(random)};
-    worst = std::max(worst, std::abs(cursor.trilinear(p.x, p.y, p.z) - sampler.sample(p, kSamplerTileSpace)));
+    float const x = inside(random), y = inside(random), z = inside(random);
+    float a[3], b[3];
+    ASSERT_EQ(any.trilinear(x, y, z, a), typed.trilinear(x, y, z, b));
+    for (int axis = 0; axis < 3; ++axis) ASSERT_EQ(a[axis], b[axis]);
   }
-  EXPECT_LE(worst, 2e-6f);
+}
+TEST(Cursor, RequirementBlendsTheSameWithItsTypeKnown) {
+  Ball const ball;
+  for (float halo : {0.0f, 1.0f}) {
+    expectTypedBlends<nanovtt::GridType::kFloat, void>(ball, halo);
+    expectTypedBlends<nanovtt::GridType::kFp4, nanovdb::Fp4>(ball, halo);
+    expectTypedBlends<nanovtt::GridType::kFp8, nanovdb::Fp8>(ball, halo);
+    expectTypedBlends<nanovtt::GridType::kFp16, nanovdb::Fp16>(ball, halo);
+    expectTypedBlends<nanovtt::GridType::kFpN, nanovdb::FpN>(ball, halo);
+  }
 }
 
 // requirement: the derivative is that of the blend

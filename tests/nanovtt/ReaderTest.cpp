@@ -1,5 +1,5 @@
 // The library's reader against the slow one, on random volumes.
-#include "Reader/NanoVTTReader.h"
+#include "Reader/NanoVTTCursor.h"
 #include "Reader/NanoVTTValidate.h"
 #include "support/FlatChecks.h"
 
@@ -58,6 +58,112 @@ void expectSameTree(nanovtt::ContainerReader const& reader, FlatModel const& mod
     for (int const z : {INT32_MIN, -536870912, 0, INT32_MAX}) expectAt({x, 0, z}, 28);
 }
 
+// Tiles by number, without the traversal structure: onward, back, and from anywhere.
+void expectSameOrder(nanovtt::ContainerReader const& reader, FlatModel const& model,
+                     std::string const& label) {
+  auto const count = static_cast<std::uint32_t>(model.tiles.size());
+  auto const expectTile = [&](nanovtt::TileRef const& tile, std::uint32_t number) {
+    auto const& wanted = model.tiles[number];
+    ASSERT_EQ(tile.number, number) << label;
+    ASSERT_EQ(tile.depth, wanted.depth) << label << ", tile " << number;
+    ASSERT_TRUE(tile.corner.x == wanted.corner.x && tile.corner.y == wanted.corner.y &&
+                tile.corner.z == wanted.corner.z)
+        << label << ", tile " << number;
+  };
+  std::uint32_t n = 0;
+  for (nanovtt::TileRef const& tile : nanovtt::tilesOf(reader)) expectTile(tile, n++);
+  EXPECT_EQ(n, count) << label;
+  nanovtt::TileIterator at(reader, count);
+  EXPECT_TRUE(at.atEnd());
+  while (n > 0) expectTile(*--at, --n);
+  std::mt19937 random(7);
+  for (int step = 0; step < 200 && count > 0; ++step) {
+    at.seek(static_cast<std::uint32_t>(random() % count));
+    expectTile(*at, at.number());
+    expectTile(*nanovtt::TileIterator(reader, at.number()), at.number());
+    if (!(++at).atEnd()) expectTile(*at, at.number());
+  }
+  for (std::uint32_t tile = 0; tile < count; tile += 3) {
+    auto const& t = model.tiles[tile];
+    nanovtt::TileRef const ref{tile, t.depth, {t.corner.x, t.corner.y, t.corner.z}};
+    bool has = false;
+    if (t.depth < 28) {
+      auto const list = reader.children(tile);
+      for (std::uint32_t c = 0; c < list.count(); ++c) has |= list[c] != nanovtt::kNoTile;
+      ASSERT_EQ(reader.hasChildren(tile), has) << label;
+    }
+    for (int c = 0; c < 27; ++c) {
+      std::int64_t const w = FlatModel::width(t.depth);
+      std::int64_t const p[3] = {t.corner.x + (c % 3 - 1) * w, t.corner.y + (c / 3 % 3 - 1) * w,
+                                 t.corner.z + (c / 9 - 1) * w};
+      bool const isIn = std::all_of(p, p + 3, [](auto v) { return v >= INT32_MIN && v <= INT32_MAX; });
+      auto const wanted =
+          isIn ? model.find({static_cast<int>(p[0]), static_cast<int>(p[1]), static_cast<int>(p[2])}, t.depth)
+               : FlatModel::kNone;
+      ASSERT_EQ(reader.neighbor(ref, c % 3 - 1, c / 3 % 3 - 1, c / 9 - 1).number, wanted)
+          << label << ", tile " << tile << ", neighbour " << c;
+    }
+  }
+}
+
+template <class Value> double componentOf(Value const& value, int c) {
+  if constexpr (std::is_arithmetic_v<Value>)
+    return static_cast<double>(value) + 0 * c;
+  else
+    return static_cast<double>(value.v[c]);
+}
+
+// A cursor that knows its type, at places in and beside tiles, near each other and not, at every depth limit.
+template <nanovtt::GridType kType>
+void expectSameReads(nanovtt::GridReader const& grid, FlatModel const& model, std::string const& label) {
+  ASSERT_EQ(grid.type(), kType) << label;
+  std::mt19937 random(11);
+  for (int const limit : {28, 27, 25, 20, -1}) {
+    nanovtt::Cursor<kType> cursor(grid, limit);
+    for (auto const& tile : model.tiles)
+      for (int n = 0; n < 3; ++n) {
+        std::int64_t const w = FlatModel::width(tile.depth);
+        std::int32_t p[3];
+        for (int a = 0; a < 3; ++a)
+          p[a] = static_cast<std::int32_t>(std::clamp<std::int64_t>(
+              tile.corner[a] - w / 2 +
+                  static_cast<std::int64_t>(random() % static_cast<std::uint64_t>(2 * w)),
+              INT32_MIN, INT32_MAX));
+        for (int step = 0; step < 3; ++step) {
+          auto const value = cursor.value(p[0], p[1], p[2]);
+          for (int c = 0; c < nanovtt::componentCount(kType); ++c)
+            ASSERT_EQ(componentOf(value, c), grid.valueAt(p[0], p[1], p[2], c, limit))
+                << label << ", at " << p[0] << ' ' << p[1] << ' ' << p[2] << ", depth " << limit;
+          if (p[step] < INT32_MAX) ++p[step];
+        }
+      }
+  }
+}
+
+void expectSameReads(nanovtt::GridReader const& grid, FlatModel const& model, std::string const& label) {
+  using nanovtt::GridType;
+  switch (grid.type()) {
+#define FLAT_READS(type)                                                                                     \
+  case GridType::type:                                                                                       \
+    return expectSameReads<GridType::type>(grid, model, label);
+    FLAT_READS(kFloat)
+    FLAT_READS(kDouble)
+    FLAT_READS(kInt16)
+    FLAT_READS(kInt32)
+    FLAT_READS(kInt64)
+    FLAT_READS(kFloat3)
+    FLAT_READS(kDouble3)
+    FLAT_READS(kUInt32)
+    FLAT_READS(kFp4)
+    FLAT_READS(kFp8)
+    FLAT_READS(kFp16)
+    FLAT_READS(kFpN)
+    FLAT_READS(kFloat4)
+#undef FLAT_READS
+  }
+  FAIL() << label << ": type " << static_cast<int>(grid.type());
+}
+
 template <class T>
 void expectSameBlocks(nanovtt::GridReader const& reader, FlatModel const& model, FlatModel::Grid const& grid,
                       std::string const& label) {
@@ -109,6 +215,7 @@ template <class HandleT> void expectSame(HandleT const& handle, std::string cons
   nanovtt::BufferReader const reader(bytes.data());
   EXPECT_EQ(reader.container().bufferSize(), bytes.size());
   expectSameTree(reader.container(), model, label);
+  expectSameOrder(reader.container(), model, label);
   ASSERT_EQ(reader.gridCount(), model.grids.size()) << label;
   for (std::uint32_t n = 0; n < reader.gridCount(); ++n) {
     auto const& wanted = model.grids[n];
@@ -168,6 +275,7 @@ template <class HandleT> void expectSame(HandleT const& handle, std::string cons
           << label;
       ASSERT_EQ(grid.valueAt(corner.x, corner.y, corner.z, 0, ref.depth), block.getComponent(0, 0)) << label;
     }
+    expectSameReads(grid, model, label);
     ASSERT_EQ(grid.valueAt(INT32_MAX, 0, 0), grid.defaultValue().getComponent(0, 0)) << label;
   }
   EXPECT_EQ(reader.find("no such name"), reader.gridCount());

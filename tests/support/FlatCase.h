@@ -161,7 +161,7 @@ private:
     if (!nanovtt::NvttFile::open(bytes, length, file).ok()) return false;
     for (std::uint32_t n = 0; n < file.sectionCount() && n < 64; ++n) {
       auto const s = file.section(n);
-      if (s.type >= nanovtt::NvttSectionType::kContainer && s.type <= nanovtt::NvttSectionType::kNeighbors)
+      if (s.type >= nanovtt::NvttSectionType::kContainer && s.type <= nanovtt::NvttSectionType::kBounds)
         file.isIntact(s);
     }
     for (std::uint64_t page = 0; page < file.pageCount() && page < 4; ++page)

@@ -209,6 +209,14 @@ TEST_F(RenderProgramTest, RequirementTurntableAndParameters) {
   EXPECT_EQ(parameters["channel"], "surface");
   EXPECT_EQ(parameters["size"][1], 80);
   EXPECT_EQ(parameters["camera"]["position"].size(), 3u);
+  for (char const* name : {"component", "depth", "light", "occlusion_rays", "samples_asked", "time_limit",
+                           "scalar_bar", "axes", "turntable"})
+    EXPECT_TRUE(parameters.contains(name)) << name;
+  EXPECT_EQ(parameters["turntable"], 3);
+  EXPECT_NEAR(parameters["light"][0].get<double>() * parameters["light"][0].get<double>() +
+                  parameters["light"][1].get<double>() * parameters["light"][1].get<double>() +
+                  parameters["light"][2].get<double>() * parameters["light"][2].get<double>(),
+              1, 1e-6);
 }
 
 // requirement: an .exr file holds light, opacity, normals and depth

@@ -78,14 +78,14 @@ TEST_P(ViewRealTest, RequirementEveryFileHasAPage) {
   std::string const data = VLN_TEST_DATA_DIR;
   if (data.empty()) GTEST_SKIP() << "no real input files";
   std::string const volume = data + "/vdb/" + GetParam();
-  if (std::string(GetParam()).find("points") != std::string::npos) {
-    expectFailure(vln({"view", volume, "-o", m_folder / "p.html"}),
-                  volume + ": has points; view shows volumes alone");
-    return;
-  }
   std::string const text = page(volume, {"--max-size", "2MB"});
   EXPECT_LT(text.size(), std::size_t(2) << 20);
   auto const json = nlohmann::json::parse(part(text, "about"));
+  if (std::string(GetParam()).find("points") != std::string::npos) {
+    EXPECT_GT(json["points"]["count"], 1000);
+    EXPECT_GT(part(text, "block0").size(), 1000u);
+    return;
+  }
   std::size_t blocks = 1;
   for (auto const& channel : json["channels"])
     for (auto const& level : channel["levels"]) {
@@ -113,6 +113,37 @@ TEST_F(ViewPageTest, RequirementSizeChoosesTheDepth) {
     deepest = depth, last = text.size();
     if (size != "20MB") { EXPECT_LE(text.size(), std::stoul(size) * 1024); }
   }
+}
+
+// A sphere of coloured points far from the origin.
+std::string dots(std::string const& path, int count) {
+  std::ofstream out(path);
+  out << "ply\nformat ascii 1.0\nelement vertex " << count
+      << "\nproperty double x\nproperty double y\nproperty double z\nproperty uchar red\nproperty uchar "
+         "green\n"
+         "property uchar blue\nend_header\n";
+  out.precision(12);
+  for (int n = 0; n < count; ++n) {
+    double const z = 1 - 2 * (n + 0.5) / count, r = std::sqrt(1 - z * z), a = 2.399963 * n;
+    out << 600000 + 5 * r * std::cos(a) << ' ' << 800000 + 5 * r * std::sin(a) << ' ' << 10 * z << ' '
+        << 40 + n * 200 / count << " 90 " << 240 - n * 200 / count << '\n';
+  }
+  return path;
+}
+
+// requirement: of points as many as fit, and larger ones
+TEST_F(ViewPageTest, RequirementSizeChoosesThePoints) {
+  std::string const file = dots(m_folder / "dots.ply", 200000);
+  auto const all = about(file)["points"];
+  EXPECT_EQ(all["count"], 200000);
+  std::string const text = page(file, {"--max-size", "256KB"});
+  EXPECT_LE(text.size(), std::size_t(256) << 10);
+  auto const few = nlohmann::json::parse(part(text, "about"))["points"];
+  EXPECT_GT(few["count"], 5000);
+  EXPECT_LT(few["count"], 100000);
+  EXPECT_GT(few["radius"], all["radius"]);
+  expectFailure(vln({"view", file, "--max-size", "1KB", "-o", m_folder / "q.html"}),
+                file + ": its points do not fit into 0 bytes");
 }
 
 // requirement
@@ -318,6 +349,7 @@ TEST_F(ViewProgramTest, RequirementPagesInABrowser) {
         *it, static_cast<float>(d < 0 ? std::max(d, -2.7) : std::max(0.0, std::min(d - 4, 3.0))));
   }
   file({halo}, "zeros.vdb");
+  dots(m_folder / "dots.ply", 3000);
   RunResult const run = runProgram({VLN_NODE, VLN_VIEW_TEST, VLN_PROGRAM, VLN_VIEW_MODULES, m_folder / ""});
   std::cout << run.out;
   EXPECT_EQ(run.code, 0) << run.err;

@@ -44,6 +44,7 @@ struct FlattenOptions {
   std::string file;
   std::string output;
   VLN::Interop::FlattenOptions flat;
+  int boundsBits = 16; ///< of the bounds of tiles beside the buffer; 0 for none
   VLN::Interop::VdbReadLimits limits;
 };
 void flatten(FlattenOptions const& options);

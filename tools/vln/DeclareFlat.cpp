@@ -62,6 +62,12 @@ void declareFlatten(CLI::App& self) {
       ->type_name("D");
   self.add_flag("--traversal", f.traversal, "Also where each tile lies")->excludes(coalesce);
   self.add_flag("--neighbours", f.neighbors, "Also the 27 neighbours of each tile")->excludes(coalesce);
+  static std::map<std::string, int> const bounds{{"none", 0}, {"8", 8}, {"16", 16}};
+  self.add_option("--bounds", o.boundsBits,
+                  "Also bounds and means of each tile, in codes of so many bits, which render and view use")
+      ->transform(CLI::CheckedTransformer(bounds, CLI::ignore_case))
+      ->default_str("16")
+      ->type_name("none|8|16");
   auto* cubic = self.add_flag("--cubic", f.cubic, "Make the buffer a cube of whole elements");
   self.add_option("--element-bytes", f.elementBytes, "Bytes of such an element")
       ->needs(cubic)

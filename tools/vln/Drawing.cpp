@@ -90,7 +90,7 @@ Drawing::Drawing(RenderCommandOptions const& options, std::string const& channel
     m_margin = m_source.points->radius;
     return;
   }
-  m_field.emplace(m_source.grid, FieldOptions{options.component, options.render.threads});
+  m_field.emplace(m_source.grid, FieldOptions{options.component, options.render.threads, m_source.bounds});
   if (m_field->empty()) throw std::invalid_argument("channel '" + m_source.channel + "' has no active voxel");
   choose(*m_field, m_source, options, m_render);
   auto const shows = [&](float low, float high) {

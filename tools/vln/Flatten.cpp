@@ -6,9 +6,12 @@
 #include "Interop/NvttWrite.h"
 #include "Interop/VolumeFile.h"
 #include "ProgressBar.h"
+#include "Render/Bounds.h"
 #include "StandardOutput.h"
 
+#include <chrono>
 #include <iostream>
+#include <vector>
 
 #include <fmt/format.h>
 
@@ -41,7 +44,23 @@ VdbVolume const& volumeFor(VdbImport const& content, std::string const& filter) 
 
 std::string megabytes(std::uint64_t bytes) { return fmt::format("{:.2f} MB", double(bytes) / 1e6); }
 
-void report(VdbVolume const& volume, FlatVolume const& flat, bool quantised) {
+// Of each grid's tiles.
+struct Bounds {
+  std::vector<std::vector<unsigned char>> grids;
+  double seconds = 0;
+};
+Bounds boundsOf(FlatVolume const& flat, int bits) {
+  Bounds bounds;
+  if (bits == 0) return bounds;
+  auto const began = std::chrono::steady_clock::now();
+  nanovtt::BufferReader const reader(flat.buffer.data());
+  for (std::uint32_t n = 0; n < reader.gridCount(); ++n)
+    bounds.grids.push_back(VLN::Render::makeBounds(reader.grid(n), {-1, bits, 0}));
+  bounds.seconds = std::chrono::duration<double>(std::chrono::steady_clock::now() - began).count();
+  return bounds;
+}
+
+void report(VdbVolume const& volume, FlatVolume const& flat, Bounds const& bounds, bool quantised) {
   nanovtt::BufferReader const reader(flat.buffer.data());
   auto const& container = reader.container();
   std::uint64_t halos = 0;
@@ -62,6 +81,9 @@ void report(VdbVolume const& volume, FlatVolume const& flat, bool quantised) {
   }
   if (!flat.traversal.empty()) text << fmt::format("  traversal   {}\n", megabytes(flat.traversal.size()));
   if (!flat.neighbors.empty()) text << fmt::format("  neighbours  {}\n", megabytes(flat.neighbors.size()));
+  if (!bounds.grids.empty())
+    text << fmt::format("  bounds      {} a grid; made in {:.1f} ms\n",
+                        megabytes(bounds.grids.front().size()), bounds.seconds * 1e3);
   std::string const each =
       voxels > 0 ? fmt::format(", {:.2f} bytes per active voxel", double(flat.buffer.size()) / double(voxels))
                  : "";
@@ -80,6 +102,7 @@ void flatten(FlattenOptions const& options) {
   checkOutputFor(FileContent::kFlatBuffers, options.output);
   VdbImport content;
   FlatVolume flat;
+  Bounds bounds;
   VdbVolume const* volume = nullptr;
   {
     ProgressBar bar;
@@ -92,13 +115,22 @@ void flatten(FlattenOptions const& options) {
     } catch (FileError const&) { throw; } catch (std::runtime_error const& error) {
       throw FileError(options.file, error.what());
     }
+    bounds = boundsOf(flat, options.boundsBits);
     if (progress) progress("writing", 0.5);
-    writeNvtt(options.output, {flat.buffer.data(), flat.buffer.size(), flat.traversal.data(),
-                               flat.traversal.size(), flat.neighbors.data(), flat.neighbors.size()});
+    NvttContent file{flat.buffer.data(),
+                     flat.buffer.size(),
+                     flat.traversal.data(),
+                     flat.traversal.size(),
+                     flat.neighbors.data(),
+                     flat.neighbors.size(),
+                     {}};
+    for (std::uint32_t n = 0; n < bounds.grids.size(); ++n)
+      file.bounds.push_back({n, bounds.grids[n].data(), bounds.grids[n].size()});
+    writeNvtt(options.output, file);
   }
   std::ostream& text = remarks(options.output);
   text << options.output << '\n';
-  if (&text == &out()) report(*volume, flat, options.flat.quantisation != Quantisation::kNone);
+  if (&text == &out()) report(*volume, flat, bounds, options.flat.quantisation != Quantisation::kNone);
   if (!volume->transform.empty())
     std::cerr << fmt::format("vln: {}: note: a flat buffer holds one voxel size; the transform is {}\n",
                              options.file, volume->transform);

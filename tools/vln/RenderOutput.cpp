@@ -173,7 +173,12 @@ void writeParameters(std::string const& path, std::string const& picture, Render
   json["size"] = {frame.picture.width, frame.picture.height};
   json["samples"] = frame.picture.samples;
   json["seconds"] = frame.picture.seconds;
+  json["samples_asked"] = r.samples;
+  json["time_limit"] = r.timeLimit;
   json["background"] = options.background;
+  json["scalar_bar"] = options.scalarBar;
+  json["axes"] = options.axes;
+  json["turntable"] = options.turntable;
   json["camera"] = {{"position", vector(frame.camera.position)},
                     {"focal_point", vector(frame.camera.focalPoint)},
                     {"view_up", vector(frame.camera.viewUp)},
@@ -182,7 +187,9 @@ void writeParameters(std::string const& path, std::string const& picture, Render
     constexpr char const* modes[] = {"fog", "surface", "mip", "mean"};
     json["mode"] = modes[static_cast<int>(r.mode)];
     json["quality"] = r.quality == Quality::kFinal ? "final" : "preview";
-    if (r.mode == Mode::kSurface) json["iso"] = r.iso;
+    json["component"] = options.component;
+    json["depth"] = frame.picture.deepest;
+    if (r.mode == Mode::kSurface) json["iso"] = r.iso, json["occlusion_rays"] = r.occlusionRays;
     if (r.mode != Mode::kSurface) {
       json["clim"] = {frame.picture.low, frame.picture.high};
       json["log"] = r.transfer.log;
@@ -190,10 +197,13 @@ void writeParameters(std::string const& path, std::string const& picture, Render
     }
     if (r.mode == Mode::kFog) {
       json["opacity"] = r.transfer.opacity;
+      if (r.transfer.awayFrom) json["opacity_rises_from"] = r.transfer.from;
+      json["anisotropy"] = r.anisotropy;
+      json["albedo"] = r.albedo;
+      json["bounces"] = r.bounces;
       json["opacity_unit"] = frame.picture.opacityUnit;
     }
-    json["light"] = vector(r.light);
-    if (options.depth >= 0) json["depth"] = options.depth;
+    json["light"] = vector(frame.picture.light);
   } else {
     json["mode"] = "points";
   }

@@ -49,6 +49,7 @@ RenderSource fromNvtt(std::string const& file, std::string const& channel) {
                               (names.empty() ? "none" : names));
   }
   source.grid = reader.grid(found);
+  source.bounds = source.mapped->bounds(found);
   source.channel = source.grid.name();
   auto const gridClass = source.grid.gridClass();
   source.gridClass = gridClass == nanovtt::GridClass::kFogVolume  ? "fog volume"

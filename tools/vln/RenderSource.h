@@ -19,6 +19,7 @@ struct RenderSource {
   std::string channel;
   std::string gridClass; ///< "fog volume", "level set", or another or none
   nanovtt::GridReader grid;
+  void const* bounds = nullptr; ///< of its tiles, where the file has them
   VLN::Render::Affine tileToWorld;
   std::string note; ///< what the user should know; empty for nothing
 

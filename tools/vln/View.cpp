@@ -6,6 +6,7 @@
 #include "Render/Colors.h"
 #include "StandardOutput.h"
 #include "ViewCommand.h"
+#include "ViewPoints.h"
 
 #include <algorithm>
 #include <array>
@@ -188,6 +189,19 @@ struct Page {
   std::string summary, note;
 };
 
+void addPoints(Page& page, PointCloud const& cloud, ViewCommandOptions const& options) {
+  std::uint64_t const beside = viewScript().size() + 8192;
+  PackedPoints points = packPoints(cloud, options.maxSize > beside ? options.maxSize - beside : 0);
+  page.summary = points.count < cloud.positions.size()
+                     ? fmt::format("  {} of {} points\n", points.count, cloud.positions.size())
+                     : fmt::format("  {} points\n", points.count);
+  page.about["points"] = {{"count", points.count},
+                          {"origin", numbers(points.origin)},
+                          {"size", numbers(points.size)},
+                          {"radius", points.radius}};
+  page.blocks.push_back(std::move(points.block));
+}
+
 Page makePage(ViewCommandOptions const& options, ProgressBar& bar) {
   Page page;
   std::vector<Channel> channels;
@@ -196,7 +210,6 @@ Page makePage(ViewCommandOptions const& options, ProgressBar& bar) {
   for (std::size_t n = 0; n < names.size(); ++n) {
     auto const from = double(n) / double(names.size()), to = double(n + 1) / double(names.size());
     Drawing drawing(options.look, names[n], bar.progress(from, from + 0.5 * (to - from)));
-    if (drawing.source().points) throw std::invalid_argument("has points; view shows volumes alone");
     page.note = drawing.source().note;
     Camera const camera = drawing.camera(0, 1);
     if (n == 0)
@@ -204,6 +217,10 @@ Page makePage(ViewCommandOptions const& options, ProgressBar& bar) {
                               {"focalPoint", numbers(camera.focalPoint)},
                               {"viewUp", numbers(camera.viewUp)},
                               {"viewAngle", camera.viewAngle}};
+    if (drawing.source().points) {
+      addPoints(page, *drawing.source().points, options);
+      return page;
+    }
     Channel channel;
     channel.about = aboutChannel(drawing, unitOf(drawing, camera));
     channel.levels = packLevels(drawing.field(), options, bar.progress(from + 0.5 * (to - from), to));

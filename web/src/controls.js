@@ -52,6 +52,16 @@ export function panel(page, look, range, actions, changed) {
   return { gui, update, show };
 }
 
+/** Of points. @param changed Called when the picture must be made anew. */
+export function pointPanel(page, look, drawn, actions, changed) {
+  const gui = new GUI({ title: page.title });
+  gui.add(drawn, 'size', 0.25, 4, 0.05).onChange(changed);
+  gui.addColor(look, 'backgroundColor').name('background').onChange(changed);
+  gui.add(actions, 'screenshot');
+  gui.add(actions, 'reset').name('reset camera');
+  return { gui };
+}
+
 /** Orbit by one finger or the left button, pan by two or another button, zoom by wheel or two fingers. */
 export function pointers(canvas, camera, moved) {
   const held = new Map();

@@ -3,10 +3,15 @@
 const VERTEX = `#version 300 es
 void main() { gl_Position = vec4(vec2(gl_VertexID & 1, gl_VertexID >> 1) * 4.0 - 1.0, 0, 1); }`;
 
-/** A fragment shader over the whole picture. @return The program, with the places of its uniforms. */
+/** A fragment shader over the whole picture. @return As link(). */
 export function program(gl, source) {
+  return link(gl, VERTEX, source);
+}
+
+/** @return The program, with the places of its uniforms. */
+export function link(gl, vertex, fragment) {
   const program = gl.createProgram();
-  for (const [type, text] of [[gl.VERTEX_SHADER, VERTEX], [gl.FRAGMENT_SHADER, source]]) {
+  for (const [type, text] of [[gl.VERTEX_SHADER, vertex], [gl.FRAGMENT_SHADER, fragment]]) {
     const shader = gl.createShader(type);
     gl.shaderSource(shader, text);
     gl.compileShader(shader);

@@ -2,7 +2,8 @@
 
 import { about, bricksOf, tablesOf, unpack } from './data.js';
 import { Camera } from './camera.js';
-import { panel, pointers } from './controls.js';
+import { panel, pointPanel, pointers } from './controls.js';
+import { PointRenderer } from './points.js';
 import { Renderer } from './renderer.js';
 import style from './style.css';
 import { Tree } from './tree.js';
@@ -26,26 +27,51 @@ class Page {
     this.canvas = element('canvas');
     this.message = element('div', 'message');
     this.about = about();
-    this.look = { channel: this.about.channels[0].name, slice: 'off', slicePlace: 0.5, cut: false,
-      backgroundColor: '#6b727a', background: linear('#6b727a') };
+    this.look = { backgroundColor: '#6b727a', background: linear('#6b727a') };
     this.movedAt = -Infinity;
   }
 
   async start() {
-    this.renderer = new Renderer(this.canvas, tablesOf(this.about, await unpack(0)));
-    this.renderer.lamp = this.about.light;
     this.camera = new Camera(this.about.camera);
-    this.loaded = new Map();
-    this.takeChannel();
     const actions = { screenshot: () => this.screenshot(), reset: () => (this.camera.reset(), this.moved()) };
-    this.panel = panel(this.about, this.look, this.range, actions, (what) => this.changed(what));
+    if (this.about.points) await this.startPoints(actions);
+    else await this.startVolume(actions);
     if (innerWidth < 500) this.panel.gui.close();
-    this.panel.update(this.range);
     pointers(this.canvas, this.camera, () => this.moved());
     new ResizeObserver(() => this.resize()).observe(this.canvas);
     this.resize();
     this.canvas.addEventListener('webglcontextlost', () => this.tell('The graphics card gave up; loading the page again may help.'));
-    // The coarsest depth first: something is seen while the rest is unpacked.
+    if (this.about.channels) await this.showDepths();
+    const loop = () => {
+      this.frame();
+      requestAnimationFrame(loop);
+    };
+    requestAnimationFrame(loop);
+  }
+
+  async startVolume(actions) {
+    Object.assign(this.look, { channel: this.about.channels[0].name, slice: 'off', slicePlace: 0.5, cut: false });
+    this.renderer = new Renderer(this.canvas, tablesOf(this.about, await unpack(0)));
+    this.renderer.lamp = this.about.light;
+    this.loaded = new Map();
+    this.takeChannel();
+    this.panel = panel(this.about, this.look, this.range, actions, (what) => this.changed(what));
+    this.panel.update(this.range);
+  }
+
+  async startPoints(actions) {
+    const renderer = this.renderer = new PointRenderer(this.canvas, this.about.points, await unpack(0));
+    const changed = () => {
+      renderer.look.background = [1, 3, 5].map((at) => parseInt(this.look.backgroundColor.slice(at, at + 2), 16) / 255);
+      this.moved();
+    };
+    this.panel = pointPanel(this.about, this.look, renderer.look, actions, changed);
+    this.inUse = true;
+    changed();
+  }
+
+  // The coarsest depth first: something is seen while the rest is unpacked.
+  async showDepths() {
     const wanted = this.look.depth;
     for (const depth of new Set([this.range.depths[0], wanted])) {
       this.look.depth = depth;
@@ -53,11 +79,6 @@ class Page {
       this.frame();
     }
     this.panel.show();
-    const loop = () => {
-      this.frame();
-      requestAnimationFrame(loop);
-    };
-    requestAnimationFrame(loop);
   }
 
   tell(text) {

@@ -99,6 +99,18 @@ bool clipTo(Ray r, inout float t0, inout float t1) {
   return t0 < t1;
 }
 
+// What holds the place a little behind t: the entry of its brick, or 0, and where the ray leaves it. What is empty is left
+// as wide as it is.
+uint cellAt(Ray r, float t, float t1, float little, out Brick b, out float leave) {
+  ivec3 c = ivec3(floor(r.o + r.d * (t + little)));
+  int s;
+  uint e = find(uSeen, c, s);
+  vec3 corner = vec3((c >> s) << s);
+  leave = max(min(exitOf(r, corner, float(1 << s)), t1), t + little);
+  if (e != 0u) b = brickOf(e, corner, s);
+  return e;
+}
+
 float placeOf(float v) {
   return clamp(((uLog ? log(max(v, 1e-30)) : v) - uLow) * uScale, 0.0, 1.0);
 }
@@ -124,19 +136,14 @@ vec4 marchFog(Ray r, vec3 world, float t0, float t1) {
   float n = ceil(t0 / uStep - uShift), t = (n + uShift) * uStep;
   int samples = 0;
   for (int cell = 0; cell < kMostCells && t < t1 && through > 2e-3; ++cell) {
-    vec3 q = r.o + r.d * t;
-    ivec3 c = ivec3(floor(q));
-    int s;
-    uint e = find(uSeen, c, s);
-    vec3 corner = vec3((c >> s) << s);
-    float leave = min(exitOf(r, corner, float(1 << s)), t1);
-    if (e == 0u) {
+    Brick b;
+    float leave;
+    if (cellAt(r, t, t1, 0.0, b, leave) == 0u) {
       n = max(n + 1.0, ceil(leave / uStep - uShift)), t = (n + uShift) * uStep;
       continue;
     }
-    Brick b = brickOf(e, corner, s);
     do {
-      q = r.o + r.d * t;
+      vec3 q = r.o + r.d * t;
       float place = placeOf(valueIn(b, q));
       float sigma = opacityAt(place) * uPerUnit;
       if (sigma > 0.0) {
@@ -166,16 +173,12 @@ bool hitSurface(Ray r, float t0, float t1, float samples, out float at) {
   float t = t0, before = 0.0;
   bool has = false;
   for (int cell = 0; cell < kMostCells && t < t1; ++cell) {
-    ivec3 c = ivec3(floor(r.o + r.d * (t + little)));
-    int s;
-    uint e = find(uSeen, c, s);
-    vec3 corner = vec3((c >> s) << s);
-    float leave = max(min(exitOf(r, corner, float(1 << s)), t1), t + little);
-    if (e == 0u) {
+    Brick b;
+    float leave;
+    if (cellAt(r, t, t1, little, b, leave) == 0u) {
       t = leave, has = false;
       continue;
     }
-    Brick b = brickOf(e, corner, s);
     float u = t, last = t, step = dt / b.scale, iso = uIso - 1e-4 * b.range;
     for (int n = 0; n < 512; ++n) {
       float f = valueIn(b, r.o + r.d * u) - iso;
@@ -264,13 +267,9 @@ vec4 project(Ray r, float t0, float t1, float whole) {
   float t = t0, little = 2e-3 / length(r.d);
   int samples = 0;
   for (int cell = 0; cell < kMostCells && t < t1; ++cell) {
-    ivec3 c = ivec3(floor(r.o + r.d * (t + little)));
-    int s;
-    uint e = find(uSeen, c, s);
-    vec3 corner = vec3((c >> s) << s);
-    float leave = max(min(exitOf(r, corner, float(1 << s)), t1), t + little);
-    if (e != 0u) {
-      Brick b = brickOf(e, corner, s);
+    Brick b;
+    float leave;
+    if (cellAt(r, t, t1, little, b, leave) != 0u) {
       float count = 1.0 + floor((leave - t) / uStep), dt = (leave - t) / count;
       for (float n = 0.0; n < count && samples < kMostSamples; n += 1.0, ++samples) {
         float v = valueIn(b, r.o + r.d * (t + (n + 0.5) * dt));

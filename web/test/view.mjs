@@ -56,6 +56,7 @@ async function hidePanel(opened) {
 }
 
 const [cloud, torus, turned, egg, tiles, zeros] = ['cloud', 'torus', 'turned', 'egg', 'tiles', 'zeros'].map((n) => join(folder, n + '.vdb'));
+const dots = join(folder, 'dots.ply');
 
 // What both draw: [name, file, options, what it may differ by more]. What is left are codes of 8 bits, edges between
 // pixels, and other random numbers; docs/viewing.md tells these bounds.
@@ -152,6 +153,69 @@ await test('a surface becomes a fog, and a slice', async () => {
     last = next;
   }
   assert.deepEqual(opened.faults, []);
+});
+
+// Fingers, as the browser's own machinery makes events of them.
+await test('one finger orbits, two zoom and pan', async () => {
+  const opened = await pageOf(torus), { page } = opened;
+  await pixels(page);
+  const cdp = await page.context().newCDPSession(page);
+  await cdp.send('Emulation.setTouchEmulationEnabled', { enabled: true, maxTouchPoints: 2 });
+  const touch = (type, ...fingers) =>
+    cdp.send('Input.dispatchTouchEvent', { type, touchPoints: fingers.map(([x, y], id) => ({ x, y, id })) });
+  const camera = () => page.evaluate(() => {
+    const { forward, distance, focalPoint } = globalThis.vlnView.camera;
+    return { forward, distance, focalPoint };
+  });
+  const apart = (a, b) => Math.hypot(...a.map((v, n) => v - b[n]));
+  const gesture = async (from, to) => {
+    const before = await camera();
+    await touch('touchStart', ...from);
+    for (let s = 1; s <= 4; ++s)
+      await touch('touchMove', ...from.map((p, n) => p.map((v, a) => v + (to[n][a] - v) * s / 4)));
+    await touch('touchEnd');
+    await page.waitForTimeout(50);
+    const after = await camera();
+    return { turned: apart(before.forward, after.forward), zoom: after.distance / before.distance,
+      moved: apart(before.focalPoint, after.focalPoint) / before.distance };
+  };
+  await hidePanel(opened);
+  const one = await gesture([[50, 60]], [[90, 70]]);
+  assert.ok(one.turned > 0.2 && Math.abs(one.zoom - 1) < 1e-9 && one.moved < 1e-9, JSON.stringify(one));
+  const spread = await gesture([[54, 64], [74, 64]], [[34, 64], [94, 64]]);
+  assert.ok(spread.turned < 1e-9 && spread.zoom < 0.5 && spread.moved < 0.05, JSON.stringify(spread));
+  const pinch = await gesture([[34, 64], [94, 64]], [[54, 64], [74, 64]]);
+  assert.ok(pinch.zoom > 2 && pinch.moved < 0.2, JSON.stringify(pinch));
+  const pan = await gesture([[40, 40], [60, 40]], [[70, 70], [90, 70]]);
+  assert.ok(pan.turned < 1e-9 && Math.abs(pan.zoom - 1) < 0.6 && pan.moved > 0.05, JSON.stringify(pan));
+  assert.deepEqual(opened.faults, []);
+  await page.context().close();
+});
+
+await test('points', async () => {
+  const opened = await pageOf(dots), { page } = opened;
+  const first = await pixels(page);
+  const picture = await pictureOf(dots, []);
+  const { mean, far } = difference(first, picture);
+  console.log(`          mean ${mean.toFixed(2)}, far ${(100 * far).toFixed(2)} %`);
+  // Other discs at the same places: their edges and shades differ, not where they are and what colour they have.
+  assert.ok(mean < 12, `mean ${mean}`);
+  const empty = { data: first.data.map((v, n) => first.data[n % 4]) };
+  assert.ok(difference(first, empty).mean > 12, 'the page is empty');
+  await hidePanel(opened);
+  await page.mouse.move(60, 60);
+  await page.mouse.down();
+  await page.mouse.move(90, 70, { steps: 3 });
+  await page.mouse.up();
+  await page.waitForTimeout(50);
+  const turned = await pixels(page);
+  assert.ok(difference(first, turned).mean > 0.5, 'a drag changes nothing');
+  await page.evaluate(() => globalThis.vlnView.panel.gui.controllersRecursive().find((c) => c.property === 'size').setValue(0.25));
+  await page.waitForTimeout(50);
+  assert.ok(difference(turned, await pixels(page)).mean > 0.5, 'their size changes nothing');
+  assert.deepEqual(opened.faults, []);
+  assert.deepEqual(opened.requests(), []);
+  await page.context().close();
 });
 
 await browser.close();
