@@ -112,6 +112,11 @@ leave() {
   [ -z "$temporary" ] || rm -rf --one-file-system "$temporary"
 }
 
+step "install dependencies" sh scripts/install-deps.sh --packages
+if [ "$try" = yes ] && ! command -v debootstrap >/dev/null; then
+  echo "deb.sh: --try needs debootstrap" >&2
+  exit 1
+fi
 step "build the libraries and the program" build_libraries
 step "build the module" build_module
 step "packages" pack
