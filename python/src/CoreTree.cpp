@@ -163,7 +163,7 @@ void Core::saveDense(std::string const& path, Long3 const& low, Long3 const& hig
   dense.indexToWorld = m_state->indexToWorld;
   switch (format) {
   case Interop::FileFormat::kZarr:
-    return writeOmeZarr(path, {dense}, tell);
+    return Interop::writeOmeZarr(path, {dense}, tell);
   case Interop::FileFormat::kVti:
     return writeVti(path, dense, tell);
   default:
