@@ -56,6 +56,7 @@ def test_requirement_a_level_set_is_a_surface_about_the_middle(tmp_path):
     covered = (seen != ground).any(axis=2)
     assert np.allclose(np.argwhere(covered).mean(axis=0), (23.5, 31.5), atol=4)
     assert 0.2 < covered.mean() < 0.6
+    assert repr(picture) == str(picture) == f"<vln.Picture of {len(picture)} bytes>"
     picture.save(tmp_path / "a.png")
     assert (tmp_path / "a.png").read_bytes() == picture
     assert volume["surface"].render(size=(64, 48)) == picture

@@ -21,6 +21,8 @@ class Picture(bytes):
     def __repr__(self) -> str:
         return f"<vln.Picture of {len(self)} bytes>"
 
+    __str__ = __repr__
+
 
 def render(
     core: Core,
