@@ -13,6 +13,7 @@
 #include <cmath>
 #include <cstring>
 #include <new>
+#include <optional>
 
 #include <zlib.h>
 
@@ -161,13 +162,12 @@ public:
       , m_progress(progress) {}
 
   void run() {
-    OutputFolder out(m_path, kZarrMark);
-    m_out = &out;
+    m_out.emplace(m_path, kZarrMark);
     for (auto const& volume : m_volumes) m_images += double(volume.channels.size());
     if (m_images == 0) throw FileError(m_path, "there is no channel to be written");
     std::set<std::string> taken{"OME"};
     std::string series;
-    out.write(kZarrMark, std::string(kGroup));
+    m_out->write(kZarrMark, std::string(kGroup));
     for (auto const& volume : m_volumes) {
       auto const levels = planLevels(volume);
       for (std::size_t n = 0; n < volume.channels.size(); ++n) {
@@ -176,18 +176,18 @@ public:
           std::string const name = folderName(volume.channels[n], taken);
           series += (series.empty() ? "" : ", ") + quoted(name);
           folder = name + "/";
-          out.write(folder + kZarrMark, std::string(kGroup));
+          m_out->write(folder + kZarrMark, std::string(kGroup));
         }
         writeImage(folder, volume, levels, n);
         ++m_imagesDone;
       }
     }
     if (m_images > 1) {
-      out.write(".zattrs", "{\"bioformats2raw.layout\": 3}\n");
-      out.write("OME/.zgroup", std::string(kGroup));
-      out.write("OME/.zattrs", "{\"series\": [" + series + "]}\n");
+      m_out->write(".zattrs", "{\"bioformats2raw.layout\": 3}\n");
+      m_out->write("OME/.zgroup", std::string(kGroup));
+      m_out->write("OME/.zattrs", "{\"series\": [" + series + "]}\n");
     }
-    out.commit();
+    m_out->commit();
     report("done", 1);
   }
 
@@ -244,9 +244,9 @@ private:
               (vector ? "1.0, " : "") + scale + "]}, {\"type\": \"translation\", \"translation\": [" +
               (vector ? "0.0, " : "") + translation + "]}]}";
     }
-    std::string axes = vector ? "{\"name\": \"c\", \"type\": \"channel\"}" : "";
-    for (char const axis : {'z', 'y', 'x'})
-      axes += std::string(axes.empty() ? "" : ", ") + "{\"name\": \"" + axis + "\", \"type\": \"space\"}";
+    std::string axes = vector ? "{\"name\": \"c\", \"type\": \"channel\"}, " : "";
+    axes += "{\"name\": \"z\", \"type\": \"space\"}, {\"name\": \"y\", \"type\": \"space\"}, "
+            "{\"name\": \"x\", \"type\": \"space\"}";
     m_out->write(folder + ".zattrs", "{\"multiscales\": [{\"version\": \"0.4\", \"name\": " +
                                          quoted(oneLine(name, kLongestName)) + ",\n  \"axes\": [" + axes +
                                          "],\n  \"datasets\": [\n" + sets + "]}]}\n");
@@ -395,7 +395,7 @@ private:
   std::string const& m_path;
   std::vector<DenseVolume> const& m_volumes;
   Progress const& m_progress;
-  OutputFolder* m_out = nullptr;
+  std::optional<OutputFolder> m_out;
   double m_images = 0, m_imagesDone = 0;
 };
 

@@ -118,7 +118,7 @@ std::string makeBeside(std::string const& path, std::string const& target) {
 
 } // namespace
 
-OutputFolder::OutputFolder(std::string path, std::string mark)
+OutputFolder::OutputFolder(std::string path, std::string const& mark)
     : m_path(std::move(path))
     , m_target(targetOf(m_path, mark))
     , m_temporary(makeBeside(m_path, m_target)) {

@@ -16,7 +16,7 @@ public:
   /// @param mark A file that tells folders of this kind. Other folders are not replaced, but empty ones.
   /// @error FileError, here and below, for what the system refuses, and for a target that is a file or a
   /// folder of another kind.
-  OutputFolder(std::string path, std::string mark);
+  OutputFolder(std::string path, std::string const& mark);
   OutputFolder(OutputFolder const&) = delete;
   OutputFolder& operator=(OutputFolder const&) = delete;
   /// Without commit() nothing stays.

@@ -273,9 +273,9 @@ private:
   void readImage(Tag const& tag) {
     m_seen = true;
     m_piece = extentOf(tag.get("WholeExtent"));
-    auto const three = [&](char const* key, std::vector<double> otherwise) {
+    auto const three = [&](char const* key, std::vector<double> const& otherwise) {
       std::string const text = tag.get(key);
-      auto const list = text.empty() ? otherwise : numbersOf<double>(text, 10);
+      auto list = text.empty() ? otherwise : numbersOf<double>(text, 10);
       if (list.size() != otherwise.size()) damaged(std::string("the attribute ") + key + " is none");
       return list;
     };
