@@ -26,9 +26,9 @@ list(FILTER sources EXCLUDE REGEX "/ChannelOps\\.cpp$")
 pybind11_add_module(_vln MODULE NO_EXTRAS ${sources})
 vln_target(_vln)
 target_include_directories(_vln PRIVATE "${PROJECT_SOURCE_DIR}/python/src")
-target_link_libraries(_vln PRIVATE vln_python_engine GeometryVolumeInterop GeometryVolume)
-set(package_dir "${PROJECT_BINARY_DIR}/python/vln")
-set_target_properties(_vln PROPERTIES LIBRARY_OUTPUT_DIRECTORY "${package_dir}")
+target_link_libraries(_vln PRIVATE vln_python_engine GeometryVolumeInterop GeometryVolumeRender GeometryVolume)
+set(python_package_dir "${PROJECT_BINARY_DIR}/python/vln")
+set_target_properties(_vln PROPERTIES LIBRARY_OUTPUT_DIRECTORY "${python_package_dir}")
 if(NOT VLN_SANITIZE)
   # The libraries' own exports stay inside, so that another copy of them in the process is not met.
   target_link_options(_vln PRIVATE -Wl,--exclude-libs,ALL)
@@ -36,10 +36,24 @@ endif()
 
 vln_glob(package python/vln/*.py python/vln/*.pyi python/vln/py.typed)
 add_custom_target(vln_python_package ALL
-  COMMAND "${CMAKE_COMMAND}" -E make_directory "${package_dir}"
-  COMMAND "${CMAKE_COMMAND}" -E copy_if_different ${package} "${package_dir}"
+  COMMAND "${CMAKE_COMMAND}" -E make_directory "${python_package_dir}"
+  COMMAND "${CMAKE_COMMAND}" -E copy_if_different ${package} "${python_package_dir}"
   DEPENDS ${package} COMMENT "" VERBATIM)
 add_dependencies(_vln vln_python_package)
+
+# For the Debian package: where the distribution's interpreter looks, and what tells it of the version. A wheel is
+# made without these rules, see python/packaging.
+set(python_dir lib/python3/dist-packages)
+set(info_dir "${PROJECT_BINARY_DIR}/python/info")
+install(TARGETS _vln LIBRARY DESTINATION "${python_dir}/vln" COMPONENT python)
+install(FILES ${package} DESTINATION "${python_dir}/vln" COMPONENT python)
+install(CODE "
+  file(REMOVE_RECURSE \"${info_dir}\")
+  file(MAKE_DIRECTORY \"${info_dir}\")
+  execute_process(COMMAND \"${Python3_EXECUTABLE}\" -B -c
+    \"import sys, build_wheel; build_wheel.prepare_metadata_for_build_wheel(sys.argv[1])\" \"${info_dir}\"
+    WORKING_DIRECTORY \"${PROJECT_SOURCE_DIR}/python/packaging\" COMMAND_ERROR_IS_FATAL ANY)" COMPONENT python)
+install(DIRECTORY "${info_dir}/" DESTINATION "${python_dir}" COMPONENT python)
 
 enable_testing()
 include(VlnTestData)

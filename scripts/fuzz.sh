@@ -9,6 +9,8 @@
 #   operations   sequences of operations on a tree and its channels, held against models
 #   ply_file     the bytes of .ply files
 #   vdb_file     the bytes of .vdb files, read in a child process as the program does
+#   npz_file     the same of .npz files
+#   vti_file     the same of .vti files
 set -eu
 . "$(dirname -- "$0")/lib.sh"
 cd "$root"
@@ -43,6 +45,8 @@ case $target in
   operations) seeds=channels:OperationsFuzz options='-max_len=768 -entropic=0' ;;
   ply_file) seeds=interop:PlyFuzz options="-max_len=4096 -dict=$root/fuzz/ply_file.dict" ;;
   vdb_file) seeds=interop:VdbFuzz options='-max_len=65536' ;;
+  npz_file) seeds=interop:NpzFuzz options='-max_len=8192' ;;
+  vti_file) seeds=interop:VtiFuzz options='-max_len=8192' ;;
   '') usage 2 >&2 ;;
   *) echo "fuzz.sh: no target '$target'" >&2 && usage 2 >&2 ;;
 esac

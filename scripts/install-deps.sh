@@ -1,7 +1,7 @@
 #!/bin/sh
-# install-deps.sh [--checks|--python|--view]: installs the Debian packages that the build and the tests need, with
-# --checks those of scripts/check.sh too, with --python those of the Python module, with --view those of the page of
-# vln view and its tests. Asks nothing; when all is there it does
+# install-deps.sh [--checks|--python|--packages|--view]: installs the Debian packages that the build and the tests need,
+# with --checks those of scripts/check.sh too, with --python those of the Python module, with --packages those of
+# scripts/deb.sh, with --view those of the page of vln view and its tests. Asks nothing; when all is there it does
 # nothing and calls no network.
 set -eu
 
@@ -18,8 +18,9 @@ case ${1:-} in
   --python)
     packages="$packages python3-dev pybind11-dev python3-numpy python3-pip python3-venv python3-pytest mypy"
     # Beside which the tests load the module, and whose readers they ask.
-    packages="$packages python3-scipy python3-openvdb python3-vtk9 libhdf5-dev python3-h5py"
+    packages="$packages python3-scipy python3-openvdb python3-vtk9 libhdf5-dev python3-h5py python3-zarr"
     ;;
+  --packages) packages="$packages python3-dev pybind11-dev python3-numpy libhdf5-dev dpkg-dev file" ;;
   --view)
     packages="$packages chromium"
     # A node of another origin does as well, and goes with no npm of Debian's.

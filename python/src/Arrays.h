@@ -2,6 +2,7 @@
 #pragma once
 
 #include "ChannelOps.h"
+#include "Names.h"
 
 #include <pybind11/numpy.h>
 #include <pybind11/pybind11.h>

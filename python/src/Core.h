@@ -76,13 +76,17 @@ public:
   py::bytes picture(std::string const& name, int axis, std::optional<double> at, int size,
                     bool gradient) const;
 
+  /// A picture by rays as the bytes of a PNG file. @param how What was asked for, by name.
+  py::bytes render(std::string const& name, int width, int height, py::dict const& how,
+                   py::object const& progress) const;
+
   void save(std::string const& path) const;
-  /// As .npz or .vti.
+  /// As .npz, .vti or .zarr; of the last, `depth` does not count.
   void saveDense(std::string const& path, Long3 const& low, Long3 const& high, int depth,
                  py::object const& progress) const;
   std::shared_ptr<Interop::FlatVolume> flatten(Interop::FlattenOptions const& options) const;
-  /// As a file's reader or writer has it.
-  Interop::VdbVolume vdbVolume() const;
+  /// As a file's writer has it. @error As Interop::writtenVolume().
+  Interop::VdbVolume vdbVolume(std::string const& path) const;
 
 private:
   py::array transform(Rows<double> const& from, bool toWorld) const;

@@ -4,6 +4,7 @@
 #include "Interop/DenseWrite.h"
 #include "Interop/FileError.h"
 #include "Interop/FileFormat.h"
+#include "Interop/OmeZarrWrite.h"
 #include "Interop/Slice.h"
 #include "Interop/VolumeIo.h"
 
@@ -160,7 +161,14 @@ void Core::saveDense(std::string const& path, Long3 const& low, Long3 const& hig
     if (note.type == "bool" || note.type == "mask") dense.flags.push_back(name);
   dense.object = m_state->volume.object();
   dense.indexToWorld = m_state->indexToWorld;
-  format == Interop::FileFormat::kNpz ? writeNpz(path, dense, tell) : writeVti(path, dense, tell);
+  switch (format) {
+  case Interop::FileFormat::kZarr:
+    return Interop::writeOmeZarr(path, {dense}, tell);
+  case Interop::FileFormat::kVti:
+    return writeVti(path, dense, tell);
+  default:
+    return writeNpz(path, dense, tell);
+  }
 }
 
 std::shared_ptr<Interop::FlatVolume> Core::flatten(Interop::FlattenOptions const& options) const {
@@ -169,13 +177,20 @@ std::shared_ptr<Interop::FlatVolume> Core::flatten(Interop::FlattenOptions const
   return std::make_shared<Interop::FlatVolume>(Interop::flattenVolume(m_state->volume.object(), options));
 }
 
-Interop::VdbVolume Core::vdbVolume() const {
+Interop::VdbVolume Core::vdbVolume(std::string const& path) const {
   py::gil_scoped_release const nogil;
   Reading const reading(*m_state);
-  Interop::VdbVolume volume;
-  volume.object = Ostil::makePtr<Object>(m_state->volume.object());
+  auto volume = Interop::writtenVolume(m_state->volume, path);
   volume.indexToWorld = m_state->indexToWorld;
   volume.voxelSize = m_state->indexToWorld.voxelSize().x;
+  for (auto& channel : volume.channels) {
+    auto const found = ChannelOps::of(m_state->volume, channel.name)->active(ruleOf(channel.name), false);
+    if (found.count == 0) continue;
+    channel.activeVoxels = found.count;
+    channel.activeBox = {found.low, found.high};
+    volume.activeBox.grow(found.low);
+    volume.activeBox.grow(found.high);
+  }
   return volume;
 }
 

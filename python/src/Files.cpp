@@ -4,6 +4,7 @@
 #include "Interop/FileFormat.h"
 #include "Interop/Ply.h"
 #include "Interop/VdbExport.h"
+#include "Interop/VolumeExport.h"
 #include "Interop/VolumeFile.h"
 
 #include <cstring>
@@ -30,7 +31,7 @@ py::dict pointsToDict(PointSet const& set, std::string const& name) {
       auto values = newArray(element, {count});
       std::memcpy(values.mutable_data(), attribute.bytes.data(),
                   std::min<std::size_t>(static_cast<std::size_t>(values.nbytes()), attribute.bytes.size()));
-      attributes[py::str(attribute.name)] = values;
+      attributes[py::cast(attribute.name)] = values;
     }
   result["name"] = name;
   result["positions"] = positions;
@@ -120,14 +121,15 @@ py::tuple openFile(std::string const& path, std::string const& channels, double 
 }
 
 void saveFile(std::vector<std::shared_ptr<Core>> const& volumes, py::list const& points,
-              std::string const& path, py::object const& progress) {
+              std::string const& path, bool voxelByVoxel, py::object const& progress) {
   Interop::VdbImport content;
-  for (auto const& volume : volumes) content.volumes.push_back(volume->vdbVolume());
+  content.file = path;
+  for (auto const& volume : volumes) content.volumes.push_back(volume->vdbVolume(path));
   for (auto const& dict : points) content.points.push_back(pointVolume(dict.cast<py::dict>()));
   auto const tell = teller(progress);
   py::gil_scoped_release const nogil;
   UsingOpenVdb const alone;
-  Interop::exportVdb(content, path, tell);
+  Interop::exportVolumes(content, path, tell, {.surface = {}, .voxelByVoxel = voxelByVoxel});
 }
 
 void savePoints(py::dict const& points, std::string const& path) {

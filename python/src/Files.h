@@ -9,9 +9,9 @@ namespace VLN::Python {
 py::tuple openFile(std::string const& path, std::string const& channels, double memoryBytes,
                    py::object const& progress);
 
-/// Volumes and points together into a .vdb file. @error As exportVdb().
+/// Volumes and points together, in the format of the suffix. @error As exportVolumes().
 void saveFile(std::vector<std::shared_ptr<Core>> const& volumes, py::list const& points,
-              std::string const& path, py::object const& progress);
+              std::string const& path, bool voxelByVoxel, py::object const& progress);
 
 /// {"name", "positions", "attributes"} as a .vdb or .ply file.
 void savePoints(py::dict const& points, std::string const& path);

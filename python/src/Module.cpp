@@ -95,6 +95,7 @@ PYBIND11_MODULE(_vln, module) {
       .def("besides_scale", &Core::besidesScale)
       .def("nbytes", &Core::bytes)
       .def("picture", &Core::picture)
+      .def("render", &Core::render)
       .def("save", &Core::save)
       .def("save_dense", &Core::saveDense)
       .def("flatten", &flatten);

@@ -12,6 +12,7 @@ from __future__ import annotations
 
 from ._channel import Channel, WritableChannel
 from ._file import File, open
+from ._picture import Picture
 from ._points import Points
 from ._vln import FINEST, OPENVDB_VERSION, VERSION, FileError, Flat
 from ._volume import Volume
@@ -25,6 +26,7 @@ __all__ = [
     "FileError",
     "Flat",
     "OPENVDB_VERSION",
+    "Picture",
     "Points",
     "Volume",
     "WritableChannel",

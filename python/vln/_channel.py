@@ -8,6 +8,7 @@ from typing import TYPE_CHECKING, Any, Dict, List, Optional, Tuple
 import numpy as np
 
 from . import _checks, _html
+from ._picture import Picture, render
 from ._vln import FINEST, Core
 
 if TYPE_CHECKING:
@@ -155,6 +156,16 @@ class Channel:
             raise ValueError(f"axis is 'x', 'y' or 'z', not {axis!r}")
         where = None if at is None else float(at)
         return self._core.picture(self._name, "xyz".index(axis), where, int(size), bool(gradient))
+
+    def render(self, **how: Any) -> Picture:
+        """A picture by rays, as `vln render` draws it: fog or surface, as the class and the values say.
+
+        size: (width, height) in pixels, by default (512, 512). mode: "fog", "surface", "isosurface", "mip" or
+        "mean". iso: the value on the surface. clim: (low, high), the values of the first and the last colour. cmap:
+        "viridis", "inferno", ... samples: for each pixel. azimuth, elevation: of the camera, in degrees; zoom.
+        progress: as in open().
+        """
+        return render(self._core, self._name, **how)
 
     def _repr_png_(self) -> Optional[bytes]:
         try:

@@ -25,6 +25,11 @@ def path_of(path: Any) -> str:
     return text
 
 
+def suffix_of(path: str) -> str:
+    """".vdb"; of folders too, whose names may end with a slash."""
+    return os.path.splitext(path.rstrip("/"))[1].lower()
+
+
 def long3(value: Any, name: str) -> Long3:
     try:
         items = [int(v) for v in value]

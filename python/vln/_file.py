@@ -66,16 +66,17 @@ class File(ByName):
         raise KeyError(f"{self.path} has no grid {name!r}; it has {', '.join(self.names) or 'none'}")
 
     def save(self, path: Any, progress: Optional[Progress] = None) -> None:
-        """Writes all volumes and points as .vdb; a file of one volume and no points in any format that
-        Volume.save() knows."""
+        """Writes all volumes and points as .vdb, several volumes also as .zarr; a file of one volume and no points
+        in any format that Volume.save() knows."""
         target = _checks.path_of(path)
         volumes = self._held()
         if len(volumes) == 1 and not self._points:
             volumes[0].save(target, progress=progress)
             return
-        if os.path.splitext(target)[1].lower() != ".vdb":
+        kind = _checks.suffix_of(target)
+        if kind != ".vdb" and (kind != ".zarr" or self._points):
             raise _vln.FileError(f"{target}: several volumes, or points, are written as .vdb")
-        _vln.save_file([v._core for v in volumes], [p._as_dict() for p in self._points], target, progress)
+        _vln.save_file([v._core for v in volumes], [p._as_dict() for p in self._points], target, False, progress)
 
     def info(self) -> Dict[str, Any]:
         return {
@@ -112,7 +113,7 @@ def open(
     progress: Optional[Progress] = None,
     memory: int = 0,
 ) -> File:
-    """Reads a file of volumes: .vdb, .nvdb, .nvtt, or a mesh (.obj, .stl, .ply), which becomes a level set.
+    """Reads a file of volumes: .vdb, .nvdb, .nvtt, .npz, .vti, or a mesh (.obj, .stl, .ply), which becomes a level set.
 
     channels: a filter of grids by name, such as "density* | velocity".
     progress: called as progress(stage, share) now and then; what it raises ends the call.

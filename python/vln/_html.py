@@ -14,4 +14,5 @@ def table(title: str, rows: Dict[str, Any], png: Optional[bytes] = None) -> str:
     lines.append("</table>")
     if png is not None:
         lines.append(f'<img src="data:image/png;base64,{base64.b64encode(png).decode()}"/>')
-    return "".join(lines)
+    # Names may hold bytes that are no text, which a notebook would not take.
+    return "".join(lines).encode("utf-8", "replace").decode("utf-8")

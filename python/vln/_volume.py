@@ -2,7 +2,6 @@
 
 from __future__ import annotations
 
-import os
 from typing import Any, Callable, Dict, List, Mapping, Optional, Tuple
 
 import numpy as np
@@ -10,6 +9,7 @@ import numpy as np
 from . import _checks, _html, _vln
 from ._channel import Channel, _box, _depth, _three
 from ._mapping import ByName
+from ._picture import Picture
 from ._points import Points
 from ._vln import FINEST, Flat
 
@@ -222,27 +222,49 @@ class Volume(ByName):
 
     # Out
 
+    def render(self, channel: str = "", **how: Any) -> Picture:
+        """A picture of a channel, see Channel.render(); by default of "density" or "surface", or of the first that has
+        active voxels."""
+        if not channel:
+            seen = [name for name in self.names if self[name].box is not None]
+            if not seen:
+                raise ValueError("the volume has no channel with active voxels")
+            channel = next((name for name in ("density", "surface") if name in seen), seen[0])
+        return self[channel].render(**how)
+
     def save(
         self,
         path: Any,
         box: Optional[Any] = None,
         depth: Optional[int] = None,
         progress: Optional[Callable[[str, float], Any]] = None,
+        sparse: bool = False,
     ) -> None:
         """Writes all channels, whole or not at all, in the format of the suffix: .vdb, .nvdb, .nvtt, .usda (with a
-        .vdb beside it), .vtkhdf (ParaView, with all levels), .ply (the surface of a level set), or dense as .npz
-        (numpy) or .vti (ParaView).
+        .vdb beside it), .vtkhdf (ParaView, with all levels), .zarr (OME-Zarr, a folder with all levels), .ply (the
+        surface of a level set), or dense as .npz (numpy) or .vti (ParaView).
 
-        box, depth, progress: of dense files alone; as in Channel.to_numpy(), and as in open().
+        box: of .npz, .vti and .zarr; as in Channel.to_numpy().
+        depth: of .npz and .vti; as there.
+        progress: of these and of .npz that are sparse; as in open().
+        sparse: of .npz, the active voxels one by one in place of a dense box.
         """
         target = _checks.path_of(path)
-        if os.path.splitext(target)[1].lower() not in (".npz", ".vti"):
-            if box is not None or depth is not None:
-                raise ValueError("a box and a depth are those of dense files: .npz and .vti")
-            self._core.save(target)
-            return
+        kind = _checks.suffix_of(target)
         if progress is not None and not callable(progress):
             raise TypeError("progress must be callable")
+        if sparse:
+            if kind != ".npz" or box is not None or depth is not None:
+                raise ValueError("sparse is for .npz files, without a box and a depth")
+            _vln.save_file([self._core], [], target, True, progress)
+            return
+        if kind not in (".npz", ".vti", ".zarr"):
+            if box is not None or depth is not None:
+                raise ValueError("a box and a depth are those of dense files: .npz, .vti and, without a depth, .zarr")
+            self._core.save(target)
+            return
+        if kind == ".zarr" and depth is not None:
+            raise ValueError("a .zarr folder holds all depths")
         low, high = (0, 0, 0), (0, 0, 0)
         if box is not None:
             low, high = _box(box)

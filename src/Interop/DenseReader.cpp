@@ -65,6 +65,12 @@ public:
         {.grain = 16});
   }
 
+  std::vector<std::byte> background() const override {
+    T const value = m_channel->defaultValue();
+    auto const* const bytes = reinterpret_cast<std::byte const*>(&value);
+    return {bytes, bytes + sizeof value};
+  }
+
 private:
   template <class Accessor>
   static TileTree3D::TreeIndex treeIndex(Accessor const& accessor, std::int64_t x, std::int64_t y,
@@ -115,7 +121,7 @@ DenseVolume denseVolumeOf(VdbVolume const& volume) {
   return dense;
 }
 
-DensePlan planDense(std::string const& path, DenseVolume const& volume) {
+DensePlan planDense(std::string const& path, DenseVolume const& volume, bool sparse) {
   DensePlan plan;
   if (volume.channels.empty()) throw FileError(path, "there is no channel to be written");
   if (volume.depth < 0 || volume.depth > DenseTraits::kMaxDepth)
@@ -135,7 +141,7 @@ DensePlan planDense(std::string const& path, DenseVolume const& volume) {
       throw FileError(path, "the channel '" + oneLine(name, 60) + "' is of a type that is not written");
     double const bytes = double(plan.count[0]) * double(plan.count[1]) * double(plan.count[2]) *
                          reader->scalarBytes * reader->components;
-    if (bytes > 1e12)
+    if (!sparse && bytes > kMostDenseBytes)
       throw FileError(path, "a dense box of '" + oneLine(name, 60) + "' would take " +
                                 std::to_string(std::int64_t(bytes / 1e9)) + " GB: choose a coarser depth");
     plan.names.push_back(name);

@@ -24,7 +24,11 @@ public:
   /// Components [first, last) of the slice of samples at `z`, x fastest, those of a sample side by side.
   /// @param box Of samples of that depth. @param out Holds exactly that.
   virtual void slice(IndexBox const& box, int z, int depth, int first, int last, std::byte* out) const = 0;
+  /// The components of the value that holds where nothing is.
+  virtual std::vector<std::byte> background() const = 0;
 };
+
+inline constexpr double kMostDenseBytes = 1e12; ///< of a channel in a file
 
 /// Checked: what a dense file will hold.
 struct DensePlan {
@@ -38,6 +42,7 @@ struct DensePlan {
 };
 
 /// @error FileError that names `path`: for a volume without a channel or a voxel, or what no file would hold.
-DensePlan planDense(std::string const& path, DenseVolume const& volume);
+/// @param sparse Whether the file leaves out what is empty: then any box will do.
+DensePlan planDense(std::string const& path, DenseVolume const& volume, bool sparse = false);
 
 } // namespace VLN::Interop

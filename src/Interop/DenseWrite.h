@@ -1,7 +1,8 @@
 // writeNpz(), writeVti(): volumes as dense boxes, for numpy and for ParaView.
 //
 //   .npz   one array for each channel, indexed [x, y, z] or [x, y, z, component]; "low", the index of element
-//          [0, 0, 0]; "to_world", the rows of the matrix from an element's place to world space
+//          [0, 0, 0]; "to_world", the rows of the matrix from an element's place to world space;
+//          "<name>.background", the value that holds elsewhere
 //   .vti   one image whose points are the samples, with one point array for each channel; extents are indices
 #pragma once
 
@@ -35,5 +36,10 @@ VLN_API void writeNpz(std::string const& path, DenseVolume const& volume, Progre
 /// Writes a file whole or not at all: XML, and behind it the values as they are.
 /// @error FileError; also for a transform that is no scale along three directions at right angles.
 VLN_API void writeVti(std::string const& path, DenseVolume const& volume, Progress const& progress = {});
+
+/// Writes the active voxels of the grids of one volume, one by one, as "<name>.indices" and "<name>.values",
+/// and no "low": places are indices.
+/// @error FileError; for a transform that is not linear too.
+VLN_API void writeNpzVoxels(std::string const& path, VdbImport const& content, Progress const& progress = {});
 
 } // namespace VLN::Interop

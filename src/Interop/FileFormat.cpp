@@ -1,7 +1,9 @@
 #include "Interop/FileFormat.h"
 
 #include "Interop/FileError.h"
+#include "Interop/OmeZarrWrite.h"
 #include "Interop/OutputFile.h"
+#include "Interop/OutputFolder.h"
 #include "Interop/OutputTargetImpl.h"
 #include "Interop/VtkHdfWrite.h"
 
@@ -25,7 +27,7 @@ constexpr Row kTable[] = {
     {FileFormat::kExr, ".exr", {}, FileContent::kRenderings},
     {FileFormat::kHtml, ".html", {}, FileContent::kPages},
     {FileFormat::kJson, ".json", {}, FileContent::kParameters},
-    {FileFormat::kNpz, ".npz", {}, FileContent::kDense | FileContent::kExports},
+    {FileFormat::kNpz, ".npz", FileContent::kVolumes, FileContent::kDense | FileContent::kExports},
     {FileFormat::kNvdb, ".nvdb", FileContent::kVolumes, FileContent::kVolumes | FileContent::kExports},
     {FileFormat::kNvtt, ".nvtt", FileContent::kVolumes | FileContent::kFlatBuffers,
      FileContent::kVolumes | FileContent::kFlatBuffers},
@@ -38,8 +40,9 @@ constexpr Row kTable[] = {
     {FileFormat::kVdb, ".vdb", FileContent::kVolumes | FileContent::kGrids | FileContent::kPoints,
      FileContent::kVolumes | FileContent::kGrids | FileContent::kPoints | FileContent::kPointData |
          FileContent::kExports},
-    {FileFormat::kVti, ".vti", {}, FileContent::kDense | FileContent::kExports},
+    {FileFormat::kVti, ".vti", FileContent::kVolumes, FileContent::kDense | FileContent::kExports},
     {FileFormat::kVtkHdf, ".vtkhdf", {}, FileContent::kVolumes | FileContent::kExports},
+    {FileFormat::kZarr, ".zarr", {}, FileContent::kDense | FileContent::kExports},
 };
 
 Row const* rowOf(FileFormat format) {
@@ -79,7 +82,9 @@ char const* nameOf(FileContent content) {
 }
 
 std::string lowerSuffix(std::string const& path) {
-  std::string suffix = std::filesystem::path(path).extension().string();
+  // Names of folders may end with slashes.
+  std::string suffix =
+      std::filesystem::path(path.substr(0, path.find_last_not_of('/') + 1)).extension().string();
   std::transform(suffix.begin(), suffix.end(), suffix.begin(),
                  [](unsigned char c) { return static_cast<char>(std::tolower(c)); });
   return suffix;
@@ -137,7 +142,10 @@ FileFormat checkOutputFor(FileContent content, std::string const& path) {
     throw FileError(path, std::string(nameOf(content)) + " are written as " + listOf(possible));
   if (fits && format == FileFormat::kVtkHdf && !writesVtkHdf())
     throw FileError(path, "this build writes no .vtkhdf files: it was made without HDF5");
-  checkOutput(path);
+  if (fits && format == FileFormat::kZarr)
+    checkOutputFolder(path, kZarrMark);
+  else
+    checkOutput(path);
   return fits ? format : standard;
 }
 

@@ -24,7 +24,8 @@ enum class FileFormat {
   kNvdb,
   kUsda,
   kStl,
-  kHtml
+  kHtml,
+  kZarr
 };
 
 /// What a file holds, as messages call it.

@@ -313,7 +313,7 @@ Handle toNano(openvdb::GridBase const& grid, std::string const& path) {
       tryWrite<openvdb::FloatGrid>(grid, handle) || tryWrite<openvdb::DoubleGrid>(grid, handle) ||
       tryWrite<openvdb::Int32Grid>(grid, handle) || tryWrite<openvdb::Int64Grid>(grid, handle) ||
       tryWrite<openvdb::BoolGrid>(grid, handle) || tryWrite<openvdb::MaskGrid>(grid, handle) ||
-      tryWrite<openvdb::Vec3SGrid>(grid, handle) || tryWrite<openvdb::Vec3DGrid>(grid, handle);
+      tryWrite<openvdb::Vec3SGrid>(grid, handle);
   if (!known) throw FileError(path, name + "is of a type that .nvdb files do not have");
   return std::move(*handle);
 }

@@ -20,7 +20,8 @@ VLN_API VdbImport importNvdb(std::string const& path, VdbReadLimits const& limit
 
 /// Writes all grids of volumes, not packed, so that the file can be used where it lies. Of metadata the name
 /// and the class are kept.
-/// @error FileError; also for a transform that is not linear, and for vectors of integers.
+/// @error FileError; also for a transform that is not linear, and for vectors of integers and of doubles,
+/// which NanoVDB's writer does not take.
 /// @cost Holds the bytes of the file in memory once.
 VLN_API void exportNvdb(VdbImport const& content, std::string const& path, Progress const& progress = {});
 

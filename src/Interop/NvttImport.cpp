@@ -6,6 +6,7 @@
 #include "GeometryVolume/pools/ChannelPool.h"
 #include "GeometryVolume/topology/Command.h"
 #include "GeometryVolume/utils/ChannelParser.h"
+#include "Interop/ArrayFiles.h"
 #include "Interop/FileError.h"
 #include "Interop/Mesh.h"
 #include "Interop/NvdbFile.h"
@@ -240,6 +241,8 @@ VdbImport importVolumes(std::string const& path, VdbReadLimits const& limits, Pr
                         MeshOptions const& mesh) {
   if (isMeshFile(path)) return importMesh(path, mesh, limits, progress);
   if (isNvdbFile(path)) return importNvdb(path, limits, progress);
+  if (isNpzFile(path)) return importNpz(path, limits, progress);
+  if (isVtiFile(path)) return importVti(path, limits, progress);
   return isNvttFile(path) ? importNvtt(path, limits, progress) : importVdb(path, limits, progress);
 }
 

@@ -1,6 +1,7 @@
 #include "Interop/OutputFile.h"
 
 #include "Interop/FileError.h"
+#include "Interop/OutputFolder.h"
 #include "Interop/OutputTargetImpl.h"
 
 #include <atomic>
@@ -210,6 +211,7 @@ void checkOutput(std::string const& path) {
 void removeUnfinishedOutput() noexcept {
   for (Slot const& slot : unfinished)
     if (slot.state.load() == Slot::kInUse) unlink(slot.path);
+  removeUnfinishedFolders();
 }
 
 } // namespace VLN::Interop

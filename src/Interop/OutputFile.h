@@ -67,8 +67,8 @@ private:
 /// @error FileError when it could not.
 VLN_API void checkOutput(std::string const& path);
 
-/// Removes the temporary files that are being written, if there are any. Made for signal handlers: it calls
-/// nothing but unlink.
+/// Removes the temporary files and folders that are being written, if there are any. Made for signal
+/// handlers: it makes system calls alone.
 VLN_API void removeUnfinishedOutput() noexcept;
 
 } // namespace VLN::Interop

@@ -4,6 +4,7 @@
 #include "Interop/FileError.h"
 #include "Interop/FileFormat.h"
 #include "Interop/NvdbFile.h"
+#include "Interop/OmeZarrWrite.h"
 #include "Interop/UsdaWrite.h"
 #include "Interop/VdbExport.h"
 #include "Interop/VdbRecord.h"
@@ -22,6 +23,14 @@ DenseVolume onlyVolume(VdbImport const& content) {
   return denseVolumeOf(content.volumes.front());
 }
 
+/// Of formats in which each has a transform of its own.
+std::vector<DenseVolume> allVolumes(VdbImport const& content) {
+  if (content.volumes.empty()) throw FileError(content.file, "has no volume that could be written");
+  std::vector<DenseVolume> volumes;
+  for (auto const& volume : content.volumes) volumes.push_back(denseVolumeOf(volume));
+  return volumes;
+}
+
 /// Of formats that hold grids: what tells them is not in a flat buffer.
 VdbImport const& grids(VdbImport const& content) {
   for (auto const& volume : content.volumes)
@@ -36,7 +45,9 @@ void exportVolumes(VdbImport const& content, std::string const& path, Progress c
                    ExportOptions const& options) {
   switch (checkOutputFor(FileContent::kExports, path)) {
   case FileFormat::kNpz:
-    return writeNpz(path, onlyVolume(content), progress);
+    if (!options.voxelByVoxel) return writeNpz(path, onlyVolume(content), progress);
+    onlyVolume(content);
+    return writeNpzVoxels(path, grids(content), progress);
   case FileFormat::kNvdb:
     return exportNvdb(grids(content), path, progress);
   case FileFormat::kPly:
@@ -47,6 +58,8 @@ void exportVolumes(VdbImport const& content, std::string const& path, Progress c
     return writeVti(path, onlyVolume(content), progress);
   case FileFormat::kVtkHdf:
     return writeVtkHdf(path, onlyVolume(content), progress);
+  case FileFormat::kZarr:
+    return writeOmeZarr(path, allVolumes(content), progress);
   default:
     return exportVdb(grids(content), path, progress);
   }

@@ -9,7 +9,8 @@
 namespace VLN::Interop {
 
 struct ExportOptions {
-  SurfaceOptions surface; ///< of .ply files
+  SurfaceOptions surface;    ///< of .ply files
+  bool voxelByVoxel = false; ///< of .npz files: the active voxels one by one, no dense box
 };
 
 /// Writes what a file held, whole or not at all, in the format of the suffix. .vdb keeps all of it; what the

@@ -84,13 +84,7 @@ Volume load(std::string const& path) {
   return Volume(*content.volumes.front().object);
 }
 
-void save(Volume const& volume, std::string const& path) {
-  FileFormat const format = checkOutputFor(FileContent::kVolumes, path);
-  if (format == FileFormat::kNvtt) {
-    auto const flat = flattenVolume(volume.object(), {});
-    writeNvtt(path, {.buffer = flat.buffer.data(), .bufferLength = flat.buffer.size()});
-    return;
-  }
+VdbVolume writtenVolume(Volume const& volume, std::string const& path) {
   VdbVolume written;
   written.object = Ostil::makePtr<Object>(withRecords(volume, path));
   written.indexToWorld = IndexToWorld(propertyOr(*written.object, kVdbTransformProperty, Ostil::String()));
@@ -100,9 +94,19 @@ void save(Volume const& volume, std::string const& path) {
     channel.type = record.type;
     written.channels.push_back(channel);
   }
+  return written;
+}
+
+void save(Volume const& volume, std::string const& path) {
+  FileFormat const format = checkOutputFor(FileContent::kVolumes, path);
+  if (format == FileFormat::kNvtt) {
+    auto const flat = flattenVolume(volume.object(), {});
+    writeNvtt(path, {.buffer = flat.buffer.data(), .bufferLength = flat.buffer.size()});
+    return;
+  }
   VdbImport content;
   content.file = path;
-  content.volumes.push_back(std::move(written));
+  content.volumes.push_back(writtenVolume(volume, path));
   exportVolumes(content, path);
 }
 

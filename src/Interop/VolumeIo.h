@@ -2,6 +2,7 @@
 #pragma once
 
 #include "GeometryVolume/volume/Volume.h"
+#include "Interop/VdbImport.h"
 #include "Interop/VolumeFile.h"
 
 #include <string>
@@ -23,5 +24,9 @@ VLN_API TileTree3D::Volume load(std::string const& path);
 /// @error FileError for another suffix, a file that cannot be written, and a field of a type that .vdb files
 /// do not have; std::runtime_error for a volume that a flat buffer cannot hold. What was there before stays.
 VLN_API void save(TileTree3D::Volume const& volume, std::string const& path);
+
+/// The volume with what exportVolumes() must know of its fields; of active voxels alone it tells nothing.
+/// @error FileError that names `path`, for a field of a type that .vdb files do not have.
+VLN_API VdbVolume writtenVolume(TileTree3D::Volume const& volume, std::string const& path);
 
 } // namespace VLN::Interop

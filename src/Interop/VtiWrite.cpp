@@ -1,3 +1,4 @@
+#include "Interop/ArrayGridImpl.h"
 #include "Interop/DenseReaderImpl.h"
 #include "Interop/FileError.h"
 #include "Interop/OutputFile.h"
@@ -72,6 +73,25 @@ std::string placeOf(std::string const& path, DensePlan const& plan) {
   return result;
 }
 
+/// What holds outside of the image: one value for each array, which readers that do not know them pass by.
+std::string backgroundsOf(DensePlan const& plan) {
+  std::string result = "<FieldData>\n";
+  for (std::size_t n = 0; n < plan.readers.size(); ++n) {
+    auto const& reader = *plan.readers[n];
+    auto const background = reader.background();
+    result += "<DataArray type=\"" + typeName(reader) + "\" Name=\"" + escaped(plan.names[n]) +
+              ".background\" NumberOfComponents=\"" + std::to_string(reader.components) +
+              "\" NumberOfTuples=\"1\" format=\"ascii\">";
+    NumberType const type{reader.kind, reader.scalarBytes};
+    for (int c = 0; c < reader.components; ++c) {
+      auto const* const at = background.data() + c * reader.scalarBytes;
+      result += " " + (reader.kind == 'f' ? number(realOf(at, type)) : std::to_string(wholeOf(at, type)));
+    }
+    result += " </DataArray>\n";
+  }
+  return result + "</FieldData>\n";
+}
+
 } // namespace
 
 void writeVti(std::string const& path, DenseVolume const& volume, Progress const& progress) {
@@ -81,8 +101,8 @@ void writeVti(std::string const& path, DenseVolume const& volume, Progress const
     extent += (a ? " " : "") + std::to_string(plan.box.min[a]) + " " + std::to_string(plan.box.max[a] - 1);
   std::string header = "<?xml version=\"1.0\"?>\n<VTKFile type=\"ImageData\" version=\"1.0\" "
                        "byte_order=\"LittleEndian\" header_type=\"UInt64\">\n<ImageData WholeExtent=\"" +
-                       extent + "\" " + placeOf(path, plan) + ">\n<Piece Extent=\"" + extent +
-                       "\">\n<PointData>\n";
+                       extent + "\" " + placeOf(path, plan) + ">\n" + backgroundsOf(plan) +
+                       "<Piece Extent=\"" + extent + "\">\n<PointData>\n";
   std::uint64_t offset = 0;
   auto const bytesOf = [&](DenseReader const& reader) {
     return static_cast<std::uint64_t>(plan.samples()) *

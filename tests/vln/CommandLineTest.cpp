@@ -60,7 +60,7 @@ TEST_F(CommandLineTest, NegativeSuffixesFitTheFormat) {
                 (m_folder / "a.jpg") + ": pictures are written as .png");
   expectFailure(vln({"convert", path, m_folder / "a.png"}),
                 (m_folder / "a.png") +
-                    ": volumes are written as .npz, .nvdb, .ply, .usda, .vdb, .vti or .vtkhdf");
+                    ": volumes are written as .npz, .nvdb, .ply, .usda, .vdb, .vti, .vtkhdf or .zarr");
   expectFailure(vln({"make", "cloud", m_folder / "a.png"}),
                 (m_folder / "a.png") + ": grids are written as .vdb");
   expectFailure(vln({"tiles", path, "--depth", "28", "-o", m_folder / "a.stl"}),

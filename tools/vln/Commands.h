@@ -37,6 +37,7 @@ struct ConvertOptions {
   VLN::Interop::VdbReadLimits limits;
   double voxelSize = 0, band = 3; ///< of what a mesh becomes
   double iso = 0, adaptivity = 0; ///< of the surface that a .ply file gets
+  bool sparse = false;            ///< of .npz files: voxel by voxel
 };
 void convert(ConvertOptions const& options);
 

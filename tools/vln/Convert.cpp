@@ -37,6 +37,8 @@ void checkWhole(VdbImport const& content) {
 
 void convert(ConvertOptions const& options) {
   FileFormat const format = checkOutputFor(FileContent::kExports, options.output);
+  if (options.sparse && format != FileFormat::kNpz)
+    throw FileError(options.output, "--sparse is for .npz files");
   bool const holdsPoints = isWritten(format, FileContent::kPointData);
   VdbImport content;
   std::size_t written = 0;
@@ -52,7 +54,7 @@ void convert(ConvertOptions const& options) {
       throw FileError(content.file,
                       "would not be written whole: it has points, which such files do not hold");
     exportVolumes(content, options.output, bar.progress(0.7, 1),
-                  {.surface = {options.iso, options.adaptivity}});
+                  {.surface = {options.iso, options.adaptivity}, .voxelByVoxel = options.sparse});
   }
   for (auto const& s : content.skipped)
     std::cerr << fmt::format("vln: {}: note: '{}' is left out: {}\n", options.file, oneLine(s.grid, 60),

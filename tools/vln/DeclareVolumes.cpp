@@ -145,6 +145,7 @@ void declareConvert(CLI::App& self) {
       ->check(CLI::Range(0.0, 1.0))
       ->capture_default_str()
       ->type_name("0..1");
+  self.add_flag("--sparse", o.sparse, "Of .npz files: the active voxels one by one in place of a dense box");
   self.add_flag("--strict", o.strict, "Write nothing where anything of the file would be left out");
   addMemoryLimit(self, o.limits);
   self.callback([options] { convert(*options); });

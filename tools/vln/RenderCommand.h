@@ -2,6 +2,7 @@
 #pragma once
 
 #include "Interop/VdbFile.h"
+#include "Render/Look.h"
 #include "Render/Renderer.h"
 
 #include <optional>
@@ -10,7 +11,7 @@
 
 namespace Vln {
 
-enum class RenderMode { kFog, kSurface, kMaximum, kMean, kIsosurface };
+using RenderMode = VLN::Render::LookMode;
 
 struct RenderCommandOptions {
   std::string file;
