@@ -14,13 +14,13 @@ enum class LookMode { kFog, kSurface, kMaximum, kMean, kIsosurface };
 
 /// What is known of a field, and what was asked for.
 struct LookHints {
-  std::string channel;   ///< its name
-  std::string gridClass; ///< "fog volume", "level set", or another or none
-  std::optional<LookMode> mode;
-  std::optional<double> iso;
-  std::optional<std::pair<double, double>> range;
-  std::string colors; ///< empty: white fogs, else viridis
-  int depth = -1;     ///< of the deepest tiles that are drawn; -1: the deepest there are
+  std::string channel{};   ///< its name
+  std::string gridClass{}; ///< "fog volume", "level set", or another or none
+  std::optional<LookMode> mode{};
+  std::optional<double> iso{};
+  std::optional<std::pair<double, double>> range{};
+  std::string colors{}; ///< empty: white fogs, else viridis
+  int depth = -1;       ///< of the deepest tiles that are drawn; -1: the deepest there are
 };
 
 /// Fills in mode, colours and ranges of the options.
