@@ -35,6 +35,9 @@ data=${VLN_TEST_DATA_DIR:-}
 for candidate in "$root/../shared/data" "$(git rev-parse --path-format=absolute --git-common-dir)/../../shared/data"; do
   if [ -z "$data" ] && [ -d "$candidate" ]; then data=$(cd "$candidate" && pwd); fi
 done
+# Which makes the pages of Volume.view(), where it was built with them.
+program="$root/build/release/bin/vln"
+if [ -z "${VLN_PROGRAM:-}" ] && [ -x "$program" ]; then export VLN_PROGRAM="$program"; fi
 step "wheel" make_wheel
 (step "tests of the wheel" test_wheel)
 (step "types" check_types)

@@ -266,3 +266,24 @@ def test_regression_names_need_not_be_text(tmp_path):
         vln.open(os.fsencode(tmp_path) + b"/\xfd.vdb")
     with pytest.raises(KeyError):
         volume["\udcfe"]
+
+
+def test_requirement_surfaces_scenes_and_flat_files(tmp_path):
+    x, y, z = np.mgrid[-14:15, -14:15, -14:15]
+    distance = np.clip((np.sqrt(x * x + y * y + z * z) - 10) * 0.1, -0.3, 0.3).astype("f4")
+    volume = vln.Volume.from_numpy(distance, voxel_size=0.1, background=0.3, name="surface", grid_class="level set")
+    for suffix in ("nvtt", "usda", "ply"):
+        volume.save(tmp_path / f"a.{suffix}")
+    box = volume["surface"].box
+    for suffix in ("nvtt", "vdb"):  # the scene names the .vdb file beside it
+        with vln.open(tmp_path / f"a.{suffix}") as file:
+            assert np.array_equal(file["surface"].to_numpy(box), volume["surface"].to_numpy(box))
+    scene = (tmp_path / "a.usda").read_text()
+    assert 'def OpenVDBAsset "surface"' in scene and "@./a.vdb@" in scene
+    with vln.open(tmp_path / "a.ply") as file:
+        # Distances from the surface's mesh, on voxels of their own size; the middle of the ball is (14, 14, 14).
+        rng = np.random.default_rng(3)
+        ways = rng.normal(size=(500, 3))
+        ways /= np.linalg.norm(ways, axis=1)[:, None]
+        found = file["surface"].sample(1.4 + ways)
+        assert np.abs(found).max() < 0.01

@@ -15,6 +15,7 @@ from ._file import File, open
 from ._picture import Picture
 from ._points import Points
 from ._vln import FINEST, OPENVDB_VERSION, VERSION, FileError, Flat
+from ._view import Page
 from ._volume import Volume
 
 __version__ = VERSION
@@ -26,6 +27,7 @@ __all__ = [
     "FileError",
     "Flat",
     "OPENVDB_VERSION",
+    "Page",
     "Picture",
     "Points",
     "Volume",

@@ -2,15 +2,16 @@
 
 from __future__ import annotations
 
-from typing import Any, Callable, Dict, List, Mapping, Optional, Tuple
+from typing import Any, Callable, Dict, List, Mapping, Optional, Sequence, Tuple, Union
 
 import numpy as np
 
-from . import _checks, _html, _vln
+from . import _checks, _html, _view, _vln
 from ._channel import Channel, _box, _depth, _three
 from ._mapping import ByName
 from ._picture import Picture
 from ._points import Points
+from ._view import Page
 from ._vln import FINEST, Flat
 
 Where = Callable[[np.ndarray, int], Any]
@@ -231,6 +232,16 @@ class Volume(ByName):
                 raise ValueError("the volume has no channel with active voxels")
             channel = next((name for name in ("density", "surface") if name in seen), seen[0])
         return self[channel].render(**how)
+
+    def view(self, channels: Union[str, Sequence[str]] = (), max_size: Union[str, int] = "20MB",
+             program: Optional[Any] = None) -> Page:
+        """A page that shows the volume in a browser, by the program vln where it was built with pages.
+
+        channels: one or several; by default those that the program chooses.
+        max_size: "20MB" or a number of bytes, which chooses the depth.
+        program: its path; else the environment's VLN_PROGRAM, else "vln" on the path.
+        """
+        return _view.view(self, channels, max_size, program)
 
     def save(
         self,
