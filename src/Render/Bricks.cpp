@@ -242,11 +242,12 @@ private:
 } // namespace
 
 int finestDepth(Field const& field) {
+  FieldView const whole = field.wholeView();
   int depth = 0;
   for (TileRef const& t : field.tiles()) {
     if (!t.valid()) continue;
     int own = t.depth;
-    for (int core = field.view().brick(t.number).core; core > nanovtt::kTileWidth; core /= 2) ++own;
+    for (int core = whole.brick(t.number).core; core > nanovtt::kTileWidth; core /= 2) ++own;
     depth = std::max(depth, own);
   }
   return depth;

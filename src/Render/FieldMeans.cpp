@@ -101,6 +101,7 @@ FieldView Field::wholeView() const {
   FieldView view = m_view;
   view.bricks = m_bricks.data();
   view.maxDepth = nanovtt::kMaxDepth;
+  for (int a = 0; a < 3; ++a) view.low[a] = m_activeLow[a] - 1, view.high[a] = m_activeHigh[a] + 1;
   return view;
 }
 

@@ -85,7 +85,7 @@ std::vector<Level> packLevels(Field const& field, ViewCommandOptions const& opti
   int const finest = finestDepth(field);
   int const deepest = options.look.depth >= 0 ? std::min(options.look.depth, finest) : finest;
   // The first depth at which the field is more than a brick wide.
-  Vec3 const extent = field.view().high - field.view().low;
+  Vec3 const extent = field.wholeView().high - field.wholeView().low;
   float const widest = std::max({extent.x, extent.y, extent.z});
   int first = deepest;
   while (first > 0 && widest > std::ldexp(float(kPackedCore), nanovtt::kMaxDepth - first)) --first;
@@ -139,8 +139,8 @@ ordered_json aboutChannel(Drawing& drawing, double unit) {
                         {"unit", unit},
                         {"rows", rows},
                         {"shift", numbers(toWorld.point(field.origin()))},
-                        {"boxLow", numbers(field.view().low.as<double>())},
-                        {"boxHigh", numbers(field.view().high.as<double>())},
+                        {"boxLow", numbers(field.wholeView().low.as<double>())},
+                        {"boxHigh", numbers(field.wholeView().high.as<double>())},
                         {"levels", ordered_json::array()}};
   if (r.transfer.awayFrom) about["awayFrom"] = r.transfer.from;
   if (!isNamed) {

@@ -6,6 +6,8 @@
 #include "GeometryVolume/core/detail/SimdLanes.h"
 #include "GeometryVolume/tiletree/TreeIndex.h"
 
+#include <climits>
+
 namespace VLN::TileTree3D::Internal {
 
 /// The low sample of the cell that holds a position, and the weights of the next ones, in lanes.
@@ -19,7 +21,8 @@ struct SampleCell {
 /// Puts a position of tile space into the cell of a tile, by the tile's depth and corner.
 /// @pre The tile holds the position.
 template <class TraitsT>
-void placeInCell(FloatLanes p, IntLanes tileCorner, Velorn::Math::float3 const& offset, SampleCell& cell) {
+[[gnu::always_inline]] inline void placeInCell(FloatLanes p, IntLanes tileCorner,
+                                               Velorn::Math::float3 const& offset, SampleCell& cell) {
   constexpr int D = TraitsT::kTDW;
   struct Scale {
     float invVoxelWidth; // kTW / W
@@ -61,7 +64,8 @@ public:
   /// @param depth What was asked for.
   void set(TreeIndex const& tile, Velorn::Math::int3 const& corner, IntLanes c, int depth) {
     m_tile = tile;
-    m_leafWidth = UnsignedLanes{}; // which holds nothing
+    m_depth = INT_MIN;
+    m_leafWidth = UnsignedLanes{}; // which holds nothing, whatever is asked for
     if (tile.depth < 0) return;
     m_corner = lanesOf(corner);
     if (tile.depth < (depth < TraitsT::kMaxDepth ? depth : TraitsT::kMaxDepth)) {
@@ -76,7 +80,7 @@ private:
   IntLanes m_corner{};
   IntLanes m_leafCorner{};
   UnsignedLanes m_leafWidth{};
-  int m_depth = 0;
+  int m_depth = INT_MIN;
 };
 
 } // namespace VLN::TileTree3D::Internal
