@@ -3,8 +3,8 @@
 #include "Interop/FileError.h"
 #include "Interop/OutputFolder.h"
 #include "Interop/OutputTargetImpl.h"
+#include "Interop/UnfinishedImpl.h"
 
-#include <atomic>
 #include <cerrno>
 #include <cstdio>
 #include <cstdlib>
@@ -20,29 +20,7 @@ namespace {
 
 constexpr std::size_t kCollect = 1 << 18;
 
-// Names for the signal handler. More outputs at a time than slots are merely not removed when the program is
-// interrupted.
-struct Slot {
-  enum State { kFree, kClaimed, kInUse };
-  std::atomic<int> state{kFree};
-  char path[4096];
-};
-Slot unfinished[8];
-
-void remember(std::string const& path) {
-  if (path.size() >= sizeof Slot::path) return;
-  for (Slot& slot : unfinished) {
-    int expected = Slot::kFree;
-    if (!slot.state.compare_exchange_strong(expected, Slot::kClaimed)) continue;
-    std::memcpy(slot.path, path.c_str(), path.size() + 1);
-    slot.state.store(Slot::kInUse);
-    return;
-  }
-}
-void forget(std::string const& path) {
-  for (Slot& slot : unfinished)
-    if (slot.state.load() == Slot::kInUse && path == slot.path) slot.state.store(Slot::kFree);
-}
+Unfinished<8> unfinished;
 
 // What open() would take away from the mode of a new file. Asking by umask() itself would change it for a
 // moment, for other threads too.
@@ -131,7 +109,7 @@ OutputFile::OutputFile(std::string path)
   }
   m_fd = openTemporary(m_target, m_temporary);
   if (m_fd < 0) fail(errno);
-  remember(m_temporary);
+  unfinished.add(m_temporary);
   struct stat old;
   if (stat(m_target.c_str(), &old) != 0) {
     if (fchmod(m_fd, 0666 & ~creationMask()) != 0) fail(errno);
@@ -147,14 +125,14 @@ OutputFile::~OutputFile() {
   if (m_fd >= 0) close(m_fd);
   if (m_temporary.empty()) return;
   unlink(m_temporary.c_str());
-  forget(m_temporary);
+  unfinished.remove(m_temporary);
 }
 
 void OutputFile::fail(int error) {
   m_failed = true;
   // A constructor that throws gets no destructor.
   if (m_fd >= 0) close(m_fd), m_fd = -1;
-  if (!m_temporary.empty()) unlink(m_temporary.c_str()), forget(m_temporary), m_temporary.clear();
+  if (!m_temporary.empty()) unlink(m_temporary.c_str()), unfinished.remove(m_temporary), m_temporary.clear();
   throw FileError(m_path, std::string("cannot be written: ") + std::strerror(error));
 }
 
@@ -198,7 +176,7 @@ void OutputFile::commit() {
     if (int const error = refill(m_target, m_fd)) fail(error);
   if (m_way != Way::kReplace) return;
   if (rename(m_temporary.c_str(), m_target.c_str()) != 0) fail(errno);
-  forget(m_temporary);
+  unfinished.remove(m_temporary);
   m_temporary.clear();
 }
 
@@ -209,8 +187,7 @@ void checkOutput(std::string const& path) {
 }
 
 void removeUnfinishedOutput() noexcept {
-  for (Slot const& slot : unfinished)
-    if (slot.state.load() == Slot::kInUse) unlink(slot.path);
+  unfinished.forEach([](char const* path) { unlink(path); });
   removeUnfinishedFolders();
 }
 

@@ -1,8 +1,8 @@
 #include "Interop/OutputFolder.h"
 
 #include "Interop/FileError.h"
+#include "Interop/UnfinishedImpl.h"
 
-#include <atomic>
 #include <cerrno>
 #include <climits>
 #include <cstdint>
@@ -21,28 +21,7 @@ namespace VLN::Interop {
 
 namespace {
 
-// For the signal handler, as those of single files.
-struct Slot {
-  enum State { kFree, kClaimed, kInUse };
-  std::atomic<int> state{kFree};
-  char path[4096];
-};
-Slot unfinished[4];
-
-void remember(std::string const& path) {
-  if (path.size() >= sizeof Slot::path) return;
-  for (Slot& slot : unfinished) {
-    int expected = Slot::kFree;
-    if (!slot.state.compare_exchange_strong(expected, Slot::kClaimed)) continue;
-    std::memcpy(slot.path, path.c_str(), path.size() + 1);
-    slot.state.store(Slot::kInUse);
-    return;
-  }
-}
-void forget(std::string const& path) {
-  for (Slot& slot : unfinished)
-    if (slot.state.load() == Slot::kInUse && path == slot.path) slot.state.store(Slot::kFree);
-}
+Unfinished<4> unfinished;
 
 /// Removes a folder with all in it, by system calls alone: signal handlers may do so. Links are not followed.
 void removeTree(int parent, char const* name, int levels) noexcept {
@@ -122,13 +101,13 @@ OutputFolder::OutputFolder(std::string path, std::string const& mark)
     : m_path(std::move(path))
     , m_target(targetOf(m_path, mark))
     , m_temporary(makeBeside(m_path, m_target)) {
-  remember(m_temporary);
+  unfinished.add(m_temporary);
 }
 
 OutputFolder::~OutputFolder() {
   if (m_temporary.empty()) return;
   removeTree(AT_FDCWD, m_temporary.c_str(), kLevels);
-  forget(m_temporary);
+  unfinished.remove(m_temporary);
 }
 
 void OutputFolder::write(std::string const& name, void const* bytes, std::size_t count) const {
@@ -176,7 +155,7 @@ void OutputFolder::commit() {
   if (changed) fail(m_path, changed);
   if (!exists) {
     if (rename(m_temporary.c_str(), m_target.c_str()) != 0) fail(m_path, errno);
-    forget(m_temporary);
+    unfinished.remove(m_temporary);
     m_temporary.clear();
     return;
   }
@@ -195,7 +174,7 @@ void OutputFolder::commit() {
     rename(aside.c_str(), m_target.c_str());
     fail(m_path, why);
   }
-  forget(m_temporary);
+  unfinished.remove(m_temporary);
   m_temporary.clear();
   removeTree(AT_FDCWD, aside.c_str(), kLevels);
 }
@@ -205,8 +184,7 @@ void checkOutputFolder(std::string const& path, std::string const& mark) {
 }
 
 void removeUnfinishedFolders() noexcept {
-  for (Slot const& slot : unfinished)
-    if (slot.state.load() == Slot::kInUse) removeTree(AT_FDCWD, slot.path, kLevels);
+  unfinished.forEach([](char const* path) { removeTree(AT_FDCWD, path, kLevels); });
 }
 
 } // namespace VLN::Interop
