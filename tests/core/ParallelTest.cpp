@@ -8,12 +8,14 @@
 
 #include <algorithm>
 #include <atomic>
+#include <chrono>
 #include <cmath>
 #include <cstring>
 #include <numeric>
 #include <random>
 #include <stdexcept>
 #include <string>
+#include <thread>
 #include <tuple>
 #include <vector>
 
@@ -180,4 +182,39 @@ TEST(Parallel, ThreadIndicesStayBelowTheNumberOfThreads) {
     });
   });
   EXPECT_GE(parallelThreads(), 1);
+}
+
+// regression: what is thrown beside a nested loop, or a nested sort, cuts neither short
+TEST(Parallel, RegressionNestedLoopsAreWholeWhereASiblingThrows) {
+  constexpr std::int64_t kCount = 200000;
+  std::atomic<bool> begun{false}, thrown{false};
+  std::atomic<std::int64_t> done{-1};
+  bool sorted = false;
+  auto const waitFor = [](std::atomic<bool> const& flag) {
+    auto const until = std::chrono::steady_clock::now() + std::chrono::seconds(2);
+    while (!flag && std::chrono::steady_clock::now() < until) std::this_thread::yield();
+  };
+  auto const outer = [&](std::int64_t begin, std::int64_t) {
+    if (begin == 0) {
+      waitFor(begun);
+      thrown = true;
+      throw std::runtime_error("beside");
+    }
+    begun = true;
+    waitFor(thrown);
+    std::this_thread::sleep_for(std::chrono::milliseconds(50)); // until the scheduler has heard of it
+    std::atomic<std::int64_t> count{0};
+    parallelFor(0, kCount, [&](std::int64_t b, std::int64_t e) { count += e - b; });
+    std::vector<SortRecord> records(20000);
+    for (std::size_t n = 0; n < records.size(); ++n)
+      records[n] = {0, 7919 * n % 20011, static_cast<std::int64_t>(n)};
+    parallelSort(records.data(), static_cast<std::int64_t>(records.size()));
+    sorted = std::is_sorted(records.begin(), records.end(),
+                            [](auto const& a, auto const& b) { return a.low < b.low; });
+    done = count.load();
+  };
+  withThreads(2, [&] { EXPECT_THROW(parallelFor(0, 2, outer), std::runtime_error); });
+  if (done < 0) GTEST_SKIP() << "both halves ran on one thread";
+  EXPECT_EQ(done, kCount);
+  EXPECT_TRUE(sorted);
 }

@@ -9,6 +9,8 @@
 #include "support/ArrayCase.h"
 #include "support/FuzzReplay.h"
 
+#include <algorithm>
+
 namespace VLN::Test {
 namespace {
 
@@ -38,8 +40,8 @@ VdbImport volume(bool turned) {
   auto const n = [](int x, int y, int z) { return x + 100 * y - 10000 * z; };
   file.grids = {
       grid<FloatGrid>("density", 3.5f, f),
-      grid<DoubleGrid>("a/b <&> \"c\"", -0.25, f),
-      grid<Int32Grid>("i", 7, n),
+      grid<DoubleGrid>("e", -0.25, f),
+      grid<Int32Grid>("a/b <&> \"c\"", 7, n),
       grid<Int64Grid>("l", -9, n),
       grid<BoolGrid>("b", false, [](int, int, int) { return true; }),
       grid<Vec3SGrid>("v", Vec3s(1, 2, 3),
@@ -81,7 +83,8 @@ TEST(ArrayFilesTest, RequirementNpzGoesThereAndBack) {
   auto const after = importVolumes(folder / "a.npz");
   expectEqual(before, after);
   EXPECT_EQ(after.volumes[0].channels[0].name, "density");
-  EXPECT_EQ(after.volumes[0].channels[4].type, "bool");
+  auto const& channels = after.volumes[0].channels;
+  EXPECT_TRUE(std::any_of(channels.begin(), channels.end(), [](auto const& c) { return c.type == "bool"; }));
 }
 
 TEST(ArrayFilesTest, RequirementVoxelsOneByOneKeepWhatIsActive) {
@@ -101,7 +104,9 @@ TEST(ArrayFilesTest, RequirementVtiGoesThereAndBack) {
     exportVolumes(before, folder / "a.vti");
     auto const after = importVolumes(folder / "a.vti");
     expectEqual(before, after);
-    EXPECT_EQ(after.volumes[0].channels[1].gridName, "a/b <&> \"c\"");
+    auto const& channels = after.volumes[0].channels;
+    EXPECT_TRUE(std::any_of(channels.begin(), channels.end(),
+                            [](auto const& c) { return c.gridName == "a/b <&> \"c\""; }));
   }
 }
 

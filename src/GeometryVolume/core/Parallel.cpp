@@ -7,6 +7,8 @@
 #include <limits>
 #include <utility>
 #if !VLN_THREAD_NOTES
+#include <tbb/blocked_range.h>
+#include <tbb/parallel_for.h>
 #include <tbb/parallel_sort.h>
 #include <tbb/task_arena.h>
 #endif
@@ -42,7 +44,13 @@ template <class T, class Less> void sortAll(T* first, T* last, Less const& less)
   });
   std::inplace_merge(first, middle, last, less);
 #else
-  tbb::this_task_arena::isolate([&] { tbb::parallel_sort(first, last, less); });
+  // On its own, as parallelFor() is.
+  tbb::task_group_context context(tbb::task_group_context::isolated);
+  tbb::this_task_arena::isolate([&] {
+    tbb::parallel_for(
+        tbb::blocked_range<int>(0, 1),
+        [&](tbb::blocked_range<int> const&) { tbb::parallel_sort(first, last, less); }, context);
+  });
 #endif
 }
 

@@ -81,11 +81,14 @@ void parallelFor(std::int64_t begin, std::int64_t end, RangeBody body, ParallelO
   } else {
     Loop loop{body, guard};
     Range const range(begin, end, static_cast<std::size_t>(grain));
+    // On its own: what is thrown beside a loop that runs inside another would cut it short, and nobody would
+    // know.
+    tbb::task_group_context context(tbb::task_group_context::isolated);
     tbb::this_task_arena::isolate([&] {
       if (options.affinity)
-        tbb::parallel_for(range, LoopChunk{&loop}, options.affinity->impl().partitioner);
+        tbb::parallel_for(range, LoopChunk{&loop}, options.affinity->impl().partitioner, context);
       else
-        tbb::parallel_for(range, LoopChunk{&loop});
+        tbb::parallel_for(range, LoopChunk{&loop}, context);
     });
   }
   guard.throwIfCancelled();
