@@ -82,7 +82,8 @@ TEST_F(SupervisorTest, SignalsReachWhoeverWorks) {
 TEST_F(SupervisorTest, NoProcessOutlivesTheProgram) {
   pid_t const process = start();
   std::vector<pid_t> children;
-  for (int n = 0; n < 200 && children.empty(); ++n) {
+  // A sanitized program beside others takes seconds to begin.
+  for (int n = 0; n < 10000 && children.empty(); ++n) {
     usleep(2000);
     children = childrenOf(process);
   }
