@@ -4,24 +4,15 @@ from __future__ import annotations
 
 from typing import Any, Callable, Dict, Optional, Tuple
 
-from . import _checks
+from ._bytes import FileBytes
 from ._vln import Core
 
 
-class Picture(bytes):
+class Picture(FileBytes):
     """The bytes of a PNG file, which a notebook shows."""
 
     def _repr_png_(self) -> bytes:
         return bytes(self)
-
-    def save(self, path: Any) -> None:
-        with open(_checks.path_of(path), "wb") as file:
-            file.write(self)
-
-    def __repr__(self) -> str:
-        return f"<vln.Picture of {len(self)} bytes>"
-
-    __str__ = __repr__
 
 
 def render(

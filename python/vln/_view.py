@@ -9,24 +9,15 @@ import subprocess
 import tempfile
 from typing import Any, List, Optional, Sequence, Union
 
-from . import _checks
+from ._bytes import FileBytes
 
 
-class Page(bytes):
+class Page(FileBytes):
     """The bytes of one HTML page that needs nothing else; a notebook shows it in a frame."""
 
     def _repr_html_(self) -> str:
         source = html.escape(self.decode("utf-8", "replace"))
         return f'<iframe srcdoc="{source}" width="800" height="600" sandbox="allow-scripts allow-downloads"></iframe>'
-
-    def save(self, path: Any) -> None:
-        with open(_checks.path_of(path), "wb") as file:
-            file.write(self)
-
-    def __repr__(self) -> str:
-        return f"<vln.Page of {len(self)} bytes>"
-
-    __str__ = __repr__
 
 
 def _program(program: Optional[Any]) -> str:

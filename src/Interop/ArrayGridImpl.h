@@ -18,6 +18,14 @@ struct UnreadableArrays : FileError {
       : FileError("", reason) {}
 };
 
+/// Indices of volumes lie closer to 0.
+inline constexpr double kIndexReach = 0x1p29;
+/// @error UnreadableArrays for an index, or the end of a box, that is not within reach.
+inline void checkIndex(double index) {
+  if (!(index > -kIndexReach && index < kIndexReach))
+    throw UnreadableArrays("lies at indices that volumes do not have");
+}
+
 struct NumberType {
   char kind = 'f'; ///< f, i, u, or b for bytes that are true or false
   int bytes = 4;

@@ -6,12 +6,14 @@
 #pragma once
 
 #include "Interop/FileError.h"
+#include "Interop/FreeNameImpl.h"
 #include "Interop/OutputFile.h"
 
 #include <algorithm>
 #include <array>
 #include <cstdint>
 #include <cstring>
+#include <iterator>
 #include <new>
 #include <set>
 #include <string>
@@ -176,10 +178,16 @@ inline std::string memberName(std::string const& channel, std::set<std::string>&
   std::string base = oneLine(channel, 200);
   std::replace(base.begin(), base.end(), '/', '_');
   std::replace(base.begin(), base.end(), '\\', '_');
-  std::string name = base;
-  for (int n = 2; !taken.insert(name).second; ++n) name = base + "_" + std::to_string(n);
-  for (char const* part : {".background", ".indices", ".values"}) taken.insert(name + part);
-  return name;
+  constexpr char const* kParts[] = {".background", ".indices", ".values"};
+  for (;;) {
+    std::string const name = freeName(base, taken);
+    // Members of its own follow an array, none of which may be there before it.
+    if (std::any_of(std::begin(kParts), std::end(kParts),
+                    [&](char const* part) { return taken.contains(name + part); }))
+      continue;
+    for (char const* part : kParts) taken.insert(name + part);
+    return name;
+  }
 }
 
 } // namespace VLN::Interop

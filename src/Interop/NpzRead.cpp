@@ -193,7 +193,7 @@ private:
     double low[3] = {0, 0, 0}, matrix[16], size[3] = {1, 1, 1}, origin[3] = {0, 0, 0};
     if (numbers("low", {{3}}, low))
       for (int a = 0; a < 3; ++a) {
-        if (!(std::abs(low[a]) < kReach)) throw UnreadableArrays("lies at indices that volumes do not have");
+        checkIndex(low[a]);
         m_low[a] = static_cast<int>(low[a]);
       }
     double rows[3][4] = {};
@@ -259,8 +259,7 @@ private:
     auto const strides = array.strides();
     ArrayLayout layout;
     for (std::size_t a = 0; a < 3; ++a) {
-      if (!(double(m_low[int(a)]) + double(array.shape[a]) < kReach))
-        throw UnreadableArrays("lies at indices that volumes do not have");
+      checkIndex(double(m_low[int(a)]) + double(array.shape[a]));
       layout.count[a] = array.shape[a];
       layout.stride[a] = strides[a];
     }
@@ -287,8 +286,7 @@ private:
       openvdb::Coord voxel;
       for (int a = 0; a < 3; ++a) {
         auto const index = wholeOf(at.data() + n * places[0] + a * places[1], at.type);
-        if (!(std::abs(double(index) + m_low[a]) < kReach))
-          throw UnreadableArrays("lies at indices that volumes do not have");
+        checkIndex(double(index) + m_low[a]);
         voxel[a] = static_cast<int>(index + m_low[a]);
       }
       grid->setVoxel(voxel, array.data() + n * strides[0], array.type, components > 1 ? strides[1] : 0);
@@ -297,8 +295,6 @@ private:
     drop(indices);
     drop(values);
   }
-
-  static constexpr double kReach = 0x1p29; ///< of the domain
 
   std::string m_bytes;
   ZipReader m_zip;

@@ -1,5 +1,5 @@
 // The active voxels of grids, one by one, for numpy.
-#include "Interop/DenseWrite.h"
+#include "Interop/DenseReaderImpl.h"
 #include "Interop/NpzArchiveImpl.h"
 #include "Interop/VdbExportImpl.h"
 #include "Interop/VdbImportImpl.h"
@@ -10,7 +10,6 @@ namespace VLN::Interop {
 
 namespace {
 
-constexpr double kMostBytes = 1e12; ///< of a file
 constexpr std::size_t kAtOnce = 1 << 18;
 
 struct Kind {
@@ -45,7 +44,7 @@ bool tryWrite(openvdb::GridBase const& base, std::string const& path, ZipWriter&
   using Value = typename GridT::ValueType;
   Kind const kind = kindOf<Value>();
   auto const count = static_cast<std::int64_t>(grid.activeVoxelCount());
-  if (double(count) * (12 + sizeof(Value)) > kMostBytes)
+  if (double(count) * (12 + sizeof(Value)) > kMostDenseBytes)
     throw FileError(path, "the active voxels of '" + oneLine(name, 60) + "' would take more than 1000 GB");
   std::string bytes;
   auto const put = [&](void const* from, std::size_t size) {

@@ -44,17 +44,6 @@ int openTemporary(std::string const& target, std::string& path) {
   return fd;
 }
 
-// 0, or an error number.
-int writeAll(int fd, char const* bytes, std::size_t count) {
-  while (count > 0) {
-    ssize_t const n = ::write(fd, bytes, count);
-    if (n < 0 && errno == EINTR) continue;
-    if (n <= 0) return n < 0 ? errno : EIO;
-    bytes += n, count -= static_cast<std::size_t>(n);
-  }
-  return 0;
-}
-
 int sync(int fd) {
   // Some file systems have no such thing.
   return fsync(fd) == 0 || errno == EINVAL || errno == ENOTSUP ? 0 : errno;

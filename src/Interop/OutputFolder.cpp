@@ -1,6 +1,7 @@
 #include "Interop/OutputFolder.h"
 
 #include "Interop/FileError.h"
+#include "Interop/OutputTargetImpl.h"
 #include "Interop/UnfinishedImpl.h"
 
 #include <cerrno>
@@ -119,16 +120,7 @@ void OutputFolder::write(std::string const& name, void const* bytes, std::size_t
     fd = open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0666);
   }
   if (fd < 0) fail(m_path, errno);
-  auto const* from = static_cast<char const*>(bytes);
-  int error = 0;
-  while (count > 0 && !error) {
-    ssize_t const n = ::write(fd, from, count);
-    if (n < 0 && errno == EINTR) continue;
-    if (n <= 0)
-      error = n < 0 ? errno : EIO;
-    else
-      from += n, count -= static_cast<std::size_t>(n);
-  }
+  int error = writeAll(fd, bytes, count);
   if (close(fd) != 0 && !error) error = errno;
   if (error) fail(m_path, error);
 }

@@ -71,4 +71,15 @@ OutputTarget findOutputTarget(std::string const& path) {
   return target;
 }
 
+int writeAll(int descriptor, void const* bytes, std::size_t count) {
+  auto const* from = static_cast<char const*>(bytes);
+  while (count > 0) {
+    ssize_t const n = ::write(descriptor, from, count);
+    if (n < 0 && errno == EINTR) continue;
+    if (n <= 0) return n < 0 ? errno : EIO;
+    from += n, count -= static_cast<std::size_t>(n);
+  }
+  return 0;
+}
+
 } // namespace VLN::Interop

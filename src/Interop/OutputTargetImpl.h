@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstddef>
 #include <string>
 
 namespace VLN::Interop {
@@ -13,5 +14,8 @@ struct OutputTarget {
 
 /// @error FileError for a folder, a file that may not be written, and a name that cannot be one.
 OutputTarget findOutputTarget(std::string const& path);
+
+/// Writes all bytes, however many calls that takes. @return 0, or an error number.
+int writeAll(int descriptor, void const* bytes, std::size_t count);
 
 } // namespace VLN::Interop

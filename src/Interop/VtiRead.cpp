@@ -263,8 +263,7 @@ private:
     if (list.size() != 6) damaged("an extent is none");
     Extent extent{};
     for (std::size_t n = 0; n < 6; ++n) {
-      if (std::abs(double(list[n])) >= kReach)
-        throw UnreadableArrays("lies at indices that volumes do not have");
+      checkIndex(double(list[n]));
       extent[n] = list[n];
     }
     return extent;
@@ -446,7 +445,6 @@ private:
     return *m_made.back().grid;
   }
 
-  static constexpr double kReach = 0x1p29; ///< of the domain
   static constexpr std::string_view kBackground = ".background";
   struct Background {
     NumberType type;

@@ -1,8 +1,10 @@
 // Coarse pictures: samples that stand for what lies about them.
 //
-//   ┌──┬──┬──┬──┐     a sample lies on the corner that eight voxels share, and takes the mean of the eight:
-//   so │  │  │  │  │     nothing moves, and sums stay what they are. The voxel of a tile is as wide as a tile
-//   two ├──┼──x──┼──┤     depths below it, whose mean is known. │  │  │  │  │
+//   +--+--+--+--+   A sample lies on the corner that eight voxels share, and takes the mean of the eight:
+//   |  |  |  |  |   so nothing moves, and sums stay what they are.
+//   +--+--x--+--+   The voxel of a tile is as wide as a tile two depths below it, whose mean is known.
+//   |  |  |  |  |
+//   +--+--+--+--+
 #include "Reader/NanoVTTPath.h"
 #include "Render/Field.h"
 #include "Render/Threads.h"

@@ -87,6 +87,33 @@ TEST(ArrayFilesTest, RequirementNpzGoesThereAndBack) {
   EXPECT_TRUE(std::any_of(channels.begin(), channels.end(), [](auto const& c) { return c.type == "bool"; }));
 }
 
+// regression: a channel that is called as the background of the next one
+TEST(ArrayFilesTest, RegressionNamesOfBackgroundsAreFreeToo) {
+  using namespace openvdb;
+  openvdb::initialize();
+  VdbFile file;
+  file.path = "memory";
+  for (int n = 0; n < 2; ++n) {
+    auto const made = FloatGrid::create(float(n));
+    made->tree().setValueOn(Coord(1, 2, 3), 5.0f + float(n));
+    made->setName(n ? "a" : "a.background");
+    file.grids.push_back(made);
+  }
+  TempFolder const folder;
+  for (bool const sparse : {false, true}) {
+    exportVolumes(importGrids(file), folder / "a.npz", {}, {.surface = {}, .voxelByVoxel = sparse});
+    auto const after = importVolumes(folder / "a.npz");
+    EXPECT_TRUE(after.skipped.empty());
+    ASSERT_EQ(after.volumes[0].channels.size(), 2u);
+    for (int n = 0; n < 2; ++n) {
+      auto const values = ChannelValues::of(after.volumes[0], after.volumes[0].channels[std::size_t(n)].name);
+      ASSERT_TRUE(values);
+      EXPECT_EQ(values->text({1, 2, 3}), n ? "6" : "5");
+      EXPECT_EQ(values->text({90, 2, 3}), n ? "1" : "0");
+    }
+  }
+}
+
 TEST(ArrayFilesTest, RequirementVoxelsOneByOneKeepWhatIsActive) {
   TempFolder const folder;
   auto const before = volume(true);
