@@ -116,6 +116,58 @@ TEST(VolumeTest, RequirementNewTilesKeepWhatWasReadThereInAllFields) {
   EXPECT_EQ(coarse.channel().tileCount(-1), volume.tileCount());
 }
 
+TEST(VolumeTest, RequirementTilesOfSeveralFieldsBecomeOne) {
+  Volume volume;
+  auto a = volume.addField<float>("a", 1), b = volume.addField<float>("b", 2);
+  auto other = a; // a handle that has looked there before
+  EXPECT_EQ(other.get(9, 9, 9), 1.0f);
+  a.set(9, 9, 9, 10);
+  other.set(10, 9, 9, 11);
+  b.set(9, 10, 9, 20);
+  b.set(400, 0, 0, 21);
+  EXPECT_EQ(a.get(10, 9, 9), 11.0f);
+  EXPECT_EQ(a.get(400, 0, 0), 1.0f);
+  EXPECT_EQ(b.get(9, 9, 9), 2.0f);
+  EXPECT_EQ(volume.tree().tileCount(Volume::Shape::kMaxDepth), 2);
+  a.set(401, 0, 0, 12); // the tile has come with the other field
+  EXPECT_EQ(volume.tree().tileCount(Volume::Shape::kMaxDepth), 2);
+  EXPECT_EQ(a.get(401, 0, 0), 12.0f);
+  // Tiles outlive the field that made them, and are in what is copied.
+  b.set(-400, 0, 0, 22);
+  Volume const copy = volume;
+  EXPECT_EQ(copy.field<float>("b").get(-400, 0, 0), 22.0f);
+  b.set(-800, 0, 0, 23);
+  volume.removeField("b");
+  EXPECT_EQ(volume.tileCount(), volume.tree().tileCount(-1));
+  EXPECT_EQ(volume.tree().tileCount(Volume::Shape::kMaxDepth), 4);
+  EXPECT_EQ(copy.tree().tileCount(Volume::Shape::kMaxDepth), 3);
+  EXPECT_TRUE(volume.tree().checkConsistency(false));
+}
+
+TEST(VolumeTest, RequirementReadersMeetTilesThatTheTreeLacks) {
+  for (int round = 0; round < 20; ++round) {
+    Volume volume;
+    auto a = volume.addField<float>("a", 0), b = volume.addField<float>("b", 0);
+    for (int n = 0; n < 700; ++n) {
+      a.set(6 * n, n % 5, 0, float(n));
+      if (n % 2) b.set(6 * n, 4 + n % 5, 0, -float(n)); // in part the same tiles
+    }
+    std::atomic<int> wrong{0};
+    std::vector<std::thread> threads;
+    for (int t = 0; t < 4; ++t)
+      threads.emplace_back([&, t] {
+        Field<float> const ownA = a, ownB = b;
+        for (int n = 0; n < 700; ++n) {
+          if (n == 100 * t) wrong += volume.tree().tileCount(-1) <= 700;
+          wrong += ownA.get(6 * n, n % 5, 0) != float(n);
+          if (n % 2) wrong += ownB.get(6 * n, 4 + n % 5, 0) != -float(n);
+        }
+      });
+    for (auto& thread : threads) thread.join();
+    EXPECT_EQ(wrong.load(), 0);
+  }
+}
+
 TEST(VolumeTest, RequirementCopiesAreIndependentAndObjectsKeepWhatTheyHave) {
   Volume volume;
   auto field = volume.addField<float>("f", 0);

@@ -130,6 +130,10 @@ public:
   /// Appends tiles of `layout().size` elements to a depth of the range.
   /// @error What is thrown leaves the tiles that were appended before.
   void appendTiles(int depth, std::int64_t count);
+  /// A tile as appendTiles() makes it, of nobody yet.
+  Vector newTile() const { return m_allocateEmptyTileData ? Vector() : newTile(m_layout.size, nullptr); }
+  /// Appends such tiles, moving them out of `arriving`: all, or none when something is thrown.
+  void appendTiles(int depth, std::vector<Vector>& arriving);
   /// Grows tiles that hold fewer elements than `source` says.
   void growElements(Internal::TileCounts const& source);
   /// Whether the tiles and elements that the moves to one depth name exist. A negative destination is no

@@ -87,15 +87,13 @@ template <class T> std::int64_t ChannelData<T>::slotElements(std::size_t size) c
 
 template <class T> TileVector<T> ChannelData<T>::unwrittenTile(std::int64_t n, T* slot) const {
   using Allocator = TileDataAllocator<T>;
-  Vector raw(static_cast<std::size_t>(n), slot ? Allocator(slot, n, false) : Allocator(false));
   // Only static tiles keep the flag: a tile that grows must carry its elements along.
-  Allocator const kept = raw.get_allocator().withConstruct(slot ? m_callElementConstructor : true);
-  return Vector(std::move(raw), kept);
+  return Internal::unwrittenVector(n, slot ? Allocator(slot, n, m_callElementConstructor) : Allocator(true));
 }
 
 template <class T> TileVector<T> ChannelData<T>::newTile(std::int64_t n, T* slot) const {
   Vector tile = unwrittenTile(n, slot);
-  if (m_callElementConstructor) std::fill(tile.begin(), tile.end(), m_defaultValue);
+  if (m_callElementConstructor) Internal::fillRun(tile.data(), n, m_defaultValue);
   return tile;
 }
 

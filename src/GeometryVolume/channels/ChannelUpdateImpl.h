@@ -4,10 +4,12 @@
 #include "GeometryVolume/channels/ChannelData.h"
 #include "GeometryVolume/channels/detail/TileVectorOps.h"
 #include "GeometryVolume/core/Parallel.h"
+#include "GeometryVolume/core/RollbackImpl.h"
 
 #include <algorithm>
 #include <atomic>
 #include <cstring>
+#include <iterator>
 #include <utility>
 
 namespace VLN::TileTree3D {
@@ -41,23 +43,6 @@ template <class T> void assignTile(TileVector<T>& to, TileVector<T> const& from)
   std::copy(from.begin(), from.end(), to.begin());
 }
 
-/// Runs `undo` unless it is told that all went well.
-template <class Undo> class Rollback {
-public:
-  explicit Rollback(Undo undo)
-      : m_undo(std::move(undo)) {}
-  ~Rollback() {
-    if (m_armed) m_undo();
-  }
-  Rollback(Rollback const&) = delete;
-  Rollback& operator=(Rollback const&) = delete;
-  void dismiss() { m_armed = false; }
-
-private:
-  Undo m_undo;
-  bool m_armed = true;
-};
-
 } // namespace Internal
 
 template <class T> bool ChannelData<T>::resizeTiles(Internal::TileCounts const& source) {
@@ -83,7 +68,7 @@ template <class T> bool ChannelData<T>::resizeTiles(Internal::TileCounts const& 
   auto const wanted = [&](int d) {
     return static_cast<std::size_t>(plan.wanted[static_cast<std::size_t>(d)]);
   };
-  Internal::Rollback added([&] {
+  VLN::Internal::Rollback added([&] {
     for (int d = firstDepth(); d <= lastDepth(); ++d) {
       auto& tiles = depthTiles(d);
       auto const n = static_cast<std::size_t>(before[static_cast<std::size_t>(d)]);
@@ -295,7 +280,7 @@ template <class T> bool ChannelData<T>::resizeDepth(int depth, std::int64_t tile
   if (count(depth) != before) return false;
   auto& tiles = depthTiles(depth);
   auto const n = static_cast<std::size_t>(tileCount);
-  Internal::Rollback added([&] {
+  VLN::Internal::Rollback added([&] {
     if (static_cast<std::int64_t>(tiles.size()) > before)
       tiles.erase(tiles.begin() + static_cast<std::ptrdiff_t>(before), tiles.end());
   });
@@ -318,9 +303,20 @@ template <class T> void ChannelData<T>::appendTiles(int depth, std::int64_t n) {
   auto& tiles = depthTiles(depth);
   Internal::reserveDepthTiles(tiles, static_cast<std::int64_t>(tiles.size()) + n);
   for (; n > 0; --n) {
-    tiles.push_back(m_allocateEmptyTileData ? Vector() : newTile(m_layout.size, nullptr));
+    tiles.push_back(newTile());
     ++count(depth), ++m_tileCountTotal;
   }
+}
+
+template <class T> void ChannelData<T>::appendTiles(int depth, std::vector<Vector>& arriving) {
+  if (!m_data || depth < firstDepth() || depth > lastDepth()) return;
+  cloneData();
+  auto& tiles = depthTiles(depth);
+  auto const n = static_cast<std::int64_t>(arriving.size());
+  Internal::reserveDepthTiles(tiles, static_cast<std::int64_t>(tiles.size()) + n);
+  tiles.insert(tiles.end(), std::make_move_iterator(arriving.begin()),
+               std::make_move_iterator(arriving.end()));
+  count(depth) += n, m_tileCountTotal += n;
 }
 
 template <class T> void ChannelData<T>::growElements(Internal::TileCounts const& source) {

@@ -245,12 +245,7 @@ private:
   static void copyRun(T const* from, int n, T* to) {
     for (int i = 0; i < n; ++i) to[i] = from[i];
   }
-  static void fillRun(T* p, int n, T const& value) {
-    T const v = value;
-    int i = 0;
-    for (; i + 4 <= n; i += 4) p[i] = v, p[i + 1] = v, p[i + 2] = v, p[i + 3] = v;
-    for (; i < n; ++i) p[i] = v;
-  }
+  static void fillRun(T* p, int n, T const& value) { Internal::fillRun(p, n, value); }
 
   /// Calls body(first, count) for the runs of elements outside the core, in rising order.
   template <class Body> static void forEachHaloRun(Body const& body) {

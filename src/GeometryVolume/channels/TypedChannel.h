@@ -89,6 +89,11 @@ public:
   /// Never in a static block.
   /// @cost Amortised constant for each tile, where updateTilesAdded() looks at all depths.
   void appendTiles(int depth, std::int64_t count);
+  /// A tile as appendTiles() makes it, of no channel yet.
+  TileVector<T> newTile() const;
+  /// Appends such tiles, moving them out of `arriving`.
+  /// @error std::bad_alloc; nothing has changed then.
+  void appendTiles(int depth, std::vector<TileVector<T>>& arriving);
   /// false without storage.
   bool removeAll();
   /// Puts tiles in a new order: new tile i of depth d is old tile newToOld[d][i]. Returns true.

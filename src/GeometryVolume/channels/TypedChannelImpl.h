@@ -120,7 +120,7 @@ template <class T> void TypedChannel<T>::setMinDepth(int minDepth, Component con
   int const old = this->minDepth();
   if (minDepth == old) return;
   write([&](ChannelData<T>& data) { data.setMinDepth(minDepth); });
-  Internal::Rollback range([&] { m_data->setMinDepth(old); });
+  VLN::Internal::Rollback range([&] { m_data->setMinDepth(old); });
   if (old <= minDepth)
     remove(old, minDepth - 1);
   else
@@ -132,7 +132,7 @@ template <class T> void TypedChannel<T>::setDepth(int depth, Component const& so
   int const old = this->depth();
   if (depth == old) return;
   write([&](ChannelData<T>& data) { data.setDepth(depth); });
-  Internal::Rollback range([&] { m_data->setDepth(old); });
+  VLN::Internal::Rollback range([&] { m_data->setDepth(old); });
   if (old >= depth)
     remove(depth + 1, old);
   else
@@ -279,6 +279,10 @@ template <class T> bool TypedChannel<T>::removeAll() {
 
 template <class T> void TypedChannel<T>::appendTiles(int depth, std::int64_t count) {
   write([&](ChannelData<T>& data) { data.appendTiles(depth, count); });
+}
+template <class T> TileVector<T> TypedChannel<T>::newTile() const { return m_data->newTile(); }
+template <class T> void TypedChannel<T>::appendTiles(int depth, std::vector<TileVector<T>>& arriving) {
+  write([&](ChannelData<T>& data) { data.appendTiles(depth, arriving); });
 }
 
 template <class T> bool TypedChannel<T>::resize(int depth, std::int64_t tileCount, int elementCount) {

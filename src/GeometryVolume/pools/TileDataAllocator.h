@@ -21,6 +21,9 @@
 
 namespace VLN {
 
+/// In place of a value: the element stays as the memory held it.
+struct Unwritten {};
+
 template <class T> class TileDataAllocator {
 public:
   using value_type = T;
@@ -80,6 +83,7 @@ public:
   template <class... Args> void construct(T* p, Args&&... args) {
     if (m_construct) ::new (static_cast<void*>(p)) T(std::forward<Args>(args)...);
   }
+  void construct(T*, Unwritten) {}
 
   /// A copied vector owns its storage.
   TileDataAllocator select_on_container_copy_construction() const { return {}; }

@@ -11,6 +11,15 @@ namespace VLN::TileTree3D {
 
 template <class TraitsT>
 TreeIndex ContainerBuilder<TraitsT>::addTileBelow(TreeIndex above, int i, int j, int k, int depth) {
+  if (depth == kMaxDepth && above.depth + 1 == depth) {
+    // The common case: a record alone, after whose allocation nothing fails.
+    TreeIndex const made = makeTile(i, j, k, depth);
+    editTile(made).setParentIndex(above.index);
+    TileType& parent = editTile(above);
+    parent.childIndex(tile(made)) = made.index;
+    parent.setBranchSize(parent.branchSize() + kTileSize);
+    return made;
+  }
   Growth growth(data());
   TreeIndex const made = makeTile(i, j, k, depth);
   insertChild(above, made);

@@ -142,11 +142,20 @@ auto TileAccessorOf<TraitsT>::addTile(int i, int j, int k, int depth) -> TileTyp
   TreeIndex at = this->findNear(i, j, k, depth);
   if (!at.valid()) return this->setCursor(tree.tile(tree.addTile(i, j, k, depth)));
   at = this->descend(at, i, j, k, depth);
-  if (at.depth != depth) {
-    tree.addTileBelow(at, i, j, k, depth);
-    this->descend(at, i, j, k, depth);
-  }
+  if (at.depth != depth) growBelow(at, i, j, k, depth);
   return this->current();
+}
+
+template <class TraitsT>
+void TileAccessorOf<TraitsT>::growBelow(TreeIndex at, int i, int j, int k, int depth) {
+  TreeIndex const made = m_mutableContainer->addTileBelow(at, i, j, k, depth);
+  if (at.depth + 1 < depth) {
+    this->descend(at, i, j, k, depth);
+    return;
+  }
+  this->m_path[depth] = made.index;
+  this->m_depth = depth, this->m_index = made.index;
+  this->m_corner = TraitsT::align(int3{i, j, k}, depth);
 }
 
 template <class TraitsT>

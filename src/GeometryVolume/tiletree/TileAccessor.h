@@ -167,6 +167,15 @@ public:
   TileType const& addTile(int i, int j, int k, int depth);
   TileType const& addTile(int3 const& p, int depth) { return addTile(p.x, p.y, p.z, depth); }
   TileType const& addTile(VoxelCoord const& at) { return addTile(at.i, at.j, at.k, at.depth); }
+  /// The same where a coarser tile holds the point already; else nothing is made.
+  /// @return The depth of the deepest tile that held the point before: `depth` where that tile was there, -1
+  /// where there is none.
+  int addTileBelow(int i, int j, int k, int depth) {
+    if (!TraitsT::isDepth(depth)) return -1;
+    TreeIndex const at = this->treeIndex(i, j, k, depth, false);
+    if (at.valid() && at.depth != depth) growBelow(at, i, j, k, depth);
+    return at.valid() ? at.depth : -1;
+  }
   /// Adds the smallest tile that holds the box.
   TileType const& addTile(int3 const& min, int3 const& max);
   /// Adds the tiles of a depth over a box, its max exclusive. Positions out of the domain are left out.
@@ -196,6 +205,8 @@ public:
                    TileMoves* moves = nullptr);
 
 private:
+  /// Makes the tile of `depth` below the cursor's tile `at`, and moves the cursor there.
+  void growBelow(TreeIndex at, int i, int j, int k, int depth);
   /// Reads the cursor's tile again at its index, or resets the cursor when there is none.
   void rereadCursor();
 

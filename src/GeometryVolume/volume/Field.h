@@ -75,24 +75,26 @@ public:
   T get(int i, int j, int k) const {
     if (!near(i, j, k, m_readEpoch)) [[unlikely]]
       moveToRead(i, j, k);
-    auto const* const tile = static_cast<T const*>(m_block->tiles[Internal::FieldBlock::slot(i, j, k)]);
+    auto const at = Internal::FieldBlock::place(i, j, k);
+    auto const* const tile = static_cast<T const*>(m_block->tile(at));
     if (!tile) [[unlikely]]
       return coarse(i, j, k);
-    return tile[Internal::FieldBlock::element(i, j, k)];
+    return tile[at.element()];
   }
   T get(int3 const& p) const { return get(p.x, p.y, p.z); }
   /// Makes the tile of the deepest depth that holds the position, where there is none: its other elements,
   /// and those of all other fields, keep the values that were read there before.
   /// @error std::out_of_range beyond the domain.
-  /// @cost As get(). A tile made costs a share of growing the tree and this field; the volume's other parts
-  /// follow when they are next asked for, all new tiles at once.
+  /// @cost As get(). A tile made costs its elements; tree and channels take all new tiles in at once, when
+  /// something other than set() next asks for them.
   void set(int i, int j, int k, T const& value) {
     if (!near(i, j, k, m_writeEpoch)) [[unlikely]]
       moveToWrite(i, j, k);
-    auto* tile = static_cast<T*>(m_block->tiles[Internal::FieldBlock::slot(i, j, k)]);
+    auto const at = Internal::FieldBlock::place(i, j, k);
+    auto* tile = static_cast<T*>(m_block->tile(at));
     if (!tile) [[unlikely]]
       tile = make(i, j, k);
-    tile[Internal::FieldBlock::element(i, j, k)] = value;
+    tile[at.element()] = value;
     m_volume->valuesChanged(*m_slot);
   }
   void set(int3 const& p, T const& value) { set(p.x, p.y, p.z, value); }
@@ -150,10 +152,12 @@ private:
                std::uint32_t(Internal::FieldBlock::kWidth) &&
            epoch == m_volume->epoch.load(std::memory_order_relaxed);
   }
+  // Remember the block of a position.
   void moveToRead(int i, int j, int k) const;
   void moveToWrite(int i, int j, int k);
-  [[gnu::cold]] T coarse(int i, int j, int k) const;
+  void findBlock(int i, int j, int k) const;
   [[gnu::noinline]] T* make(int i, int j, int k);
+  [[gnu::cold]] T coarse(int i, int j, int k) const;
   void const* sampler() const;
 
   Internal::VolumeData* m_volume = nullptr;

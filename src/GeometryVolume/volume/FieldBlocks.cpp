@@ -21,7 +21,7 @@ void FieldBlocks::insert(int3 const& corner, void* elements) {
     slot = {at, &m_chunks.back()[kChunk - m_left--]};
     ++m_used;
   }
-  slot.block->tiles[FieldBlock::slot(corner.x, corner.y, corner.z)] = elements;
+  slot.block->tiles[FieldBlock::place(corner.x, corner.y, corner.z).slot()].storeRelease(elements);
 }
 
 void FieldBlocks::clear() { *this = FieldBlocks(); }

@@ -59,10 +59,10 @@ Chunk findRuns(FieldBlocks const& blocks, std::span<int3 const> positions, std::
       runBegin = n;
     }
     tile = {p.x & ~3, p.y & ~3, p.z & ~3};
-    std::size_t const slot = FieldBlock::slot(p.x, p.y, p.z);
-    if (block->tiles[slot]) continue;
+    auto const place = FieldBlock::place(p.x, p.y, p.z);
+    if (block->tile(place)) continue;
     if (!listedBlock) listedBlock = listed.find(p.x, p.y, p.z);
-    if (listedBlock->tiles[slot]) continue;
+    if (listedBlock->tile(place)) continue;
     listed.insert(p, &out);
     listedBlock = listed.find(p.x, p.y, p.z);
     out.missing.push_back(tile);
@@ -74,6 +74,7 @@ Chunk findRuns(FieldBlocks const& blocks, std::span<int3 const> positions, std::
 } // namespace
 
 BulkRuns planBulk(VolumeData& volume, FieldSlot& slot, std::span<int3 const> positions) {
+  volume.sync();
   volume.prepareWrite(slot);
   auto const n = static_cast<std::int64_t>(positions.size());
   std::int64_t const grain = std::clamp<std::int64_t>(n / 16, 16384, 1 << 20);

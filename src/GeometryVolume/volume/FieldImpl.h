@@ -5,6 +5,7 @@
 #include "GeometryVolume/channels/NonLeafValues.h"
 #include "GeometryVolume/core/ElementTypes.h"
 #include "GeometryVolume/core/Parallel.h"
+#include "GeometryVolume/core/RollbackImpl.h"
 #include "GeometryVolume/sampling/VoxelSamplerLinear.h"
 #include "GeometryVolume/topology/Command.h"
 #include "GeometryVolume/volume/FieldBulkImpl.h"
@@ -13,6 +14,7 @@
 #include <algorithm>
 #include <array>
 #include <cstring>
+#include <deque>
 #include <stdexcept>
 #include <utility>
 
@@ -51,26 +53,53 @@ template <class T> struct TypedSlot final : FieldSlot {
     volume.epoch.fetch_add(1, std::memory_order_relaxed);
   }
 
-  void follow(VolumeData& volume, int firstDepth) override {
+  void follow(VolumeData& volume) override {
     VolumeTree const& tree = *volume.tree;
-    std::int64_t added = 0;
     auto const missing = [&](int d) {
       return tree.tileCount(d) - static_cast<std::int64_t>(tiles()[static_cast<std::size_t>(d)].size());
     };
-    for (int d = firstDepth; d <= kFinest; ++d) added += std::max<std::int64_t>(0, missing(d));
-    if (added > 0) {
-      detach(volume);
-      if (added > kFewTiles) {
-        volume.updateTopology();
-        m_channel->update(*volume.topology);
-      } else {
-        for (int d = firstDepth; d <= kFinest; ++d)
-          if (std::int64_t const n = missing(d); n > 0) m_channel->appendTiles(d, n);
-      }
+    std::int64_t added = 0;
+    for (int d = 0; d <= kFinest; ++d) added += std::max<std::int64_t>(0, missing(d));
+    if (added > 0) detach(volume);
+    if (added > kFewTiles && m_pending.empty()) {
+      volume.updateTopology();
+      m_channel->update(*volume.topology);
     }
-    for (int d = firstDepth; d <= kFinest; ++d) fillNew(tree, d);
+    for (int d = 0; d < kFinest; ++d) {
+      if (std::int64_t const n = missing(d); n > 0) m_channel->appendTiles(d, n);
+      fillNew(tree, d);
+    }
+    if (!m_pending.empty()) {
+      adoptPending(tree);
+    } else {
+      if (std::int64_t const n = missing(kFinest); n > 0) m_channel->appendTiles(kFinest, n);
+      fillNew(tree, kFinest);
+    }
     enterBlocks(tree);
     version.store(volume.version, std::memory_order_release);
+  }
+
+  bool hasPending() const override { return !m_pending.empty(); }
+  void listPending(Ostil::Array<int3>& corners) const override {
+    for (PendingTile const& tile : m_pending) corners.append(tile.corner);
+  }
+
+  /// Elements for the tile of a position, which neither the tree nor another write has made yet: with the
+  /// values that are read there.
+  /// @error std::out_of_range beyond the domain; what is thrown leaves all as it was.
+  void makePending(VolumeData& volume, int3 const& position) {
+    if (!VolumeShape::inDomain(position)) throwOutside(position);
+    TreeIndex const above = volume.deepestTile(position.x, position.y, position.z);
+    int3 const corner{position.x & ~3, position.y & ~3, position.z & ~3};
+    m_pending.push_back({corner, m_channel->newTile(), -1});
+    TileVector<T>& elements = m_pending.back().elements;
+    VLN::Internal::Rollback added([&] { m_pending.pop_back(); });
+    if (above.depth == kFinest || elements.size() < kTileElements)
+      throw std::logic_error("field \"" + name + "\": a tile holds no elements");
+    if (above.valid()) fillFromCoarse(*volume.tree, above, corner, elements);
+    blocks.insert(corner, elements.data());
+    added.dismiss();
+    volume.pending.store(true, std::memory_order_release);
   }
 
   void tilesRemoved(VolumeData& volume, TileRemovalList const& moves) override {
@@ -117,7 +146,8 @@ private:
     if (begin >= end) return;
     if (depth > 0) {
       auto const body = [&](std::int64_t b, std::int64_t e) {
-        for (auto n = b; n < e; ++n) fillFromParent(tree, n, depth);
+        for (auto n = b; n < e; ++n)
+          fillFromParent(tree, {n, depth}, (*m_tiles)[d][static_cast<std::size_t>(n)]);
       };
       if (end - begin < kFewTiles)
         body(begin, end);
@@ -126,12 +156,11 @@ private:
     }
     m_filled[d] = end;
   }
-  void fillFromParent(VolumeTree const& tree, std::int64_t n, int depth) {
-    auto const& made = tree.tile(n, depth);
+  void fillFromParent(VolumeTree const& tree, TreeIndex const& place, TileVector<T>& to) {
+    auto const& made = tree.tile(place);
     if (!made.valid() || made.isRoot()) return;
     TreeIndex const above = made.parentTreeIndex();
     TileVector<T> const& from = tile(above);
-    TileVector<T>& to = (*m_tiles)[static_cast<std::size_t>(depth)][static_cast<std::size_t>(n)];
     if (from.size() < kTileElements || to.size() < kTileElements) return;
     int3 const slot = tree.tile(above).childIJK(made);
     std::size_t const first = ConstTileData<T, 4, 0>::index(2 * slot.x, 2 * slot.y, 2 * slot.z);
@@ -141,6 +170,60 @@ private:
     if (same(0) && same(1) && same(4) && same(5) && same(16) && same(17) && same(20) && same(21)) return;
     for (std::size_t at = 0; at < kTileElements; ++at)
       to[at] = p[(at & 3) / 2 + (at >> 2 & 3) / 2 * 4 + (at >> 4) / 2 * 16];
+  }
+  /// The same for a tile with missing ones above it: from the tile `at`, the deepest there is.
+  void fillFromCoarse(VolumeTree const& tree, TreeIndex at, int3 const& corner, TileVector<T>& to) {
+    while (at.valid() && tile(at).size() < kTileElements) at = tree.tile(at).parentTreeIndex();
+    if (!at.valid()) return;
+    TileVector<T> const& from = tile(at);
+    // Samples above the deepest depth are two elements wide or wider.
+    auto const& above = tree.tile(at);
+    int3 const p[2] = {above.childDataIJK(corner), above.childDataIJK(corner + int3{2, 2, 2})};
+    for (std::size_t n = 0; n < kTileElements; ++n)
+      to[n] = from[static_cast<std::size_t>(
+          ConstTileData<T, 4, 0>::index(p[n >> 1 & 1].x, p[n >> 3 & 1].y, p[n >> 5].z))];
+  }
+
+  /// Tiles that a write made and the tree lacks, in the order of the writes.
+  struct PendingTile {
+    int3 corner;
+    TileVector<T> elements;
+    std::int64_t arrival; ///< place among the tiles that are being adopted
+  };
+  /// Makes the finest tiles of the tree that the channel lacks, pending ones by handing over their elements.
+  /// What is thrown leaves all as it was.
+  void adoptPending(VolumeTree const& tree) {
+    auto const first = static_cast<std::int64_t>(tiles()[static_cast<std::size_t>(kFinest)].size());
+    std::vector<TileVector<T>> arriving(static_cast<std::size_t>(tree.tileCount(kFinest) - first));
+    parallelFor(0, static_cast<std::int64_t>(m_pending.size()),
+                [&](std::int64_t begin, std::int64_t end) {
+                  auto const accessor = tree.tileAccessor();
+                  for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+                    int3 const& p = m_pending[n].corner;
+                    m_pending[n].arrival = accessor.treeIndex(p.x, p.y, p.z, kFinest, true).index - first;
+                  }
+                },
+                {.grain = 1024});
+    auto const swapAll = [&] {
+      for (PendingTile& tile : m_pending)
+        arriving[static_cast<std::size_t>(tile.arrival)].swap(tile.elements);
+    };
+    swapAll();
+    VLN::Internal::Rollback swapped(swapAll);
+    parallelFor(0, static_cast<std::int64_t>(arriving.size()),
+                [&](std::int64_t begin, std::int64_t end) {
+                  for (auto n = begin; n < end; ++n) {
+                    auto& elements = arriving[static_cast<std::size_t>(n)];
+                    if (!elements.empty()) continue;
+                    elements = m_channel->newTile();
+                    fillFromParent(tree, {first + n, kFinest}, elements);
+                  }
+                },
+                {.grain = kFewTiles});
+    m_channel->appendTiles(kFinest, arriving);
+    swapped.dismiss();
+    m_pending.clear();
+    m_filled[static_cast<std::size_t>(kFinest)] = tree.tileCount(kFinest);
   }
   /// Enters the finest tiles that the table lacks.
   void enterBlocks(VolumeTree const& tree) {
@@ -164,6 +247,7 @@ private:
   TileArrays<T>* m_tiles = nullptr; ///< of the channel, while it is exclusive
   DepthCounts m_filled{};           ///< tiles that hold what they should
   std::int64_t m_entered = 0;       ///< finest tiles in the table
+  std::deque<PendingTile> m_pending;
 };
 
 } // namespace Internal
@@ -197,34 +281,38 @@ template <class T> T const& Field<T>::background() const {
   return Internal::typed<T>(*m_slot).typed().defaultValue();
 }
 
-template <class T> void Field<T>::moveToRead(int i, int j, int k) const {
-  m_volume->sync(*m_slot);
+template <class T> void Field<T>::findBlock(int i, int j, int k) const {
   m_readEpoch = m_volume->epoch.load(std::memory_order_relaxed);
   m_writeEpoch = m_slot->exclusive.load(std::memory_order_relaxed) ? m_readEpoch : 0;
   m_at = {i & ~7, j & ~7, k & ~7};
   m_block = m_slot->blocks.find(i, j, k);
 }
 
+template <class T> void Field<T>::moveToRead(int i, int j, int k) const {
+  m_volume->sync(*m_slot);
+  findBlock(i, j, k);
+}
+
 template <class T> void Field<T>::moveToWrite(int i, int j, int k) {
   m_volume->prepareWrite(*m_slot);
-  moveToRead(i, j, k);
+  findBlock(i, j, k);
 }
 
 template <class T> T* Field<T>::make(int i, int j, int k) {
-  using Internal::FieldBlock, Internal::FieldBlocks;
-  m_volume->makeTile(*m_slot, i, j, k);
-  // A block that was there has the new tile.
-  if (m_block == FieldBlocks::noBlock() || !near(i, j, k, m_writeEpoch)) moveToWrite(i, j, k);
-  void* tile = m_block->tiles[FieldBlock::slot(i, j, k)];
-  if (!tile) throw std::logic_error("field \"" + m_slot->name + "\": a tile holds no elements");
-  return static_cast<T*>(tile);
+  // Another handle may have made the block.
+  if (m_block == Internal::FieldBlocks::noBlock()) findBlock(i, j, k);
+  if (!m_block->tile(i, j, k)) {
+    Internal::typed<T>(*m_slot).makePending(*m_volume, {i, j, k});
+    findBlock(i, j, k);
+  }
+  return static_cast<T*>(m_block->tile(i, j, k));
 }
 
 template <class T> T Field<T>::coarse(int i, int j, int k) const {
   using namespace Internal;
   moveToRead(i, j, k); // the tile may have been made through another handle
-  if (auto const* const tile = static_cast<T const*>(m_block->tiles[FieldBlock::slot(i, j, k)]))
-    return tile[FieldBlock::element(i, j, k)];
+  auto const place = FieldBlock::place(i, j, k);
+  if (auto const* const tile = static_cast<T const*>(m_block->tile(place))) return tile[place.element()];
   auto& slot = typed<T>(*m_slot);
   auto const accessor = std::as_const(*m_volume->tree).tileAccessor();
   TreeIndex at = accessor.treeIndex(i, j, k, kFinest, false);
@@ -251,8 +339,8 @@ template <class T> void Field<T>::set(std::span<int3 const> positions, std::span
     auto const begin = static_cast<std::size_t>(run.begin), count = static_cast<std::size_t>(run.count);
     for (std::size_t n = begin; n < begin + count; ++n) {
       int3 const& p = positions[n];
-      auto* const tile = static_cast<T*>(run.block->tiles[FieldBlock::slot(p.x, p.y, p.z)]);
-      tile[FieldBlock::element(p.x, p.y, p.z)] = values[n];
+      auto const at = FieldBlock::place(p.x, p.y, p.z);
+      static_cast<T*>(run.block->tile(at))[at.element()] = values[n];
     }
   };
   parallelFor(0, static_cast<std::int64_t>(plan.shares), [&](std::int64_t begin, std::int64_t end) {
@@ -270,6 +358,7 @@ template <class T> void Field<T>::fill(T const& value) {
 
 template <class T> void const* Field<T>::sampler() const {
   if constexpr (std::is_same_v<T, float>) {
+    m_volume->syncTree();
     auto const epoch = m_volume->epoch.load(std::memory_order_relaxed);
     if (m_slot->written.load(std::memory_order_acquire)) {
       std::lock_guard const lock(m_volume->mutex);

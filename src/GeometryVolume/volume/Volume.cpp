@@ -114,10 +114,11 @@ std::vector<std::string> Volume::fieldNames() const {
 
 void Volume::removeField(std::string const& name) {
   FieldSlot const& slot = findSlot(name);
+  m_data->syncTree(); // its tiles stay
   std::erase_if(m_data->slots, [&](auto const& s) { return s.get() == &slot; });
 }
 
-std::int64_t Volume::tileCount() const { return m_data->tree->tileCount(-1); }
+std::int64_t Volume::tileCount() const { return tree().tileCount(-1); }
 
 Volume::Topology const& Volume::topology() const {
   m_data->sync();
@@ -141,6 +142,7 @@ void Volume::addTiles(int3 const& low, int3 const& high) {
 void Volume::refineWhere(int3 const& low, int3 const& high, FunctionRef<bool(TileBox const&)> predicate,
                          int depth) {
   depth = std::min(depth, kFinest);
+  m_data->syncTree();
   int const root = m_data->rootDepth();
   Tree::TileLists lists;
   std::vector<int3> frontier;
@@ -184,7 +186,7 @@ void Volume::refineWhere(int3 const& low, int3 const& high, FunctionRef<bool(Til
 }
 
 std::int64_t Volume::removeWhere(FunctionRef<bool(TileBox const&)> predicate) {
-  Tree const& tree = *m_data->tree;
+  Tree const& tree = this->tree();
   TileIndexLists lists(static_cast<std::size_t>(Shape::kDepths));
   auto& finest = lists[static_cast<std::size_t>(kFinest)];
   finest = parallelReduce(

@@ -95,9 +95,12 @@ public:
   /// @error std::invalid_argument for a name without points.
   std::vector<float3> points(std::string const& name) const;
 
-  // The parts, in step
+  // The parts, in step when they are asked for: ask again after Field::set().
   float voxelSize() const { return m_data->tree->voxelSize(); }
-  Tree const& tree() const { return *m_data->tree; }
+  Tree const& tree() const {
+    m_data->syncTree();
+    return *m_data->tree;
+  }
   Topology const& topology() const;
   /// Everything as one object, for the rest of the library. It keeps what it has: a volume that is written
   /// afterwards separates.

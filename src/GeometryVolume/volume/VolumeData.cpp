@@ -5,6 +5,7 @@
 
 #include <stdexcept>
 #include <string>
+#include <utility>
 
 namespace VLN::TileTree3D::Internal {
 
@@ -14,6 +15,12 @@ namespace {
 /// wide that a small volume needs many tiles above it.
 constexpr int kRootDepth = VolumeShape::kMaxDepth - 10;
 static_assert(VolumeShape::width(kRootDepth) == 4096);
+
+constexpr int kFinest = VolumeShape::kMaxDepth;
+/// Fewer pending tiles are added one by one, also where the tree holds this many times as many: adding in
+/// bulk looks at every tile.
+constexpr std::uint64_t kFewTiles = 256;
+constexpr std::uint64_t kBulkShare = 64;
 
 } // namespace
 
@@ -71,25 +78,54 @@ void VolumeData::updateRest(TileRemovalList const* removed) {
 }
 
 void VolumeData::sync() {
-  if (syncedVersion.load(std::memory_order_acquire) == version) return;
+  if (!hasPending() && syncedVersion.load(std::memory_order_acquire) == version) return;
   std::lock_guard const lock(mutex);
+  flushLocked();
   updateTopology();
   for (auto& slot : slots)
-    if (slot->version.load(std::memory_order_relaxed) != version) slot->follow(*this, 0);
+    if (slot->version.load(std::memory_order_relaxed) != version) slot->follow(*this);
   updateRest(nullptr);
   syncedVersion.store(version, std::memory_order_release);
 }
 
 void VolumeData::follow(FieldSlot& slot) {
   std::lock_guard const lock(mutex);
-  if (slot.version.load(std::memory_order_relaxed) != version) slot.follow(*this, 0);
+  flushLocked();
+  if (slot.version.load(std::memory_order_relaxed) != version) slot.follow(*this);
+}
+
+void VolumeData::flush() {
+  std::lock_guard const lock(mutex);
+  flushLocked();
+}
+
+void VolumeData::flushLocked() {
+  if (!hasPending()) return;
+  VolumeTree::TileLists lists;
+  auto& finest = lists[static_cast<std::size_t>(kFinest)];
+  for (auto const& slot : slots) slot->listPending(finest);
+  VolumeTree& edited = editTree();
+  epoch.fetch_add(1, std::memory_order_relaxed);
+  ++version;
+  if (finest.size() <= kFewTiles || finest.size() * kBulkShare <= std::uint64_t(edited.tileCount(-1))) {
+    for (int3 const& p : finest) {
+      if (m_accessor.addTileBelow(p.x, p.y, p.z, kFinest) >= 0) continue;
+      m_accessor.addTile(p, rootDepth());
+      m_accessor.addTile(p, kFinest);
+    }
+  } else {
+    addTiles(edited, lists);
+  }
+  for (auto& slot : slots)
+    if (slot->hasPending()) slot->follow(*this);
+  pending.store(false, std::memory_order_release);
 }
 
 void VolumeData::prepareWrite(FieldSlot& slot) {
-  sync(slot);
+  if (slot.version.load(std::memory_order_acquire) != version) follow(slot);
   if (!slot.exclusive.load(std::memory_order_relaxed)) {
     slot.detach(*this);
-    sync(slot);
+    if (slot.version.load(std::memory_order_relaxed) != version) follow(slot);
   }
 }
 
@@ -108,20 +144,13 @@ int VolumeData::rootDepth() const {
   return kRootDepth;
 }
 
-void VolumeData::makeTile(FieldSlot& slot, int i, int j, int k) {
-  if (!VolumeShape::inDomain(i, j, k)) throwOutside({i, j, k});
-  prepareWrite(slot);
-  editTree();
-  constexpr int kFinest = VolumeShape::kMaxDepth;
-  TreeIndex const above = m_accessor.treeIndex(i, j, k, kFinest, false);
-  if (above.depth == kFinest) return;
-  // Fields that share elements with another volume will leave them when they follow.
-  if (slots.size() > 1) epoch.fetch_add(1, std::memory_order_relaxed);
-  ++version;
-  int const first = above.valid() ? above.depth + 1 : rootDepth();
-  if (!above.valid()) m_accessor.addTile(i, j, k, first);
-  m_accessor.addTile(i, j, k, kFinest);
-  slot.follow(*this, first);
+TreeIndex VolumeData::deepestTile(int i, int j, int k) {
+  if (tree->tileCount(-1) == 0) return {};
+  if (m_readerTree != tree.get()) {
+    m_reader = std::as_const(*tree).tileAccessor();
+    m_readerTree = tree.get();
+  }
+  return m_reader.treeIndex(i, j, k, kFinest, false);
 }
 
 void VolumeData::growTree(FunctionRef<void(VolumeTree&)> change) {
@@ -130,23 +159,26 @@ void VolumeData::growTree(FunctionRef<void(VolumeTree&)> change) {
   epoch.fetch_add(1, std::memory_order_relaxed);
   ++version;
   change(edited);
+  m_accessorTree = m_readerTree = nullptr;
 }
 
 void VolumeData::makeTiles(VolumeTree::TileLists& lists) {
-  growTree([&](VolumeTree& edited) {
-    int const root = rootDepth();
-    auto& roots = lists[static_cast<std::size_t>(root)];
-    int3 last{0, 0, 0};
-    bool any = false;
-    for (int d = root + 1; d <= VolumeShape::kMaxDepth; ++d)
-      for (int3 const& p : lists[static_cast<std::size_t>(d)]) {
-        int3 const corner{VolumeShape::align(p.x, root), VolumeShape::align(p.y, root),
-                          VolumeShape::align(p.z, root)};
-        if (!any || corner != last) roots.append(corner);
-        any = true, last = corner;
-      }
-    edited.tileAccessor().addTiles(lists);
-  });
+  growTree([&](VolumeTree& edited) { addTiles(edited, lists); });
+}
+
+void VolumeData::addTiles(VolumeTree& edited, VolumeTree::TileLists& lists) {
+  int const root = rootDepth();
+  auto& roots = lists[static_cast<std::size_t>(root)];
+  int3 last{0, 0, 0};
+  bool any = false;
+  for (int d = root + 1; d <= kFinest; ++d)
+    for (int3 const& p : lists[static_cast<std::size_t>(d)]) {
+      int3 const corner{VolumeShape::align(p.x, root), VolumeShape::align(p.y, root),
+                        VolumeShape::align(p.z, root)};
+      if (!any || corner != last) roots.append(corner);
+      any = true, last = corner;
+    }
+  edited.tileAccessor().addTiles(lists);
 }
 
 void VolumeData::removeTiles(TileIndexLists const& lists) {
@@ -154,7 +186,7 @@ void VolumeData::removeTiles(TileIndexLists const& lists) {
   editTree();
   TileMoves moves;
   m_accessor.removeTiles(lists, true, &moves);
-  m_accessorTree = nullptr;
+  m_accessorTree = m_readerTree = nullptr;
   ++version;
   epoch.fetch_add(1, std::memory_order_relaxed);
   updateTopology();

@@ -7,9 +7,48 @@
 #include "GeometryVolume/pools/TileDataAllocator.h"
 
 #include <cstddef>
+#include <iterator>
 #include <stdexcept>
 
 namespace VLN::TileTree3D::Internal {
+
+/// Counts elements that nobody writes. A vector made from such a range is made by no loop at all.
+class UnwrittenElements {
+public:
+  using iterator_category = std::random_access_iterator_tag;
+  using value_type = Unwritten;
+  using difference_type = std::ptrdiff_t;
+  using pointer = void;
+  using reference = Unwritten;
+
+  explicit UnwrittenElements(std::ptrdiff_t at)
+      : m_at(at) {}
+  Unwritten operator*() const { return {}; }
+  UnwrittenElements& operator++() {
+    ++m_at;
+    return *this;
+  }
+  std::ptrdiff_t operator-(UnwrittenElements const& other) const { return m_at - other.m_at; }
+  bool operator==(UnwrittenElements const&) const = default;
+
+private:
+  std::ptrdiff_t m_at;
+};
+
+/// A vector of `n` elements on an allocator, not written.
+template <class T> TileVector<T> unwrittenVector(std::int64_t n, TileDataAllocator<T> const& allocator) {
+  return TileVector<T>(UnwrittenElements(0), UnwrittenElements(static_cast<std::ptrdiff_t>(n)), allocator);
+}
+
+/// Sets a run of elements, of which `value` may be one.
+template <class T> void fillRun(T* p, std::int64_t n, T const& value) {
+  // Blocks of a known length become stores of whole registers.
+  constexpr std::int64_t kBlock = sizeof(T) < 64 ? 64 / sizeof(T) : 1;
+  T const v = value;
+  for (; n >= kBlock; n -= kBlock, p += kBlock)
+    for (std::int64_t i = 0; i < kBlock; ++i) p[i] = v;
+  for (; n > 0; --n) *p++ = v;
+}
 
 /// Whether a vector on this allocator can take `capacity` further elements without leaving its block.
 template <class T> bool hasRoom(TileDataAllocator<T> const& a, std::size_t capacity) {

@@ -9,6 +9,7 @@
 #pragma once
 
 #include "GeometryVolume/core/Export.h"
+#include "GeometryVolume/core/detail/Atomic.h"
 #include "Velorn/Math.h"
 
 #include <array>
@@ -22,16 +23,32 @@ namespace VLN::TileTree3D::Internal {
 using Velorn::Math::int3;
 
 /// Tiles as slots of their parent, i fastest. A block stays where it is for as long as its table lives.
+/// @threads A reader may look for a tile while another thread enters it.
 struct alignas(64) FieldBlock {
   static constexpr int kWidth = 8;
-  std::array<void*, 8> tiles{};
+  std::array<VLN::Internal::Atomic<void*>, 8> tiles{};
 
-  static std::size_t slot(int i, int j, int k) {
-    return static_cast<std::size_t>((i >> 2 & 1) | (j >> 1 & 2) | (k & 4));
+  /// Where a sample lies: slot and element, from a table for each axis, which is half the arithmetic.
+  struct Place {
+    unsigned code;
+    unsigned slot() const { return code >> 6; }
+    unsigned element() const { return code & 63; }
+  };
+  static Place place(int i, int j, int k) {
+    return {unsigned(kPlaces[0][i & 7]) + kPlaces[1][j & 7] + kPlaces[2][k & 7]};
   }
-  static std::size_t element(int i, int j, int k) {
-    return static_cast<std::size_t>((i & 3) | (j & 3) << 2 | (k & 3) << 4);
-  }
+  /// The tile that holds a sample, or null.
+  void* tile(Place at) const { return tiles[at.slot()].loadAcquire(); }
+  void* tile(int i, int j, int k) const { return tile(place(i, j, k)); }
+
+private:
+  static constexpr auto kPlaces = [] {
+    std::array<std::array<std::uint16_t, 8>, 3> all{};
+    for (unsigned axis = 0; axis < 3; ++axis)
+      for (unsigned c = 0; c < 8; ++c)
+        all[axis][c] = static_cast<std::uint16_t>((c >> 2) << (6 + axis) | (c & 3) << (2 * axis));
+    return all;
+  }();
 };
 
 /// @threads As a container of the standard library.
@@ -46,7 +63,7 @@ public:
     }
   }
   /// The elements of the tile at a position, or null.
-  void* tile(int i, int j, int k) const { return find(i, j, k)->tiles[FieldBlock::slot(i, j, k)]; }
+  void* tile(int i, int j, int k) const { return find(i, j, k)->tile(i, j, k); }
   /// Enters the tile at a position.
   void insert(int3 const& corner, void* elements);
   void clear();

@@ -1,10 +1,12 @@
 // What a volume holds, and what its fields share. For Volume and Field alone.
 //
-// The tree grows at a write; everything else follows at the first access that needs it:
+// A write makes elements at once, and tiles later: the tree grows when it is next asked for, by all new tiles
+// together, and everything else follows where it is needed.
 //
-//   Field a: set() -- makes tiles --> tree, version n+1
-//                  -- follows ------> a, version n+1
-//                                     topology, b, c: still at n; they follow when they are asked for
+//   Field a: set() -- makes elements --> a holds pending tiles
+//   tree(), sample(), a.get() far off -- flush() --> tree, version n+1
+//                                          |------> a, version n+1: pending tiles become the channel's
+//                                          '------> topology, b, c: still at n; they follow when asked for
 //
 // What a handle remembers of a field holds as long as the epoch stays: it rises when elements move in memory,
 // and when they begin to be shared.
@@ -38,8 +40,11 @@ struct VLN_API FieldSlot {
   virtual std::unique_ptr<FieldSlot> share() const = 0;
   /// Takes in the tiles that are new in the tree, with the values that were read there before, and completes
   /// `blocks`. The caller holds the lock or is the only user of the volume.
-  /// @param firstDepth Above it no tile is new to the field.
-  virtual void follow(VolumeData& volume, int firstDepth) = 0;
+  /// @pre The tree has all pending tiles.
+  virtual void follow(VolumeData& volume) = 0;
+  virtual bool hasPending() const = 0;
+  /// Appends the corners of tiles that have elements, but are not in the tree yet.
+  virtual void listPending(Ostil::Array<int3>& corners) const = 0;
   /// Makes the channel and its elements the volume's alone.
   virtual void detach(VolumeData& volume) = 0;
   virtual void tilesRemoved(VolumeData& volume, TileRemovalList const& moves) = 0;
@@ -66,15 +71,20 @@ struct VLN_API VolumeData {
   void sync();
   /// Brings one field into step.
   void sync(FieldSlot& slot) {
-    if (slot.version.load(std::memory_order_acquire) != version) follow(slot);
+    if (hasPending() || slot.version.load(std::memory_order_acquire) != version) follow(slot);
   }
-  /// Before elements are written.
+  /// Brings the tree into step.
+  void syncTree() {
+    if (hasPending()) flush();
+  }
+  /// Whether fields hold tiles that the tree lacks. While they do, `version` is nobody's but the lock's.
+  bool hasPending() const { return pending.load(std::memory_order_acquire); }
+  /// Before elements are written. Pending tiles stay.
   void prepareWrite(FieldSlot& slot);
   /// Tells that elements of the field were or may be written.
   void valuesChanged(FieldSlot& slot) { slot.written.store(true, std::memory_order_relaxed); }
-  /// Makes the finest tile at a position, where there is none, and lets the field follow.
-  /// @error std::out_of_range beyond the domain.
-  void makeTile(FieldSlot& slot, int i, int j, int k);
+  /// The deepest tile of the tree that holds a position. Pending ones are not looked at.
+  TreeIndex deepestTile(int i, int j, int k);
   /// Makes the finest tiles of many positions, and roots above them.
   void makeTiles(VolumeTree::TileLists& lists);
   /// Lets `change` grow the tree.
@@ -94,18 +104,27 @@ struct VLN_API VolumeData {
   std::vector<std::unique_ptr<FieldSlot>> slots;
   std::uint64_t version = 1; ///< of the tree
   std::uint64_t topologyVersion = 0, restVersion = 0;
+  std::atomic<bool> pending{false};
   std::atomic<std::uint64_t> syncedVersion{0};
   std::atomic<std::uint64_t> epoch{1};
   std::mutex mutex;
 
 private:
   void follow(FieldSlot& slot);
+  void flush();
+  /// The caller holds the lock.
+  void flushLocked();
   void updateRest(TileRemovalList const* removed);
 
   VolumeTree& editTree();
+  /// Adds tiles of the deepest depth and of the depths below the roots', and the roots above them.
+  void addTiles(VolumeTree& edited, VolumeTree::TileLists& lists);
 
+  // Cursors that survive growth.
   VolumeTree::TileAccessor m_accessor;
+  VolumeTree::ConstTileAccessor m_reader;
   VolumeTree const* m_accessorTree = nullptr;
+  VolumeTree const* m_readerTree = nullptr;
 };
 
 /// @error std::out_of_range, always.
