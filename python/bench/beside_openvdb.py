@@ -34,7 +34,11 @@ def measure(ours, theirs, runs=RUNS):
 
 def rows_for(path):
     ours = vln.open(path)
-    name = ours.names[0]
+    # Numbers of one component are compared: OpenVDB's module has no dense vectors beside them in scipy.
+    name = next((n for n in ours.names if ours[n].dtype == np.float32 and np.ndim(ours[n].background) == 0), None)
+    if name is None:
+        print(f"beside_openvdb.py: {path} holds no grid of floats, and is left out", file=sys.stderr)
+        return
     theirs = pyopenvdb.read(path, name)
     channel = ours[name]
     low, high = channel.box
@@ -111,4 +115,6 @@ def main(paths):
 
 
 if __name__ == "__main__":
+    if len(sys.argv) < 2:
+        sys.exit("usage: beside_openvdb.py FILE.vdb...")
     main(sys.argv[1:])

@@ -34,11 +34,12 @@ public:
   /// @cost In the block of the read before: one test, and two loads. In another with a tile of the deepest
   /// depth: one load more. Elsewhere a lookup in the tree.
   value_type const& value(int i, int j, int k) const {
-    Internal::FinestSample const at = m_blocks.find(i, j, k);
-    if (!at.elements) [[unlikely]]
+    using Tile = typename ChannelT::ConstTile;
+    value_type const* const sample =
+        m_blocks.template element<value_type, Tile::kWidth, Tile::index(0, 0, 0)>(i, j, k);
+    if (!sample) [[unlikely]]
       return coarse(i, j, k);
-    constexpr std::size_t w = ChannelT::ConstTile::kWidth;
-    return static_cast<value_type const*>(at.elements)[kFirst + at.i + w * (at.j + w * at.k)];
+    return *sample;
   }
   value_type const& value(int3 const& p) const { return value(p.x, p.y, p.z); }
 
@@ -46,8 +47,6 @@ public:
   std::uint64_t memUsage() const { return m_tables->memUsage(); }
 
 private:
-  static constexpr std::size_t kFirst = ChannelT::ConstTile::index(0, 0, 0);
-
   /// Null for a tile that the channel lacks, or that has fewer elements than a whole one.
   static value_type const* elements(ChannelT const& channel, TreeIndex const& at) {
     if (!channel.tileArrays() || at.depth < channel.minDepth() || at.depth > channel.depth()) return nullptr;

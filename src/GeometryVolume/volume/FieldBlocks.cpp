@@ -7,7 +7,7 @@ FieldBlock* FieldBlocks::noBlock() {
   return &none;
 }
 
-void FieldBlocks::insert(int3 const& corner, void* elements) {
+FieldBlock::Entry& FieldBlocks::entry(int3 const& corner) {
   if (2 * (m_used + 1) > m_slots.size()) resize(2 * m_slots.size());
   int3 const at{corner.x >> 3, corner.y >> 3, corner.z >> 3};
   std::size_t n = hash(at) & m_mask;
@@ -21,7 +21,7 @@ void FieldBlocks::insert(int3 const& corner, void* elements) {
     slot = {at, &m_chunks.back()[kChunk - m_left--]};
     ++m_used;
   }
-  slot.block->tiles[FieldBlock::place(corner.x, corner.y, corner.z).slot()].storeRelease(elements);
+  return slot.block->tiles[FieldBlock::place(corner.x, corner.y, corner.z).slot()];
 }
 
 void FieldBlocks::clear() { *this = FieldBlocks(); }

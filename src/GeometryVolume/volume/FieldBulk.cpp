@@ -63,7 +63,7 @@ Chunk findRuns(FieldBlocks const& blocks, std::span<int3 const> positions, std::
     if (block->tile(place)) continue;
     if (!listedBlock) listedBlock = listed.find(p.x, p.y, p.z);
     if (listedBlock->tile(place)) continue;
-    listed.insert(p, &out);
+    listed.entry(p).storeRelaxed(&out);
     listedBlock = listed.find(p.x, p.y, p.z);
     out.missing.push_back(tile);
   }
@@ -74,7 +74,6 @@ Chunk findRuns(FieldBlocks const& blocks, std::span<int3 const> positions, std::
 } // namespace
 
 BulkRuns planBulk(VolumeData& volume, FieldSlot& slot, std::span<int3 const> positions) {
-  volume.sync();
   volume.prepareWrite(slot);
   auto const n = static_cast<std::int64_t>(positions.size());
   std::int64_t const grain = std::clamp<std::int64_t>(n / 16, 16384, 1 << 20);
@@ -97,15 +96,13 @@ BulkRuns planBulk(VolumeData& volume, FieldSlot& slot, std::span<int3 const> pos
       found[c] = findRuns(slot.blocks, positions, begin, std::min(n, begin + grain), out.shares,
                           &out.lists[c * out.shares]);
     });
-    VolumeTree::TileLists lists;
-    auto& finest = lists[static_cast<std::size_t>(VolumeShape::kMaxDepth)];
+    std::vector<int3> missing;
     for (auto c = static_cast<std::size_t>(first); c < static_cast<std::size_t>(last); ++c) {
       if (found[c].outside >= 0) throwOutside(positions[static_cast<std::size_t>(found[c].outside)]);
-      for (int3 const& p : found[c].missing) finest.append(p);
+      missing.insert(missing.end(), found[c].missing.begin(), found[c].missing.end());
     }
-    if (finest.size() == 0) continue;
-    volume.makeTiles(lists);
-    volume.prepareWrite(slot);
+    if (missing.empty()) continue;
+    slot.makePending(volume, missing);
     // Blocks that were there have their new tiles; the others are looked up again.
     forEachChunk([&](std::size_t c) {
       for (std::size_t list = c * out.shares; list < (c + 1) * out.shares; ++list)

@@ -84,20 +84,35 @@ template <class T> struct TypedSlot final : FieldSlot {
     for (PendingTile const& tile : m_pending) corners.append(tile.corner);
   }
 
-  /// Elements for the tile of a position, which neither the tree nor another write has made yet: with the
-  /// values that are read there.
-  /// @error std::out_of_range beyond the domain; what is thrown leaves all as it was.
-  void makePending(VolumeData& volume, int3 const& position) {
-    if (!VolumeShape::inDomain(position)) throwOutside(position);
-    TreeIndex const above = volume.deepestTile(position.x, position.y, position.z);
-    int3 const corner{position.x & ~3, position.y & ~3, position.z & ~3};
-    m_pending.push_back({corner, m_channel->newTile(), -1});
-    TileVector<T>& elements = m_pending.back().elements;
-    VLN::Internal::Rollback added([&] { m_pending.pop_back(); });
-    if (above.depth == kFinest || elements.size() < kTileElements)
-      throw std::logic_error("field \"" + name + "\": a tile holds no elements");
-    if (above.valid()) fillFromCoarse(*volume.tree, above, corner, elements);
-    blocks.insert(corner, elements.data());
+  void makePending(VolumeData& volume, std::span<int3 const> corners) override {
+    std::size_t const first = m_pending.size();
+    VLN::Internal::Rollback added([&] {
+      for (; m_pending.size() > first; m_pending.pop_back()) m_pending.back().entry->storeRelaxed(nullptr);
+    });
+    bool const few = corners.size() < static_cast<std::size_t>(kFewTiles);
+    if (!few) blocks.reserve(static_cast<std::int64_t>(corners.size()));
+    for (int3 const& corner : corners) {
+      auto& entry = blocks.entry(corner);
+      if (entry.loadRelaxed()) continue;
+      m_pending.push_back({corner, &entry, TileVector<T>(), -1});
+      entry.storeRelaxed(this); // so that it is listed once
+    }
+    auto const deepest = [&](VolumeTree::ConstTileAccessor const& accessor, int3 const& p) {
+      return accessor.treeIndex(p.x, p.y, p.z, kFinest, false);
+    };
+    VolumeTree const& tree = *volume.tree;
+    auto const body = [&](VolumeTree::ConstTileAccessor const& accessor, std::int64_t begin,
+                          std::int64_t end) {
+      bool const grown = tree.tileCount(-1) > 0;
+      for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n)
+        makeElements(tree, m_pending[n], grown ? deepest(accessor, m_pending[n].corner) : TreeIndex());
+    };
+    auto const begin = static_cast<std::int64_t>(first), end = static_cast<std::int64_t>(m_pending.size());
+    if (few)
+      body(volume.reader(), begin, end);
+    else
+      parallelFor(begin, end, [&](std::int64_t b, std::int64_t e) { body(tree.tileAccessor(), b, e); },
+                  {.grain = kFewTiles});
     added.dismiss();
     volume.pending.store(true, std::memory_order_release);
   }
@@ -187,9 +202,18 @@ private:
   /// Tiles that a write made and the tree lacks, in the order of the writes.
   struct PendingTile {
     int3 corner;
+    FieldBlock::Entry* entry; ///< of the table
     TileVector<T> elements;
     std::int64_t arrival; ///< place among the tiles that are being adopted
   };
+  /// @param above The deepest tile of the tree there.
+  void makeElements(VolumeTree const& tree, PendingTile& made, TreeIndex const& above) {
+    made.elements = m_channel->newTile();
+    if (above.depth == kFinest || made.elements.size() < kTileElements)
+      throw std::logic_error("field \"" + name + "\": a tile holds no elements");
+    if (above.valid()) fillFromCoarse(tree, above, made.corner, made.elements);
+    made.entry->storeRelease(made.elements.data());
+  }
   /// Makes the finest tiles of the tree that the channel lacks, pending ones by handing over their elements.
   /// What is thrown leaves all as it was.
   void adoptPending(VolumeTree const& tree) {
@@ -238,7 +262,7 @@ private:
       auto const& at = tree.tile(m_entered, kFinest);
       TileVector<T> const& elements = finest[static_cast<std::size_t>(m_entered)];
       if (at.valid() && elements.size() >= kTileElements)
-        blocks.insert(at.tijk(), const_cast<T*>(elements.data()));
+        blocks.entry(at.tijk()).storeRelease(const_cast<T*>(elements.data()));
     }
     blocksBuilt = true;
   }
@@ -302,7 +326,10 @@ template <class T> T* Field<T>::make(int i, int j, int k) {
   // Another handle may have made the block.
   if (m_block == Internal::FieldBlocks::noBlock()) findBlock(i, j, k);
   if (!m_block->tile(i, j, k)) {
-    Internal::typed<T>(*m_slot).makePending(*m_volume, {i, j, k});
+    int3 const p{i, j, k};
+    if (!Internal::VolumeShape::inDomain(p)) Internal::throwOutside(p);
+    int3 const corner{i & ~3, j & ~3, k & ~3};
+    Internal::typed<T>(*m_slot).makePending(*m_volume, {&corner, 1});
     findBlock(i, j, k);
   }
   return static_cast<T*>(m_block->tile(i, j, k));

@@ -144,13 +144,12 @@ int VolumeData::rootDepth() const {
   return kRootDepth;
 }
 
-TreeIndex VolumeData::deepestTile(int i, int j, int k) {
-  if (tree->tileCount(-1) == 0) return {};
+VolumeTree::ConstTileAccessor const& VolumeData::reader() {
   if (m_readerTree != tree.get()) {
     m_reader = std::as_const(*tree).tileAccessor();
     m_readerTree = tree.get();
   }
-  return m_reader.treeIndex(i, j, k, kFinest, false);
+  return m_reader;
 }
 
 void VolumeData::growTree(FunctionRef<void(VolumeTree&)> change) {

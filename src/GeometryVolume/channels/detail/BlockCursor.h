@@ -1,6 +1,7 @@
 // BlockCursor: the last block of ReadTables that was read from.
 #pragma once
 
+#include "GeometryVolume/channels/detail/BlockPlaces.h"
 #include "GeometryVolume/channels/detail/ReadTables.h"
 
 namespace VLN::TileTree3D::Internal {
@@ -32,6 +33,16 @@ public:
     // Sums of whole tile widths before the division: powers of two need one shift then.
     return {m_block->tiles[((x - x % w) + slots * ((y - y % w) + slots * (z - z % w))) / w], x % w, y % w,
             z % w};
+  }
+
+  /// The same for tiles whose elements lie kWidth in a row from element kFirst on.
+  /// @return The element itself; null where there is no such tile.
+  template <class T, int kWidth, int kFirst> T const* element(int i, int j, int k) {
+    seek(i, j, k);
+    auto const at = BlockPlaces<TraitsT::kTW, TraitsT::kTDW, kWidth, kFirst>::find(
+        within(i, m_corner.x), within(j, m_corner.y), within(k, m_corner.z));
+    auto const* const tile = static_cast<T const*>(m_block->tiles[at.slot()]);
+    return tile ? tile + at.element() : nullptr;
   }
 
   /// Moves to the block of a point.

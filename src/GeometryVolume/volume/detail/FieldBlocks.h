@@ -8,6 +8,7 @@
 // Unlike the tables of a ChannelReader these grow with the field, a tile at a time.
 #pragma once
 
+#include "GeometryVolume/channels/detail/BlockPlaces.h"
 #include "GeometryVolume/core/Export.h"
 #include "GeometryVolume/core/detail/Atomic.h"
 #include "Velorn/Math.h"
@@ -26,29 +27,17 @@ using Velorn::Math::int3;
 /// @threads A reader may look for a tile while another thread enters it.
 struct alignas(64) FieldBlock {
   static constexpr int kWidth = 8;
-  std::array<VLN::Internal::Atomic<void*>, 8> tiles{};
+  using Entry = VLN::Internal::Atomic<void*>;
+  std::array<Entry, 8> tiles{};
 
-  /// Where a sample lies: slot and element, from a table for each axis, which is half the arithmetic.
-  struct Place {
-    unsigned code;
-    unsigned slot() const { return code >> 6; }
-    unsigned element() const { return code & 63; }
-  };
+  using Places = BlockPlaces<2, 4, 4, 0>;
+  using Place = Places::Place;
   static Place place(int i, int j, int k) {
-    return {unsigned(kPlaces[0][i & 7]) + kPlaces[1][j & 7] + kPlaces[2][k & 7]};
+    return Places::find(std::uint32_t(i) % kWidth, std::uint32_t(j) % kWidth, std::uint32_t(k) % kWidth);
   }
   /// The tile that holds a sample, or null.
   void* tile(Place at) const { return tiles[at.slot()].loadAcquire(); }
   void* tile(int i, int j, int k) const { return tile(place(i, j, k)); }
-
-private:
-  static constexpr auto kPlaces = [] {
-    std::array<std::array<std::uint16_t, 8>, 3> all{};
-    for (unsigned axis = 0; axis < 3; ++axis)
-      for (unsigned c = 0; c < 8; ++c)
-        all[axis][c] = static_cast<std::uint16_t>((c >> 2) << (6 + axis) | (c & 3) << (2 * axis));
-    return all;
-  }();
 };
 
 /// @threads As a container of the standard library.
@@ -64,10 +53,10 @@ public:
   }
   /// The elements of the tile at a position, or null.
   void* tile(int i, int j, int k) const { return find(i, j, k)->tile(i, j, k); }
-  /// Enters the tile at a position.
-  void insert(int3 const& corner, void* elements);
+  /// The tile at a position, to be entered. It stays where it is.
+  FieldBlock::Entry& entry(int3 const& corner);
   void clear();
-  /// Makes room, so that the next inserts of `tiles` tiles in a row move no slots.
+  /// Makes room, so that entering `tiles` tiles moves no slots.
   void reserve(std::int64_t tiles);
   /// A block without tiles, the same for all tables. Nothing writes it.
   static FieldBlock* noBlock();

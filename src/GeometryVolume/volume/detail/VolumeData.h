@@ -22,6 +22,7 @@
 #include <cstdint>
 #include <memory>
 #include <mutex>
+#include <span>
 #include <vector>
 
 namespace VLN::TileTree3D::Internal {
@@ -43,6 +44,12 @@ struct VLN_API FieldSlot {
   /// @pre The tree has all pending tiles.
   virtual void follow(VolumeData& volume) = 0;
   virtual bool hasPending() const = 0;
+  /// Makes elements for tiles that neither the tree nor another write has made yet, with the values that are
+  /// read there. In parallel.
+  /// @param corners In the domain; some may come more than once, or have elements.
+  /// @pre The slot is in step and exclusive.
+  /// @error What is thrown leaves all as it was.
+  virtual void makePending(VolumeData& volume, std::span<int3 const> corners) = 0;
   /// Appends the corners of tiles that have elements, but are not in the tree yet.
   virtual void listPending(Ostil::Array<int3>& corners) const = 0;
   /// Makes the channel and its elements the volume's alone.
@@ -83,8 +90,8 @@ struct VLN_API VolumeData {
   void prepareWrite(FieldSlot& slot);
   /// Tells that elements of the field were or may be written.
   void valuesChanged(FieldSlot& slot) { slot.written.store(true, std::memory_order_relaxed); }
-  /// The deepest tile of the tree that holds a position. Pending ones are not looked at.
-  TreeIndex deepestTile(int i, int j, int k);
+  /// A cursor on the tree for whoever writes.
+  VolumeTree::ConstTileAccessor const& reader();
   /// Makes the finest tiles of many positions, and roots above them.
   void makeTiles(VolumeTree::TileLists& lists);
   /// Lets `change` grow the tree.
