@@ -13,15 +13,20 @@ FieldBlock::Entry& FieldBlocks::entry(int3 const& corner) {
   std::size_t n = hash(at) & m_mask;
   while (m_slots[n].block && m_slots[n].at != at) n = (n + 1) & m_mask;
   Slot& slot = m_slots[n];
+  FieldBlock& block = slot.block ? *slot.block : newBlock();
   if (!slot.block) {
-    if (m_left == 0) {
-      m_chunks.push_back(std::make_unique<FieldBlock[]>(kChunk));
-      m_left = kChunk;
-    }
-    slot = {at, &m_chunks.back()[kChunk - m_left--]};
+    slot = {at, &block};
     ++m_used;
   }
-  return slot.block->tiles[FieldBlock::place(corner.x, corner.y, corner.z).slot()];
+  return block.tiles[FieldBlock::place(corner.x, corner.y, corner.z).slot()];
+}
+
+FieldBlock& FieldBlocks::newBlock() {
+  if (m_left == 0) {
+    m_chunks.emplace_back(kChunk);
+    m_left = kChunk;
+  }
+  return m_chunks.back()[kChunk - m_left--];
 }
 
 void FieldBlocks::clear() { *this = FieldBlocks(); }

@@ -16,7 +16,6 @@
 #include <array>
 #include <cstddef>
 #include <cstdint>
-#include <memory>
 #include <vector>
 
 namespace VLN::TileTree3D::Internal {
@@ -75,11 +74,12 @@ private:
     return static_cast<std::size_t>((h ^ h >> 32) * 0xd6e8feb86659fd93ull >> 32);
   }
   void resize(std::size_t slots);
+  FieldBlock& newBlock();
 
   std::vector<Slot> m_slots = std::vector<Slot>(16, Slot{{0, 0, 0}, nullptr});
   std::size_t m_mask = 15, m_used = 0;
-  std::vector<std::unique_ptr<FieldBlock[]>> m_chunks;
-  std::size_t m_left = 0; ///< blocks of the last chunk that are not in use
+  std::vector<std::vector<FieldBlock>> m_chunks; ///< of fixed sizes, so that blocks stay where they are
+  std::size_t m_left = 0;                        ///< blocks of the last chunk that are not in use
 };
 
 } // namespace VLN::TileTree3D::Internal
