@@ -4,8 +4,10 @@
 #include <atomic>
 #include <cstdint>
 #include <cstdlib>
+#include <fstream>
 #include <gtest/gtest.h>
 #include <sched.h>
+#include <sstream>
 #include <string>
 #include <thread>
 #include <vector>
@@ -31,6 +33,32 @@ TEST(BulkAllocation, RequirementIsAlignedAndWritable) {
     std::fill_n(static_cast<unsigned char*>(block), bulkBytes(count, 12), 0xab);
     deallocate_jemalloc(block);
   }
+}
+
+/// Whether the mapping of an address is to be made of huge pages.
+bool asksForHugePages(void const* address) {
+  std::ifstream maps("/proc/self/smaps");
+  auto const at = reinterpret_cast<std::uintptr_t>(address);
+  bool here = false;
+  for (std::string line; std::getline(maps, line);) {
+    std::uintptr_t low = 0, high = 0;
+    char dash = 0;
+    std::istringstream range(line);
+    if (range >> std::hex >> low >> dash >> high && dash == '-')
+      here = low <= at && at < high;
+    else if (here && line.starts_with("VmFlags:"))
+      return line.find(" hg") != std::string::npos;
+  }
+  return false;
+}
+
+TEST(BulkAllocation, RequirementLargeBlocksAskForHugePages) {
+  if (!std::ifstream("/sys/kernel/mm/transparent_hugepage/enabled")) GTEST_SKIP() << "the system has none";
+  std::uint64_t const bytes = 64 << 20;
+  auto* const block = static_cast<char*>(allocate_jemalloc(bytes, 1));
+  ASSERT_NE(block, nullptr);
+  EXPECT_TRUE(asksForHugePages(block + bytes / 2));
+  deallocate_jemalloc(block);
 }
 
 TEST(FlushCache, RequirementReturnsFromManyThreadsAtOnce) {

@@ -1,5 +1,6 @@
 #include "GeometryVolume/pools/Jemalloc.h"
 
+#include "GeometryVolume/core/HugePagesImpl.h"
 #include "GeometryVolume/core/WorkersImpl.h"
 #include "vljemalloc/vljemalloc.h"
 
@@ -29,7 +30,10 @@ void flushWorkers() noexcept {
 } // namespace
 
 void* allocate_jemalloc(std::uint64_t count, std::uint64_t elementSize) {
-  return vlje_aligned_alloc(kBulkAlignment, bulkBytes(count, elementSize));
+  std::uint64_t const bytes = bulkBytes(count, elementSize);
+  void* const block = vlje_aligned_alloc(kBulkAlignment, bytes);
+  Internal::preferHugePages(block, bytes);
+  return block;
 }
 
 void deallocate_jemalloc(void* block) { vlje_free(block); }

@@ -1,6 +1,7 @@
 // How the array of a depth's tiles grows, shrinks and is put in another order.
 #pragma once
 
+#include "GeometryVolume/core/HugePagesImpl.h"
 #include "GeometryVolume/tiletree/detail/TileArray.h"
 
 #include <algorithm>
@@ -32,6 +33,7 @@ template <class TileT> TileT* TileArray<TileT>::block(TileT* old, std::int64_t c
   auto const bytes = static_cast<std::size_t>(std::max<std::int64_t>(capacity, 1)) * sizeof(TileT);
   void* const room = std::realloc(static_cast<void*>(old), bytes);
   if (!room) throw std::bad_alloc();
+  VLN::Internal::preferHugePages(room, bytes);
   return static_cast<TileT*>(room);
 }
 
