@@ -195,17 +195,27 @@ BENCHMARK(levelSetNano)
     ->Name("level set/NanoVDB ZeroCrossing (voxel, not root)")
     ->Unit(benchmark::kMillisecond);
 
+// 0 samples: as previews are made; 1: with a ray for each pixel.
 void fogOurs(benchmark::State& state) {
   static Data data("smoke.vdb");
   RenderOptions options;
   options.width = options.height = kAcross;
-  options.threads = 1;
+  options.threads = static_cast<int>(state.range(1)), options.samples = static_cast<int>(state.range(0));
   options.transfer.high = data.field->high();
-  double seconds = 0;
-  for (auto _ : state) seconds = render(*data.field, data.toWorld, data.camera, options).seconds;
+  Picture picture;
+  for (auto _ : state) picture = render(*data.field, data.toWorld, data.camera, options);
   finish(state, 0);
-  state.counters["rays alone, s"] = seconds;
+  state.counters["rays alone, s"] = picture.seconds;
+  state.counters["rays"] = static_cast<double>(picture.rays);
 }
-BENCHMARK(fogOurs)->Name("fog/this library, preview with its preparation")->Unit(benchmark::kMillisecond);
+BENCHMARK(fogOurs)
+    ->Name("fog/this library, preview with its preparation")
+    ->ArgNames({"samples", "threads"})
+    ->Args({1, 1})
+    ->Args({0, 1})
+    ->Args({0, 2})
+    ->MeasureProcessCPUTime()
+    ->UseRealTime()
+    ->Unit(benchmark::kMillisecond);
 
 } // namespace

@@ -4,6 +4,7 @@
 #include "Render/Fog.h"
 #include "Render/LightLatticeImpl.h"
 #include "Render/PixelBlocks.h"
+#include "Render/SparsePixelsImpl.h"
 #include "Render/Surface.h"
 #include "Render/Threads.h"
 
@@ -405,6 +406,43 @@ void addSample(Picture& picture, Scene const& scene, PixelBlocks const& blocks, 
   });
 }
 
+/// Pixels from one ray to the next of a fog's preview, at first: where voxels are seen several pixels wide,
+/// what lies between follows from those about it. Opacities of pairs may have peaks that are narrower than
+/// voxels.
+int strideOf(Scene const& scene, double voxel) {
+  RenderOptions const& options = scene.options;
+  FieldView const& field = scene.field.view();
+  if (options.mode != Mode::kFog || options.quality == Quality::kFinal || options.samples > 0 ||
+      field.maxDepth < nanovtt::kMaxDepth || options.transfer.opacity.find(':') != std::string::npos)
+    return 1;
+  double farthest = 0;
+  for (int corner = 0; corner < 8; ++corner) {
+    Vec3d const p{double(corner & 1 ? field.high.x : field.low.x),
+                  double(corner & 2 ? field.high.y : field.low.y),
+                  double(corner & 4 ? field.high.z : field.low.z)};
+    farthest = std::max(farthest, dot(scene.toWorld.point(p) - scene.camera.position, scene.camera.forward));
+  }
+  double const pixels = voxel / (2 * scene.camera.halfHeight / options.height * farthest);
+  return pixels >= 5 ? 4 : pixels >= 2.5 ? 2 : 1;
+}
+
+/// Draws a preview of a fog in which not every pixel needs a ray of its own.
+std::int64_t drawSparsely(Picture& picture, Scene const& scene, PixelBlocks const& blocks, int stride,
+                          FogShader const& shader, std::function<void(double)> const& watch) {
+  auto const trace = [&](int x, int y) {
+    Start s;
+    scene.start((x + 0.5) / picture.width, (y + 0.5) / picture.height, blocks.at(x, y), s);
+    Sample const got = shader(s, 0, 0);
+    auto const n =
+        static_cast<std::size_t>(y) * static_cast<std::size_t>(picture.width) + static_cast<std::size_t>(x);
+    picture.color[n] = got.color, picture.opacity[n] = got.opacity, picture.depth[n] = got.depth;
+  };
+  SparsePixels pixels(picture, blocks, scene.options.threads);
+  return pixels.draw(stride, trace, [&](double share) {
+    if (watch) watch(share);
+  });
+}
+
 /// From sums to means.
 void divide(Picture& picture) {
   float const scale = picture.samples > 0 ? 1 / static_cast<float>(picture.samples) : 0;
@@ -492,7 +530,12 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
   auto const addOne = [&](auto const& shader) {
     addSample(picture, scene, blocks, picture.samples, samples, shader, watch);
   };
-  for (picture.samples = 0; picture.samples < samples; ++picture.samples) {
+  int const stride = strideOf(scene, voxel);
+  if (stride > 1) {
+    picture.rays = drawSparsely(picture, scene, blocks, stride, FogShader{fog.view, isFinal}, watch);
+    picture.samples = 1;
+  }
+  for (; picture.samples < samples; ++picture.samples) {
     if (picture.samples > 0 && options.timeLimit > 0 && seconds() >= options.timeLimit) break;
     if (options.mode == Mode::kSurface) {
       int const rays = options.occlusionRays >= 0 ? options.occlusionRays : 2;
@@ -505,7 +548,7 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
     }
   }
   picture.seconds = seconds();
-  picture.rays = static_cast<std::int64_t>(count) * picture.samples;
+  if (stride == 1) picture.rays = static_cast<std::int64_t>(count) * picture.samples;
   divide(picture);
   if (!picture.value.empty()) colorValues(picture, options, transfer);
   return picture;
