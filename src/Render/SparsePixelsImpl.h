@@ -80,18 +80,20 @@ private:
       n[k] = p.isAlongX ? at(x + by, y) : at(x, y + by);
     }
     float opacity;
-    if (!cubic(
-            m_picture.opacity, n, [](float v) { return v; }, opacity))
-      return false;
+    auto const itself = [](float v) { return v; };
+    if (!(cubic(m_picture.opacity, n, itself, opacity) < kUnseen)) return false;
     bool isEmpty = true;
     for (std::size_t k : n) isEmpty = isEmpty && m_picture.opacity[k] == 0;
     if (isEmpty) return true;
     if (m_picture.opacity[n[1]] == 0 || m_picture.opacity[n[2]] == 0) return false;
     Vec3 color;
-    for (int a = 0; a < 3; ++a)
-      if (!cubic(
-              m_picture.color, n, [a](Vec3 v) { return v[a]; }, color[a]))
-        return false;
+    for (int a = 0; a < 3; ++a) {
+      auto const part = [a](Vec3 v) { return v[a]; };
+      float const bend = cubic(m_picture.color, n, part, color[a]);
+      // In the dark less makes a step of a byte: before a background that is not quite black.
+      float const light = color[a] + 0.15f * (1 - opacity);
+      if (!(bend < kUnseen * std::min(1.0f, 0.1f + 3 * light))) return false;
+    }
     std::size_t const to = at(x, y);
     m_picture.opacity[to] = std::clamp(opacity, 0.0f, 1.0f);
     if (m_picture.opacity[to] == 0) return true;
@@ -102,16 +104,19 @@ private:
     m_picture.depth[to] = depth / weight * m_picture.opacity[to];
     return true;
   }
-  /// @return false where the cubic through four differs from the line between the middle two by more than is
-  /// seen.
+  /// The middle of the cubic through four. @return By how much it differs from the line between the inner
+  /// two.
   template <class T, class Part>
-  static bool cubic(std::vector<T> const& of, std::size_t const n[4], Part const& part, float& v) {
-    constexpr float kUnseen = 1.0f / 768;
+  static float cubic(std::vector<T> const& of, std::size_t const n[4], Part const& part, float& v) {
     float const a = part(of[n[0]]), b = part(of[n[1]]), c = part(of[n[2]]), d = part(of[n[3]]);
     float const bend = (b + c - a - d) * (1.0f / 16);
     v = 0.5f * (b + c) + bend;
-    return std::abs(bend) < kUnseen;
+    return std::abs(bend);
   }
+
+  /// Of light. @source On smoke, cloud and noise: by this the picture differs from that of all rays by at
+  /// most a few of 255.
+  static constexpr float kUnseen = 1.0f / 768;
 
   Picture& m_picture;
   PixelBlocks const& m_blocks;
