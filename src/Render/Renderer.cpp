@@ -4,6 +4,7 @@
 #include "Render/Fog.h"
 #include "Render/LightLatticeImpl.h"
 #include "Render/PixelBlocks.h"
+#include "Render/RestlessPixelsImpl.h"
 #include "Render/SparsePixelsImpl.h"
 #include "Render/Surface.h"
 #include "Render/Threads.h"
@@ -368,10 +369,11 @@ int samplesOf(RenderOptions const& options) {
   }
 }
 
-/// Adds one sample to every pixel.
+/// Adds one sample to every pixel, or to those that are marked.
 template <class Shader>
-void addSample(Picture& picture, Scene const& scene, PixelBlocks const& blocks, int sample, int samples,
-               Shader const& shader, std::function<void(double)> const& watch) {
+void addSample(Picture& picture, Scene const& scene, PixelBlocks const& blocks,
+               std::vector<std::uint8_t> const& marked, int sample, int samples, Shader const& shader,
+               std::function<void(double)> const& watch) {
   bool const isWhole = scene.options.mode == Mode::kMean; // over all of the box
   auto const rows = [&](std::int64_t begin, std::int64_t end) {
     for (std::int64_t y = begin; y < end; ++y)
@@ -380,6 +382,7 @@ void addSample(Picture& picture, Scene const& scene, PixelBlocks const& blocks, 
         if (span.empty()) continue;
         auto const n = static_cast<std::size_t>(y) * static_cast<std::size_t>(picture.width) +
                        static_cast<std::size_t>(x);
+        if (!marked.empty() && !marked[n]) continue;
         double du = 0.5, dv = 0.5;
         if (samples > 1) {
           // The recurrence of the occlusion rays, from the middle on.
@@ -527,19 +530,28 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
   auto const began = Clock::now();
   auto const seconds = [&] { return std::chrono::duration<double>(Clock::now() - began).count(); };
   PixelBlocks const blocks(field.view(), scene.toWorld, camera, options.width, options.height);
+  // Of surfaces in previews those pixels get more samples that need them.
+  bool const mayRest = options.mode == Mode::kSurface && !isFinal && options.samples == 0;
+  std::vector<std::uint8_t> marked;
   auto const addOne = [&](auto const& shader) {
-    addSample(picture, scene, blocks, picture.samples, samples, shader, watch);
+    addSample(picture, scene, blocks, marked, picture.samples, samples, shader, watch);
   };
   int const stride = strideOf(scene, voxel);
   if (stride > 1) {
     picture.rays = drawSparsely(picture, scene, blocks, stride, FogShader{fog.view, isFinal}, watch);
     picture.samples = 1;
   }
+  auto rays = static_cast<std::int64_t>(count);
   for (; picture.samples < samples; ++picture.samples) {
+    if (mayRest && picture.samples == 1) {
+      marked = markRestless(picture, options.threads);
+      rays = std::count(marked.begin(), marked.end(), std::uint8_t(1));
+    }
     if (picture.samples > 0 && options.timeLimit > 0 && seconds() >= options.timeLimit) break;
+    if (stride == 1) picture.rays += rays;
     if (options.mode == Mode::kSurface) {
-      int const rays = options.occlusionRays >= 0 ? options.occlusionRays : 2;
-      addOne(SurfaceShader{scene, rays, static_cast<float>(0.15 * scene.diagonal),
+      int const occlusion = options.occlusionRays >= 0 ? options.occlusionRays : 2;
+      addOne(SurfaceShader{scene, occlusion, static_cast<float>(0.15 * scene.diagonal),
                            static_cast<float>(0.5 * voxel)});
     } else if (options.mode == Mode::kFog) {
       addOne(FogShader{fog.view, isFinal});
@@ -548,7 +560,7 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
     }
   }
   picture.seconds = seconds();
-  if (stride == 1) picture.rays = static_cast<std::int64_t>(count) * picture.samples;
+  repeatUnmarked(picture, marked);
   divide(picture);
   if (!picture.value.empty()) colorValues(picture, options, transfer);
   return picture;
