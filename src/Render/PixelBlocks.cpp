@@ -109,7 +109,12 @@ private:
       }
     }
     if (middle.z + radius < 0) return;
-    Span const span{static_cast<float>(std::max({distance - radius, nearest, 0.0}) * (1 - 1e-6)),
+    // No point lies nearer than its part along the way to the middle.
+    double const along =
+        distance > 0
+            ? (std::abs(dot(ex, middle)) + std::abs(dot(ey, middle)) + std::abs(dot(ez, middle))) / distance
+            : radius;
+    Span const span{static_cast<float>(std::max({distance - along, nearest, 0.0}) * (1 - 1e-6)),
                     static_cast<float>((distance + radius) * (1 + 1e-6))};
     int from[2] = {0, 0}, to[2] = {m_across - 1, m_down - 1};
     if (nearest > 1e-9 * distance)
