@@ -134,7 +134,7 @@ NANOVTT_HD inline FogSample marchFog(FogView const& fog, Ray const& ray, Vec3 wo
     Lanes const from = (origin - Lanes(s.corner)) * s.scale, along = direction * s.scale;
     for (std::int32_t n = -floorOf(-(s.t0 + shift) / fog.step);; n += 4) {
       // Four at a time: what they scatter does not wait for one another.
-      float t[4], place[4], sigma[4] = {0, 0, 0, 0};
+      float t[4], place[4] = {0, 0, 0, 0}, sigma[4] = {0, 0, 0, 0};
       int count = 0;
       for (; count < 4; ++count) {
         t[count] = static_cast<float>(n + count) * fog.step - shift;

@@ -146,7 +146,7 @@ float Transfer::largestOpacity(float low, float high) const {
   auto const last = std::min<std::size_t>(
       static_cast<std::size_t>(std::ceil(m_view.place(high) * (kTransferSize - 1))), kTransferSize - 1);
   std::size_t const count = std::max(last, first) - first + 1;
-  auto const level = static_cast<std::size_t>(std::bit_width(count)) - 1;
+  auto const level = static_cast<std::size_t>(std::bit_width(count >> 1));
   return std::max(m_largest[level][first], m_largest[level][first + count - (std::size_t(1) << level)]);
 }
 

@@ -52,9 +52,10 @@ TEST_P(PixelBlocksTest, RequirementHoldEverythingOnTheRays) {
   std::uniform_real_distribution<double> part(0, 1);
   for (View const& view : views()) {
     SCOPED_TRACE(view.name);
-    std::vector<Vec3d> corners;
+    std::vector<Vec3d> corners(8);
     for (int c = 0; c < 8; ++c)
-      corners.push_back(view.toWorld.point({c & 1 ? 20.0 : -20, c & 2 ? 20.0 : -20, c & 4 ? 20.0 : -20}));
+      corners[static_cast<std::size_t>(c)] =
+          view.toWorld.point({c & 1 ? 20.0 : -20, c & 2 ? 20.0 : -20, c & 4 ? 20.0 : -20});
     Camera const camera(view.camera, corners, 0, double(kWidth) / kHeight);
     Affine toWorld = view.toWorld;
     toWorld.shift = toWorld.point(field.origin());
