@@ -6,7 +6,7 @@
 
 #include <cstring>
 
-#if defined(__SSE2__) && !defined(__CUDA_ARCH__)
+#if defined(__SSE2__) && !defined(__CUDACC__)
 #define VLN_RENDER_SSE2 1
 #include <emmintrin.h>
 #endif
@@ -30,8 +30,9 @@ struct Lanes {
   static Lanes load(float const* p) { return Lanes(_mm_loadu_ps(p)); }
   /// Two from each address.
   static Lanes pairs(float const* p, float const* q) {
-    __m128d const low = _mm_load_sd(reinterpret_cast<double const*>(p));
-    return Lanes(_mm_castpd_ps(_mm_loadh_pd(low, reinterpret_cast<double const*>(q))));
+    __m128i const low = _mm_loadl_epi64(reinterpret_cast<__m128i const*>(p)),
+                  high = _mm_loadl_epi64(reinterpret_cast<__m128i const*>(q));
+    return Lanes(_mm_movelh_ps(_mm_castsi128_ps(low), _mm_castsi128_ps(high)));
   }
 
   friend Lanes operator+(Lanes a, Lanes b) { return Lanes(_mm_add_ps(a.v, b.v)); }
