@@ -7,6 +7,7 @@
 //   read       a million active voxels, leaf by leaf or at random, through NanoVDB's accessor and through a
 //              cursor on the flat buffer; an item is a voxel
 //   trilinear  in the cells of the same voxels, through NanoVDB's sampler and from tiles with halo
+//   bounds     smallest, largest and mean value of each tile, for rays, of a buffer with halos
 //
 // "bytes a voxel" counts active voxels. NanoVDB's conversion takes threads of its own, whatever it is given.
 #include "BenchGrids.h"
@@ -15,6 +16,7 @@
 #include "GeometryVolume/nanovtt/VTTToNanoVTT.h"
 #include "Reader/NanoVTTCursor.h"
 #include "Reader/NanoVTTValidate.h"
+#include "Render/Bounds.h"
 
 #include <benchmark/benchmark.h>
 
@@ -195,6 +197,61 @@ void addReads(Subject const* subject) {
   }
 }
 
+// Of a build with codes of 8 bits, which float grids are read from as well.
+void addQuantisedReads(Subject const* subject) {
+  auto const add = [&](char const* name, float halo, auto read) {
+    benchmark::RegisterBenchmark((subject->name + "/" + name).c_str(), [=](benchmark::State& state) {
+      auto const flat = flatten<nanovdb::Fp8>(*subject, halo);
+      auto const grid = nanovtt::BufferReader(flat.data()).grid(0);
+      read(state, grid);
+    })->Unit(benchmark::kMillisecond);
+  };
+  auto const values = [=](auto& cursor, benchmark::State& state) {
+    readBench(state, *subject, false,
+              [&](openvdb::Coord const& c) { return cursor.value(c.x(), c.y(), c.z()); });
+  };
+  auto const blends = [=](auto& cursor, benchmark::State& state) {
+    readBench(state, *subject, false, [&](openvdb::Coord const& c) {
+      return cursor.trilinear(float(c.x()) + 0.25f, float(c.y()) + 0.5f, float(c.z()) + 0.75f);
+    });
+  };
+  using Known = nanovtt::Cursor<nanovtt::GridType::kFp8>;
+  add("read/coherent/ours, 8 bits", 0, [=](benchmark::State& state, nanovtt::GridReader const& grid) {
+    nanovtt::GridCursor cursor(grid);
+    values(cursor, state);
+  });
+  add("read/coherent/ours, 8 bits, type known", 0,
+      [=](benchmark::State& state, nanovtt::GridReader const& grid) {
+        Known cursor(grid);
+        values(cursor, state);
+      });
+  add("trilinear/coherent/ours, halo tiles, 8 bits", 1,
+      [=](benchmark::State& state, nanovtt::GridReader const& grid) {
+        nanovtt::GridCursor cursor(grid);
+        blends(cursor, state);
+      });
+  add("trilinear/coherent/ours, halo tiles, 8 bits, type known", 1,
+      [=](benchmark::State& state, nanovtt::GridReader const& grid) {
+        Known cursor(grid);
+        blends(cursor, state);
+      });
+}
+
+void addBounds(Subject const* subject) {
+  for (int threads : {1, 2})
+    benchmark::RegisterBenchmark((subject->name + "/bounds/threads:" + std::to_string(threads)).c_str(),
+                                 [=](benchmark::State& state) {
+                                   auto const flat = flatten<void>(*subject, 1.0f);
+                                   auto const grid = nanovtt::BufferReader(flat.data()).grid(0);
+                                   for (auto _ : state)
+                                     benchmark::DoNotOptimize(Render::makeBounds(grid, {-1, 16, threads}));
+                                   state.counters["tiles"] = grid.container().tileCount();
+                                 })
+        ->Unit(benchmark::kMillisecond)
+        ->MeasureProcessCPUTime()
+        ->UseRealTime();
+}
+
 template <class BuildT> void addBuild(std::string const& build, Subject const* subject) {
   for (int threads : {1, 2}) {
     std::string const tail = build + "/threads:" + std::to_string(threads);
@@ -211,6 +268,8 @@ template <class BuildT> void addBuild(std::string const& build, Subject const* s
 
 void addAll(Subject const* subject) {
   addReads(subject);
+  addQuantisedReads(subject);
+  addBounds(subject);
   benchmark::RegisterBenchmark((subject->name + "/validate").c_str(), validateBench, subject)
       ->Unit(benchmark::kMillisecond);
   addBuild<void>("float", subject);

@@ -1,11 +1,13 @@
 // Rays from a camera that frames the grid, 512 x 512 of them, one thread, as values over items a second:
 //
 //   level set   the first surface of the bunny at 128 voxels, hit or missed, without shading: this library's
-//               rays, OpenVDB's LevelSetRayIntersector and NanoVDB's zero crossing on the same rays
+//               rays one by one and by blocks of pixels, as pictures are made, with the whole picture beside
+//               them; OpenVDB's LevelSetRayIntersector and NanoVDB's zero crossing on the same rays
 //   fog         shaded pixels of the preview of the smoke, those beside it included
 #include "BenchGrids.h"
 #include "Interop/Flatten.h"
 #include "Interop/VdbDetails.h"
+#include "Render/PixelBlocks.h"
 #include "Render/Renderer.h"
 #include "Render/Surface.h"
 
@@ -100,6 +102,58 @@ void levelSetOurs(benchmark::State& state) {
 }
 BENCHMARK(levelSetOurs)->Name("level set/this library")->Unit(benchmark::kMillisecond);
 
+// As pictures are made: rays begin where the tiles that matter do in their block of pixels.
+void levelSetBlocks(benchmark::State& state) {
+  Data& data = bunny();
+  data.field->weigh([](float low, float high) { return crosses(low, high, 0) ? 1.0f : 0.0f; });
+  FieldView const& view = data.field->view();
+  Affine toWorld = data.toWorld;
+  toWorld.shift = toWorld.point(data.field->origin());
+  Affine const local = toWorld.inverse();
+  Vec3d const eye = local.point(data.camera.position);
+  std::int64_t hits = 0;
+  for (auto _ : state) {
+    hits = 0;
+    PixelBlocks const blocks(view, toWorld, data.camera, kAcross, kAcross);
+    for (int y = 0; y < kAcross; ++y)
+      for (int x = 0; x < kAcross; ++x) {
+        auto const& span = blocks.at(x, y);
+        if (span.empty()) continue;
+        Vec3d const d = local.vector(data.camera.ray((x + 0.5) / kAcross, (y + 0.5) / kAcross));
+        Ray const ray((eye + d * double(span.near)).as<float>(), d.as<float>());
+        float t;
+        hits += hitSurface(view, ray, 0, span.far - span.near, 0, t);
+      }
+  }
+  finish(state, hits);
+}
+BENCHMARK(levelSetBlocks)->Name("level set/this library, by blocks of pixels")->Unit(benchmark::kMillisecond);
+
+// The whole: also the normal and the light of what they meet, and what is done once for a picture; without
+// rays to the light.
+void levelSetPicture(benchmark::State& state) {
+  Data& data = bunny();
+  RenderOptions options;
+  options.width = options.height = kAcross;
+  options.mode = Mode::kSurface;
+  options.samples = 1, options.occlusionRays = 0, options.threads = static_cast<int>(state.range(0));
+  std::int64_t hits = 0;
+  for (auto _ : state) {
+    auto const picture = render(*data.field, data.toWorld, data.camera, options);
+    hits = 0;
+    for (float const opacity : picture.opacity) hits += opacity > 0;
+  }
+  finish(state, hits);
+}
+BENCHMARK(levelSetPicture)
+    ->Name("level set/this library, picture")
+    ->ArgName("threads")
+    ->Arg(1)
+    ->Arg(2)
+    ->MeasureProcessCPUTime()
+    ->UseRealTime()
+    ->Unit(benchmark::kMillisecond);
+
 void levelSetOpenVdb(benchmark::State& state) {
   Data& data = bunny();
   openvdb::tools::LevelSetRayIntersector<openvdb::FloatGrid> intersector(*data.grid);
@@ -141,17 +195,27 @@ BENCHMARK(levelSetNano)
     ->Name("level set/NanoVDB ZeroCrossing (voxel, not root)")
     ->Unit(benchmark::kMillisecond);
 
+// 0 samples: as previews are made; 1: with a ray for each pixel.
 void fogOurs(benchmark::State& state) {
   static Data data("smoke.vdb");
   RenderOptions options;
   options.width = options.height = kAcross;
-  options.threads = 1;
+  options.threads = static_cast<int>(state.range(1)), options.samples = static_cast<int>(state.range(0));
   options.transfer.high = data.field->high();
-  double seconds = 0;
-  for (auto _ : state) seconds = render(*data.field, data.toWorld, data.camera, options).seconds;
+  Picture picture;
+  for (auto _ : state) picture = render(*data.field, data.toWorld, data.camera, options);
   finish(state, 0);
-  state.counters["rays alone, s"] = seconds;
+  state.counters["rays alone, s"] = picture.seconds;
+  state.counters["rays"] = static_cast<double>(picture.rays);
 }
-BENCHMARK(fogOurs)->Name("fog/this library, preview with its preparation")->Unit(benchmark::kMillisecond);
+BENCHMARK(fogOurs)
+    ->Name("fog/this library, preview with its preparation")
+    ->ArgNames({"samples", "threads"})
+    ->Args({1, 1})
+    ->Args({0, 1})
+    ->Args({0, 2})
+    ->MeasureProcessCPUTime()
+    ->UseRealTime()
+    ->Unit(benchmark::kMillisecond);
 
 } // namespace

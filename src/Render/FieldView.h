@@ -10,6 +10,7 @@
 #pragma once
 
 #include "Reader/NanoVTTReader.h"
+#include "Render/Lanes.h"
 #include "Render/Vec.h"
 
 namespace VLN::Render {
@@ -77,21 +78,30 @@ NANOVTT_HD inline float lerp(float a, float b, float f) { return (b - a) * f + a
 
 NANOVTT_HD inline float trilinear(float const* p, int stride, float fx, float fy, float fz) {
   float const* const q = p + static_cast<std::int64_t>(stride) * stride;
-  float const y0 = lerp(lerp(p[0], p[1], fx), lerp(p[stride], p[stride + 1], fx), fy);
-  float const y1 = lerp(lerp(q[0], q[1], fx), lerp(q[stride], q[stride + 1], fx), fy);
-  return lerp(y0, y1, fz);
+  Lanes const low = Lanes::pairs(p, q), high = Lanes::pairs(p + stride, q + stride);
+  Lanes const x = lerp(evens(low, high), odds(low, high), fx); // of p, q, and the rows above them
+  Lanes const y = lerp(x, x.upper(), fy);
+  return lerp(y.first(), y.second(), fz);
+}
+
+/// The cell of a brick that holds `u`, in samples from its first one, and the place in the cell.
+struct Cell {
+  std::int32_t at[4];
+  Lanes in;
+};
+/// @edges The next one where there is none.
+NANOVTT_HD inline Cell cellAt(Brick const& b, Lanes u) {
+  Cell c;
+  Lanes const most(static_cast<float>(b.core) - 0.5f);
+  c.in = u - lesser(larger(u, Lanes(0.0f)), most).whole(c.at);
+  return c;
+}
+NANOVTT_HD inline float trilinear(Brick const& b, Cell const& c) {
+  return trilinear(b.at(c.at[0], c.at[1], c.at[2]), b.stride, c.in.first(), c.in.second(), c.in.third());
 }
 
 /// Blend at `u`, in samples from the brick's first one, 0 to core on each axis.
-NANOVTT_HD inline float trilinear(Brick const& b, Vec3 u) {
-  int const last = b.core - 1;
-  int i = static_cast<int>(u.x), j = static_cast<int>(u.y), k = static_cast<int>(u.z);
-  i = i < 0 ? 0 : i > last ? last : i;
-  j = j < 0 ? 0 : j > last ? last : j;
-  k = k < 0 ? 0 : k > last ? last : k;
-  return trilinear(b.at(i, j, k), b.stride, u.x - static_cast<float>(i), u.y - static_cast<float>(j),
-                   u.z - static_cast<float>(k));
-}
+NANOVTT_HD inline float trilinear(Brick const& b, Vec3 u) { return trilinear(b, cellAt(b, Lanes(u))); }
 
 /// The way from a root to a tile, kept from one place to the next: a step goes up only as far as the first
 /// tile that holds both places, which the highest bit tells in which their coordinates differ.

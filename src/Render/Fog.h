@@ -19,27 +19,22 @@ struct LightView {
   int size[3] = {1, 1, 1};
   Vec3 low, scale; ///< lattice = (local - low) * scale
 
-  NANOVTT_HD Shares at(Vec3 p) const {
-    int n[3];
-    float f[3];
-    for (int a = 0; a < 3; ++a) {
-      float const u = (p[a] - low[a]) * scale[a], most = static_cast<float>(size[a] - 1);
-      float const c = u > 0 ? (u < most ? u : most) : 0;
-      n[a] = static_cast<int>(c);
-      if (n[a] > size[a] - 2) n[a] = size[a] > 1 ? size[a] - 2 : 0;
-      f[a] = c - static_cast<float>(n[a]);
-    }
-    std::int64_t const dx = size[0] > 1, dy = size[1] > 1 ? size[0] : 0,
-                       dz = size[2] > 1 ? std::int64_t(size[0]) * size[1] : 0;
-    Shares const* const v = values + (std::int64_t(n[2]) * size[1] + n[1]) * size[0] + n[0];
-    Shares const y0 = mix(mix(v[0], v[dx], f[0]), mix(v[dy], v[dy + dx], f[0]), f[1]);
-    Shares const y1 = mix(mix(v[dz], v[dz + dx], f[0]), mix(v[dz + dy], v[dz + dy + dx], f[0]), f[1]);
-    return mix(y0, y1, f[2]);
-  }
-
-private:
-  NANOVTT_HD static Shares mix(Shares a, Shares b, float f) {
-    return {lerp(a.direct, b.direct, f), lerp(a.above, b.above, f)};
+  /// @param u In points of the lattice. @edges The nearest side's for what lies outside.
+  /// @pre There are two points or more along each axis.
+  NANOVTT_HD Shares at(Lanes u) const {
+    Lanes const last(static_cast<float>(size[0] - 1), static_cast<float>(size[1] - 1),
+                     static_cast<float>(size[2] - 1), 0);
+    Lanes const c = lesser(larger(u, Lanes(0.0f)), last);
+    std::int32_t n[4];
+    Lanes const f = c - lesser(c, last - Lanes(0.5f)).whole(n);
+    std::int64_t const dy = size[0], dz = dy * size[1];
+    float const* const v = &values[n[2] * dz + n[1] * dy + n[0]].direct;
+    // Both shares of a point, and of the next one along x.
+    float const fy = f.second();
+    Lanes const z0 = lerp(Lanes::load(v), Lanes::load(v + 2 * dy), fy),
+                z1 = lerp(Lanes::load(v + 2 * dz), Lanes::load(v + 2 * (dz + dy)), fy);
+    Lanes const z = lerp(z0, z1, f.third()), x = lerp(z, z.upper(), f.first());
+    return {x.first(), x.second()};
   }
 };
 
@@ -128,35 +123,45 @@ NANOVTT_HD inline FogSample marchFog(FogView const& fog, Ray const& ray, Vec3 wo
   float through = 1;
   float const cosine = dot(world, fog.light);
   float const phase = henyeyGreenstein(cosine, fog.anisotropy);
+  Lanes const origin(ray.origin), direction(ray.direction), lightColor(fog.lightColor), sky(fog.sky),
+      ground(fog.ground), perPoint(fog.lights.scale);
+  Lanes const lightsFrom = (origin - Lanes(fog.lights.low)) * perPoint, lightsAlong = direction * perPoint;
+  Lanes color(0.0f);
   Walk walk(fog.field, ray, t0, t1);
   Segment s;
-  while (through > 2e-3f && walk.next(s)) {
+  while (through >= 2e-3f && walk.next(s)) {
     std::uint64_t const cells = fog.field.cells[s.tile];
-    for (auto n = static_cast<std::int64_t>(std::ceil((s.t0 + shift) / fog.step));; ++n) {
-      float const t = static_cast<float>(n) * fog.step - shift;
-      if (!(t < s.t1)) break;
-      Vec3 const p = ray.at(t);
-      Vec3 const u = s.samples(p);
-      if (s.brick.core == 4) {
-        int const i = static_cast<int>(u.x) & 3, j = static_cast<int>(u.y) & 3, k = static_cast<int>(u.z) & 3;
-        if (!(cells >> (i + 4 * j + 16 * k) & 1)) continue;
+    Lanes const from = (origin - Lanes(s.corner)) * s.scale, along = direction * s.scale;
+    for (std::int32_t n = -floorOf(-(s.t0 + shift) / fog.step);; n += 4) {
+      // Four at a time: what they scatter does not wait for one another.
+      float t[4], place[4] = {0, 0, 0, 0}, sigma[4] = {0, 0, 0, 0};
+      int count = 0;
+      for (; count < 4; ++count) {
+        t[count] = static_cast<float>(n + count) * fog.step - shift;
+        if (!(t[count] < s.t1)) break;
+        Cell const c = cellAt(s.brick, from + along * t[count]);
+        if (s.brick.core == 4 && !(cells >> (c.at[0] + 4 * c.at[1] + 16 * c.at[2]) & 1)) continue;
+        sigma[count] = fog.extinction(trilinear(s.brick, c), place[count]);
       }
-      float place;
-      float const sigma = fog.extinction(trilinear(s.brick, u), place);
-      if (!(sigma > 0)) continue;
-      float const alpha = 1 - std::exp(-sigma * fog.step);
-      auto const [lit, open] = fog.lights.at(p);
-      float const root = std::sqrt(std::sqrt(lit));
-      Vec3 const light = fog.lightColor * (0.65f * phase * lit + 0.35f * root * root * 0.5f + 0.1f * root) +
-                         fog.ground * (0.35f + 0.25f * root) + fog.sky * open;
-      float const w = through * alpha;
-      out.color = out.color + fog.tint(place) * light * w;
-      out.opacity += w;
-      out.depth += w * t;
-      through *= 1 - alpha;
-      if (through < 2e-3f) break;
+      float alpha[4];
+      (Lanes(1.0f) - decay(Lanes::load(sigma) * fog.step)).store(alpha);
+      for (int k = 0; k < count && through >= 2e-3f; ++k) {
+        if (!(sigma[k] > 0)) continue;
+        auto const [lit, open] = fog.lights.at(lightsFrom + lightsAlong * t[k]);
+        float const root = std::sqrt(std::sqrt(lit));
+        float const w = through * alpha[k];
+        Lanes light = lightColor * (0.65f * phase * lit + 0.175f * root * root + 0.1f * root) +
+                      ground * (0.35f + 0.25f * root) + sky * open;
+        if (fog.colored) light = light * Lanes(fog.transfer->colorAt(place[k]));
+        color = color + light * w;
+        out.opacity += w;
+        out.depth += w * t[k];
+        through *= 1 - alpha[k];
+      }
+      if (count < 4 || through < 2e-3f) break;
     }
   }
+  out.color = Vec3{color.first(), color.second(), color.third()} * fog.albedo;
   return out;
 }
 

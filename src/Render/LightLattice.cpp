@@ -41,7 +41,7 @@ void sweep(LightView const& v, std::vector<float> const& extinctions, Vec3 toLig
         }
         auto const here = plane * stride[axis] + j * stride[b] + k * stride[c];
         float const mean = 0.5f * (thick + extinctions[static_cast<std::size_t>(here)]);
-        light[here].*share = lit * std::exp(-mean * toPlane);
+        light[here].*share = lit * decay(Lanes(mean * toPlane)).first();
       }
   }
 }

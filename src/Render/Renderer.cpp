@@ -3,6 +3,9 @@
 #include "Render/Colors.h"
 #include "Render/Fog.h"
 #include "Render/LightLatticeImpl.h"
+#include "Render/PixelBlocks.h"
+#include "Render/RestlessPixelsImpl.h"
+#include "Render/SparsePixelsImpl.h"
 #include "Render/Surface.h"
 #include "Render/Threads.h"
 
@@ -18,7 +21,6 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
-constexpr std::int64_t kRowGrain = 4;
 constexpr float kNowhere = std::numeric_limits<float>::infinity();
 constexpr Vec3 kKeyLight{1.0f, 0.96f, 0.9f}, kSky{0.55f, 0.6f, 0.68f}, kGround{0.22f, 0.2f, 0.19f};
 constexpr Vec3 kClay{0.72f, 0.68f, 0.62f};
@@ -29,12 +31,12 @@ constexpr double kFewestSteps = 320;
 /// And where one edge of a voxel is far shorter than the others, larger.
 constexpr double kMostSteps = 65536;
 
-/// A camera's ray in local space. Its origin is where it enters the field's box.
+/// A camera's ray in local space. Its origin is where it comes to the field's box, or to what is in it.
 struct Start {
   Vec3d world; ///< unit
   Vec3 origin, direction;
   double base = 0; ///< distance from the camera to the origin
-  float end = 0;   ///< distance in the box
+  float end = 0;   ///< distance from there to what it leaves
 };
 
 struct Scene {
@@ -47,6 +49,7 @@ struct Scene {
   Vec3d light;     ///< world, unit
   double diagonal; ///< of the field's box, world length; set with the depth
 
+  /// From side to side of the field's box.
   bool start(double u, double v, Start& s) const {
     s.world = camera.ray(u, v);
     Vec3d const d = toLocal.vector(s.world);
@@ -62,11 +65,21 @@ struct Scene {
       t0 = std::max(t0, std::min(p, q)), t1 = std::min(t1, std::max(p, q));
     }
     if (!(t0 < t1)) return false;
+    cut(s, d, t0, t1);
+    return true;
+  }
+  /// Through what lies in its block of pixels.
+  void start(double u, double v, PixelBlocks::Span const& span, Start& s) const {
+    s.world = camera.ray(u, v);
+    cut(s, toLocal.vector(s.world), double(span.near), double(span.far));
+  }
+
+private:
+  void cut(Start& s, Vec3d d, double t0, double t1) const {
     s.base = t0;
     s.origin = (eye + d * t0).as<float>();
     s.direction = d.as<float>();
     s.end = static_cast<float>(t1 - t0);
-    return true;
   }
 };
 
@@ -356,23 +369,32 @@ int samplesOf(RenderOptions const& options) {
   }
 }
 
-/// Adds one sample to every pixel.
+/// Adds one sample to every pixel, or to those that are marked.
 template <class Shader>
-void addSample(Picture& picture, Scene const& scene, int sample, int samples, Shader const& shader,
+void addSample(Picture& picture, Scene const& scene, PixelBlocks const& blocks,
+               std::vector<std::uint8_t> const& marked, int sample, int samples, Shader const& shader,
                std::function<void(double)> const& watch) {
+  bool const isWhole = scene.options.mode == Mode::kMean; // over all of the box
   auto const rows = [&](std::int64_t begin, std::int64_t end) {
     for (std::int64_t y = begin; y < end; ++y)
       for (int x = 0; x < picture.width; ++x) {
+        auto const& span = blocks.at(x, static_cast<int>(y));
+        if (span.empty()) continue;
         auto const n = static_cast<std::size_t>(y) * static_cast<std::size_t>(picture.width) +
                        static_cast<std::size_t>(x);
+        if (!marked.empty() && !marked[n]) continue;
         double du = 0.5, dv = 0.5;
         if (samples > 1) {
           // The recurrence of the occlusion rays, from the middle on.
           du += 0.7548776662 * (sample + 1), dv += 0.5698402910 * (sample + 1);
           du -= std::floor(du), dv -= std::floor(dv);
         }
+        double const u = (x + du) / picture.width, v = (double(y) + dv) / picture.height;
         Start s;
-        if (!scene.start((x + du) / picture.width, (double(y) + dv) / picture.height, s)) continue;
+        if (!isWhole)
+          scene.start(u, v, span, s);
+        else if (!scene.start(u, v, s))
+          continue;
         Sample const got = shader(s, static_cast<std::uint32_t>(n), static_cast<std::uint32_t>(sample));
         if (!(got.opacity > 0)) continue;
         picture.color[n] = picture.color[n] + got.color;
@@ -382,8 +404,45 @@ void addSample(Picture& picture, Scene const& scene, int sample, int samples, Sh
         if (!picture.value.empty()) picture.value[n] += got.value;
       }
   };
-  forRanges(picture.height, kRowGrain, scene.options.threads, rows, [&](double share) {
+  forRanges(picture.height, PixelBlocks::kWidth, scene.options.threads, rows, [&](double share) {
     if (watch) watch((sample + share) / samples);
+  });
+}
+
+/// Pixels from one ray to the next of a fog's preview, at first: where voxels are seen several pixels wide,
+/// what lies between follows from those about it. Opacities of pairs may have peaks that are narrower than
+/// voxels.
+int strideOf(Scene const& scene, double voxel) {
+  RenderOptions const& options = scene.options;
+  FieldView const& field = scene.field.view();
+  if (options.mode != Mode::kFog || options.quality == Quality::kFinal || options.samples > 0 ||
+      field.maxDepth < nanovtt::kMaxDepth || options.transfer.opacity.find(':') != std::string::npos)
+    return 1;
+  double farthest = 0;
+  for (int corner = 0; corner < 8; ++corner) {
+    Vec3d const p{double(corner & 1 ? field.high.x : field.low.x),
+                  double(corner & 2 ? field.high.y : field.low.y),
+                  double(corner & 4 ? field.high.z : field.low.z)};
+    farthest = std::max(farthest, dot(scene.toWorld.point(p) - scene.camera.position, scene.camera.forward));
+  }
+  double const pixels = voxel / (2 * scene.camera.halfHeight / options.height * farthest);
+  return pixels >= 5 ? 4 : pixels >= 2.5 ? 2 : 1;
+}
+
+/// Draws a preview of a fog in which not every pixel needs a ray of its own.
+std::int64_t drawSparsely(Picture& picture, Scene const& scene, PixelBlocks const& blocks, int stride,
+                          FogShader const& shader, std::function<void(double)> const& watch) {
+  auto const trace = [&](int x, int y) {
+    Start s;
+    scene.start((x + 0.5) / picture.width, (y + 0.5) / picture.height, blocks.at(x, y), s);
+    Sample const got = shader(s, 0, 0);
+    auto const n =
+        static_cast<std::size_t>(y) * static_cast<std::size_t>(picture.width) + static_cast<std::size_t>(x);
+    picture.color[n] = got.color, picture.opacity[n] = got.opacity, picture.depth[n] = got.depth;
+  };
+  SparsePixels pixels(picture, blocks, scene.options.threads);
+  return pixels.draw(stride, trace, [&](double share) {
+    if (watch) watch(share);
   });
 }
 
@@ -470,14 +529,29 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
   int const samples = samplesOf(options);
   auto const began = Clock::now();
   auto const seconds = [&] { return std::chrono::duration<double>(Clock::now() - began).count(); };
+  PixelBlocks const blocks(field.view(), scene.toWorld, camera, options.width, options.height);
+  // Of surfaces in previews those pixels get more samples that need them.
+  bool const mayRest = options.mode == Mode::kSurface && !isFinal && options.samples == 0;
+  std::vector<std::uint8_t> marked;
   auto const addOne = [&](auto const& shader) {
-    addSample(picture, scene, picture.samples, samples, shader, watch);
+    addSample(picture, scene, blocks, marked, picture.samples, samples, shader, watch);
   };
-  for (picture.samples = 0; picture.samples < samples; ++picture.samples) {
+  int const stride = strideOf(scene, voxel);
+  if (stride > 1) {
+    picture.rays = drawSparsely(picture, scene, blocks, stride, FogShader{fog.view, isFinal}, watch);
+    picture.samples = 1;
+  }
+  auto rays = static_cast<std::int64_t>(count);
+  for (; picture.samples < samples; ++picture.samples) {
+    if (mayRest && picture.samples == 1) {
+      marked = markRestless(picture, options.threads);
+      rays = std::count(marked.begin(), marked.end(), std::uint8_t(1));
+    }
     if (picture.samples > 0 && options.timeLimit > 0 && seconds() >= options.timeLimit) break;
+    if (stride == 1) picture.rays += rays;
     if (options.mode == Mode::kSurface) {
-      int const rays = options.occlusionRays >= 0 ? options.occlusionRays : 2;
-      addOne(SurfaceShader{scene, rays, static_cast<float>(0.15 * scene.diagonal),
+      int const occlusion = options.occlusionRays >= 0 ? options.occlusionRays : 2;
+      addOne(SurfaceShader{scene, occlusion, static_cast<float>(0.15 * scene.diagonal),
                            static_cast<float>(0.5 * voxel)});
     } else if (options.mode == Mode::kFog) {
       addOne(FogShader{fog.view, isFinal});
@@ -486,7 +560,7 @@ Picture render(Field& field, Affine const& tileToWorld, Camera const& camera, Re
     }
   }
   picture.seconds = seconds();
-  picture.rays = static_cast<std::int64_t>(count) * picture.samples;
+  repeatUnmarked(picture, marked);
   divide(picture);
   if (!picture.value.empty()) colorValues(picture, options, transfer);
   return picture;

@@ -22,8 +22,8 @@ struct RenderOptions {
   int width = 1024, height = 1024;
   Mode mode = Mode::kFog;
   Quality quality = Quality::kPreview;
-  float iso = 0;            ///< of kSurface
-  int samples = 0;          ///< for each pixel; 0: as the quality asks
+  float iso = 0;   ///< of kSurface
+  int samples = 0; ///< for each pixel; 0: as the quality asks, of a fog's preview maybe fewer than pixels
   double timeLimit = 0;     ///< seconds, after which no further sample of the pixels is begun; 0: none
   TransferOptions transfer; ///< of fogs and projections
   bool colored = false;     ///< fogs take their colours from the map; else they are white
@@ -53,7 +53,7 @@ struct Picture {
   Vec3d light;             ///< world direction to the light that was used
   float low = 0, high = 0; ///< range of the colours that was used
   double seconds = 0;      ///< of the rays alone
-  std::int64_t rays = 0;   ///< from the camera
+  std::int64_t rays = 0;   ///< from the camera; fewer than pixels where some follow from those about them
 };
 
 /// @param tileToWorld The place in the world of a sample, from its tile-space position.

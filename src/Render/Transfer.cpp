@@ -3,6 +3,7 @@
 #include "Render/Colors.h"
 
 #include <algorithm>
+#include <bit>
 #include <charconv>
 #include <cmath>
 #include <stdexcept>
@@ -145,8 +146,7 @@ float Transfer::largestOpacity(float low, float high) const {
   auto const last = std::min<std::size_t>(
       static_cast<std::size_t>(std::ceil(m_view.place(high) * (kTransferSize - 1))), kTransferSize - 1);
   std::size_t const count = std::max(last, first) - first + 1;
-  std::size_t level = 0;
-  while ((std::size_t(2) << level) <= count) ++level;
+  auto const level = static_cast<std::size_t>(std::bit_width(count >> 1));
   return std::max(m_largest[level][first], m_largest[level][first + count - (std::size_t(1) << level)]);
 }
 

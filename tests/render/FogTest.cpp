@@ -186,6 +186,65 @@ TEST(Fog, RequirementSameForAnyNumberOfThreads) {
     }
 }
 
+// A ball that is lumpy from voxel to voxel.
+float lumps(double x, double y, double z) {
+  double const r = std::sqrt(x * x + y * y + z * z);
+  return static_cast<float>(std::max(
+      0.0, (1.2 - r / 13) * (0.6 + 0.4 * std::sin(2.1 * x) * std::cos(1.7 * y) * std::sin(1.9 * z + 0.3))));
+}
+
+// requirement: where voxels are several pixels wide most pixels need no ray, and they are no others than
+// those that have one; voxels that are no cubes, or turned, and any camera and number of threads included
+TEST(Fog, RequirementPixelsBetweenRaysAreThoseOfRays) {
+  RenderCase const volume(lumps, -kHalf, kHalf);
+  Affine turned;
+  turned.rows[0] = {0.6, -0.8, 0.2}, turned.rows[1] = {0.8, 0.6, 0}, turned.rows[2] = {0, 0.3, 2.5};
+  for (Affine const& toWorld : {Affine{}, turned})
+    for (double distance : {25.0, 110.0}) {
+      Field field(volume.grid());
+      CameraOptions from;
+      from.position = Vec3d{0.7 * distance, 0.3 * distance, 0.65 * distance},
+      from.focalPoint = Vec3d{0, 0, 0};
+      Camera const camera(from, {{0, 0, 0}}, 0, 237.0 / 211);
+      RenderOptions options = smallOptions(Mode::kFog);
+      options.width = 237, options.height = 211; // no multiples of anything
+      options.colored = true;
+      Picture const some = render(field, toWorld, camera, options);
+      auto const bytes = toBytes(some, {0.1f, 0.1f, 0.1f}, true);
+      options.samples = 1;
+      Picture const all = render(field, toWorld, camera, options);
+      EXPECT_LT(some.rays, all.rays * 2 / 3);
+      double worst = 0, depth = 0;
+      int seen = 0;
+      for (std::size_t n = 0; n < all.opacity.size(); ++n) {
+        worst = std::max(worst, std::abs(double(all.opacity[n]) - double(some.opacity[n])));
+        for (int a = 0; a < 3; ++a)
+          worst = std::max(worst, std::abs(double(all.color[n][a]) - double(some.color[n][a])));
+        seen += all.opacity[n] > 0.05f;
+        if (all.opacity[n] > 0.05f) depth = std::max(depth, std::abs(double(all.depth[n] - some.depth[n])));
+      }
+      EXPECT_GT(seen, 2000);
+      EXPECT_LT(worst, 0.006);
+      EXPECT_LT(depth, 1.0); // a voxel
+      options.samples = 0;
+      for (int threads : {1, 2, 8}) {
+        options.threads = threads;
+        EXPECT_EQ(toBytes(render(field, toWorld, camera, options), {0.1f, 0.1f, 0.1f}, true), bytes)
+            << threads;
+      }
+    }
+}
+
+// requirement: a shell that is thinner than a voxel is not looked for between rays
+TEST(Fog, RequirementThinShellsHaveARayForEachPixel) {
+  RenderCase const volume(lumps, -kHalf, kHalf);
+  Field field(volume.grid());
+  RenderOptions options = smallOptions(Mode::kFog);
+  options.width = options.height = 200;
+  options.transfer.opacity = "0:0,0.49:0,0.5:1,0.51:0,1:0";
+  EXPECT_EQ(render(field, Affine{}, frontCamera(90, 20), options).rays, 200 * 200);
+}
+
 // requirement
 TEST(Transfer, RequirementLargestOpacityIsABound) {
   TransferOptions options = unit();

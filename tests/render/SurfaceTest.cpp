@@ -90,6 +90,43 @@ TEST(Surface, RequirementSphereIsWhereItIs) {
   }
 }
 
+// requirement: where a sample looks like those about it, it stands for all: with fewer rays nearly the same
+// picture, edges and shadows included, at any number of threads
+TEST(Surface, RequirementCalmPixelsNeedNoMoreSamples) {
+  RenderCase const volume(
+      [](double x, double y, double z) {
+        double const ball = std::sqrt(x * x + y * y + z * z) - 12, plate = std::abs(y + 11) - 1.5;
+        return static_cast<float>(std::clamp(std::min(ball, plate), -3.0, 3.0));
+      },
+      -20, 20, {}, 3);
+  Field field(volume.grid());
+  CameraOptions from;
+  from.position = Vec3d{60, 50, 70}, from.focalPoint = Vec3d{0, -3, 0};
+  Camera const camera(from, {{0, 0, 0}}, 0, 1);
+  RenderOptions options;
+  options.mode = Mode::kSurface;
+  options.width = options.height = 160;
+  Picture const some = render(field, Affine{}, camera, options);
+  auto const bytes = toBytes(some, {0.1f, 0.1f, 0.1f}, true);
+  options.samples = some.samples;
+  Picture const all = render(field, Affine{}, camera, options);
+  EXPECT_LT(some.rays, all.rays * 3 / 4);
+  double sum = 0, most = 0;
+  for (std::size_t n = 0; n < all.opacity.size(); ++n) {
+    EXPECT_NEAR(some.opacity[n], all.opacity[n], 0.26);
+    double const by = std::abs(double(all.color[n].y) - double(some.color[n].y));
+    sum += by, most = std::max(most, by);
+    if (all.opacity[n] == 1 && some.opacity[n] == 1) { ASSERT_NEAR(some.depth[n], all.depth[n], 2) << n; }
+  }
+  EXPECT_LT(sum / double(all.opacity.size()), 0.002);
+  EXPECT_LT(most, 0.4);
+  options.samples = 0;
+  for (int threads : {1, 2, 8}) {
+    options.threads = threads;
+    EXPECT_EQ(toBytes(render(field, Affine{}, camera, options), {0.1f, 0.1f, 0.1f}, true), bytes) << threads;
+  }
+}
+
 // requirement: a plane through samples is met once, and zeros round a positive field are no surface
 TEST(Surface, BoundaryValuesThatAreExactlyThere) {
   RenderCase const plane([](double, double, double z) { return static_cast<float>(-z); }, -16, 16, {}, 100);
