@@ -68,6 +68,7 @@ public:
 private:
   // Those of types that hold what they say. OpenVDB itself drops its notes for late loading.
   void readMetadata(openvdb::MetaMap& map) {
+    map.clearMetadata();
     for (auto count = m_bytes.number<std::uint32_t>(); count > 0; --count) {
       std::string const name = m_bytes.text(), type = m_bytes.text();
       std::size_t const begin = m_bytes.place();
