@@ -10,7 +10,6 @@
 #include <array>
 #include <memory>
 #include <optional>
-#include <set>
 #include <string>
 #include <vector>
 
@@ -25,6 +24,27 @@ struct GridSummary {
   std::int64_t activeTiles = 0;
   double minimum = 0, maximum = 0; ///< of values, or of the lengths of vectors
   bool hasRange = false;
+};
+
+/// The roots of a depth: their corners, and which of the places round them hold one. They are few on each
+/// axis.
+class RootPlaces {
+public:
+  RootPlaces(std::vector<Velorn::Math::int3> const& corners, int depth);
+
+  std::vector<Velorn::Math::int3> const& corners() const { return m_corners; }
+  int depth() const { return m_depth; }
+  /// @pre The corner is that of a root, or of one beside a root.
+  bool hold(Velorn::Math::int3 const& corner) const { return m_held[numberOf(corner)]; }
+
+private:
+  std::size_t numberOf(Velorn::Math::int3 const& corner) const;
+
+  std::vector<Velorn::Math::int3> m_corners;
+  int m_depth;
+  int m_shift; ///< their width is a power of two
+  std::array<std::int64_t, 3> m_first{}, m_count{};
+  std::vector<char> m_held;
 };
 
 /// Corners of tiles by depth.
@@ -52,8 +72,7 @@ public:
   virtual void collectTiles(int rootDepth, std::uint64_t mostTiles, TileCorners& corners) const = 0;
   /// Appends the corners of further roots: those on the high sides of the others where a blend would
   /// otherwise not meet the background.
-  virtual void collectBeyondRoots(std::set<std::array<int, 3>> const& roots, int depth,
-                                  std::vector<Velorn::Math::int3>& out) const = 0;
+  virtual void collectBeyondRoots(RootPlaces const& roots, std::vector<Velorn::Math::int3>& out) const = 0;
   /// The rule by which values tell what is active, or kChannel.
   virtual VdbActiveRule activeRule() const = 0;
   /// A channel with the grid's values for every sample of the tree.

@@ -88,32 +88,29 @@ public:
     joinSorted(at(VdbTraits::kMaxDepth), known, std::move(before));
   }
 
-  void collectBeyondRoots(std::set<std::array<int, 3>> const& roots, int depth,
-                          std::vector<int3>& out) const override {
-    int const width = VdbTraits::width(depth), step = width / VdbTraits::kTDW;
+  void collectBeyondRoots(RootPlaces const& roots, std::vector<int3>& out) const override {
+    int const width = VdbTraits::width(roots.depth()), step = width / VdbTraits::kTDW;
     auto grid = m_grid->getConstAccessor();
-    for (auto const& root : roots)
+    for (int3 const& root : roots.corners())
       for (int n = 1; n < 8; ++n) {
         int const side[3] = {n & 1, n >> 1 & 1, n >> 2};
-        std::array<std::int64_t, 3> beyond;
         bool inside = true;
-        for (std::size_t a = 0; a < 3; ++a) {
-          beyond[a] = std::int64_t(root[a]) + std::int64_t(side[a]) * width;
-          inside = inside && beyond[a] <= VdbTraits::kMaxTileCoord;
-        }
-        int3 const next{static_cast<int>(beyond[0]), static_cast<int>(beyond[1]),
-                        static_cast<int>(beyond[2])};
-        if (!inside || roots.count({next.x, next.y, next.z})) continue;
+        for (int a = 0; a < 3; ++a)
+          inside =
+              inside && std::int64_t(root[a]) + std::int64_t(side[a]) * width <= VdbTraits::kMaxTileCoord;
+        if (!inside) continue;
+        int3 const next{root.x + side[0] * width, root.y + side[1] * width, root.z + side[2] * width};
+        if (roots.hold(next)) continue;
         // Without a root there, the outermost samples would go on for ever.
         bool ends = false;
         for (int s = 0; s < VdbTraits::kTileDataSize && !ends; ++s) {
           int const at[3] = {s % 4, s / 4 % 4, s / 16};
           bool outermost = true;
           for (int a = 0; a < 3; ++a) outermost = outermost && (!side[a] || at[a] == 3);
-          ends =
-              outermost && !sameBits(Value(grid.getValue(Coord(root[0] + at[0] * step, root[1] + at[1] * step,
-                                                               root[2] + at[2] * step))),
-                                     m_background);
+          ends = outermost &&
+                 !sameBits(
+                     Value(grid.getValue(toCoord(root).offsetBy(at[0] * step, at[1] * step, at[2] * step))),
+                     m_background);
         }
         if (ends) out.push_back(next);
       }

@@ -97,9 +97,8 @@ std::size_t countOf(TileCorners const& corners) {
 }
 
 void addRootsBeyond(std::vector<int3>& roots, Group const& group, int depth) {
-  std::set<std::array<int, 3>> known;
-  for (int3 const& c : roots) known.insert({c.x, c.y, c.z});
-  for (auto const& grid : group.grids) grid->collectBeyondRoots(known, depth, roots);
+  RootPlaces const known(roots, depth);
+  for (auto const& grid : group.grids) grid->collectBeyondRoots(known, roots);
   TileCorners only;
   only[static_cast<std::size_t>(depth)] = std::move(roots);
   completeCorners(only, depth);
