@@ -40,13 +40,9 @@ RootPlaces::RootPlaces(std::vector<int3> const& corners, int depth)
     m_count[a] = (std::int64_t((*high)[static_cast<int>(a)]) >> m_shift) + 2 - m_first[a];
   }
   m_held.resize(static_cast<std::size_t>(m_count[0] * m_count[1] * m_count[2]));
-  for (int3 const& c : corners) m_held[numberOf(c)] = 1;
-}
-
-std::size_t RootPlaces::numberOf(int3 const& corner) const {
-  auto const place = [&](std::size_t a, int c) { return (std::int64_t(c) >> m_shift) - m_first[a]; };
-  return static_cast<std::size_t>((place(0, corner.x) * m_count[1] + place(1, corner.y)) * m_count[2] +
-                                  place(2, corner.z));
+  for (int3 const& c : corners) m_held[static_cast<std::size_t>(numberOf(c))] = 1;
+  for (std::size_t side = 1; side < 8; ++side)
+    m_step[side] = ((side & 1 ? m_count[1] : 0) + (side & 2 ? 1 : 0)) * m_count[2] + (side & 4 ? 1 : 0);
 }
 
 GridSummary joinSummaries(GridSummary a, GridSummary const& b) {

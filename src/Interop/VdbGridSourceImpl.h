@@ -34,16 +34,26 @@ public:
 
   std::vector<Velorn::Math::int3> const& corners() const { return m_corners; }
   int depth() const { return m_depth; }
-  /// @pre The corner is that of a root, or of one beside a root.
-  bool hold(Velorn::Math::int3 const& corner) const { return m_held[numberOf(corner)]; }
+  /// The places without a root among the seven at a root's high sides. The place one further along the axes
+  /// whose bits are set in `side` has bit 1 << side; x has bit 1.
+  unsigned missingBeside(Velorn::Math::int3 const& root) const {
+    char const* const held = m_held.data() + numberOf(root);
+    unsigned missing = 0;
+    for (unsigned side = 1; side < 8; ++side) missing |= unsigned(!held[m_step[side]]) << side;
+    return missing;
+  }
 
 private:
-  std::size_t numberOf(Velorn::Math::int3 const& corner) const;
+  std::int64_t numberOf(Velorn::Math::int3 const& corner) const {
+    auto const place = [&](std::size_t a, int c) { return (std::int64_t(c) >> m_shift) - m_first[a]; };
+    return (place(0, corner.x) * m_count[1] + place(1, corner.y)) * m_count[2] + place(2, corner.z);
+  }
 
   std::vector<Velorn::Math::int3> m_corners;
   int m_depth;
   int m_shift; ///< their width is a power of two
   std::array<std::int64_t, 3> m_first{}, m_count{};
+  std::array<std::int64_t, 8> m_step{}; ///< to the place beside
   std::vector<char> m_held;
 };
 

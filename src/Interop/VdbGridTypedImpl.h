@@ -91,29 +91,19 @@ public:
   void collectBeyondRoots(RootPlaces const& roots, std::vector<int3>& out) const override {
     int const width = VdbTraits::width(roots.depth()), step = width / VdbTraits::kTDW;
     auto grid = m_grid->getConstAccessor();
-    for (int3 const& root : roots.corners())
-      for (int n = 1; n < 8; ++n) {
+    for (int3 const& root : roots.corners()) {
+      unsigned const missing = roots.missingBeside(root);
+      for (int n = 1; missing >> n != 0; ++n) {
+        if (!(missing >> n & 1)) continue;
         int const side[3] = {n & 1, n >> 1 & 1, n >> 2};
         bool inside = true;
         for (int a = 0; a < 3; ++a)
           inside =
               inside && std::int64_t(root[a]) + std::int64_t(side[a]) * width <= VdbTraits::kMaxTileCoord;
-        if (!inside) continue;
-        int3 const next{root.x + side[0] * width, root.y + side[1] * width, root.z + side[2] * width};
-        if (roots.hold(next)) continue;
-        // Without a root there, the outermost samples would go on for ever.
-        bool ends = false;
-        for (int s = 0; s < VdbTraits::kTileDataSize && !ends; ++s) {
-          int const at[3] = {s % 4, s / 4 % 4, s / 16};
-          bool outermost = true;
-          for (int a = 0; a < 3; ++a) outermost = outermost && (!side[a] || at[a] == 3);
-          ends = outermost &&
-                 !sameBits(
-                     Value(grid.getValue(toCoord(root).offsetBy(at[0] * step, at[1] * step, at[2] * step))),
-                     m_background);
-        }
-        if (ends) out.push_back(next);
+        if (inside && goesOn(grid, root, side, step))
+          out.push_back({root.x + side[0] * width, root.y + side[1] * width, root.z + side[2] * width});
       }
+    }
   }
 
   Ostil::Ptr<TileTree3D::ChannelBase> makeChannel(std::string const& name, VdbContainer const& container,
@@ -156,6 +146,21 @@ public:
 private:
   using Accessor = typename GridT::ConstAccessor;
   using Places = LeafPlaces<GridT>;
+
+  /// Whether one of a root's outermost samples on some high sides is not the background: without a root
+  /// there, it would go on for ever.
+  bool goesOn(Accessor& grid, int3 const& root, int const (&side)[3], int step) const {
+    for (int s = 0; s < VdbTraits::kTileDataSize; ++s) {
+      int const at[3] = {s % 4, s / 4 % 4, s / 16};
+      bool outermost = true;
+      for (int a = 0; a < 3; ++a) outermost = outermost && (!side[a] || at[a] == 3);
+      if (outermost &&
+          !sameBits(Value(grid.getValue(toCoord(root).offsetBy(at[0] * step, at[1] * step, at[2] * step))),
+                    m_background))
+        return true;
+    }
+    return false;
+  }
 
   /// A tile of the file's tree that is active, or has another value than the background.
   struct WideTile {
