@@ -8,9 +8,14 @@
 #include <openvdb/io/io.h>
 
 #include <algorithm>
-#include <fstream>
+#include <atomic>
+#include <cerrno>
 #include <memory>
+#include <new>
 #include <streambuf>
+
+#include <fcntl.h>
+#include <unistd.h>
 
 namespace VLN::Interop {
 
@@ -31,18 +36,53 @@ public:
   std::size_t place() const { return static_cast<std::size_t>(gptr() - eback()); }
 };
 
-// What a stream knows of the grid that is read from it.
-struct GridState {
-  openvdb::VersionId library;
-  std::uint32_t version;
-  ValueCoding coding;
-  void const* background;
-  void tell(std::istream& in) const {
-    openvdb::io::setVersion(in, library, version);
-    openvdb::io::setDataCompression(in, coding.compression);
-    openvdb::io::setGridBackgroundValuePtr(in, background);
-  }
-};
+/// Reads the buffers of a leaf, which have been walked through.
+template <class Leaf>
+void readLeaf(Leaf& leaf, WalkedBytes bytes, std::size_t place, MemoryStream& in, ValueCoding const& coding,
+              typename Leaf::ValueType const& background) {
+  using Value = typename Leaf::ValueType;
+  in.goTo(place);
+  typename Leaf::NodeMaskType mask;
+  mask.load(in);
+  leaf.setValueMask(mask);
+  bytes.take(place);
+  WrittenValues const values = walkBuffers<Leaf>(bytes, coding);
+  Value* const out = leaf.buffer().data();
+  Value some[Leaf::SIZE];
+  Value* const written = values.count == Leaf::SIZE ? out : some;
+  in.goTo(values.place);
+  if (coding.half)
+    openvdb::io::HalfReader<openvdb::io::RealToHalf<Value>::isReal, Value>::read(in, written, values.count,
+                                                                                 coding.compression);
+  else
+    openvdb::io::readData<Value>(in, written, values.count, coding.compression);
+  if (written != out) spreadValues(values, bytes.data() + place, written, background, out);
+}
+
+/// All bytes of a file; null where they are not there.
+std::unique_ptr<char[]> bytesOf(std::string const& path, std::size_t size) {
+  int const file = open(path.c_str(), O_RDONLY | O_CLOEXEC);
+  if (file < 0) return nullptr;
+  std::unique_ptr<char[]> bytes(new (std::nothrow) char[size]);
+  std::atomic<bool> whole = bytes != nullptr;
+  constexpr std::int64_t kPart = 1 << 20;
+  if (bytes)
+    parallelFor(0, std::int64_t(size),
+                [&](std::int64_t first, std::int64_t last) {
+                  while (first < last) {
+                    ssize_t const got =
+                        pread(file, bytes.get() + first, static_cast<std::size_t>(last - first), first);
+                    if (got < 0 && errno == EINTR) continue;
+                    if (got <= 0) break;
+                    first += got;
+                  }
+                  if (first < last) whole = false;
+                },
+                {.grain = kPart});
+  close(file);
+  if (!whole) bytes.reset();
+  return bytes;
+}
 
 class CheckedReader : public openvdb::io::Archive {
 public:
@@ -113,15 +153,15 @@ private:
     m_in.goTo(begin);
     GridBase::Ptr grid = descriptor.read(m_in);
     walkOnlyIf(m_in.place() == m_bytes.place());
-    GridState state{libraryVersion(), fileVersion(), {m_bytes.number<std::uint32_t>(), false}, nullptr};
-    openvdb::io::setDataCompression(m_in, state.coding.compression);
+    ValueCoding coding{m_bytes.number<std::uint32_t>(), false};
+    openvdb::io::setDataCompression(m_in, coding.compression);
     readMetadata(*grid);
     readTransform(*grid);
-    state.coding.half = grid->saveFloatAsHalf();
+    coding.half = grid->saveFloatAsHalf();
     bool done = false;
     auto const attempt = [&]<class GridT>(GridT const*) {
       if (!done && grid->isType<GridT>()) {
-        readTree(static_cast<GridT&>(*grid).tree(), state);
+        readTree(static_cast<GridT&>(*grid).tree(), coding);
         done = true;
       }
     };
@@ -136,16 +176,15 @@ private:
     return grid;
   }
 
-  template <class TreeT> void readTree(TreeT& tree, GridState state) {
+  template <class TreeT> void readTree(TreeT& tree, ValueCoding const& coding) {
     using Leaf = typename TreeT::LeafNodeType;
     std::size_t const begin = m_bytes.place();
-    std::uint64_t const memory = walkTopology<TreeT>(m_bytes, state.coding);
+    std::uint64_t const memory = walkTopology<TreeT>(m_bytes, coding);
     walkOnlyIf(memory <= m_memoryLeft);
     m_memoryLeft -= memory;
     m_in.goTo(begin);
-    tree.readTopology(m_in, state.coding.half);
+    tree.readTopology(m_in, coding.half);
     walkOnlyIf(m_in.place() == m_bytes.place());
-    state.background = &tree.background();
 
     std::vector<Leaf*> leaves;
     leaves.reserve(tree.leafCount());
@@ -154,16 +193,14 @@ private:
     places.reserve(leaves.size());
     for (std::size_t n = 0; n < leaves.size(); ++n) {
       places.push_back(m_bytes.place());
-      walkBuffers<Leaf>(m_bytes, state.coding);
+      walkBuffers<Leaf>(m_bytes, coding);
     }
+    WalkedBytes const all(m_bytes.data(), m_bytes.size());
     parallelFor(0, std::int64_t(leaves.size()),
                 [&](std::int64_t first, std::int64_t last) {
-                  MemoryStream in(m_bytes);
-                  state.tell(in);
-                  for (auto n = static_cast<std::size_t>(first); n < static_cast<std::size_t>(last); ++n) {
-                    in.goTo(places[n]);
-                    leaves[n]->readBuffers(in, state.coding.half);
-                  }
+                  MemoryStream in(all);
+                  for (auto n = static_cast<std::size_t>(first); n < static_cast<std::size_t>(last); ++n)
+                    readLeaf(*leaves[n], all, places[n], in, coding, tree.background());
                 },
                 {.grain = 64});
   }
@@ -180,9 +217,8 @@ std::optional<VdbFile> readChecked(std::string const& path, std::uint64_t fileSi
   if (fileSize > memoryBytes) return std::nullopt;
   try {
     auto const size = static_cast<std::size_t>(fileSize);
-    std::unique_ptr<char[]> const bytes(new char[size]);
-    std::ifstream in(path, std::ios::binary);
-    if (!in.read(bytes.get(), static_cast<std::streamsize>(size))) return std::nullopt;
+    std::unique_ptr<char[]> const bytes = bytesOf(path, size);
+    if (!bytes) return std::nullopt;
     VdbFile file;
     file.path = path;
     file.memoryBytes = memoryBytes;

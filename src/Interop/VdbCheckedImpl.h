@@ -1,6 +1,6 @@
 // Reading of .vdb files whose every count and size is looked at before OpenVDB's own readers meet them.
 //
-//   bytes of the file --> walked through --> nodes made by OpenVDB --> leaves filled by OpenVDB, in parallel
+//   bytes of the file --> walked through --> nodes made by OpenVDB --> leaves filled in parallel
 //
 // The walk follows grids of the usual trees in files of today's versions. Whatever else comes, be it damaged
 // or only seldom, ends it without a word: such a file is for a child process.

@@ -6,7 +6,6 @@
 #include "Interop/VdbLeafImpl.h"
 
 #include <algorithm>
-#include <numeric>
 
 namespace VLN::Interop {
 
@@ -21,8 +20,12 @@ public:
   explicit TypedGrid(typename GridT::ConstPtr grid)
       : m_grid(std::move(grid))
       , m_background(m_grid->background()) {
-    collectWideTiles();
-    collectLeaves();
+    m_leaves.reserve(m_grid->tree().leafCount());
+    forEachInOrder(
+        m_grid->tree(), [&](Leaf const& leaf) { m_leaves.push_back(&leaf); },
+        [&](Coord const& c, int width, Value const& value, bool active) {
+          m_wide.push_back({c, width, value, active});
+        });
     bool fits = placesAgree(m_grid->tree());
     for (Leaf const* leaf : m_leaves) fits = fits && fitsTheTree(leaf->origin(), Leaf::DIM);
     for (WideTile const& tile : m_wide) fits = fits && (!tile.active || fitsTheTree(tile.corner, tile.width));
@@ -150,15 +153,12 @@ private:
   /// Whether one of a root's outermost samples on some high sides is not the background: without a root
   /// there, it would go on for ever.
   bool goesOn(Accessor& grid, int3 const& root, int const (&side)[3], int step) const {
-    for (int s = 0; s < VdbTraits::kTileDataSize; ++s) {
-      int const at[3] = {s % 4, s / 4 % 4, s / 16};
-      bool outermost = true;
-      for (int a = 0; a < 3; ++a) outermost = outermost && (!side[a] || at[a] == 3);
-      if (outermost &&
-          !sameBits(Value(grid.getValue(toCoord(root).offsetBy(at[0] * step, at[1] * step, at[2] * step))),
-                    m_background))
-        return true;
-    }
+    for (int k = side[2] ? 3 : 0; k < 4; ++k)
+      for (int j = side[1] ? 3 : 0; j < 4; ++j)
+        for (int i = side[0] ? 3 : 0; i < 4; ++i)
+          if (!sameBits(Value(grid.getValue(toCoord(root).offsetBy(i * step, j * step, k * step))),
+                        m_background))
+            return true;
     return false;
   }
 
@@ -169,25 +169,6 @@ private:
     Value value;
     bool active;
   };
-
-  void collectWideTiles() {
-    forEachTile(m_grid->tree(), [&](Coord const& c, int width, Value const& value, bool active) {
-      if (active || !sameBits(value, m_background)) m_wide.push_back({c, width, value, active});
-    });
-  }
-
-  void collectLeaves() {
-    std::vector<Leaf const*> leaves;
-    leaves.reserve(m_grid->tree().leafCount());
-    m_grid->tree().getNodes(leaves);
-    std::vector<std::uint64_t> order(leaves.size());
-    std::iota(order.begin(), order.end(), std::uint64_t(0));
-    parallelSortPositions(order.data(), std::int64_t(order.size()), [&](std::uint64_t a, std::uint64_t b) {
-      return TileTree3D::mortonLess(toInt3(leaves[a]->origin()), toInt3(leaves[b]->origin()));
-    });
-    m_leaves.reserve(leaves.size());
-    for (std::uint64_t const n : order) m_leaves.push_back(leaves[n]);
-  }
 
   /// What a look at every voxel tells.
   struct Findings {
@@ -438,12 +419,7 @@ private:
     if (depth == VdbTraits::kMaxDepth) {
       Leaf const* leaf = grid.probeConstLeaf(origin);
       if (!leaf) return;
-      openvdb::Index const first = Leaf::coordToOffset(origin);
-      for (openvdb::Index k = 0; k < 4; ++k)
-        for (openvdb::Index j = 0; j < 4; ++j)
-          for (openvdb::Index i = 0; i < 4; ++i)
-            *states++ = static_cast<unsigned char>(
-                kVdbStateLeaf | (leaf->isValueOn(first + 64 * i + 8 * j + k) ? kVdbStateActive : 0));
+      writeBlockStates(*leaf, static_cast<int>(Leaf::coordToOffset(origin)), states);
       return;
     }
     int const step = VdbTraits::width(depth) / VdbTraits::kTDW;
@@ -464,7 +440,7 @@ private:
   typename GridT::ConstPtr m_grid;
   Value m_background;
   std::vector<Leaf const*> m_leaves; ///< along the Z-shaped curve
-  std::vector<WideTile> m_wide;
+  std::vector<WideTile> m_wide;      ///< likewise
   std::optional<std::string> m_whyNot;
   GridSummary m_summary;
   VdbActiveRule m_rule = VdbActiveRule::kChannel;

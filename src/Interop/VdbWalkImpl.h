@@ -9,6 +9,7 @@
 
 #include "Interop/VdbTreeImpl.h"
 
+#include <algorithm>
 #include <bit>
 #include <cstring>
 #include <limits>
@@ -91,28 +92,38 @@ inline unsigned bitsIn(char const* mask, std::size_t bytes) {
   return count;
 }
 
+/// Where the values of a node lie, and what stands for those that are not there.
+struct WrittenValues {
+  std::int8_t code = 0;
+  char const* inactive = nullptr;  ///< up to two values
+  char const* selection = nullptr; ///< null, or a mask of those that are the second of two
+  std::size_t place = 0;           ///< of the others
+  std::uint32_t count = 0;         ///< of the others: all values, or the active ones
+};
+
 /// Takes the values of a node with `slots` of them.
 template <class Value>
-void walkValues(WalkedBytes& bytes, char const* activeMask, std::uint32_t slots, ValueCoding const& coding) {
+WrittenValues walkValues(WalkedBytes& bytes, char const* activeMask, std::uint32_t slots,
+                         ValueCoding const& coding) {
   using namespace openvdb::io;
-  auto const code = bytes.number<std::int8_t>();
+  WrittenValues values;
+  auto const code = values.code = bytes.number<std::int8_t>();
   walkOnlyIf(code >= NO_MASK_OR_INACTIVE_VALS && code <= NO_MASK_AND_ALL_VALS);
-  std::uint64_t const inactive = code == MASK_AND_TWO_INACTIVE_VALS ? 2
-                                 : code == NO_MASK_AND_ONE_INACTIVE_VAL || code == MASK_AND_ONE_INACTIVE_VAL
-                                     ? 1
-                                     : 0;
-  bytes.take(inactive * sizeof(Value));
-  if (code == MASK_AND_NO_INACTIVE_VALS || code == MASK_AND_ONE_INACTIVE_VAL ||
-      code == MASK_AND_TWO_INACTIVE_VALS)
-    bytes.take(slots / 8);
+  bool const one = code == NO_MASK_AND_ONE_INACTIVE_VAL || code == MASK_AND_ONE_INACTIVE_VAL;
+  bool const two = code == MASK_AND_TWO_INACTIVE_VALS;
+  values.inactive = bytes.take((two ? 2 : one ? 1 : 0) * sizeof(Value));
+  if (two || code == MASK_AND_NO_INACTIVE_VALS || code == MASK_AND_ONE_INACTIVE_VAL)
+    values.selection = bytes.take(slots / 8);
   bool const activeOnly = (coding.compression & COMPRESS_ACTIVE_MASK) && code != NO_MASK_AND_ALL_VALS;
-  std::uint64_t const count = activeOnly ? bitsIn(activeMask, slots / 8) : slots;
+  values.count = activeOnly ? bitsIn(activeMask, slots / 8) : slots;
+  values.place = bytes.place();
   using Half = RealToHalf<Value>;
   if (coding.half && Half::isReal) {
-    if (count > 0) walkData(bytes, count * sizeof(typename Half::HalfT), coding.compression);
+    if (values.count > 0) walkData(bytes, values.count * sizeof(typename Half::HalfT), coding.compression);
   } else {
-    walkData(bytes, count * sizeof(Value), coding.compression);
+    walkData(bytes, values.count * sizeof(Value), coding.compression);
   }
+  return values;
 }
 
 /// OpenVDB turns backgrounds round; the least integer has no other side.
@@ -167,9 +178,35 @@ template <class TreeT> std::uint64_t walkTopology(WalkedBytes& bytes, ValueCodin
 }
 
 /// Takes the buffers of one leaf.
-template <class Leaf> void walkBuffers(WalkedBytes& bytes, ValueCoding const& coding) {
+/// @return What follows the mask.
+template <class Leaf> WrittenValues walkBuffers(WalkedBytes& bytes, ValueCoding const& coding) {
   char const* const active = bytes.take(Leaf::SIZE / 8);
-  walkValues<typename Leaf::ValueType>(bytes, active, Leaf::SIZE, coding);
+  return walkValues<typename Leaf::ValueType>(bytes, active, Leaf::SIZE, coding);
+}
+
+/// Puts the values of a leaf in their places: those that were written are the active ones, in order.
+/// @param written Of values.count.
+template <class Value>
+void spreadValues(WrittenValues const& values, char const* activeMask, Value const* written,
+                  Value const& background, Value* out) {
+  using namespace openvdb::io;
+  // As the format has it, the second of two is the background.
+  Value inactive[2] = {
+      values.code == NO_MASK_OR_INACTIVE_VALS ? background : openvdb::math::negative(background), background};
+  if (values.code == NO_MASK_AND_ONE_INACTIVE_VAL || values.code == MASK_AND_ONE_INACTIVE_VAL)
+    std::memcpy(&inactive[0], values.inactive, sizeof(Value));
+  else if (values.code == MASK_AND_TWO_INACTIVE_VALS)
+    std::memcpy(inactive, values.inactive, sizeof inactive);
+  for (int i = 0; i < 8; ++i, out += 64) {
+    std::uint64_t active, second = 0;
+    std::memcpy(&active, activeMask + 8 * i, sizeof active);
+    if (values.selection) std::memcpy(&second, values.selection + 8 * i, sizeof second);
+    if (second == 0 || second == ~std::uint64_t(0))
+      std::fill_n(out, 64, inactive[second & 1]);
+    else
+      for (int n = 0; n < 64; ++n) out[n] = inactive[second >> n & 1];
+    for (; active != 0; active &= active - 1) out[std::countr_zero(active)] = *written++;
+  }
 }
 
 } // namespace VLN::Interop
