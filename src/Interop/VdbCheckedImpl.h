@@ -15,7 +15,7 @@ namespace VLN::Interop {
 
 /// The file's content, all of it in memory; nothing where the walk ends, or where more than `memoryBytes`
 /// would be needed.
-std::optional<VdbFile> readChecked(std::string const& path, std::uint64_t fileSize,
-                                   std::uint64_t memoryBytes);
+VLN_API std::optional<VdbFile> readChecked(std::string const& path, std::uint64_t fileSize,
+                                           std::uint64_t memoryBytes);
 
 } // namespace VLN::Interop
