@@ -121,8 +121,9 @@ public:
         parallelFor(first, last,
                     [&](std::int64_t begin, std::int64_t end) {
                       auto accessor = m_grid->getConstAccessor();
+                      LastPlace place;
                       for (std::int64_t n = begin; n < end; ++n)
-                        fillTile(accessor, container.tile(n, depth).tijk(), depth,
+                        fillTile(accessor, place, container.tile(n, depth).tijk(), depth,
                                  &*channel->tileData(n, depth).begin());
                     },
                     {.grain = 256});
@@ -326,23 +327,35 @@ private:
   }
   /// Whether one of a tile's 26 neighbours of the same width is finer, or has another value.
   static bool isExposed(Accessor& grid, WideTile const& tile) {
-    int const level = tile.width == kNodeWidths[0] ? 2 : tile.width == kNodeWidths[1] ? 1 : 0;
+    if (tile.width == kNodeWidths[0]) {
+      Places places(grid, tile.corner);
+      for (int n = 0; n < 27; ++n) {
+        auto const& place = places.at(n / 9 - 1, n / 3 % 3 - 1, n % 3 - 1);
+        if (place.leaf || !sameBits(place.value, tile.value)) return true;
+      }
+      return false;
+    }
+    int const level = tile.width == kNodeWidths[1] ? 1 : 0;
     for (int n = 0; n < 27; ++n) {
       Coord const c = tile.corner.offsetBy((n / 9 - 1) * tile.width, (n / 3 % 3 - 1) * tile.width,
                                            (n % 3 - 1) * tile.width);
-      if (level == 2 ? grid.probeConstLeaf(c) != nullptr : grid.getValueDepth(c) > level) return true;
+      if (grid.getValueDepth(c) > level) return true;
       if (!sameBits(Value(grid.getValue(c)), tile.value)) return true;
     }
     return false;
   }
 
-  /// The blocks in and before a tile that is as wide as a leaf. Those in leaves have been looked at.
-  static void collectRound(Accessor& grid, Coord const& corner, std::vector<int3>& out) {
+  /// The blocks in and before a tile that is as wide as a leaf. Those in leaves have been looked at, and
+  /// those in tiles like this one come with them.
+  void collectRound(Accessor& grid, Coord const& corner, std::vector<int3>& out) const {
     Places places(grid, corner);
     for (int x = -1; x < 2; ++x)
       for (int y = -1; y < 2; ++y)
         for (int z = -1; z < 2; ++z) {
-          if ((x == 0 && y == 0 && z == 0) || places.at(x >> 1, y >> 1, z >> 1).leaf) continue;
+          if (x == 0 && y == 0 && z == 0) continue;
+          bool const inside = x >= 0 && y >= 0 && z >= 0;
+          auto const& place = places.at(x >> 1, y >> 1, z >> 1);
+          if (place.leaf || (!inside && place.isNarrow && !sameBits(place.value, m_background))) continue;
           collectUnlessUniform(places, blockOf(corner, x, y, z), x, y, z, out);
         }
   }
@@ -374,7 +387,13 @@ private:
     return channel;
   }
 
-  static void fillTile(Accessor& grid, int3 const& corner, int depth, Element* samples) {
+  /// The place of a leaf that was looked up last: tiles that are filled one after another share it.
+  struct LastPlace {
+    std::optional<Coord> corner;
+    LeafPlace<TreeT> place;
+  };
+
+  static void fillTile(Accessor& grid, LastPlace& last, int3 const& corner, int depth, Element* samples) {
     int const step = VdbTraits::width(depth) / VdbTraits::kTDW;
     if (step >= kLeafWidth) {
       for (int k = 0; k < 4; ++k)
@@ -389,11 +408,17 @@ private:
     for (int k = 0; k < 4; k += count)
       for (int j = 0; j < 4; j += count)
         for (int i = 0; i < 4; i += count)
-          fillFromPlace(grid, toCoord(corner).offsetBy(i * step, j * step, k * step), step, count,
+          fillFromPlace(grid, last, toCoord(corner).offsetBy(i * step, j * step, k * step), step, count,
                         samples + i + 4 * (j + 4 * k));
   }
-  static void fillFromPlace(Accessor& grid, Coord const& at, int step, int count, Element* samples) {
-    Leaf const* const leaf = grid.probeConstLeaf(at);
+  static void fillFromPlace(Accessor& grid, LastPlace& last, Coord const& at, int step, int count,
+                            Element* samples) {
+    Coord const corner = at & -kLeafWidth;
+    if (last.corner != corner) {
+      last.place.lookUp(grid, corner);
+      last.corner = corner;
+    }
+    Leaf const* const leaf = last.place.leaf;
     auto const fill = [&](auto const& valueAt) {
       for (int k = 0; k < count; ++k)
         for (int j = 0; j < count; ++j)
@@ -401,14 +426,13 @@ private:
             samples[i + 4 * (j + 4 * k)] = toElement(Value(valueAt((64 * i + 8 * j + k) * step)));
     };
     if (!leaf) {
-      Value const value = grid.getValue(at);
-      return fill([&](int) { return value; });
+      return fill([&](int) { return last.place.value; });
     }
     auto const first = static_cast<int>(Leaf::coordToOffset(at));
     if constexpr (std::is_same_v<Value, bool>) { // kept as bits
       fill([&](int n) { return leaf->getValue(static_cast<openvdb::Index>(first + n)); });
     } else {
-      Value const* const values = leaf->buffer().data() + first;
+      Value const* const values = last.place.values + first;
       if (step == 1) return copyBlock(values, samples);
       fill([&](int n) { return values[n]; });
     }

@@ -215,6 +215,7 @@ template <class TreeT> struct LeafPlace {
   Leaf const* leaf = nullptr;
   Value const* values = nullptr; ///< of the leaf, unless they are bits
   Value value{};                 ///< without a leaf
+  bool isNarrow = false;         ///< whether the tile is known to be as wide as a leaf
 
   using Lower = typename TreeT::RootNodeType::ChildNodeType::ChildNodeType;
 
@@ -226,7 +227,7 @@ template <class TreeT> struct LeafPlace {
   void lookUp(Lower const& lower, Coord const& corner) {
     auto const slot = Lower::coordToOffset(corner);
     take(lower.isChildMaskOn(slot) ? lower.getTable()[slot].getChild() : nullptr);
-    if (!leaf) value = lower.getTable()[slot].getValue();
+    if (!leaf) value = lower.getTable()[slot].getValue(), isNarrow = true;
   }
   void take(Leaf const* found) {
     leaf = found;
