@@ -320,13 +320,6 @@ Verdict watchChild(int fd, pid_t child, VdbReadLimits const& limits, Memory cons
   }
 }
 
-VdbReadLimits effective(VdbReadLimits limits, std::uint64_t fileSize) {
-  if (limits.memoryBytes == 0) limits.memoryBytes = availableMemory() / 4 * 3;
-  if (limits.seconds == 0)
-    limits.seconds = static_cast<unsigned>(10 + std::min<std::uint64_t>(fileSize / kMB, 100000));
-  return limits;
-}
-
 enum class Outcome { kSound, kStalled, kGoesOn };
 
 // Reads the file in one child.
@@ -384,16 +377,23 @@ bool readInSomeChild(std::string const& path, ReadGrids const& read, VdbReadLimi
 
 } // namespace
 
+VdbReadLimits effectiveLimits(VdbReadLimits limits, std::uint64_t fileSize) {
+  if (limits.memoryBytes == 0) limits.memoryBytes = availableMemory() / 4 * 3;
+  if (limits.seconds == 0)
+    limits.seconds = static_cast<unsigned>(10 + std::min<std::uint64_t>(fileSize / kMB, 100000));
+  return limits;
+}
+
 VdbReadLimits probeInChild(std::string const& path, VdbReadLimits const& asked, std::uint64_t fileSize,
                            ReadGrids const& read) {
-  VdbReadLimits limits = effective(asked, fileSize);
+  VdbReadLimits limits = effectiveLimits(asked, fileSize);
   readInSomeChild(path, read, limits, nullptr);
   return limits;
 }
 
 VdbFile readGuarded(std::string const& path, VdbReadLimits const& asked, std::uint64_t fileSize,
                     ReadGrids const& read) {
-  VdbReadLimits const limits = effective(asked, fileSize);
+  VdbReadLimits const limits = effectiveLimits(asked, fileSize);
   VdbFile file;
   if (!readInSomeChild(path, read, limits, mayGoOn() ? &file : nullptr)) {
     try {

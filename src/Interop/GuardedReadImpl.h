@@ -7,6 +7,9 @@
 
 namespace VLN::Interop {
 
+/// Limits with numbers in place of zeros.
+VdbReadLimits effectiveLimits(VdbReadLimits limits, std::uint64_t fileSize);
+
 /// Reads all of a file.
 using ReadGrids = std::function<VdbFile()>;
 

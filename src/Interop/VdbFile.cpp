@@ -3,6 +3,7 @@
 #include "Interop/FileError.h"
 #include "Interop/GuardedReadImpl.h"
 #include "Interop/RegularFileImpl.h"
+#include "Interop/VdbCheckedImpl.h"
 #include "Interop/VdbFileImpl.h"
 
 #include <openvdb/io/Archive.h>
@@ -104,7 +105,10 @@ void probeVdbFile(std::string const& path, VdbReadLimits const& limits) {
 
 VdbFile readVdbFile(std::string const& path, VdbReadLimits const& limits) {
   openvdb::initialize();
-  return readGuarded(path, limits, checkHeader(path), [&] { return readWhole(path); });
+  std::uint64_t const size = checkHeader(path);
+  VdbReadLimits const bounds = effectiveLimits(limits, size);
+  if (auto file = readChecked(path, size, bounds.memoryBytes)) return std::move(*file);
+  return readGuarded(path, bounds, size, [&] { return readWhole(path); });
 }
 
 char const* openvdbVersion() { return openvdb::getLibraryVersionString(); }

@@ -1,10 +1,12 @@
 // Safe reading of .vdb files. No type of OpenVDB shows here.
 //
-//   file --> header looked at --> read whole in a child process --> read for real, or the child goes on
-//                                 (memory and time bounded)
+//   file --> header looked at --> every count and size looked at --> read
+//                                          |
+//                                          '--> read whole in a child process --> read for real, or the child
+//                                               (memory and time bounded)          goes on
 //
-// OpenVDB trusts its input: a damaged file can make it ask for any amount of memory, loop, or crash. The
-// child process meets all of that first, and only its verdict comes back.
+// OpenVDB trusts its input: a damaged file can make it ask for any amount of memory, loop, or crash. What is
+// not plainly sound is met by a child process first, and only its verdict comes back.
 #pragma once
 
 #include "GeometryVolume/core/Export.h"
@@ -36,9 +38,9 @@ struct SkippedGrid {
 /// @threads No other thread may be calling OpenVDB meanwhile: its locks would stay taken in the child.
 VLN_API void probeVdbFile(std::string const& path, VdbReadLimits const& limits = {});
 
-/// Makes this process read its first file once only, if it has no further threads by then: the child that
-/// reads it within the limits goes on as the program, and this process waits for it and ends as it does. For
-/// programs that do one thing and end: call it first, and endProgram() last.
+/// Makes this process read the first file that takes a child once only, if it has no further threads by then:
+/// the child that reads it within the limits goes on as the program, and this process waits for it and ends
+/// as it does. For programs that do one thing and end: call it first, and endProgram() last.
 VLN_API void goOnInReader();
 /// Ends the program, in a child that has gone on without the destructors of libraries' globals: they may wait
 /// for threads that are not there.

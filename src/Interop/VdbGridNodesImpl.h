@@ -1,9 +1,12 @@
 // The values and the nodes of a file's tree, as import and export see them.
 #pragma once
 
+#include "GeometryVolume/tiletree/Morton.h"
 #include "Interop/VdbRecord.h"
 #include "Interop/VdbTreeImpl.h"
 
+#include <algorithm>
+#include <bit>
 #include <cmath>
 #include <cstring>
 
@@ -58,20 +61,84 @@ template <class V> bool followsRule(VdbActiveRule rule, V const& value, V const&
 
 // --- Nodes ---
 
-/// Calls `f(corner, width, value, active)` for each tile of the file's tree, active or not.
-template <class TreeT, class F> void forEachTile(TreeT const& tree, F const& f) {
+/// The slots of a node along the Z-shaped curve: x leads, then y.
+template <int Log2Dim> class SlotOrder {
+public:
+  static constexpr int kSlots = 1 << 3 * Log2Dim;
+
+  SlotOrder() {
+    for (unsigned slot = 0; slot < kSlots; ++slot) {
+      unsigned rank = 0;
+      for (int bit = 0; bit < Log2Dim; ++bit)
+        for (int a = 0; a < 3; ++a) rank |= (slot >> (Log2Dim * a + bit) & 1) << (3 * bit + a);
+      m_rank[slot] = static_cast<std::uint16_t>(rank);
+      m_slot[rank] = static_cast<std::uint16_t>(slot);
+    }
+  }
+  static SlotOrder const& table() {
+    static SlotOrder const made;
+    return made;
+  }
+
+  /// Calls `f(slot)` for the slots that `wanted` holds for.
+  template <class Wanted, class F> void forEach(Wanted const& wanted, F const& f) const {
+    std::uint64_t ranks[kSlots / 64] = {};
+    for (unsigned slot = 0; slot < kSlots; ++slot) {
+      unsigned const rank = m_rank[slot];
+      ranks[rank / 64] |= std::uint64_t(wanted(slot)) << rank % 64;
+    }
+    for (unsigned n = 0; n < kSlots / 64; ++n)
+      for (std::uint64_t word = ranks[n]; word != 0; word &= word - 1)
+        f(unsigned(m_slot[64 * n + static_cast<unsigned>(std::countr_zero(word))]));
+  }
+
+private:
+  std::uint16_t m_rank[kSlots], m_slot[kSlots];
+};
+
+/// Goes through a file's tree along the Z-shaped curve: calls `onLeaf(leaf)`, and `onTile(corner, width,
+/// value, active)` for each tile that is active or has another value than the background.
+template <class TreeT, class OnLeaf, class OnTile>
+void forEachInOrder(TreeT const& tree, OnLeaf const& onLeaf, OnTile const& onTile) {
   using Upper = typename TreeT::RootNodeType::ChildNodeType;
-  using Lower = typename Upper::ChildNodeType;
+  using Value = typename TreeT::ValueType;
+  Value const background = tree.background();
+  auto const inNode = [&]<class Node, class OnChild>(Node const& node, OnChild const& onChild) {
+    auto const* const table = node.getTable();
+    auto const& children = node.getChildMask();
+    auto const& active = node.getValueMask();
+    SlotOrder<Node::LOG2DIM>::table().forEach(
+        [&](unsigned slot) {
+          return children.isOn(slot) || active.isOn(slot) || !sameBits(table[slot].getValue(), background);
+        },
+        [&](unsigned slot) {
+          if (children.isOn(slot)) return onChild(*table[slot].getChild());
+          Coord corner;
+          Node::offsetToLocalCoord(slot, corner);
+          onTile((corner << Node::ChildNodeType::TOTAL) + node.origin(), 1 << Node::ChildNodeType::TOTAL,
+                 table[slot].getValue(), active.isOn(slot));
+        });
+  };
+  struct Entry {
+    Coord corner;
+    Upper const* node;
+    Value value;
+    bool active;
+  };
+  std::vector<Entry> entries;
+  for (auto it = tree.root().cbeginChildOn(); it; ++it) entries.push_back({it.getCoord(), &*it, {}, false});
   for (auto it = tree.root().cbeginValueAll(); it; ++it)
-    f(it.getCoord(), kNodeWidths[2], *it, it.isValueOn());
-  std::vector<Upper const*> uppers;
-  tree.getNodes(uppers);
-  for (Upper const* node : uppers)
-    for (auto it = node->cbeginValueAll(); it; ++it) f(it.getCoord(), kNodeWidths[1], *it, it.isValueOn());
-  std::vector<Lower const*> lowers;
-  tree.getNodes(lowers);
-  for (Lower const* node : lowers)
-    for (auto it = node->cbeginValueAll(); it; ++it) f(it.getCoord(), kNodeWidths[0], *it, it.isValueOn());
+    if (it.isValueOn() || !sameBits(*it, background))
+      entries.push_back({it.getCoord(), nullptr, *it, it.isValueOn()});
+  std::sort(entries.begin(), entries.end(), [](Entry const& a, Entry const& b) {
+    return TileTree3D::mortonLess(toInt3(a.corner), toInt3(b.corner));
+  });
+  for (Entry const& entry : entries) {
+    if (!entry.node)
+      onTile(entry.corner, kNodeWidths[2], entry.value, entry.active);
+    else
+      inNode(*entry.node, [&](auto const& lower) { inNode(lower, onLeaf); });
+  }
 }
 
 /// Whether every node lies where a search for its position looks: the root's entries come from the file, and

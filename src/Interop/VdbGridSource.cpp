@@ -1,6 +1,7 @@
 #include "Interop/VdbGridSourceImpl.h"
 
 #include <algorithm>
+#include <bit>
 #include <iterator>
 
 namespace VLN::Interop {
@@ -23,6 +24,26 @@ void sortCorners(std::vector<int3>& corners) {
 }
 
 } // namespace
+
+RootPlaces::RootPlaces(std::vector<int3> const& corners, int depth)
+    : m_corners(corners)
+    , m_depth(depth)
+    , m_shift(std::countr_zero(static_cast<unsigned>(VdbTraits::width(depth)))) {
+  if (corners.empty()) return;
+  for (std::size_t a = 0; a < 3; ++a) {
+    auto const [low, high] =
+        std::minmax_element(corners.begin(), corners.end(), [a](int3 const& b, int3 const& c) {
+          return b[static_cast<int>(a)] < c[static_cast<int>(a)];
+        });
+    // With a margin: places beside the outermost ones are asked for too.
+    m_first[a] = (std::int64_t((*low)[static_cast<int>(a)]) >> m_shift) - 1;
+    m_count[a] = (std::int64_t((*high)[static_cast<int>(a)]) >> m_shift) + 2 - m_first[a];
+  }
+  m_held.resize(static_cast<std::size_t>(m_count[0] * m_count[1] * m_count[2]));
+  for (int3 const& c : corners) m_held[static_cast<std::size_t>(numberOf(c))] = 1;
+  for (std::size_t side = 1; side < 8; ++side)
+    m_step[side] = ((side & 1 ? m_count[1] : 0) + (side & 2 ? 1 : 0)) * m_count[2] + (side & 4 ? 1 : 0);
+}
 
 GridSummary joinSummaries(GridSummary a, GridSummary const& b) {
   grow(a.stored, b.stored), grow(a.active, b.active);

@@ -10,7 +10,6 @@
 #include <array>
 #include <memory>
 #include <optional>
-#include <set>
 #include <string>
 #include <vector>
 
@@ -25,6 +24,37 @@ struct GridSummary {
   std::int64_t activeTiles = 0;
   double minimum = 0, maximum = 0; ///< of values, or of the lengths of vectors
   bool hasRange = false;
+};
+
+/// The roots of a depth: their corners, and which of the places round them hold one. They are few on each
+/// axis.
+class RootPlaces {
+public:
+  RootPlaces(std::vector<Velorn::Math::int3> const& corners, int depth);
+
+  std::vector<Velorn::Math::int3> const& corners() const { return m_corners; }
+  int depth() const { return m_depth; }
+  /// The places without a root among the seven at a root's high sides. The place one further along the axes
+  /// whose bits are set in `side` has bit 1 << side; x has bit 1.
+  unsigned missingBeside(Velorn::Math::int3 const& root) const {
+    char const* const held = m_held.data() + numberOf(root);
+    unsigned missing = 0;
+    for (unsigned side = 1; side < 8; ++side) missing |= unsigned(!held[m_step[side]]) << side;
+    return missing;
+  }
+
+private:
+  std::int64_t numberOf(Velorn::Math::int3 const& corner) const {
+    auto const place = [&](std::size_t a, int c) { return (std::int64_t(c) >> m_shift) - m_first[a]; };
+    return (place(0, corner.x) * m_count[1] + place(1, corner.y)) * m_count[2] + place(2, corner.z);
+  }
+
+  std::vector<Velorn::Math::int3> m_corners;
+  int m_depth;
+  int m_shift; ///< their width is a power of two
+  std::array<std::int64_t, 3> m_first{}, m_count{};
+  std::array<std::int64_t, 8> m_step{}; ///< to the place beside
+  std::vector<char> m_held;
 };
 
 /// Corners of tiles by depth.
@@ -52,8 +82,7 @@ public:
   virtual void collectTiles(int rootDepth, std::uint64_t mostTiles, TileCorners& corners) const = 0;
   /// Appends the corners of further roots: those on the high sides of the others where a blend would
   /// otherwise not meet the background.
-  virtual void collectBeyondRoots(std::set<std::array<int, 3>> const& roots, int depth,
-                                  std::vector<Velorn::Math::int3>& out) const = 0;
+  virtual void collectBeyondRoots(RootPlaces const& roots, std::vector<Velorn::Math::int3>& out) const = 0;
   /// The rule by which values tell what is active, or kChannel.
   virtual VdbActiveRule activeRule() const = 0;
   /// A channel with the grid's values for every sample of the tree.

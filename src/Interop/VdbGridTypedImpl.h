@@ -6,7 +6,6 @@
 #include "Interop/VdbLeafImpl.h"
 
 #include <algorithm>
-#include <numeric>
 
 namespace VLN::Interop {
 
@@ -21,8 +20,12 @@ public:
   explicit TypedGrid(typename GridT::ConstPtr grid)
       : m_grid(std::move(grid))
       , m_background(m_grid->background()) {
-    collectWideTiles();
-    collectLeaves();
+    m_leaves.reserve(m_grid->tree().leafCount());
+    forEachInOrder(
+        m_grid->tree(), [&](Leaf const& leaf) { m_leaves.push_back(&leaf); },
+        [&](Coord const& c, int width, Value const& value, bool active) {
+          m_wide.push_back({c, width, value, active});
+        });
     bool fits = placesAgree(m_grid->tree());
     for (Leaf const* leaf : m_leaves) fits = fits && fitsTheTree(leaf->origin(), Leaf::DIM);
     for (WideTile const& tile : m_wide) fits = fits && (!tile.active || fitsTheTree(tile.corner, tile.width));
@@ -88,35 +91,22 @@ public:
     joinSorted(at(VdbTraits::kMaxDepth), known, std::move(before));
   }
 
-  void collectBeyondRoots(std::set<std::array<int, 3>> const& roots, int depth,
-                          std::vector<int3>& out) const override {
-    int const width = VdbTraits::width(depth), step = width / VdbTraits::kTDW;
+  void collectBeyondRoots(RootPlaces const& roots, std::vector<int3>& out) const override {
+    int const width = VdbTraits::width(roots.depth()), step = width / VdbTraits::kTDW;
     auto grid = m_grid->getConstAccessor();
-    for (auto const& root : roots)
-      for (int n = 1; n < 8; ++n) {
+    for (int3 const& root : roots.corners()) {
+      unsigned const missing = roots.missingBeside(root);
+      for (int n = 1; missing >> n != 0; ++n) {
+        if (!(missing >> n & 1)) continue;
         int const side[3] = {n & 1, n >> 1 & 1, n >> 2};
-        std::array<std::int64_t, 3> beyond;
         bool inside = true;
-        for (std::size_t a = 0; a < 3; ++a) {
-          beyond[a] = std::int64_t(root[a]) + std::int64_t(side[a]) * width;
-          inside = inside && beyond[a] <= VdbTraits::kMaxTileCoord;
-        }
-        int3 const next{static_cast<int>(beyond[0]), static_cast<int>(beyond[1]),
-                        static_cast<int>(beyond[2])};
-        if (!inside || roots.count({next.x, next.y, next.z})) continue;
-        // Without a root there, the outermost samples would go on for ever.
-        bool ends = false;
-        for (int s = 0; s < VdbTraits::kTileDataSize && !ends; ++s) {
-          int const at[3] = {s % 4, s / 4 % 4, s / 16};
-          bool outermost = true;
-          for (int a = 0; a < 3; ++a) outermost = outermost && (!side[a] || at[a] == 3);
-          ends =
-              outermost && !sameBits(Value(grid.getValue(Coord(root[0] + at[0] * step, root[1] + at[1] * step,
-                                                               root[2] + at[2] * step))),
-                                     m_background);
-        }
-        if (ends) out.push_back(next);
+        for (int a = 0; a < 3; ++a)
+          inside =
+              inside && std::int64_t(root[a]) + std::int64_t(side[a]) * width <= VdbTraits::kMaxTileCoord;
+        if (inside && goesOn(grid, root, side, step))
+          out.push_back({root.x + side[0] * width, root.y + side[1] * width, root.z + side[2] * width});
       }
+    }
   }
 
   Ostil::Ptr<TileTree3D::ChannelBase> makeChannel(std::string const& name, VdbContainer const& container,
@@ -131,8 +121,9 @@ public:
         parallelFor(first, last,
                     [&](std::int64_t begin, std::int64_t end) {
                       auto accessor = m_grid->getConstAccessor();
+                      LastPlace place;
                       for (std::int64_t n = begin; n < end; ++n)
-                        fillTile(accessor, container.tile(n, depth).tijk(), depth,
+                        fillTile(accessor, place, container.tile(n, depth).tijk(), depth,
                                  &*channel->tileData(n, depth).begin());
                     },
                     {.grain = 256});
@@ -160,6 +151,18 @@ private:
   using Accessor = typename GridT::ConstAccessor;
   using Places = LeafPlaces<GridT>;
 
+  /// Whether one of a root's outermost samples on some high sides is not the background: without a root
+  /// there, it would go on for ever.
+  bool goesOn(Accessor& grid, int3 const& root, int const (&side)[3], int step) const {
+    for (int k = side[2] ? 3 : 0; k < 4; ++k)
+      for (int j = side[1] ? 3 : 0; j < 4; ++j)
+        for (int i = side[0] ? 3 : 0; i < 4; ++i)
+          if (!sameBits(Value(grid.getValue(toCoord(root).offsetBy(i * step, j * step, k * step))),
+                        m_background))
+            return true;
+    return false;
+  }
+
   /// A tile of the file's tree that is active, or has another value than the background.
   struct WideTile {
     Coord corner;
@@ -167,25 +170,6 @@ private:
     Value value;
     bool active;
   };
-
-  void collectWideTiles() {
-    forEachTile(m_grid->tree(), [&](Coord const& c, int width, Value const& value, bool active) {
-      if (active || !sameBits(value, m_background)) m_wide.push_back({c, width, value, active});
-    });
-  }
-
-  void collectLeaves() {
-    std::vector<Leaf const*> leaves;
-    leaves.reserve(m_grid->tree().leafCount());
-    m_grid->tree().getNodes(leaves);
-    std::vector<std::uint64_t> order(leaves.size());
-    std::iota(order.begin(), order.end(), std::uint64_t(0));
-    parallelSortPositions(order.data(), std::int64_t(order.size()), [&](std::uint64_t a, std::uint64_t b) {
-      return TileTree3D::mortonLess(toInt3(leaves[a]->origin()), toInt3(leaves[b]->origin()));
-    });
-    m_leaves.reserve(leaves.size());
-    for (std::uint64_t const n : order) m_leaves.push_back(leaves[n]);
-  }
 
   /// What a look at every voxel tells.
   struct Findings {
@@ -343,23 +327,35 @@ private:
   }
   /// Whether one of a tile's 26 neighbours of the same width is finer, or has another value.
   static bool isExposed(Accessor& grid, WideTile const& tile) {
-    int const level = tile.width == kNodeWidths[0] ? 2 : tile.width == kNodeWidths[1] ? 1 : 0;
+    if (tile.width == kNodeWidths[0]) {
+      Places places(grid, tile.corner);
+      for (int n = 0; n < 27; ++n) {
+        auto const& place = places.at(n / 9 - 1, n / 3 % 3 - 1, n % 3 - 1);
+        if (place.leaf || !sameBits(place.value, tile.value)) return true;
+      }
+      return false;
+    }
+    int const level = tile.width == kNodeWidths[1] ? 1 : 0;
     for (int n = 0; n < 27; ++n) {
       Coord const c = tile.corner.offsetBy((n / 9 - 1) * tile.width, (n / 3 % 3 - 1) * tile.width,
                                            (n % 3 - 1) * tile.width);
-      if (level == 2 ? grid.probeConstLeaf(c) != nullptr : grid.getValueDepth(c) > level) return true;
+      if (grid.getValueDepth(c) > level) return true;
       if (!sameBits(Value(grid.getValue(c)), tile.value)) return true;
     }
     return false;
   }
 
-  /// The blocks in and before a tile that is as wide as a leaf. Those in leaves have been looked at.
-  static void collectRound(Accessor& grid, Coord const& corner, std::vector<int3>& out) {
+  /// The blocks in and before a tile that is as wide as a leaf. Those in leaves have been looked at, and
+  /// those in tiles like this one come with them.
+  void collectRound(Accessor& grid, Coord const& corner, std::vector<int3>& out) const {
     Places places(grid, corner);
     for (int x = -1; x < 2; ++x)
       for (int y = -1; y < 2; ++y)
         for (int z = -1; z < 2; ++z) {
-          if ((x == 0 && y == 0 && z == 0) || places.at(x >> 1, y >> 1, z >> 1).leaf) continue;
+          if (x == 0 && y == 0 && z == 0) continue;
+          bool const inside = x >= 0 && y >= 0 && z >= 0;
+          auto const& place = places.at(x >> 1, y >> 1, z >> 1);
+          if (place.leaf || (!inside && place.isNarrow && !sameBits(place.value, m_background))) continue;
           collectUnlessUniform(places, blockOf(corner, x, y, z), x, y, z, out);
         }
   }
@@ -391,7 +387,13 @@ private:
     return channel;
   }
 
-  static void fillTile(Accessor& grid, int3 const& corner, int depth, Element* samples) {
+  /// The place of a leaf that was looked up last: tiles that are filled one after another share it.
+  struct LastPlace {
+    std::optional<Coord> corner;
+    LeafPlace<TreeT> place;
+  };
+
+  static void fillTile(Accessor& grid, LastPlace& last, int3 const& corner, int depth, Element* samples) {
     int const step = VdbTraits::width(depth) / VdbTraits::kTDW;
     if (step >= kLeafWidth) {
       for (int k = 0; k < 4; ++k)
@@ -406,11 +408,17 @@ private:
     for (int k = 0; k < 4; k += count)
       for (int j = 0; j < 4; j += count)
         for (int i = 0; i < 4; i += count)
-          fillFromPlace(grid, toCoord(corner).offsetBy(i * step, j * step, k * step), step, count,
+          fillFromPlace(grid, last, toCoord(corner).offsetBy(i * step, j * step, k * step), step, count,
                         samples + i + 4 * (j + 4 * k));
   }
-  static void fillFromPlace(Accessor& grid, Coord const& at, int step, int count, Element* samples) {
-    Leaf const* const leaf = grid.probeConstLeaf(at);
+  static void fillFromPlace(Accessor& grid, LastPlace& last, Coord const& at, int step, int count,
+                            Element* samples) {
+    Coord const corner = at & -kLeafWidth;
+    if (last.corner != corner) {
+      last.place.lookUp(grid, corner);
+      last.corner = corner;
+    }
+    Leaf const* const leaf = last.place.leaf;
     auto const fill = [&](auto const& valueAt) {
       for (int k = 0; k < count; ++k)
         for (int j = 0; j < count; ++j)
@@ -418,14 +426,13 @@ private:
             samples[i + 4 * (j + 4 * k)] = toElement(Value(valueAt((64 * i + 8 * j + k) * step)));
     };
     if (!leaf) {
-      Value const value = grid.getValue(at);
-      return fill([&](int) { return value; });
+      return fill([&](int) { return last.place.value; });
     }
     auto const first = static_cast<int>(Leaf::coordToOffset(at));
     if constexpr (std::is_same_v<Value, bool>) { // kept as bits
       fill([&](int n) { return leaf->getValue(static_cast<openvdb::Index>(first + n)); });
     } else {
-      Value const* const values = leaf->buffer().data() + first;
+      Value const* const values = last.place.values + first;
       if (step == 1) return copyBlock(values, samples);
       fill([&](int n) { return values[n]; });
     }
@@ -436,12 +443,7 @@ private:
     if (depth == VdbTraits::kMaxDepth) {
       Leaf const* leaf = grid.probeConstLeaf(origin);
       if (!leaf) return;
-      openvdb::Index const first = Leaf::coordToOffset(origin);
-      for (openvdb::Index k = 0; k < 4; ++k)
-        for (openvdb::Index j = 0; j < 4; ++j)
-          for (openvdb::Index i = 0; i < 4; ++i)
-            *states++ = static_cast<unsigned char>(
-                kVdbStateLeaf | (leaf->isValueOn(first + 64 * i + 8 * j + k) ? kVdbStateActive : 0));
+      writeBlockStates(*leaf, static_cast<int>(Leaf::coordToOffset(origin)), states);
       return;
     }
     int const step = VdbTraits::width(depth) / VdbTraits::kTDW;
@@ -462,7 +464,7 @@ private:
   typename GridT::ConstPtr m_grid;
   Value m_background;
   std::vector<Leaf const*> m_leaves; ///< along the Z-shaped curve
-  std::vector<WideTile> m_wide;
+  std::vector<WideTile> m_wide;      ///< likewise
   std::optional<std::string> m_whyNot;
   GridSummary m_summary;
   VdbActiveRule m_rule = VdbActiveRule::kChannel;

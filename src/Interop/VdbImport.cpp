@@ -97,13 +97,12 @@ std::size_t countOf(TileCorners const& corners) {
 }
 
 void addRootsBeyond(std::vector<int3>& roots, Group const& group, int depth) {
-  std::set<std::array<int, 3>> known;
-  for (int3 const& c : roots) known.insert({c.x, c.y, c.z});
-  for (auto const& grid : group.grids) grid->collectBeyondRoots(known, depth, roots);
-  TileCorners only;
-  only[static_cast<std::size_t>(depth)] = std::move(roots);
-  completeCorners(only, depth);
-  roots = std::move(only[static_cast<std::size_t>(depth)]);
+  std::vector<int3> beyond;
+  RootPlaces const known(roots, depth);
+  for (auto const& grid : group.grids) grid->collectBeyondRoots(known, beyond);
+  if (beyond.empty()) return;
+  joinSorted(roots, roots.size(), std::move(beyond));
+  roots.erase(std::unique(roots.begin(), roots.end()), roots.end());
 }
 
 // About what a volume takes: records of tiles and of their vectors, child tables and samples. Many grids that

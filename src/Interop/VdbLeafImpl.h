@@ -195,6 +195,18 @@ template <class V, class T> void copyBlock(V const* block, T* samples) {
   }
 }
 
+/// Writes the states of a block's voxels, as the samples of a tile: i fastest. The block begins with voxel
+/// `first`.
+template <class LeafT> void writeBlockStates(LeafT const& leaf, int first, unsigned char* states) {
+  for (int i = 0; i < kBlockWidth; ++i) {
+    std::uint64_t const word = maskWord(leaf, first / 64 + i) >> first % 64;
+    for (int j = 0; j < kBlockWidth; ++j)
+      for (int k = 0; k < kBlockWidth; ++k)
+        states[i + 4 * j + 16 * k] =
+            static_cast<unsigned char>(kVdbStateLeaf | (word >> (8 * j + k) & 1) * kVdbStateActive);
+  }
+}
+
 /// What lies at the place of a leaf: one, or a value of the tile there.
 template <class TreeT> struct LeafPlace {
   using Leaf = typename TreeT::LeafNodeType;
@@ -203,13 +215,24 @@ template <class TreeT> struct LeafPlace {
   Leaf const* leaf = nullptr;
   Value const* values = nullptr; ///< of the leaf, unless they are bits
   Value value{};                 ///< without a leaf
+  bool isNarrow = false;         ///< whether the tile is known to be as wide as a leaf
+
+  using Lower = typename TreeT::RootNodeType::ChildNodeType::ChildNodeType;
 
   template <class AccessorT> void lookUp(AccessorT& grid, Coord const& corner) {
-    leaf = grid.probeConstLeaf(corner);
-    if (!leaf)
-      value = grid.getValue(corner);
-    else if constexpr (!std::is_same_v<Value, bool>)
-      values = leaf->buffer().data();
+    take(grid.probeConstLeaf(corner));
+    if (!leaf) value = grid.getValue(corner);
+  }
+  /// The same where the node above is known.
+  void lookUp(Lower const& lower, Coord const& corner) {
+    auto const slot = Lower::coordToOffset(corner);
+    take(lower.isChildMaskOn(slot) ? lower.getTable()[slot].getChild() : nullptr);
+    if (!leaf) value = lower.getTable()[slot].getValue(), isNarrow = true;
+  }
+  void take(Leaf const* found) {
+    leaf = found;
+    if constexpr (!std::is_same_v<Value, bool>)
+      if (leaf) values = leaf->buffer().data();
   }
   Value valueAt(int n) const {
     if (!leaf) return value;
@@ -244,7 +267,8 @@ public:
 
   LeafPlaces(Accessor& grid, Coord const& origin)
       : m_grid(grid)
-      , m_origin(origin) {}
+      , m_origin(origin)
+      , m_lower(grid.template probeConstNode<Lower>(origin)) {}
 
   /// The place x, y, z leaves away, each -1, 0 or 1.
   LeafPlace<TreeT> const& at(int x, int y, int z) {
@@ -252,7 +276,15 @@ public:
     LeafPlace<TreeT>& place = m_lookupTable[n];
     if (!m_known[n]) {
       m_known[n] = true;
-      place.lookUp(m_grid, m_origin.offsetBy(kLeafWidth * x, kLeafWidth * y, kLeafWidth * z));
+      Coord const corner = m_origin.offsetBy(kLeafWidth * x, kLeafWidth * y, kLeafWidth * z);
+      auto const sameNode = [&](int a) {
+        return (static_cast<unsigned>(corner[a]) ^ static_cast<unsigned>(m_origin[a])) <
+               unsigned(kNodeWidths[1]);
+      };
+      if (m_lower && sameNode(0) && sameNode(1) && sameNode(2))
+        place.lookUp(*m_lower, corner);
+      else
+        place.lookUp(m_grid, corner);
     }
     return place;
   }
@@ -277,8 +309,11 @@ private:
     return at(x >> 1, y >> 1, z >> 1).template holds<I, J, K>(numberIn(x, y, z), wanted);
   }
 
+  using Lower = typename LeafPlace<TreeT>::Lower;
+
   Accessor& m_grid;
   Coord m_origin;
+  Lower const* m_lower; ///< the node that the leaf's place is in, if it is that fine
   LeafPlace<TreeT> m_lookupTable[27];
   bool m_known[27] = {};
 };

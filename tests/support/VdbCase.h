@@ -1,8 +1,8 @@
 // The bytes of a .vdb file as a fuzzer's input.
 //
-// The whole way of the product is taken, with its child process: what OpenVDB itself does with damaged bytes
-// ends there. A file is either refused with one line of text, or gives volumes that are consistent, and that
-// come back the same when they are written and read again.
+// The whole way of the product is taken, with its child process where a file is not plainly sound: what
+// OpenVDB itself does with damaged bytes ends there. A file is either refused with one line of text, or gives
+// volumes that are consistent, and that come back the same when they are written and read again.
 #pragma once
 
 #include "GeometryVolume/channels/ChannelBase.h"

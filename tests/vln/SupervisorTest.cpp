@@ -25,14 +25,23 @@ bool isThere(pid_t process) {
 
 class SupervisorTest : public testing::Test {
 protected:
-  SupervisorTest() { EXPECT_EQ(vln({"make", "cloud", m_cloud, "--voxels", "1000000"}).code, 0); }
+  SupervisorTest() {
+    EXPECT_EQ(vln({"make", "cloud", m_sound, "--voxels", "1000000"}).code, 0);
+    // Metadata of a type that OpenVDB takes as it is: such a file is read in a child.
+    std::string bytes = readAll(m_sound);
+    std::string const name("file_compression\x06\0\0\0string", 26);
+    std::size_t const at = bytes.find(name);
+    EXPECT_NE(at, std::string::npos);
+    if (at != std::string::npos) bytes[at + 24] = 'm';
+    writeAll(m_cloud, bytes);
+  }
 
-  pid_t start() {
+  pid_t start(std::string const& input) {
     pid_t const process = fork();
     if (process == 0) {
       int const null = open("/dev/null", O_RDWR);
       for (int n = 0; n < 3; ++n) dup2(null, n);
-      execl(VLN_PROGRAM, VLN_PROGRAM, "convert", m_cloud.c_str(), m_output.c_str(), nullptr);
+      execl(VLN_PROGRAM, VLN_PROGRAM, "convert", input.c_str(), m_output.c_str(), nullptr);
       _exit(127);
     }
     return process;
@@ -42,8 +51,9 @@ protected:
                                                   std::filesystem::directory_iterator()));
   }
 
-  TempFolder m_folder;
-  std::string const m_cloud = m_folder / "cloud.vdb", m_output = m_folder / "out.vdb";
+  TempFolder m_folder, m_inputs;
+  std::string const m_cloud = m_inputs / "cloud.vdb", m_output = m_folder / "out.vdb";
+  std::string const m_sound = m_inputs / "sound.vdb"; ///< for which this process needs no other
 };
 
 // requirement: a signal to the process that was started ends the one that works too, by the same signal, and
@@ -52,11 +62,12 @@ TEST_F(SupervisorTest, SignalsReachWhoeverWorks) {
   int ended = 0;
   for (int delay : {5, 20, 60, 120, 180, 240, 300}) {
     for (int number : {SIGTERM, SIGINT, SIGHUP}) {
+      bool const sound = number == SIGINT;
       std::filesystem::remove(m_output);
-      pid_t const process = start();
+      pid_t const process = start(sound ? m_sound : m_cloud);
       usleep(static_cast<useconds_t>(delay) * 1000);
       auto const children = childrenOf(process);
-      EXPECT_LE(children.size(), 1u);
+      EXPECT_LE(children.size(), sound ? 0u : 1u);
       kill(process, number);
       int status = 0;
       ASSERT_EQ(waitpid(process, &status, 0), process);
@@ -67,11 +78,11 @@ TEST_F(SupervisorTest, SignalsReachWhoeverWorks) {
         EXPECT_EQ(WTERMSIG(status), number);
         // The whole file may have its name already.
         bool const isWhole = std::filesystem::exists(m_output);
-        EXPECT_EQ(fileCount(), isWhole ? 2u : 1u) << "after " << delay << " ms";
+        EXPECT_EQ(fileCount(), isWhole ? 1u : 0u) << "after " << delay << " ms";
         if (isWhole) { EXPECT_EQ(vln({"info", "--brief", m_output}).code, 0); }
       } else {
         EXPECT_EQ(WEXITSTATUS(status), 0); // it was done
-        EXPECT_EQ(fileCount(), 2u);
+        EXPECT_EQ(fileCount(), 1u);
       }
     }
   }
@@ -80,7 +91,7 @@ TEST_F(SupervisorTest, SignalsReachWhoeverWorks) {
 
 // requirement: killed without mercy, it leaves no process behind
 TEST_F(SupervisorTest, NoProcessOutlivesTheProgram) {
-  pid_t const process = start();
+  pid_t const process = start(m_cloud);
   std::vector<pid_t> children;
   // A sanitized program beside others takes seconds to begin.
   for (int n = 0; n < 10000 && children.empty(); ++n) {
@@ -97,7 +108,7 @@ TEST_F(SupervisorTest, NoProcessOutlivesTheProgram) {
 
 // requirement: codes and output are those of the work: several files, one of them damaged
 TEST_F(SupervisorTest, EndsAsTheWorkDoes) {
-  std::string const damaged = m_folder / "damaged.vdb";
+  std::string const damaged = m_inputs / "damaged.vdb";
   std::string bytes = readAll(m_cloud);
   std::ofstream(damaged, std::ios::binary) << bytes.substr(0, bytes.size() / 2);
   auto const good = vln({"info", "--brief", m_cloud});

@@ -1,0 +1,21 @@
+// Reading of .vdb files whose every count and size is looked at before OpenVDB's own readers meet them.
+//
+//   bytes of the file --> walked through --> nodes made by OpenVDB --> leaves filled in parallel
+//
+// The walk follows grids of the usual trees in files of today's versions. Whatever else comes, be it damaged
+// or only seldom, ends it without a word: such a file is for a child process.
+#pragma once
+
+#include "Interop/VdbFileImpl.h"
+
+#include <cstdint>
+#include <optional>
+
+namespace VLN::Interop {
+
+/// The file's content, all of it in memory; nothing where the walk ends, or where more than `memoryBytes`
+/// would be needed.
+VLN_API std::optional<VdbFile> readChecked(std::string const& path, std::uint64_t fileSize,
+                                           std::uint64_t memoryBytes);
+
+} // namespace VLN::Interop
