@@ -136,6 +136,16 @@ def test_requirement_progress_is_told_and_may_end_the_call(data):
 
     with pytest.raises(Enough):
         vln.open(data / "vdb" / "smoke.vdb", progress=stop)
+    reading = []
+
+    def stop_reading(stage, share):
+        reading.append((stage, share))
+        if stage == "reading" and share > 0:
+            raise Enough
+
+    with pytest.raises(Enough):
+        vln.open(data / "vdb" / "bunny_ls_512_half.vdb", progress=stop_reading)
+    assert reading[-1][0] == "reading" and len(reading) == 2
     vln.open(data / "vdb" / "sphereCd.vdb")  # nothing stays locked
 
 

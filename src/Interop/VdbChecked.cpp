@@ -10,6 +10,7 @@
 #include <algorithm>
 #include <atomic>
 #include <cerrno>
+#include <exception>
 #include <memory>
 #include <new>
 #include <streambuf>
@@ -84,12 +85,18 @@ std::unique_ptr<char[]> bytesOf(std::string const& path, std::size_t size) {
   return bytes;
 }
 
+/// What somebody who was told has thrown, apart from what reading throws.
+struct ReadingStopped {
+  std::exception_ptr reason;
+};
+
 class CheckedReader : public openvdb::io::Archive {
 public:
-  CheckedReader(WalkedBytes bytes, std::uint64_t memoryBytes)
+  CheckedReader(WalkedBytes bytes, std::uint64_t memoryBytes, std::function<void(double)> const& told)
       : m_bytes(bytes)
       , m_in(bytes)
-      , m_memoryLeft(memoryBytes) {}
+      , m_memoryLeft(memoryBytes)
+      , m_told(told) {}
 
   void read(VdbFile& file) {
     m_bytes.take(8); // it starts as it should
@@ -196,24 +203,39 @@ private:
       walkBuffers<Leaf>(m_bytes, coding);
     }
     WalkedBytes const all(m_bytes.data(), m_bytes.size());
-    parallelFor(0, std::int64_t(leaves.size()),
-                [&](std::int64_t first, std::int64_t last) {
-                  MemoryStream in(all);
-                  for (auto n = static_cast<std::size_t>(first); n < static_cast<std::size_t>(last); ++n)
-                    readLeaf(*leaves[n], all, places[n], in, coding, tree.background());
-                },
-                {.grain = 64});
+    auto const count = std::int64_t(leaves.size());
+    for (std::int64_t done = 0, next = 0; done < count; done = next) {
+      tell(places[static_cast<std::size_t>(done)]);
+      next = std::min(done + kLeavesAtOnce, count);
+      parallelFor(done, next,
+                  [&](std::int64_t first, std::int64_t last) {
+                    MemoryStream in(all);
+                    for (auto n = static_cast<std::size_t>(first); n < static_cast<std::size_t>(last); ++n)
+                      readLeaf(*leaves[n], all, places[n], in, coding, tree.background());
+                  },
+                  {.grain = 64});
+    }
   }
+
+  void tell(std::size_t place) const {
+    if (!m_told) return;
+    try {
+      m_told(double(place) / double(m_bytes.size()));
+    } catch (...) { throw ReadingStopped{std::current_exception()}; }
+  }
+
+  static constexpr std::int64_t kLeavesAtOnce = 16384; ///< some hundredths of a second
 
   WalkedBytes m_bytes;
   MemoryStream m_in;
   std::uint64_t m_memoryLeft;
+  std::function<void(double)> const& m_told;
 };
 
 } // namespace
 
-std::optional<VdbFile> readChecked(std::string const& path, std::uint64_t fileSize,
-                                   std::uint64_t memoryBytes) {
+std::optional<VdbFile> readChecked(std::string const& path, std::uint64_t fileSize, std::uint64_t memoryBytes,
+                                   std::function<void(double)> const& told) {
   if (fileSize > memoryBytes) return std::nullopt;
   try {
     auto const size = static_cast<std::size_t>(fileSize);
@@ -222,8 +244,10 @@ std::optional<VdbFile> readChecked(std::string const& path, std::uint64_t fileSi
     VdbFile file;
     file.path = path;
     file.memoryBytes = memoryBytes;
-    CheckedReader(WalkedBytes(bytes.get(), size), memoryBytes - fileSize).read(file);
+    CheckedReader(WalkedBytes(bytes.get(), size), memoryBytes - fileSize, told).read(file);
     return file;
+  } catch (ReadingStopped const& stopped) {
+    std::rethrow_exception(stopped.reason);
   } catch (WalkEnds const&) { return std::nullopt; } catch (std::exception const&) {
     return std::nullopt;
   }

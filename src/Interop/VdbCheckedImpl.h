@@ -9,13 +9,16 @@
 #include "Interop/VdbFileImpl.h"
 
 #include <cstdint>
+#include <functional>
 #include <optional>
 
 namespace VLN::Interop {
 
 /// The file's content, all of it in memory; nothing where the walk ends, or where more than `memoryBytes`
 /// would be needed.
+/// @param told Told now and then what share has been read; what it throws ends the reading, and comes out.
 VLN_API std::optional<VdbFile> readChecked(std::string const& path, std::uint64_t fileSize,
-                                           std::uint64_t memoryBytes);
+                                           std::uint64_t memoryBytes,
+                                           std::function<void(double)> const& told = {});
 
 } // namespace VLN::Interop

@@ -103,11 +103,12 @@ void probeVdbFile(std::string const& path, VdbReadLimits const& limits) {
   probeInChild(path, limits, checkHeader(path), [&] { return readWhole(path); });
 }
 
-VdbFile readVdbFile(std::string const& path, VdbReadLimits const& limits) {
+VdbFile readVdbFile(std::string const& path, VdbReadLimits const& limits,
+                    std::function<void(double)> const& told) {
   openvdb::initialize();
   std::uint64_t const size = checkHeader(path);
   VdbReadLimits const bounds = effectiveLimits(limits, size);
-  if (auto file = readChecked(path, size, bounds.memoryBytes)) return std::move(*file);
+  if (auto file = readChecked(path, size, bounds.memoryBytes, told)) return std::move(*file);
   return readGuarded(path, bounds, size, [&] { return readWhole(path); });
 }
 

@@ -4,6 +4,7 @@
 #include "Interop/VdbFile.h"
 #include "Interop/VdbTypesImpl.h"
 
+#include <functional>
 #include <vector>
 
 namespace VLN::Interop {
@@ -16,8 +17,10 @@ struct VdbFile {
   std::uint64_t memoryBytes = 0;    ///< most that what is made of it may take; 0 for no bound
 };
 
-/// Probes a file as probeVdbFile() does, then reads all of it, nothing delayed.
+/// Reads all of a file, nothing delayed.
+/// @param told As of readChecked(); where a child process reads first, nobody is told.
 /// @error FileError.
-VLN_API VdbFile readVdbFile(std::string const& path, VdbReadLimits const& limits = {});
+VLN_API VdbFile readVdbFile(std::string const& path, VdbReadLimits const& limits = {},
+                            std::function<void(double)> const& told = {});
 
 } // namespace VLN::Interop

@@ -271,7 +271,8 @@ VdbImport importGrids(VdbFile& file, VdbReadLimits const& limits, Progress const
 
 VdbImport importVdb(std::string const& path, VdbReadLimits const& limits, Progress const& progress) {
   report(progress, "reading", 0);
-  VdbFile file = readVdbFile(path, limits);
+  VdbFile file =
+      readVdbFile(path, limits, [&](double share) { report(progress, "reading", kReadDone * share); });
   return importGrids(file, limits, progress);
 }
 

@@ -9,6 +9,7 @@
 #include <cstring>
 #include <functional>
 #include <random>
+#include <stdexcept>
 
 #include <sys/resource.h>
 
@@ -206,6 +207,32 @@ TEST(VdbChecked, KeepsToItsMemory) {
 }
 
 // negative
+TEST(VdbChecked, TellsHowFarItIsAndStopsWhereItIsTold) {
+  TempFolder const folder;
+  auto const grid = openvdb::FloatGrid::create();
+  for (int n = 0; n < 40000; ++n)
+    grid->tree().touchLeaf(Coord(8 * (n % 200), 8 * (n / 200), 0))->setValueOn(0, 1);
+  write(folder / "many.vdb", {grid}, openvdb::io::COMPRESS_ACTIVE_MASK);
+  auto const read = [&](std::function<void(double)> const& told) {
+    openvdb::initialize();
+    return readChecked(folder / "many.vdb", readAll(folder / "many.vdb").size(), kMuch, told);
+  };
+  std::vector<double> shares;
+  ASSERT_TRUE(read([&](double share) { shares.push_back(share); }));
+  EXPECT_GE(shares.size(), 3u);
+  EXPECT_TRUE(std::is_sorted(shares.begin(), shares.end()));
+  EXPECT_GT(shares.front(), 0.0);
+  EXPECT_LT(shares.back(), 1.0);
+  // An error of theirs is not taken for one of the file.
+  struct Enough : std::runtime_error {
+    using std::runtime_error::runtime_error;
+  };
+  EXPECT_THROW(read([](double share) {
+                 if (share > 0.6) throw Enough("stop");
+               }),
+               Enough);
+}
+
 TEST(VdbChecked, RefusesATruncatedFileOfAnyLength) {
   openvdb::initialize();
   TempFolder const folder;

@@ -29,8 +29,9 @@ template <class TraitsT> constexpr SortRecord mortonRecord(int3 const& corner, s
   return {word(16), word(0), value};
 }
 
-/// Whether a comes before b in the order of the keys, without making them: the axis whose coordinates differ
-/// in the highest bit decides.
+/// Whether a comes before b along a Z-shaped curve, without making keys: the axis whose coordinates differ in
+/// the highest bit decides. Of several i does, so that this is the order of files whose leaves have k fastest;
+/// in keys k does.
 /// @pre Corners of the power-of-two shape.
 inline bool mortonLess(int3 const& a, int3 const& b) {
   std::uint32_t highest = 0;
