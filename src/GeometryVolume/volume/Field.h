@@ -155,7 +155,7 @@ private:
   // Remember the block of a position.
   void moveToRead(int i, int j, int k) const;
   void moveToWrite(int i, int j, int k);
-  void findBlock(int i, int j, int k) const;
+  [[gnu::always_inline]] void findBlock(int i, int j, int k) const;
   [[gnu::noinline]] T* make(int i, int j, int k);
   [[gnu::cold]] T coarse(int i, int j, int k) const;
   void const* sampler() const;

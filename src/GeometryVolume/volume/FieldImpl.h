@@ -305,7 +305,7 @@ template <class T> T const& Field<T>::background() const {
   return Internal::typed<T>(*m_slot).typed().defaultValue();
 }
 
-template <class T> void Field<T>::findBlock(int i, int j, int k) const {
+template <class T> inline void Field<T>::findBlock(int i, int j, int k) const {
   m_readEpoch = m_volume->epoch.load(std::memory_order_relaxed);
   m_writeEpoch = m_slot->exclusive.load(std::memory_order_relaxed) ? m_readEpoch : 0;
   m_at = {i & ~7, j & ~7, k & ~7};

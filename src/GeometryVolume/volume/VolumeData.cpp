@@ -121,7 +121,7 @@ void VolumeData::flushLocked() {
   pending.store(false, std::memory_order_release);
 }
 
-void VolumeData::prepareWrite(FieldSlot& slot) {
+void VolumeData::separate(FieldSlot& slot) {
   if (slot.version.load(std::memory_order_acquire) != version) follow(slot);
   if (!slot.exclusive.load(std::memory_order_relaxed)) {
     slot.detach(*this);

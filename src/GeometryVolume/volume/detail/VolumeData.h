@@ -87,7 +87,11 @@ struct VLN_API VolumeData {
   /// Whether fields hold tiles that the tree lacks. While they do, `version` is nobody's but the lock's.
   bool hasPending() const { return pending.load(std::memory_order_acquire); }
   /// Before elements are written. Pending tiles stay.
-  void prepareWrite(FieldSlot& slot);
+  void prepareWrite(FieldSlot& slot) {
+    if (slot.version.load(std::memory_order_acquire) != version ||
+        !slot.exclusive.load(std::memory_order_relaxed)) [[unlikely]]
+      separate(slot);
+  }
   /// Tells that elements of the field were or may be written.
   void valuesChanged(FieldSlot& slot) { slot.written.store(true, std::memory_order_relaxed); }
   /// A cursor on the tree for whoever writes.
@@ -118,6 +122,7 @@ struct VLN_API VolumeData {
 
 private:
   void follow(FieldSlot& slot);
+  void separate(FieldSlot& slot);
   void flush();
   /// The caller holds the lock.
   void flushLocked();
