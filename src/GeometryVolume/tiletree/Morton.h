@@ -30,8 +30,8 @@ template <class TraitsT> constexpr SortRecord mortonRecord(int3 const& corner, s
 }
 
 /// Whether a comes before b along a Z-shaped curve, without making keys: the axis whose coordinates differ in
-/// the highest bit decides. Of several i does, so that this is the order of files whose leaves have k fastest;
-/// in keys k does.
+/// the highest bit decides. Of several i does, so that this is the order of files whose leaves have k
+/// fastest; in keys k does.
 /// @pre Corners of the power-of-two shape.
 inline bool mortonLess(int3 const& a, int3 const& b) {
   std::uint32_t highest = 0;
