@@ -3,8 +3,11 @@
 //   level set   the first surface of the bunny at 128 voxels, hit or missed, without shading: this library's
 //               rays one by one and by blocks of pixels, as pictures are made, with the whole picture beside
 //               them; OpenVDB's LevelSetRayIntersector and NanoVDB's zero crossing on the same rays
-//   fog         shaded pixels of the preview of the smoke, those beside it included
+//   fog         shaded pixels of the preview of the smoke, those beside it included; NanoVDB's marcher
+//   through
+//               the same grid, with a blend at every voxel's width, but neither light nor shadows
 #include "BenchGrids.h"
+#include "GeometryVolume/core/Parallel.h"
 #include "Interop/Flatten.h"
 #include "Interop/VdbDetails.h"
 #include "Render/PixelBlocks.h"
@@ -15,11 +18,13 @@
 #include <openvdb/tools/LevelSetSphere.h>
 #include <openvdb/tools/RayIntersector.h>
 
+#include <cmath>
 #include <memory>
 
 #include <nanovdb/util/HDDA.h>
 #include <nanovdb/util/OpenToNanoVDB.h>
 #include <nanovdb/util/Ray.h>
+#include <nanovdb/util/SampleFromVoxels.h>
 
 namespace {
 
@@ -71,6 +76,11 @@ struct Data {
 
 Data& bunny() {
   static Data data("bunny_ls_128.vdb");
+  return data;
+}
+
+Data& smoke() {
+  static Data data("smoke.vdb");
   return data;
 }
 
@@ -171,33 +181,58 @@ void levelSetOpenVdb(benchmark::State& state) {
 }
 BENCHMARK(levelSetOpenVdb)->Name("level set/OpenVDB LevelSetRayIntersector")->Unit(benchmark::kMillisecond);
 
+using NanoRay = nanovdb::Ray<float>;
+
+/// Sends the rays on the threads of the first argument: `body(accessor, ray)` for each, in index space.
+/// @return The sum of what it gives.
+template <class Body>
+double forNanoRays(benchmark::State& state, Data const& data, nanovdb::FloatGrid const& grid,
+                   Body const& body) {
+  Vec3d const p = data.camera.position;
+  double sum = 0;
+  withThreads(static_cast<int>(state.range(0)), [&] {
+    sum = parallelReduce(
+        0, kAcross, 8, 0.0,
+        [&](std::int64_t begin, std::int64_t end) {
+          double part = 0;
+          auto accessor = grid.getAccessor();
+          for (auto y = begin; y < end; ++y)
+            for (int x = 0; x < kAcross; ++x) {
+              Vec3d const d = data.camera.ray((x + 0.5) / kAcross, (double(y) + 0.5) / kAcross);
+              NanoRay const world({float(p.x), float(p.y), float(p.z)}, {float(d.x), float(d.y), float(d.z)});
+              part += body(accessor, world.worldToIndexF(grid));
+            }
+          return part;
+        },
+        [](double a, double b) { return a + b; });
+  });
+  return sum;
+}
+
 void levelSetNano(benchmark::State& state) {
   Data& data = bunny();
   auto const handle = nanovdb::openToNanoVDB(*data.grid);
-  auto const* const grid = handle.grid<float>();
-  auto accessor = grid->getAccessor();
-  Vec3d const p = data.camera.position;
-  std::int64_t hits = 0;
-  for (auto _ : state) {
-    hits = 0;
-    data.forRays([&](Vec3d const& d) {
-      nanovdb::Ray<float> const world({float(p.x), float(p.y), float(p.z)},
-                                      {float(d.x), float(d.y), float(d.z)});
-      auto ray = world.worldToIndexF(*grid);
+  double hits = 0;
+  for (auto _ : state)
+    hits = forNanoRays(state, data, *handle.grid<float>(), [](auto& accessor, NanoRay ray) {
       nanovdb::Coord cell;
       float value, t;
-      hits += nanovdb::ZeroCrossing(ray, accessor, cell, value, t);
+      return nanovdb::ZeroCrossing(ray, accessor, cell, value, t) ? 1.0 : 0.0;
     });
-  }
-  finish(state, hits);
+  finish(state, static_cast<std::int64_t>(hits));
 }
 BENCHMARK(levelSetNano)
     ->Name("level set/NanoVDB ZeroCrossing (voxel, not root)")
+    ->ArgName("threads")
+    ->Arg(1)
+    ->Arg(2)
+    ->MeasureProcessCPUTime()
+    ->UseRealTime()
     ->Unit(benchmark::kMillisecond);
 
 // 0 samples: as previews are made; 1: with a ray for each pixel.
 void fogOurs(benchmark::State& state) {
-  static Data data("smoke.vdb");
+  Data& data = smoke();
   RenderOptions options;
   options.width = options.height = kAcross;
   options.threads = static_cast<int>(state.range(1)), options.samples = static_cast<int>(state.range(0));
@@ -214,6 +249,36 @@ BENCHMARK(fogOurs)
     ->Args({1, 1})
     ->Args({0, 1})
     ->Args({0, 2})
+    ->MeasureProcessCPUTime()
+    ->UseRealTime()
+    ->Unit(benchmark::kMillisecond);
+
+// How much of each ray's light goes through.
+void fogNano(benchmark::State& state) {
+  Data& data = smoke();
+  auto const handle = nanovdb::openToNanoVDB(*data.grid);
+  using Accessor = nanovdb::FloatGrid::AccessorType;
+  using Marcher = nanovdb::TreeMarcher<nanovdb::LeafNode<float>, NanoRay, Accessor>;
+  double opacity = 0;
+  for (auto _ : state)
+    opacity = forNanoRays(state, data, *handle.grid<float>(), [](Accessor& accessor, NanoRay const& ray) {
+      Marcher marcher(accessor);
+      if (!marcher.init(ray)) return 0.0;
+      auto const sampler = nanovdb::createSampler<1>(accessor);
+      float through = 1, t0 = 0, t1 = 0;
+      nanovdb::LeafNode<float> const* leaf = nullptr;
+      while (through >= 2e-3f && marcher.step(&leaf, t0, t1))
+        for (float t = std::ceil(t0); t < t1; t += 1) through *= std::exp(-0.1f * sampler(ray(t)));
+      return 1.0 - double(through);
+    });
+  finish(state, 0);
+  state.counters["opacity"] = opacity / (kAcross * kAcross);
+}
+BENCHMARK(fogNano)
+    ->Name("fog/NanoVDB TreeMarcher, opacity alone")
+    ->ArgName("threads")
+    ->Arg(1)
+    ->Arg(2)
     ->MeasureProcessCPUTime()
     ->UseRealTime()
     ->Unit(benchmark::kMillisecond);
