@@ -89,6 +89,11 @@ void finish(benchmark::State& state, std::int64_t hits) {
   state.counters["hits"] = static_cast<double>(hits);
 }
 
+void onOneAndTwoThreads(benchmark::internal::Benchmark* bench) {
+  bench->ArgName("threads")->Arg(1)->Arg(2);
+  bench->MeasureProcessCPUTime()->UseRealTime()->Unit(benchmark::kMillisecond);
+}
+
 void levelSetOurs(benchmark::State& state) {
   Data& data = bunny();
   data.field->weigh([](float low, float high) { return crosses(low, high, 0) ? 1.0f : 0.0f; });
@@ -155,14 +160,7 @@ void levelSetPicture(benchmark::State& state) {
   }
   finish(state, hits);
 }
-BENCHMARK(levelSetPicture)
-    ->Name("level set/this library, picture")
-    ->ArgName("threads")
-    ->Arg(1)
-    ->Arg(2)
-    ->MeasureProcessCPUTime()
-    ->UseRealTime()
-    ->Unit(benchmark::kMillisecond);
+BENCHMARK(levelSetPicture)->Name("level set/this library, picture")->Apply(onOneAndTwoThreads);
 
 void levelSetOpenVdb(benchmark::State& state) {
   Data& data = bunny();
@@ -221,14 +219,7 @@ void levelSetNano(benchmark::State& state) {
     });
   finish(state, static_cast<std::int64_t>(hits));
 }
-BENCHMARK(levelSetNano)
-    ->Name("level set/NanoVDB ZeroCrossing (voxel, not root)")
-    ->ArgName("threads")
-    ->Arg(1)
-    ->Arg(2)
-    ->MeasureProcessCPUTime()
-    ->UseRealTime()
-    ->Unit(benchmark::kMillisecond);
+BENCHMARK(levelSetNano)->Name("level set/NanoVDB ZeroCrossing (voxel, not root)")->Apply(onOneAndTwoThreads);
 
 // 0 samples: as previews are made; 1: with a ray for each pixel.
 void fogOurs(benchmark::State& state) {
@@ -274,13 +265,6 @@ void fogNano(benchmark::State& state) {
   finish(state, 0);
   state.counters["opacity"] = opacity / (kAcross * kAcross);
 }
-BENCHMARK(fogNano)
-    ->Name("fog/NanoVDB TreeMarcher, opacity alone")
-    ->ArgName("threads")
-    ->Arg(1)
-    ->Arg(2)
-    ->MeasureProcessCPUTime()
-    ->UseRealTime()
-    ->Unit(benchmark::kMillisecond);
+BENCHMARK(fogNano)->Name("fog/NanoVDB TreeMarcher, opacity alone")->Apply(onOneAndTwoThreads);
 
 } // namespace

@@ -151,6 +151,10 @@ private:
   }
 
   GridBase::Ptr readGrid() {
+    // What a grid takes by itself: many small ones are more in memory than in a file.
+    constexpr std::uint64_t kGrid = 8192;
+    walkOnlyIf(m_memoryLeft >= kGrid);
+    m_memoryLeft -= kGrid;
     std::size_t const begin = m_bytes.place();
     m_bytes.text();                     // name
     m_bytes.text();                     // type
@@ -172,13 +176,11 @@ private:
         done = true;
       }
     };
-    attempt(static_cast<openvdb::FloatGrid const*>(nullptr));
-    attempt(static_cast<openvdb::DoubleGrid const*>(nullptr));
-    attempt(static_cast<openvdb::Int32Grid const*>(nullptr));
-    attempt(static_cast<openvdb::Int64Grid const*>(nullptr));
-    attempt(static_cast<openvdb::Vec3SGrid const*>(nullptr));
-    attempt(static_cast<openvdb::Vec3DGrid const*>(nullptr));
-    attempt(static_cast<openvdb::Vec3IGrid const*>(nullptr));
+#define VLN_ATTEMPT(GridT) attempt(static_cast<openvdb::GridT const*>(nullptr));
+    VLN_FOR_EACH_VDB_REAL_GRID(VLN_ATTEMPT)
+    VLN_FOR_EACH_VDB_VECTOR_GRID(VLN_ATTEMPT)
+    VLN_ATTEMPT(Int64Grid) // bytes of a file may be no bools
+#undef VLN_ATTEMPT
     walkOnlyIf(done);
     return grid;
   }

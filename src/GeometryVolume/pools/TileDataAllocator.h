@@ -92,13 +92,6 @@ public:
     return m_static ? b.m_static && m_base == b.m_base : !b.m_static;
   }
 
-  /// The same state with another construct flag.
-  TileDataAllocator withConstruct(bool construct) const {
-    TileDataAllocator a(*this);
-    a.m_construct = construct;
-    return a;
-  }
-
   bool isStatic() const { return m_static; }
   bool constructs() const { return m_construct; }
   T* base() const { return m_base; }

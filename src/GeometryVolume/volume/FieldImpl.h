@@ -97,15 +97,13 @@ template <class T> struct TypedSlot final : FieldSlot {
       m_pending.push_back({corner, &entry, TileVector<T>(), -1});
       entry.storeRelaxed(this); // so that it is listed once
     }
-    auto const deepest = [&](VolumeTree::ConstTileAccessor const& accessor, int3 const& p) {
-      return accessor.treeIndex(p.x, p.y, p.z, kFinest, false);
-    };
     VolumeTree const& tree = *volume.tree;
     auto const body = [&](VolumeTree::ConstTileAccessor const& accessor, std::int64_t begin,
                           std::int64_t end) {
-      bool const grown = tree.tileCount(-1) > 0;
-      for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n)
-        makeElements(tree, m_pending[n], grown ? deepest(accessor, m_pending[n].corner) : TreeIndex());
+      for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+        int3 const& p = m_pending[n].corner;
+        makeElements(tree, m_pending[n], accessor.treeIndex(p.x, p.y, p.z, kFinest, false));
+      }
     };
     auto const begin = static_cast<std::int64_t>(first), end = static_cast<std::int64_t>(m_pending.size());
     if (few)
@@ -151,9 +149,6 @@ template <class T> struct TypedSlot final : FieldSlot {
   ChannelType& typed() { return *m_channel; }
 
 private:
-  /// Fewer new tiles are appended one by one; more are worth a parallel pass.
-  static constexpr std::int64_t kFewTiles = 256;
-
   /// New tiles take the values of the coarser samples that were read at their places.
   void fillNew(VolumeTree const& tree, int depth) {
     auto const d = static_cast<std::size_t>(depth);

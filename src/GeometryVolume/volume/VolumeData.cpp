@@ -17,10 +17,8 @@ constexpr int kRootDepth = VolumeShape::kMaxDepth - 10;
 static_assert(VolumeShape::width(kRootDepth) == 4096);
 
 constexpr int kFinest = VolumeShape::kMaxDepth;
-/// Fewer pending tiles are added one by one, also where the tree holds this many times as many: adding in
-/// bulk looks at every tile.
-constexpr std::uint64_t kFewTiles = 256;
-constexpr std::uint64_t kBulkShare = 64;
+/// Nor are tiles added in bulk where the tree holds this many times as many: that looks at every one.
+constexpr std::int64_t kBulkShare = 64;
 
 } // namespace
 
@@ -107,7 +105,8 @@ void VolumeData::flushLocked() {
   VolumeTree& edited = editTree();
   epoch.fetch_add(1, std::memory_order_relaxed);
   ++version;
-  if (finest.size() <= kFewTiles || finest.size() * kBulkShare <= std::uint64_t(edited.tileCount(-1))) {
+  auto const count = static_cast<std::int64_t>(finest.size());
+  if (count <= kFewTiles || count * kBulkShare <= edited.tileCount(-1)) {
     for (int3 const& p : finest) {
       if (m_accessor.addTileBelow(p.x, p.y, p.z, kFinest) >= 0) continue;
       m_accessor.addTile(p, rootDepth());

@@ -33,6 +33,9 @@ using VolumeTopology = VoxelTopology<VolumeShape>;
 
 struct VolumeData;
 
+/// Fewer tiles are made one by one; more are worth a pass over lists, in parallel.
+inline constexpr std::int64_t kFewTiles = 256;
+
 /// One field of a volume, without its element type.
 struct VLN_API FieldSlot {
   virtual ~FieldSlot();
