@@ -7,9 +7,9 @@ FieldBlock* FieldBlocks::noBlock() {
   return &none;
 }
 
-FieldBlock::Entry& FieldBlocks::entry(int3 const& corner) {
+FieldBlock& FieldBlocks::make(int3 const& position) {
   if (2 * (m_used + 1) > m_slots.size()) resize(2 * m_slots.size());
-  int3 const at{corner.x >> 3, corner.y >> 3, corner.z >> 3};
+  int3 const at{position.x >> 3, position.y >> 3, position.z >> 3};
   std::size_t n = hash(at) & m_mask;
   while (m_slots[n].block && m_slots[n].at != at) n = (n + 1) & m_mask;
   Slot& slot = m_slots[n];
@@ -18,7 +18,7 @@ FieldBlock::Entry& FieldBlocks::entry(int3 const& corner) {
     slot = {at, &block};
     ++m_used;
   }
-  return block.tiles[FieldBlock::place(corner.x, corner.y, corner.z).slot()];
+  return block;
 }
 
 FieldBlock& FieldBlocks::newBlock() {
@@ -31,10 +31,9 @@ FieldBlock& FieldBlocks::newBlock() {
 
 void FieldBlocks::clear() { *this = FieldBlocks(); }
 
-void FieldBlocks::reserve(std::int64_t tiles) {
+void FieldBlocks::reserve(std::size_t blocks) {
   std::size_t slots = m_slots.size();
-  // Most blocks hold several tiles; those that do not make the table grow.
-  while (slots < 2 * (m_used + static_cast<std::size_t>(tiles) / 4)) slots *= 2;
+  while (slots < 2 * (m_used + blocks)) slots *= 2;
   if (slots > m_slots.size()) resize(slots);
 }
 

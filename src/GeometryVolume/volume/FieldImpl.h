@@ -13,6 +13,7 @@
 
 #include <algorithm>
 #include <array>
+#include <bit>
 #include <cstring>
 #include <deque>
 #include <stdexcept>
@@ -84,29 +85,36 @@ template <class T> struct TypedSlot final : FieldSlot {
     for (PendingTile const& tile : m_pending) corners.append(tile.corner);
   }
 
-  void makePending(VolumeData& volume, std::span<int3 const> corners) override {
+  void makePending(VolumeData& volume, std::span<BlockTiles const> tiles) override {
     std::size_t const first = m_pending.size();
     VLN::Internal::Rollback added([&] {
       for (; m_pending.size() > first; m_pending.pop_back()) m_pending.back().entry->storeRelaxed(nullptr);
     });
-    bool const few = corners.size() < static_cast<std::size_t>(kFewTiles);
-    if (!few) blocks.reserve(static_cast<std::int64_t>(corners.size()));
-    for (int3 const& corner : corners) {
-      auto& entry = blocks.entry(corner);
-      if (entry.loadRelaxed()) continue;
-      m_pending.push_back({corner, &entry, TileVector<T>(), -1});
-      entry.storeRelaxed(this); // so that it is listed once
+    if (tiles.size() > 1) blocks.reserve(tiles.size());
+    for (BlockTiles const& wanted : tiles) {
+      FieldBlock& block = blocks.make(wanted.position);
+      for (std::uint32_t left = wanted.slots; left; left &= left - 1) {
+        auto const slot = static_cast<std::size_t>(std::countr_zero(left));
+        auto& entry = block.tiles[slot];
+        if (entry.loadRelaxed()) continue;
+        PendingTile& made = m_pending.emplace_back();
+        made.corner = FieldBlock::tileCorner(wanted.position, slot);
+        made.entry = &entry;
+        entry.storeRelaxed(this); // so that it is listed once
+      }
     }
     VolumeTree const& tree = *volume.tree;
     auto const body = [&](VolumeTree::ConstTileAccessor const& accessor, std::int64_t begin,
                           std::int64_t end) {
+      bool const grown = tree.tileCount(-1) > 0;
       for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
         int3 const& p = m_pending[n].corner;
-        makeElements(tree, m_pending[n], accessor.treeIndex(p.x, p.y, p.z, kFinest, false));
+        makeElements(tree, m_pending[n],
+                     grown ? accessor.treeIndex(p.x, p.y, p.z, kFinest, false) : TreeIndex());
       }
     };
     auto const begin = static_cast<std::int64_t>(first), end = static_cast<std::int64_t>(m_pending.size());
-    if (few)
+    if (end - begin < kFewTiles)
       body(volume.reader(), begin, end);
     else
       parallelFor(begin, end, [&](std::int64_t b, std::int64_t e) { body(tree.tileAccessor(), b, e); },
@@ -199,7 +207,7 @@ private:
     int3 corner;
     FieldBlock::Entry* entry; ///< of the table
     TileVector<T> elements;
-    std::int64_t arrival; ///< place among the tiles that are being adopted
+    std::int64_t arrival = -1; ///< place among the tiles that are being adopted
   };
   /// @param above The deepest tile of the tree there.
   void makeElements(VolumeTree const& tree, PendingTile& made, TreeIndex const& above) {
@@ -252,7 +260,8 @@ private:
     }
     auto const& finest = tiles()[static_cast<std::size_t>(kFinest)];
     auto const count = std::min(static_cast<std::int64_t>(finest.size()), tree.tileCount(kFinest));
-    if (count - m_entered > kFewTiles) blocks.reserve(count - m_entered);
+    // Most blocks hold several tiles; those that do not make the table grow.
+    if (count - m_entered > kFewTiles) blocks.reserve(static_cast<std::size_t>(count - m_entered) / 4);
     for (; m_entered < count; ++m_entered) {
       auto const& at = tree.tile(m_entered, kFinest);
       TileVector<T> const& elements = finest[static_cast<std::size_t>(m_entered)];
@@ -323,8 +332,8 @@ template <class T> T* Field<T>::make(int i, int j, int k) {
   if (!m_block->tile(i, j, k)) {
     int3 const p{i, j, k};
     if (!Internal::VolumeShape::inDomain(p)) Internal::throwOutside(p);
-    int3 const corner{i & ~3, j & ~3, k & ~3};
-    Internal::typed<T>(*m_slot).makePending(*m_volume, {&corner, 1});
+    Internal::BlockTiles const tile{p, 1u << Internal::FieldBlock::place(i, j, k).slot()};
+    Internal::typed<T>(*m_slot).makePending(*m_volume, {&tile, 1});
     findBlock(i, j, k);
   }
   return static_cast<T*>(m_block->tile(i, j, k));
@@ -357,18 +366,13 @@ template <class T> void Field<T>::set(std::span<int3 const> positions, std::span
                                 " positions with " + std::to_string(values.size()) + " values");
   BulkRuns const plan = planBulk(*m_volume, *m_slot, positions);
   m_volume->valuesChanged(*m_slot);
-  auto const write = [&](BulkRun const& run) {
-    auto const begin = static_cast<std::size_t>(run.begin), count = static_cast<std::size_t>(run.count);
-    for (std::size_t n = begin; n < begin + count; ++n) {
-      int3 const& p = positions[n];
-      auto const at = FieldBlock::place(p.x, p.y, p.z);
-      static_cast<T*>(run.block->tile(at))[at.element()] = values[n];
-    }
-  };
   parallelFor(0, static_cast<std::int64_t>(plan.shares), [&](std::int64_t begin, std::int64_t end) {
     for (auto share = static_cast<std::size_t>(begin); share < static_cast<std::size_t>(end); ++share)
-      for (std::size_t list = share; list < plan.lists.size(); list += plan.shares)
-        for (BulkRun const& run : plan.lists[list]) write(run);
+      for (std::size_t chunk = 0; chunk < plan.chunks; ++chunk) {
+        std::size_t const first = chunk * plan.grain;
+        for (BulkRun const& run : plan.list(chunk, share))
+          writeRun(run, positions.data() + first + run.begin, values.data() + first + run.begin);
+      }
   });
 }
 

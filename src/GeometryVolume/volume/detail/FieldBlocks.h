@@ -34,9 +34,21 @@ struct alignas(64) FieldBlock {
   static Place place(int i, int j, int k) {
     return Places::find(std::uint32_t(i) % kWidth, std::uint32_t(j) % kWidth, std::uint32_t(k) % kWidth);
   }
+  /// The low corner of a tile of the block that holds `position`.
+  static int3 tileCorner(int3 const& position, std::size_t slot) {
+    auto const n = static_cast<int>(slot);
+    return {(position.x & ~7) + (n & 1) * 4, (position.y & ~7) + (n >> 1 & 1) * 4,
+            (position.z & ~7) + (n >> 2) * 4};
+  }
   /// The tile that holds a sample, or null.
   void* tile(Place at) const { return tiles[at.slot()].loadAcquire(); }
   void* tile(int i, int j, int k) const { return tile(place(i, j, k)); }
+};
+
+/// Some tiles of the block that holds a position: bit n stands for slot n.
+struct BlockTiles {
+  int3 position;
+  std::uint32_t slots;
 };
 
 /// @threads As a container of the standard library.
@@ -52,11 +64,15 @@ public:
   }
   /// The elements of the tile at a position, or null.
   void* tile(int i, int j, int k) const { return find(i, j, k)->tile(i, j, k); }
+  /// The block that holds the position, made where there is none.
+  FieldBlock& make(int3 const& position);
   /// The tile at a position, to be entered. It stays where it is.
-  FieldBlock::Entry& entry(int3 const& corner);
+  FieldBlock::Entry& entry(int3 const& position) {
+    return make(position).tiles[FieldBlock::place(position.x, position.y, position.z).slot()];
+  }
   void clear();
-  /// Makes room, so that entering `tiles` tiles moves no slots.
-  void reserve(std::int64_t tiles);
+  /// Makes room, so that making `blocks` blocks more moves no slots.
+  void reserve(std::size_t blocks);
   /// A block without tiles, the same for all tables. Nothing writes it.
   static FieldBlock* noBlock();
 

@@ -49,10 +49,10 @@ struct VLN_API FieldSlot {
   virtual bool hasPending() const = 0;
   /// Makes elements for tiles that neither the tree nor another write has made yet, with the values that are
   /// read there. In parallel.
-  /// @param corners In the domain; some may come more than once, or have elements.
+  /// @param tiles In the domain; some may come more than once, or have elements.
   /// @pre The slot is in step and exclusive.
   /// @error What is thrown leaves all as it was.
-  virtual void makePending(VolumeData& volume, std::span<int3 const> corners) = 0;
+  virtual void makePending(VolumeData& volume, std::span<BlockTiles const> tiles) = 0;
   /// Appends the corners of tiles that have elements, but are not in the tree yet.
   virtual void listPending(Ostil::Array<int3>& corners) const = 0;
   /// Makes the channel and its elements the volume's alone.

@@ -1,0 +1,184 @@
+// Many elements written in one call, in the orders that callers have: the result is that of as many single
+// writes.
+#include "GeometryVolume/core/Parallel.h"
+#include "GeometryVolume/volume/Volume.h"
+#include "support/Print.h"
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <cstdlib>
+#include <limits>
+#include <map>
+#include <random>
+#include <string>
+#include <tuple>
+#include <vector>
+
+namespace VLN::Test {
+namespace {
+
+using namespace VLN::TileTree3D;
+
+constexpr int kLow = -536870912, kHigh = 536870911;
+
+struct Order {
+  char const* name;
+  std::vector<int3> positions;
+};
+
+/// Every position of a box that no tile or block is aligned to, the axis `a` fastest, then `b`.
+std::vector<int3> boxOf(int3 const& low, int3 const& size, int a, int b, int step = 1) {
+  std::vector<int3> out;
+  int const c = 3 - a - b;
+  int3 p;
+  for (p[c] = low[c]; p[c] < low[c] + size[c]; ++p[c])
+    for (p[b] = low[b]; p[b] < low[b] + size[b]; ++p[b])
+      for (p[a] = low[a]; p[a] < low[a] + size[a]; p[a] += step) out.push_back(p);
+  return out;
+}
+
+std::vector<Order> orders() {
+  int3 const low{-13, -7, 5}, size{45, 37, 41}; // more than a chunk of positions
+  std::vector<Order> all{{"i, j, k", boxOf(low, size, 0, 1)},
+                         {"j, k, i", boxOf(low, size, 1, 2)},
+                         {"k, j, i", boxOf(low, size, 2, 1)},
+                         {"every other i", boxOf(low, size, 0, 2, 2)},
+                         {"every third k", boxOf(low, size, 2, 0, 3)}};
+  Order backwards{"backwards", boxOf(low, size, 0, 1)};
+  std::reverse(backwards.positions.begin(), backwards.positions.end());
+  all.push_back(backwards);
+  Order twice{"twice", boxOf(low, size, 0, 1)};
+  auto const again = boxOf(low, size, 2, 1);
+  twice.positions.insert(twice.positions.end(), again.begin(), again.end());
+  all.push_back(twice);
+  Order shuffled{"shuffled", twice.positions};
+  std::shuffle(shuffled.positions.begin(), shuffled.positions.end(), std::mt19937(5));
+  all.push_back(shuffled);
+  // Rows of all lengths at all places, along all axes, with diagonals and steps back between them.
+  Order walks{"walks", {}};
+  std::mt19937 random(11);
+  for (int3 p{0, 0, 0}; walks.positions.size() < 60000;) {
+    auto const axis = static_cast<int>(random() % 3);
+    for (auto n = random() % 20; n > 0; --n) {
+      walks.positions.push_back(p);
+      ++p[axis];
+    }
+    for (auto n = random() % 6; n > 0; --n) {
+      walks.positions.push_back(p);
+      for (int a = 0; a < 3; ++a) p[a] += static_cast<int>(random() % 3) - 1;
+    }
+    for (int a = 0; a < 3; ++a)
+      if (std::abs(p[a]) > 30) p[a] = 0;
+  }
+  all.push_back(walks);
+  // More positions of one block in a row than a run holds.
+  Order lingering{"lingering", {}};
+  for (int n = 0; n < 2000; ++n) lingering.positions.push_back({n * 5 % 8, n * 3 % 8, n % 2});
+  all.push_back(lingering);
+  Order ends{"ends of the domain", boxOf({kHigh - 9, kHigh - 2, kLow}, {10, 3, 3}, 0, 1)};
+  for (int3 const& p : boxOf({kLow, kLow, kHigh - 20}, {2, 2, 21}, 2, 0)) ends.positions.push_back(p);
+  all.push_back(ends);
+  return all;
+}
+
+template <class T> T valueOf(std::size_t n) { return static_cast<T>(n % 251 + 1); }
+
+template <class T> void expectAsOneByOne(Order const& order, int threads) {
+  std::vector<T> values;
+  for (std::size_t n = 0; n < order.positions.size(); ++n) values.push_back(valueOf<T>(n));
+  std::map<std::tuple<int, int, int>, T> model;
+  for (std::size_t n = 0; n < values.size(); ++n) {
+    int3 const& p = order.positions[n];
+    model[{p.x, p.y, p.z}] = values[n];
+  }
+  Volume volume;
+  auto field = volume.addField<T>("f", T(0));
+  auto const write = [&] { VLN::withThreads(threads, [&] { field.set(order.positions, values); }); };
+  auto const expectModel = [&](char const* when) {
+    for (auto const& [p, value] : model) {
+      auto const [x, y, z] = p;
+      ASSERT_EQ(field.get(x, y, z), value)
+          << order.name << ", " << when << ", " << threads << " threads, " << x << " " << y << " " << z;
+    }
+    // Whatever else its tiles hold is untouched.
+    std::int64_t written = 0;
+    for (T const& element : field.channel()) written += element != T(0);
+    ASSERT_EQ(written, static_cast<std::int64_t>(model.size())) << order.name << ", " << when;
+  };
+  write();
+  expectModel("into nothing");
+  // Over half of the tiles, which the tree has by now, and others that are new.
+  field.fill(T(0));
+  write();
+  expectModel("into tiles of the tree");
+}
+
+TEST(BulkSetTest, RequirementEveryOrderIsThatOfSingleWrites) {
+  for (Order const& order : orders())
+    for (int const threads : {1, 2, 3}) {
+      expectAsOneByOne<float>(order, threads);
+      if (HasFatalFailure()) return;
+    }
+}
+
+TEST(BulkSetTest, RequirementElementsOfEverySize) {
+  for (Order const& order : orders()) {
+    expectAsOneByOne<std::uint8_t>(order, 2);
+    expectAsOneByOne<double>(order, 2);
+    if (HasFatalFailure()) return;
+  }
+}
+
+TEST(BulkSetTest, RequirementSomeTilesThereAndSomeNot) {
+  auto const box = boxOf({-9, -9, -9}, {40, 40, 40}, 0, 1);
+  Volume volume;
+  auto field = volume.addField<float>("f", 0);
+  std::mt19937 random(3);
+  for (int n = 0; n < 200; ++n) {
+    int3 const& p = box[random() % box.size()];
+    field.set(p, 1); // pending tiles, and after n = 100 tiles of the tree too
+    if (n == 100) volume.tileCount();
+  }
+  std::vector<float> values;
+  for (std::size_t n = 0; n < box.size(); ++n) values.push_back(valueOf<float>(n));
+  field.set(box, values);
+  for (std::size_t n = 0; n < box.size(); ++n) ASSERT_EQ(field.get(box[n]), values[n]) << n;
+  EXPECT_EQ(field.get(-10, -9, -9), 0.0f);
+}
+
+/// The first position that is beyond names itself, wherever in a row it is, and nothing is written.
+TEST(BulkSetTest, NegativeRowsThatLeaveTheDomain) {
+  constexpr int kMost = std::numeric_limits<int>::max();
+  struct Case {
+    int3 first;
+    int axis;
+    int3 outside;
+  };
+  for (Case const& c :
+       {Case{{kHigh - 10, 0, 0}, 0, {kHigh + 1, 0, 0}}, Case{{0, kHigh - 3, 0}, 1, {0, kHigh + 1, 0}},
+        Case{{5, 6, kHigh}, 2, {5, 6, kHigh + 1}}, Case{{kLow - 5, 1, 1}, 0, {kLow - 5, 1, 1}},
+        Case{{3, kMost - 20, 3}, 1, {3, kMost - 20, 3}}, Case{{1 << 30, 0, 0}, 2, {1 << 30, 0, 0}}}) {
+    std::vector<int3> positions(20, c.first);
+    for (int n = 0; n < 20; ++n) positions[static_cast<std::size_t>(n)][c.axis] += n;
+    positions.push_back({1, 2, 3});
+    Volume volume;
+    auto field = volume.addField<float>("f", 0);
+    std::string message;
+    try {
+      field.set(positions, std::vector<float>(positions.size(), 1.0f));
+    } catch (std::out_of_range const& e) { message = e.what(); }
+    EXPECT_EQ(message, "(" + std::to_string(c.outside.x) + ", " + std::to_string(c.outside.y) + ", " +
+                           std::to_string(c.outside.z) + ") lies outside the domain of a volume");
+    EXPECT_EQ(field.get(1, 2, 3), 0.0f);
+    for (float const& element : field.channel()) EXPECT_EQ(element, 0.0f);
+  }
+  // A row that ends where ints do and goes on at their other end is none.
+  Volume volume;
+  auto field = volume.addField<float>("f", 0);
+  std::vector<int3> const wrapped{{kMost, 0, 0}, {-kMost - 1, 0, 0}};
+  EXPECT_THROW(field.set(wrapped, std::vector<float>(2, 1.0f)), std::out_of_range);
+}
+
+} // namespace
+} // namespace VLN::Test
