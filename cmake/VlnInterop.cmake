@@ -16,9 +16,9 @@ if(sources)
   vln_uses_openvdb(GeometryVolumeInterop)
   target_link_libraries(GeometryVolumeInterop PRIVATE PNG::PNG)
   if(vln_hdf5)
-    set_source_files_properties(src/Interop/VtkHdfWrite.cpp PROPERTIES
-      COMPILE_DEFINITIONS VLN_HDF5 INCLUDE_DIRECTORIES "${VLN_HDF5_INCLUDE_DIR}")
-    target_link_libraries(GeometryVolumeInterop PRIVATE "${VLN_HDF5_LIBRARY}")
+    set_source_files_properties(src/Interop/Hdf5.cpp src/Interop/VtkHdfWrite.cpp PROPERTIES
+      COMPILE_DEFINITIONS "VLN_HDF5=\"${vln_hdf5_name}\"" INCLUDE_DIRECTORIES "${VLN_HDF5_INCLUDE_DIR}")
+    target_link_libraries(GeometryVolumeInterop PRIVATE ${CMAKE_DL_LIBS})
   endif()
   target_link_libraries(GeometryVolumeInterop PRIVATE NanoVDB::nanovdb ZLIB::ZLIB)
   # Large templates for each type, which move memory: they compile in half the time.
@@ -31,6 +31,9 @@ if(sources)
     VERSION ${PROJECT_VERSION}
     SOVERSION ${PROJECT_VERSION_MAJOR}.${PROJECT_VERSION_MINOR}
     INSTALL_RPATH "$ORIGIN")
+  # OpenVDB's templates have default visibility. Calls of the copies that are here need not be looked up at
+  # each start, thousands of them by names of hundreds of letters.
+  target_link_options(GeometryVolumeInterop PRIVATE -Wl,-Bsymbolic-functions)
 else()
   message(STATUS "src/Interop has no source yet: no target GeometryVolumeInterop")
 endif()

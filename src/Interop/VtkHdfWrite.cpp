@@ -22,14 +22,13 @@ void writeVtkHdf(std::string const& path, DenseVolume const&, Progress const&) {
 
 #include "GeometryVolume/core/Parallel.h"
 #include "Interop/FreeNameImpl.h"
+#include "Interop/Hdf5Impl.h"
 
 #include <algorithm>
 #include <array>
 #include <cmath>
 #include <cstring>
 #include <set>
-
-#include <hdf5.h>
 
 namespace VLN::Interop {
 
@@ -62,45 +61,34 @@ private:
 /// HDF5 prints its errors unless told not to; they are told in one line here.
 class QuietErrors {
 public:
-  QuietErrors() {
-    H5Eget_auto2(H5E_DEFAULT, &m_print, &m_data);
-    H5Eset_auto2(H5E_DEFAULT, nullptr, nullptr);
+  explicit QuietErrors(Hdf5 const& hdf5)
+      : m_hdf5(hdf5) {
+    m_hdf5.H5Eget_auto2(H5E_DEFAULT, &m_print, &m_data);
+    m_hdf5.H5Eset_auto2(H5E_DEFAULT, nullptr, nullptr);
   }
   QuietErrors(QuietErrors const&) = delete;
   QuietErrors& operator=(QuietErrors const&) = delete;
-  ~QuietErrors() { H5Eset_auto2(H5E_DEFAULT, m_print, m_data); }
+  ~QuietErrors() { m_hdf5.H5Eset_auto2(H5E_DEFAULT, m_print, m_data); }
 
 private:
+  Hdf5 const& m_hdf5;
   H5E_auto2_t m_print = nullptr;
   void* m_data = nullptr;
 };
 
-hid_t memoryType(DenseReader const& reader) {
-  bool const real = reader.kind == 'f', plain = reader.kind == 'u';
-  switch (reader.scalarBytes) {
-  case 1:
-    return plain ? H5T_NATIVE_UINT8 : H5T_NATIVE_INT8;
-  case 2:
-    return plain ? H5T_NATIVE_UINT16 : H5T_NATIVE_INT16;
-  case 4:
-    return real ? H5T_NATIVE_FLOAT : plain ? H5T_NATIVE_UINT32 : H5T_NATIVE_INT32;
-  default:
-    return real ? H5T_NATIVE_DOUBLE : plain ? H5T_NATIVE_UINT64 : H5T_NATIVE_INT64;
-  }
-}
-
-class Writer {
+class Writer : Hdf5 {
 public:
   Writer(std::string const& path, DenseVolume const& volume, Progress const& progress)
-      : m_path(path)
+      : Hdf5(load(path))
+      , m_path(path)
       , m_volume(volume)
       , m_progress(progress) {}
 
   void run() {
-    QuietErrors const quiet;
+    QuietErrors const quiet(*this);
     plan();
     OutputFile out(m_path);
-    Handle const access(check(H5Pcreate(H5P_FILE_ACCESS)), H5Pclose);
+    Handle const access(check(H5Pcreate(H5P_CLS_FILE_ACCESS_ID_g)), H5Pclose);
     check(H5Pset_fapl_core(access, kMemoryStep, false));
     Handle const file(check(H5Fcreate("volume.vtkhdf", H5F_ACC_TRUNC, H5P_DEFAULT, access)), H5Fclose);
     writeRoot(file);
@@ -171,9 +159,23 @@ private:
     }
   }
 
+  hid_t memoryType(DenseReader const& reader) const {
+    bool const real = reader.kind == 'f', plain = reader.kind == 'u';
+    switch (reader.scalarBytes) {
+    case 1:
+      return plain ? H5T_NATIVE_UINT8_g : H5T_NATIVE_INT8_g;
+    case 2:
+      return plain ? H5T_NATIVE_UINT16_g : H5T_NATIVE_INT16_g;
+    case 4:
+      return real ? H5T_NATIVE_FLOAT_g : plain ? H5T_NATIVE_UINT32_g : H5T_NATIVE_INT32_g;
+    default:
+      return real ? H5T_NATIVE_DOUBLE_g : plain ? H5T_NATIVE_UINT64_g : H5T_NATIVE_INT64_g;
+    }
+  }
+
   // Without times of creation: equal volumes make equal files.
   Handle group(hid_t parent, std::string const& name) const {
-    Handle const how(check(H5Pcreate(H5P_GROUP_CREATE)), H5Pclose);
+    Handle const how(check(H5Pcreate(H5P_CLS_GROUP_CREATE_ID_g)), H5Pclose);
     check(H5Pset_obj_track_times(how, false));
     return {check(H5Gcreate2(parent, name.c_str(), H5P_DEFAULT, how, H5P_DEFAULT)), H5Gclose};
   }
@@ -184,7 +186,7 @@ private:
     check(H5Awrite(made, inMemory, values));
   }
   void text(hid_t owner, char const* name, char const* value) const {
-    Handle const type(check(H5Tcopy(H5T_C_S1)), H5Tclose);
+    Handle const type(check(H5Tcopy(H5T_C_S1_g)), H5Tclose);
     check(H5Tset_size(type, std::strlen(value)));
     check(H5Tset_strpad(type, H5T_STR_NULLPAD));
     attribute(owner, name, type, type, 0, value);
@@ -193,11 +195,11 @@ private:
   void writeRoot(hid_t file) {
     Handle const root = group(file, "VTKHDF");
     std::int64_t const version[2] = {1, 0};
-    attribute(root, "Version", H5T_STD_I64LE, H5T_NATIVE_INT64, 2, version);
+    attribute(root, "Version", H5T_STD_I64LE_g, H5T_NATIVE_INT64_g, 2, version);
     text(root, "Type", "OverlappingAMR");
     text(root, "GridDescription", "XYZ");
     double const origin[3] = {m_origin.x, m_origin.y, m_origin.z};
-    attribute(root, "Origin", H5T_IEEE_F64LE, H5T_NATIVE_DOUBLE, 3, origin);
+    attribute(root, "Origin", H5T_IEEE_F64LE_g, H5T_NATIVE_DOUBLE_g, 3, origin);
     for (std::size_t n = 0; n < m_levels.size(); ++n) {
       Handle const level = group(root, "Level" + std::to_string(n));
       writeLevel(level, m_levels[n]);
@@ -207,7 +209,7 @@ private:
   void writeLevel(hid_t group_, AmrLevel const& level) {
     double spacing[3];
     for (int a = 0; a < 3; ++a) spacing[a] = m_edge[a] * level.width;
-    attribute(group_, "Spacing", H5T_IEEE_F64LE, H5T_NATIVE_DOUBLE, 3, spacing);
+    attribute(group_, "Spacing", H5T_IEEE_F64LE_g, H5T_NATIVE_DOUBLE_g, 3, spacing);
     // Numbers from the low corner on are never negative, and fit: the domain is 2^30 wide.
     int const ratio = m_levels.front().width / level.width;
     std::vector<std::int32_t> boxes;
@@ -219,12 +221,12 @@ private:
         boxes.push_back(static_cast<std::int32_t>(box.max[a] - 1 - low));
       }
     hsize_t const shape[2] = {level.boxes.size(), 6};
-    Handle const how(check(H5Pcreate(H5P_DATASET_CREATE)), H5Pclose);
+    Handle const how(check(H5Pcreate(H5P_CLS_DATASET_CREATE_ID_g)), H5Pclose);
     check(H5Pset_obj_track_times(how, false));
     Handle const space(check(H5Screate_simple(2, shape, nullptr)), H5Sclose);
-    Handle const set(check(H5Dcreate2(group_, "AMRBox", H5T_STD_I32LE, space, H5P_DEFAULT, how, H5P_DEFAULT)),
-                     H5Dclose);
-    check(H5Dwrite(set, H5T_NATIVE_INT32, H5S_ALL, H5S_ALL, H5P_DEFAULT, boxes.data()));
+    Handle const set(
+        check(H5Dcreate2(group_, "AMRBox", H5T_STD_I32LE_g, space, H5P_DEFAULT, how, H5P_DEFAULT)), H5Dclose);
+    check(H5Dwrite(set, H5T_NATIVE_INT32_g, H5S_ALL, H5S_ALL, H5P_DEFAULT, boxes.data()));
     for (char const* empty : {"PointData", "FieldData"}) group(group_, empty);
     Handle const cells = group(group_, "CellData");
     for (std::size_t n = 0; n < m_readers.size(); ++n) writeValues(cells, level, m_names[n], *m_readers[n]);
@@ -236,7 +238,7 @@ private:
     hsize_t const shape[2] = {static_cast<hsize_t>(level.samples()), components};
     hsize_t const chunk[2] = {std::min(kChunk / components, shape[0]), components};
     hid_t const type = memoryType(reader);
-    Handle const how(check(H5Pcreate(H5P_DATASET_CREATE)), H5Pclose);
+    Handle const how(check(H5Pcreate(H5P_CLS_DATASET_CREATE_ID_g)), H5Pclose);
     check(H5Pset_obj_track_times(how, false));
     check(H5Pset_chunk(how, rank, chunk));
     check(H5Pset_deflate(how, kCompression));
