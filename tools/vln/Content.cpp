@@ -4,6 +4,9 @@
 
 #include <fmt/format.h>
 
+#include <utility>
+#include <vector>
+
 namespace Vln {
 
 namespace {
@@ -36,6 +39,11 @@ Memory memoryOf(VLN::Object const& object) {
     memory.used += one.used, memory.allocated += one.allocated;
   }
   return memory;
+}
+
+void leaveToSystem(VdbImport content) {
+  static auto* const left = new std::vector<VdbImport>;
+  left->push_back(std::move(content));
 }
 
 } // namespace Vln

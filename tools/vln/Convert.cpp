@@ -1,4 +1,5 @@
 #include "Commands.h"
+#include "Content.h"
 #include "Interop/FileError.h"
 #include "Interop/FileFormat.h"
 #include "Interop/OutputFile.h"
@@ -62,6 +63,7 @@ void convert(ConvertOptions const& options) {
   for (auto const& points : content.points) noteLosses(options.file, points);
   remarks(options.output) << fmt::format("{}: {} {} written\n", options.output, written,
                                          written == 1 ? "grid" : "grids");
+  leaveToSystem(std::move(content));
 }
 
 } // namespace Vln

@@ -142,6 +142,7 @@ void flatten(FlattenOptions const& options) {
     if (std::find(kept.begin(), kept.end(), channel.name) == kept.end() && options.flat.channels == "*")
       std::cerr << fmt::format("vln: {}: note: '{}' is left out: a flat buffer holds no {}\n", options.file,
                                oneLine(channel.name, 60), channel.type);
+  leaveToSystem(std::move(content));
 }
 
 void validate(ValidateOptions const& options) {

@@ -239,7 +239,7 @@ void info(InfoOptions const& options) {
   auto list = nlohmann::ordered_json::array();
   for (std::size_t n = 0; n < files.size(); ++n) {
     try {
-      VdbImport const content = read(files[n], options);
+      VdbImport content = read(files[n], options);
       if (options.json) {
         list.push_back(fileJson(content));
       } else if (options.brief) {
@@ -249,6 +249,7 @@ void info(InfoOptions const& options) {
         printTables(content);
       }
       if (options.memory) printMemory();
+      if (n + 1 == files.size()) leaveToSystem(std::move(content));
     } catch (FileError const& error) {
       if (!several) throw;
       // The others are worth their while.

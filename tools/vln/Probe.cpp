@@ -202,6 +202,7 @@ void probe(ProbeOptions const& options) {
       text.write(points);
     }
   if (file) file->commit();
+  leaveToSystem(std::move(content));
 }
 
 } // namespace Vln

@@ -21,7 +21,7 @@ void slice(SliceOptions const& options) {
   std::string summary;
   {
     ProgressBar bar;
-    auto const content = importVolumes(options.file, options.limits, bar.progress());
+    auto content = importVolumes(options.file, options.limits, bar.progress());
     auto const& volume = volumeWith(content, options.channel);
     try {
       auto plane = options.plane;
@@ -35,6 +35,7 @@ void slice(SliceOptions const& options) {
       summary = fmt::format("{} at {} = {:.9g}: values {:.6g} .. {:.6g}, {} x {} pixels\n", what, axis,
                             result.at, result.low, result.high, result.image.width(), result.image.height());
     } catch (std::invalid_argument const& error) { throw FileError(options.file, error.what()); }
+    leaveToSystem(std::move(content));
   }
   remarks(options.output) << summary;
 }

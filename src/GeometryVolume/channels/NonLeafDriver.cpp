@@ -5,6 +5,8 @@
 #include <algorithm>
 #include <atomic>
 #include <cstring>
+#include <span>
+#include <type_traits>
 #include <vector>
 
 namespace VLN::TileTree3D::Internal {
@@ -26,37 +28,56 @@ int nonLeafChildElement(ChannelLayout const& layout, VoxelOffsetType offsetType,
 
 namespace {
 
-// The samples of a tile: where each lies, the slot of its voxel, and which child sample belongs to it.
-struct Sample {
-  int element, slot, childElement;
+// A sample of a tile and the sample of a child that it takes: offsets in bytes from where their elements
+// begin.
+struct Pair {
+  std::ptrdiff_t own, child;
 };
 
-template <class TraitsT> std::vector<Sample> samplesOf(NonLeafPass const& pass) {
-  constexpr int w = TraitsT::kTDW, perVoxel = TraitsT::kTDW / TraitsT::kTW;
-  std::vector<Sample> samples;
-  for (int k = 0; k < w; ++k)
-    for (int j = 0; j < w; ++j)
-      for (int i = 0; i < w; ++i)
-        samples.push_back(
-            {pass.layout.element(i, j, k),
-             Tile<TraitsT, TraitsT::kTileSize>::slotOf(i / perVoxel, j / perVoxel, k / perVoxel),
-             nonLeafChildElement(pass.layout, pass.offsetType, {i, j, k})});
-  return samples;
+// Those of each slot one after another, as many for each.
+template <class TraitsT> std::vector<Pair> pairsOf(NonLeafPass const& pass) {
+  constexpr int perVoxel = TraitsT::kTDW / TraitsT::kTW;
+  auto const size = static_cast<std::ptrdiff_t>(pass.tiles.ops->size);
+  std::vector<Pair> pairs;
+  for (int slot = 0; slot < TraitsT::kTileSize; ++slot) {
+    int3 const child = Tile<TraitsT, TraitsT::kTileSize>::childIJK(slot);
+    for (int n = 0; n < perVoxel * perVoxel * perVoxel; ++n) {
+      int3 const at{child.x * perVoxel + n % perVoxel, child.y * perVoxel + n / perVoxel % perVoxel,
+                    child.z * perVoxel + n / (perVoxel * perVoxel)};
+      pairs.push_back({pass.layout.element(at.x, at.y, at.z) * size,
+                       nonLeafChildElement(pass.layout, pass.offsetType, at) * size});
+    }
+  }
+  return pairs;
 }
 
-// Calls f(parent element, child element) for the refined samples of a tile whose data exist, until it says
-// that it is done.
+// Calls f(elements, elements of the child, pairs) for the refined slots of a tile whose data exist, until it
+// says that it is done.
 template <class TraitsT, class F>
-void forPairs(NonLeafPass const& pass, std::vector<Sample> const& samples,
-              Tile<TraitsT, TraitsT::kTileSize> const& tile, F const& f) {
+void forChildren(NonLeafPass const& pass, std::vector<Pair> const& pairs,
+                 Tile<TraitsT, TraitsT::kTileSize> const& tile, F const& f) {
   if (!tile.valid()) return;
   auto const* const own = static_cast<std::byte const*>(pass.tiles.elements(tile.treeIndex()));
   if (!own) return;
-  auto const size = static_cast<std::ptrdiff_t>(pass.tiles.ops->size);
-  for (Sample const& s : samples) {
-    if (tile.isLeaf(s.slot)) continue;
-    auto const* const child = static_cast<std::byte const*>(pass.tiles.elements(tile.childTreeIndex(s.slot)));
-    if (child && f(own + s.element * size, child + s.childElement * size)) return;
+  std::size_t const each = pairs.size() / static_cast<std::size_t>(TraitsT::kTileSize);
+  for (int slot = 0; slot < TraitsT::kTileSize; ++slot) {
+    if (tile.isLeaf(slot)) continue;
+    auto const* const child = static_cast<std::byte const*>(pass.tiles.elements(tile.childTreeIndex(slot)));
+    if (child && f(own, child, std::span(pairs).subspan(static_cast<std::size_t>(slot) * each, each))) return;
+  }
+}
+
+// Calls f with the size of an element, for the usual ones as a constant.
+template <class F> void withSize(std::size_t size, F const& f) {
+  switch (size) {
+  case 4:
+    return f(std::integral_constant<std::size_t, 4>());
+  case 8:
+    return f(std::integral_constant<std::size_t, 8>());
+  case 12:
+    return f(std::integral_constant<std::size_t, 12>());
+  default:
+    return f(size);
   }
 }
 
@@ -71,33 +92,48 @@ template <class TraitsT> Depths depthsOf(NonLeafPass const& pass) {
 } // namespace
 
 template <class TraitsT> void setNonLeafValues(NonLeafPass const& pass, Container<TraitsT> const& tree) {
-  auto const samples = samplesOf<TraitsT>(pass);
+  auto const pairs = pairsOf<TraitsT>(pass);
   auto const [low, high] = depthsOf<TraitsT>(pass);
   for (int d = high; d >= low; --d)
     parallelFor(0, tree.tileCount(d), [&, depth = d](std::int64_t begin, std::int64_t end) {
-      for (std::int64_t n = begin; n < end; ++n)
-        forPairs<TraitsT>(pass, samples, tree.tile(n, depth),
-                          [&](std::byte const* to, std::byte const* from) {
-                            std::memcpy(const_cast<std::byte*>(to), from, pass.tiles.ops->size);
-                            return false;
-                          });
+      withSize(pass.tiles.ops->size, [&](auto size) {
+        for (std::int64_t n = begin; n < end; ++n)
+          forChildren<TraitsT>(pass, pairs, tree.tile(n, depth),
+                               [&](std::byte const* own, std::byte const* child, std::span<Pair const> of) {
+                                 auto* const to = const_cast<std::byte*>(own);
+                                 for (Pair const& p : of) std::memcpy(to + p.own, child + p.child, size);
+                                 return false;
+                               });
+      });
     });
 }
 
 template <class TraitsT>
 bool findNonLeafDifference(NonLeafPass const& pass, double tolerance, Container<TraitsT> const& tree) {
-  auto const samples = samplesOf<TraitsT>(pass);
+  auto const pairs = pairsOf<TraitsT>(pass);
   auto const [low, high] = depthsOf<TraitsT>(pass);
+  auto const differs = [&](void const* a, void const* b) {
+    return pass.tiles.ops->distance(a, b) > tolerance;
+  };
   std::atomic<bool> found = false;
   for (int d = high; d >= low && !found; --d)
     parallelFor(0, tree.tileCount(d), [&, depth = d](std::int64_t begin, std::int64_t end) {
-      for (std::int64_t n = begin; n < end && !found.load(std::memory_order_relaxed); ++n)
-        forPairs<TraitsT>(pass, samples, tree.tile(n, depth),
-                          [&](std::byte const* own, std::byte const* child) {
-                            bool const differs = pass.tiles.ops->distance(own, child) > tolerance;
-                            if (differs) found.store(true, std::memory_order_relaxed);
-                            return differs;
-                          });
+      withSize(pass.tiles.ops->size, [&](auto size) {
+        for (std::int64_t n = begin; n < end && !found.load(std::memory_order_relaxed); ++n)
+          forChildren<TraitsT>(pass, pairs, tree.tile(n, depth),
+                               [&](std::byte const* own, std::byte const* child, std::span<Pair const> of) {
+                                 for (Pair const& p : of) {
+                                   // Most are the same to the bit, and then no number lies between them.
+                                   if (tolerance >= 0 && !std::memcmp(own + p.own, child + p.child, size))
+                                     continue;
+                                   if (differs(own + p.own, child + p.child)) {
+                                     found.store(true, std::memory_order_relaxed);
+                                     return true;
+                                   }
+                                 }
+                                 return false;
+                               });
+      });
     });
   return found;
 }
