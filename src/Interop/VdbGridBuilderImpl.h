@@ -6,7 +6,10 @@
 #include "Interop/VdbGridNodesImpl.h"
 
 #include <algorithm>
+#include <array>
+#include <cstdint>
 #include <map>
+#include <type_traits>
 
 namespace VLN::Interop {
 
@@ -98,27 +101,39 @@ private:
   }
 
   void fillLeaf(Leaf& leaf, Block const& block) const {
+    std::array<std::uint64_t, 8> active{};              // a word for each i, k fastest
+    constexpr bool kBits = std::is_same_v<Value, bool>; // values that have no addresses
+    Value* values = nullptr;
+    if constexpr (!kBits) values = leaf.buffer().data();
+    auto const write = [&leaf, values](int n, Value const& value) {
+      if constexpr (kBits)
+        leaf.setValueOnly(static_cast<openvdb::Index>(n), value);
+      else
+        values[n] = value;
+    };
     for (int slot = 0; slot < 8; ++slot) {
       int const qi = 4 * (slot & 1), qj = 4 * (slot >> 1 & 1), qk = 4 * (slot >> 2);
       std::int64_t const quarter = block.quarters[static_cast<std::size_t>(slot)];
       TreeIndex const at{quarter, kMaxDepth};
-      // A quarter that was left out has one value, which the tile above holds at its corner.
-      Value const uniform = quarter >= 0 || !block.above.valid()
-                                ? m_background
-                                : valueAt(block.above, {qi / 2, qj / 2, qk / 2});
-      for (int k = 0; k < 4; ++k)
-        for (int j = 0; j < 4; ++j)
-          for (int i = 0; i < 4; ++i) {
-            auto const n = Leaf::coordToOffset(Coord(qi + i, qj + j, qk + k));
-            Value const value = quarter < 0 ? uniform : valueAt(at, {i, j, k});
-            bool active = false;
-            if (quarter >= 0)
-              active = m_from.state ? (m_from.state->tileData(at)(i, j, k) & kVdbStateActive) != 0
-                                    : isActive(value);
-            leaf.setValueOnly(n, value);
-            leaf.setActiveState(n, active);
-          }
+      if (quarter < 0) {
+        // A quarter that was left out has one value, which the tile above holds at its corner.
+        Value const uniform =
+            block.above.valid() ? valueAt(block.above, {qi / 2, qj / 2, qk / 2}) : m_background;
+        for (int n = 0; n < 64; ++n)
+          write((qi + (n >> 4)) * 64 + (qj + (n >> 2 & 3)) * 8 + qk + (n & 3), uniform);
+        continue;
+      }
+      Element const* const elements = &*m_channel.tileData(at).begin();
+      unsigned char const* const states = m_from.state ? &*m_from.state->tileData(at).begin() : nullptr;
+      for (int n = 0; n < 64; ++n) {
+        int const i = qi + (n & 3), place = (qj + (n >> 2 & 3)) * 8 + qk + (n >> 4);
+        Value const value = fromElement<Value>(elements[n]);
+        bool const on = states ? (states[n] & kVdbStateActive) != 0 : isActive(value);
+        write(i * 64 + place, value);
+        active[static_cast<std::size_t>(i)] |= std::uint64_t(on) << place;
+      }
     }
+    for (openvdb::Index i = 0; i < 8; ++i) leaf.getValueMask().template getWord<std::uint64_t>(i) = active[i];
   }
 
   void writeLeaves() {
