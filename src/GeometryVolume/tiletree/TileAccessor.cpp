@@ -73,8 +73,15 @@ template <class TraitsT>
 TreeIndex ConstTileAccessorOf<TraitsT>::find(int i, int j, int k, int depth, bool exact) const {
   if (!m_container || depth < 0 || !TraitsT::inDomain(i, j, k)) return {};
   TreeIndex at;
-  if (auto const* table = m_container->lookupTable(); table && depth >= table->lastDepth)
+  if (auto const* table = m_container->lookupTable(); table && depth >= table->lastDepth) {
     at = table->find(i, j, k);
+    if (at.depth == table->kNoTile) return {};
+    // A tile of the last depth may have deeper ones below it; other answers are complete.
+    if (at.depth >= 0 && (at.depth < table->lastDepth || at.depth == depth)) {
+      setCursor(at, i, j, k);
+      return exact && at.depth != depth ? TreeIndex{} : at;
+    }
+  }
   if (at.valid())
     m_pathTop = at.depth;
   else
