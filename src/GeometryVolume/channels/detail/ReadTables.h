@@ -64,8 +64,8 @@ private:
   }
   /// Of blocks: beyond the last one where there is none.
   std::uint32_t cellOf(int c, std::size_t axis) const {
-    // Blocks lie at multiples of their width. From the low corner on, and the domain is a quarter of all
-    // integers: positions below wrap to far above.
+    // Blocks lie at multiples of their width. The domain is a quarter of all integers: positions below the
+    // box wrap to far above it.
     if constexpr (TraitsT::kTW == 2)
       return (static_cast<std::uint32_t>(c) - m_low[axis]) / std::uint32_t(kBlockWidth);
     else

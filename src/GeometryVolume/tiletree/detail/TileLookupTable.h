@@ -53,7 +53,7 @@ template <class TraitsT> struct TileLookupTable {
   /// @cost Half of the instructions of find(). Reads at random wait for memory side by side, as many as the
   /// processor holds.
   std::int64_t indexAtLast(int i, int j, int k) const requires(TraitsT::kTW == 2) {
-    // The grid is not as wide as the domain: positions below it wrap to far above.
+    // The domain is a quarter of all integers: positions below the grid wrap to far above it.
     std::uint32_t const x = static_cast<std::uint32_t>(i) - low[0],
                         y = static_cast<std::uint32_t>(j) - low[1],
                         z = static_cast<std::uint32_t>(k) - low[2];
