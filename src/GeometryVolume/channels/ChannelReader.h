@@ -50,7 +50,9 @@ public:
   /// @space Tile space.
   /// @edges The channel's default value where no tile has data, and out of the domain.
   /// @cost In the block of the read before: one test, and two loads. In another with a tile of the deepest
-  /// depth: one load more. Elsewhere a lookup in the tree.
+  /// depth: one load more, and where blocks are read one after another, their samples are fetched ahead.
+  /// Elsewhere a lookup in the tree.
+  /// @error std::bad_alloc from the first lookup in the tree.
   value_type const& value(int i, int j, int k) const {
     using Tile = typename ChannelT::ConstTile;
     value_type const* const sample =

@@ -37,9 +37,10 @@ public:
 
   /// The same for tiles whose elements lie kWidth in a row from element kFirst on.
   /// @return The element itself; null where there is no such tile.
-  /// @cost As find(). Elements of blocks that a way leads through are fetched ahead.
+  /// @cost As find(). Where blocks are read one after another, what they hold is fetched ahead.
   template <class T, int kWidth, int kFirst> T const* element(int i, int j, int k) {
     Steps at = steps(i, j, k);
+    ++m_reads;
     if (!at.inBlock()) [[unlikely]] {
       move<sizeof(T) * kWidth * kWidth * kWidth>(i, j, k);
       at = steps(i, j, k);
@@ -80,10 +81,9 @@ private:
     // Out of the domain, too, the corner is less than a block away, and the block is the empty one.
     int const x = alignToBlock(i), y = alignToBlock(j), z = alignToBlock(k);
     if constexpr (kBits && kBytes > 0 && kBytes <= kMostBytes) {
-      bool const near = static_cast<std::uint32_t>((x ^ m_x) | (y ^ m_y) | (z ^ m_z)) < 2 * kBlockWidth;
-      m_near = m_near * 2 | std::uint32_t(near);
-      if (m_near & kNearMoves) [[unlikely]]
+      if (m_reads > kManyReads) [[unlikely]]
         m_fetched = m_tables->fetch(*block, m_fetched, next(x, m_x), next(y, m_y), next(z, m_z), kBytes);
+      m_reads /= 2;
     }
     m_block = block, m_x = x, m_y = y, m_z = z;
   }
@@ -98,15 +98,16 @@ private:
       return TraitsT::align(c, Tables::kBlockDepth);
   }
 
-  /// Reads that go on from block to block had a short move among the last three. At random there are few.
-  static constexpr std::uint32_t kNearMoves = 7;
+  /// In the last blocks, so that much of the next one will be read as well. Rows of a box and short walks
+  /// read less in one go.
+  static constexpr std::uint32_t kManyReads = 48;
   /// Of a tile that is fetched ahead: a block of larger ones would drive out what is read now.
   static constexpr std::size_t kMostBytes = 512;
 
   // The corner's coordinates lie apart, or the compiler stores two at once, for which reads of one have to
   // wait.
   int m_x = TraitsT::kMinTileCoord;
-  std::uint32_t m_near = 0; ///< a bit for each of the last moves: a short one; the last is lowest
+  std::uint32_t m_reads = 0; ///< by element() in the block, and half of those before, and so on
   Tables const* m_tables = nullptr;
   int m_y = TraitsT::kMinTileCoord;
   typename Tables::Block const* m_block = nullptr;
