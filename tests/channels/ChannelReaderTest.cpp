@@ -4,7 +4,10 @@
 #include "support/RandomForest.h"
 #include "support/Shapes.h"
 
+#include <algorithm>
 #include <limits>
+#include <utility>
+#include <vector>
 
 namespace VLN::Test {
 namespace {
@@ -85,6 +88,87 @@ TYPED_TEST(ChannelReaderTest, GivesTheDefaultValueWhereNothingIs) {
                                                                     : 3.0f)
           << c;
   EXPECT_LT(reader.memUsage(), 1u << 20);
+}
+
+// edge: a table of blocks at either end of the domain, positions around it and at the ends of all integers
+TYPED_TEST(ChannelReaderTest, GivesTheDefaultValueBesideEitherEndOfTheDomain) {
+  using Traits = TypeParam;
+  using ChannelT = Channel<Traits, float, Traits::kTDW, 0>;
+  constexpr int kLow = std::numeric_limits<int>::min(), kTop = std::numeric_limits<int>::max();
+  constexpr int kWidth = Traits::width(Traits::kMaxDepth - 1);
+  for (int const end : {Traits::kMinTileCoord, Traits::kMaxTileCoord, -1, 0}) {
+    Container<Traits> tree("", 1.0f);
+    auto const corner = tree.tileAccessor().addTile(end, end, end, Traits::kMaxDepth).tijk();
+    auto channel = channelOn<ChannelT>(tree, 3.0f, 0, Traits::kMaxDepth);
+    channel.tileData(0, Traits::kMaxDepth).set(1.0f);
+    ChannelReader<ChannelT> const reader(tree, channel);
+    for (std::int64_t const step : {0, 1, -1, kWidth, -kWidth, 1 << 29, -(1 << 29), 1 << 30, -(1 << 30)}) {
+      auto const c = static_cast<int>(std::clamp<std::int64_t>(std::int64_t(corner.x) + step, kLow, kTop));
+      bool const within = c >= corner.x && c < corner.x + Traits::width(Traits::kMaxDepth);
+      for (int axis = 0; axis < 3; ++axis) {
+        int3 p = corner;
+        p[axis] = c;
+        EXPECT_EQ(reader.value(p), within ? 1.0f : 3.0f) << end << " and " << step << " on axis " << axis;
+      }
+    }
+    for (int const c : {kLow, kTop}) EXPECT_EQ(reader.value(corner.x, c, corner.z), 3.0f);
+  }
+}
+
+// model: ways of short and long steps along each axis, with the samples of blocks ahead, to beyond the domain
+TYPED_TEST(ChannelReaderTest, ReadsTheSameOnWaysFromBlockToBlock) {
+  using Traits = TypeParam;
+  using ChannelT = Channel<Traits, float, Traits::kTDW, 0>;
+  using Wide = Channel<Traits, float, Traits::kTDW, 1>;
+  constexpr int kBlock = Traits::width(Traits::kMaxDepth - 1);
+  Container<Traits> tree("", 1.0f);
+  int const top = Traits::kMaxTileCoord;
+  for (int n = 0; n < 6; n += 1 + n % 2) {
+    tree.tileAccessor().addTile(n * kBlock, 0, -n, Traits::kMaxDepth);
+    tree.tileAccessor().addTile(top - n * kBlock, top, top, Traits::kMaxDepth);
+  }
+  auto channel = channelOn<ChannelT>(tree, 3.0f, 0, Traits::kMaxDepth);
+  auto wide = channelOn<Wide>(tree, 3.0f, 0, Traits::kMaxDepth);
+  fillRandom(channel, tree, 1);
+  fillRandom(wide, tree, 2);
+  ChannelReader<ChannelT> const reader(tree, channel);
+  ChannelReader<Wide> const wideReader(tree, wide);
+  for (int3 const& start : {int3{-2 * kBlock, 0, 0}, int3{top - 7 * kBlock, top, top}})
+    for (int const step : {1, kBlock - 1, kBlock, -kBlock, 2 * kBlock})
+      for (int axis = 0; axis < 3; ++axis) {
+        int3 p = start;
+        for (int n = 0; n < 20; ++n) {
+          float const expected = modelValue(tree, channel, p);
+          ASSERT_EQ(reader.value(p), expected) << p.x << ' ' << p.y << ' ' << p.z;
+          ASSERT_EQ(wideReader.value(p), modelValue(tree, wide, p)) << p.x << ' ' << p.y << ' ' << p.z;
+          // Readers fetch ahead once they have read much of a block.
+          for (int again = 0; again < 60; ++again) ASSERT_EQ(reader.value(p), expected) << again;
+          p[axis] += step;
+        }
+      }
+}
+
+TYPED_TEST(ChannelReaderTest, CopiesReadByThemselves) {
+  using Traits = TypeParam;
+  using ChannelT = Channel<Traits, float, Traits::kTDW, 0>;
+  Container<Traits> trees[2] = {Container<Traits>("", 1.0f), Container<Traits>("", 1.0f)};
+  std::vector<ChannelT> channels;
+  for (auto& tree : trees) {
+    tree.tileAccessor().addTile(0, 0, 0, Traits::kMaxDepth - 1);
+    channels.push_back(channelOn<ChannelT>(tree, 3.0f, 0, Traits::kMaxDepth));
+    channels.back().tileData(0, Traits::kMaxDepth - 1).set(static_cast<float>(channels.size()));
+  }
+  ChannelReader<ChannelT> a(trees[0], channels[0]), b(trees[1], channels[1]);
+  EXPECT_EQ(a.value(0, 0, 0), 1.0f);
+  ChannelReader<ChannelT> c(a);
+  a = b;
+  EXPECT_EQ(a.value(0, 0, 0), 2.0f);
+  EXPECT_EQ(c.value(0, 0, 0), 1.0f);
+  auto const& same = c;
+  c = same;
+  b = std::move(c);
+  EXPECT_EQ(b.value(0, 0, 0), 1.0f);
+  EXPECT_EQ(b.value(Traits::kMaxTileCoord, 0, 0), 3.0f);
 }
 
 // edge: a tile that lost elements is no whole tile, and its parent answers

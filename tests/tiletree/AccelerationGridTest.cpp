@@ -243,6 +243,41 @@ TYPED_TEST(AccelerationGrid, ThreadsSearchWhileTheTableOfPlacesIsMade) {
   EXPECT_NE(Access::data(tree).m_lookup.loadAcquire(), nullptr);
 }
 
+// boundary: positions around the grid and at the ends of all integers, for grids at either end of the domain
+TYPED_TEST(AccelerationGrid, PositionsAroundTheGridHaveNoTile) {
+  using T = TypeParam;
+  constexpr int kLow = std::numeric_limits<int>::min(), kTop = std::numeric_limits<int>::max();
+  for (int const depth : {T::kMaxDepth, T::kMaxDepth - 1, T::kMaxDepth - 2})
+    for (int const end : {T::kMinTileCoord, T::kMaxTileCoord, -1, 0}) {
+      Container<T> tree;
+      // The grid's depth, and by turns as many levels below it as a table holds.
+      int3 const corner = tree.tileAccessor().addTile(end, end, end, depth).tijk();
+      tree.tileAccessor().addTile(end, end, end, T::kMaxDepth);
+      Container<T> const plain = tree;
+      tree.buildAccessorAccelerationStructure(depth);
+      ASSERT_EQ(Access::data(tree).m_gridDepth, depth);
+      auto const accessor = std::as_const(tree).tileAccessor();
+      std::int64_t const w = T::width(depth);
+      for (std::int64_t const step :
+           {std::int64_t(0), std::int64_t(1), std::int64_t(-1), w - 1, w, -w, std::int64_t(1) << 29,
+            -(std::int64_t(1) << 29), std::int64_t(1) << 30, -(std::int64_t(1) << 30), std::int64_t(1) << 31})
+        for (int axis = 0; axis < 3; ++axis)
+          for (int d : {T::kMaxDepth, depth, T::kMaxDepth + 1}) {
+            int3 p = corner;
+            p[axis] =
+                static_cast<int>(std::clamp<std::int64_t>(std::int64_t(corner[axis]) + step, kLow, kTop));
+            for (bool const exact : {false, true}) {
+              auto const expected = plain.tileAccessor().treeIndex(p.x, p.y, p.z, d, exact);
+              auto const found = accessor.treeIndex(p.x, p.y, p.z, d, exact);
+              ASSERT_EQ(found, expected) << end << ", depth " << d << ", step " << step;
+              if (!found.valid()) continue;
+              EXPECT_EQ(accessor.cursorCorner(), tree.tile(found).tijk());
+              EXPECT_EQ(&accessor.current(), &tree.tile(found));
+            }
+          }
+    }
+}
+
 // regression: a cell of the grid without a tile of its depth may still hold a deeper root
 TYPED_TEST(AccelerationGrid, DeeperRootsAreFound) {
   using T = TypeParam;

@@ -5,6 +5,8 @@
 #include "GeometryVolume/channels/Channel.h"
 #include "GeometryVolume/channels/detail/BlockCursor.h"
 
+#include <utility>
+
 namespace VLN::TileTree3D {
 
 /// Remembers the last block of tiles, and finds others through tables of its own, which copies share.
@@ -24,21 +26,42 @@ public:
                                         [&](std::int64_t n) -> void const* {
                                           return elements(channel, {n, TraitsT::kMaxDepth});
                                         }))
+      , m_tree(&tree)
       , m_channel(&channel)
-      , m_tiles(tree.tileAccessor())
       , m_blocks(*m_tables) {}
+  ChannelReader(ChannelReader const& other)
+      : m_tables(other.m_tables)
+      , m_tree(other.m_tree)
+      , m_channel(other.m_channel)
+      , m_blocks(other.m_blocks) {}
+  ChannelReader& operator=(ChannelReader const& other) {
+    m_tables = other.m_tables, m_tree = other.m_tree, m_channel = other.m_channel, m_blocks = other.m_blocks;
+    drop(std::exchange(m_coarse, nullptr));
+    return *this;
+  }
+  // Inline on the ways of exceptions as well. Then nothing takes the address of a reader that is a function's
+  // own, and what it remembers stays in registers.
+  [[gnu::always_inline]] ~ChannelReader() {
+    if (m_coarse) [[unlikely]]
+      drop(m_coarse);
+  }
 
   /// The sample that holds the position, of the deepest tile that has data.
   /// @space Tile space.
   /// @edges The channel's default value where no tile has data, and out of the domain.
   /// @cost In the block of the read before: one test, and two loads. In another with a tile of the deepest
-  /// depth: one load more. Elsewhere a lookup in the tree.
+  /// depth: one load more, and where blocks are read one after another, their samples are fetched ahead.
+  /// Elsewhere a lookup in the tree.
+  /// @error std::bad_alloc from the first lookup in the tree.
   value_type const& value(int i, int j, int k) const {
     using Tile = typename ChannelT::ConstTile;
     value_type const* const sample =
         m_blocks.template element<value_type, Tile::kWidth, Tile::index(0, 0, 0)>(i, j, k);
-    if (!sample) [[unlikely]]
-      return coarse(i, j, k);
+    if (!sample) [[unlikely]] {
+      Coarse const found = coarse(m_coarse, *m_tree, *m_channel, i, j, k);
+      m_coarse = found.tiles;
+      return *found.sample;
+    }
     return *sample;
   }
   value_type const& value(int3 const& p) const { return value(p.x, p.y, p.z); }
@@ -54,21 +77,31 @@ private:
     auto const n = static_cast<std::size_t>(at.index);
     return n < tiles.size() && tiles[n].size() >= std::size_t(ChannelT::kSize) ? tiles[n].data() : nullptr;
   }
+  using Tiles = ConstTileAccessorOf<TraitsT>;
+  struct Coarse {
+    Tiles* tiles;
+    value_type const* sample;
+  };
   /// From the tile that a search in the tree finds, or from one above it.
-  [[gnu::cold]] value_type const& coarse(int i, int j, int k) const {
-    TreeIndex at = m_tiles.treeIndex(i, j, k, TraitsT::kMaxDepth, false);
+  /// @param tiles The accessor of earlier searches, null for the first one.
+  [[gnu::cold, gnu::noinline]] static Coarse coarse(Tiles* tiles, Container<TraitsT> const& tree,
+                                                    ChannelT const& channel, int i, int j, int k) {
+    if (!tiles) tiles = new Tiles(tree.tileAccessor());
+    TreeIndex at = tiles->treeIndex(i, j, k, TraitsT::kMaxDepth, false);
     while (at.valid()) {
-      auto const& tile = m_tiles.tile(at);
-      if (value_type const* const samples = elements(*m_channel, at))
-        return samples[ChannelT::ConstTile::index(tile.childDataIJK(i, j, k))];
+      auto const& tile = tiles->tile(at);
+      if (value_type const* const samples = elements(channel, at))
+        return {tiles, samples + ChannelT::ConstTile::index(tile.childDataIJK(i, j, k))};
       at = tile.parentTreeIndex();
     }
-    return m_channel->defaultValue();
+    return {tiles, &channel.defaultValue()};
   }
+  [[gnu::cold, gnu::noinline]] static void drop(Tiles* tiles) { delete tiles; }
 
   Ostil::Ptr<Tables> m_tables;
+  Container<TraitsT> const* m_tree;
   ChannelT const* m_channel;
-  ConstTileAccessorOf<TraitsT> m_tiles;
+  mutable Tiles* m_coarse = nullptr;
   mutable Internal::BlockCursor<TraitsT> m_blocks;
 };
 

@@ -26,11 +26,50 @@ template <class TraitsT> void ReadTables<TraitsT>::chooseCells(Container<TraitsT
       // The upper corner is exclusive.
       std::uint32_t const last = TraitsT::quotient(TraitsT::offset(box.max[axis]) - 1, m_cellDepth);
       m_origin[a] = first, m_size[a] = last - first + 1;
+      m_low[a] = static_cast<std::uint32_t>(TraitsT::align(box.min[axis], m_cellDepth));
       cells = std::min(cells * m_size[a], std::uint64_t(1) << 32);
     }
     if (cells > wanted) continue;
     m_cells.assign(cells, 0);
     return;
+  }
+}
+
+template <class TraitsT> auto ReadTables<TraitsT>::blockInNodes(int i, int j, int k) const -> Block const* {
+  std::uint32_t const u[3] = {TraitsT::offset(i), TraitsT::offset(j), TraitsT::offset(k)};
+  std::size_t cell = 0;
+  bool inside = true;
+  for (std::size_t a = 3; a-- > 0;) {
+    std::uint32_t const q = TraitsT::quotient(u[a], m_cellDepth) - m_origin[a];
+    inside &= q < m_size[a];
+    cell = cell * m_size[a] + q;
+  }
+  if (!inside) return &noBlock();
+  std::int32_t id = m_cells[cell];
+  for (int d = m_cellDepth + 1; d <= kBlockDepth; ++d) id = m_nodes[static_cast<std::size_t>(id)][slot(u, d)];
+  return &m_blocks[static_cast<std::size_t>(id)];
+}
+
+template <class TraitsT>
+auto ReadTables<TraitsT>::fetch(Block const& here, Block const* fetched, int i, int j, int k,
+                                std::size_t tileBytes) const -> Block const* {
+  constexpr std::size_t kLine = 64;
+  Block const* const ahead = block(i, j, k);
+  // Not a function for one block: the compiler takes one that does nothing but fetch ahead for one without
+  // effect.
+  for (auto const* b = &here == fetched ? ahead : &here;; b = ahead) {
+    for (void const* tile : b->tiles) {
+      if (!tile) continue;
+      // By four lines, the size of most tiles.
+      for (std::size_t at = 0; at < tileBytes; at += 4 * kLine) {
+        auto const* const line = static_cast<char const*>(tile) + at;
+        __builtin_prefetch(line);
+        __builtin_prefetch(line + kLine);
+        __builtin_prefetch(line + 2 * kLine);
+        __builtin_prefetch(line + 3 * kLine);
+      }
+    }
+    if (b == ahead) return ahead;
   }
 }
 

@@ -240,10 +240,10 @@ VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::sampleGradient(Position const* positions,
              [&](std::int64_t n) { values[n] = sampleGradient(positions[n], depth, space, &gradients[n]); });
 }
 
-// The samples of the tile of the same depth that lies on in a direction, null where there is none.
-VLN_SAMPLER_TEMPLATE float const* VLN_SAMPLER::highSide(TreeIndex const& tile, HighSides& sides,
-                                                        unsigned direction) const {
-  if (sides.known >> direction & 1) return sides.data[direction];
+// Finds the tile of the same depth that lies on in a direction.
+VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::findHighSide(TreeIndex const& tile, HighSides& sides,
+                                                    unsigned direction) const {
+  if (sides.known >> direction & 1) return;
   int3 const corner =
       this->m_last.tile() == tile ? Internal::toInt3(this->m_last.corner()) : m_container->tile(tile).tijk();
   int const w = TraitsT::width(tile.depth);
@@ -251,26 +251,22 @@ VLN_SAMPLER_TEMPLATE float const* VLN_SAMPLER::highSide(TreeIndex const& tile, H
   TreeIndex const at =
       m_tileAccessor.treeIndex(corner.x + on(1), corner.y + on(2), corner.z + on(4), tile.depth, true);
   sides.known |= 1u << direction;
-  return sides.data[direction] = at.valid() ? dataOf(*m_channelCore, at) : nullptr;
+  if (!at.valid()) sides.missing |= 1u << direction;
+  // Something to read in any case.
+  sides.data[direction] = at.valid() ? dataOf(*m_channelCore, at) : sides.data[0];
 }
 
 // The eight samples of a cell of corner samples, x fastest.
 // @param edge Bits of the axes on which the cell begins at the tile's last sample.
-// @param tiles The tile, and those on along x, y and z by bits; null where there is none.
-// @return Bits of the samples that are not there.
-VLN_SAMPLER_TEMPLATE unsigned VLN_SAMPLER::readEdge(int3 const& low, unsigned edge,
-                                                    std::array<float const*, 8> const& tiles,
-                                                    float* corners) {
-  unsigned gaps = 0;
-  for (unsigned c = 0; c < 8; ++c) {
-    float const* const data = tiles[c & edge];
-    auto const at = [&](int i, unsigned bit) { return !(c & bit) ? i : edge & bit ? 0 : i + 1; };
-    if (data)
-      corners[c] = data[at(low.x, 1) + D * (at(low.y, 2) + D * at(low.z, 4))];
-    else
-      gaps |= 1u << c;
-  }
-  return gaps;
+// @param tiles The tile, and those on along x, y and z by bits.
+VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::readEdge(int3 const& low, unsigned edge,
+                                                std::array<float const*, 8> const& tiles, float* corners) {
+  auto const next = [edge](int i, unsigned bit) { return edge & bit ? 0 : i + 1; };
+  int const x[2] = {low.x, next(low.x, 1)}, y[2] = {D * low.y, D * next(low.y, 2)},
+            z[2] = {D * D * low.z, D * D * next(low.z, 4)};
+  // Written out, without branches: which samples come from where is hard to foretell.
+  auto const read = [&](unsigned c) { corners[c] = tiles[c & edge][x[c & 1] + (y[c >> 1 & 1] + z[c >> 2])]; };
+  read(0), read(1), read(2), read(3), read(4), read(5), read(6), read(7);
 }
 
 // The eight samples of a cell of corner samples: those beyond the tile from the tiles beside it,
@@ -281,16 +277,21 @@ VLN_SAMPLER_TEMPLATE bool VLN_SAMPLER::edgeCorners(TreeIndex const& tile, int3 c
                                                    int& budget) const {
   auto& sides = m_highSides[tile.depth];
   if (sides.tile != tile.index) {
-    sides.tile = tile.index, sides.known = 1, sides.gaps = 0;
+    sides.tile = tile.index, sides.known = 1, sides.missing = 0, sides.gaps = 0;
     sides.data[0] = dataOf(*m_channelCore, tile);
   }
   unsigned const edge =
       unsigned(low.x == D - 1) | unsigned(low.y == D - 1) << 1 | unsigned(low.z == D - 1) << 2;
-  for (unsigned direction = edge; direction; direction = (direction - 1) & edge)
-    highSide(tile, sides, direction);
-  unsigned const gaps = readEdge(low, edge, sides.data, corners);
-  if (gaps == 0) return true;
+  // Bits of the directions that a cell asks for: the parts of its edge.
+  static constexpr std::array<std::uint8_t, 8> kParts = {0x01, 0x03, 0x05, 0x0f, 0x11, 0x33, 0x55, 0xff};
+  if (kParts[edge] & ~sides.known)
+    for (unsigned direction = edge; direction; direction = (direction - 1) & edge)
+      findHighSide(tile, sides, direction);
+  readEdge(low, edge, sides.data, corners);
+  if (!(kParts[edge] & sides.missing)) return true;
 
+  unsigned gaps = 0;
+  for (unsigned c = 0; c < 8; ++c) gaps |= (sides.missing >> (c & edge) & 1) << c;
   ++sides.gaps;
   auto const& record = m_container->tile(tile);
   if (!hasUsableParent(record)) {

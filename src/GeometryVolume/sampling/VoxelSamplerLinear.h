@@ -246,10 +246,10 @@ private:
   template <class F>
   void forBatches(Position const* positions, std::int64_t count, int depth, SamplerSpace space,
                   F const& f) const;
-  static unsigned readEdge(int3 const& low, unsigned edge, std::array<float const*, 8> const& tiles,
-                           float* corners);
+  static void readEdge(int3 const& low, unsigned edge, std::array<float const*, 8> const& tiles,
+                       float* corners);
   bool edgeCorners(TreeIndex const& tile, int3 const& low, float* corners, int& budget) const;
-  float const* highSide(TreeIndex const& tile, HighSides& sides, unsigned direction) const;
+  void findHighSide(TreeIndex const& tile, HighSides& sides, unsigned direction) const;
 
   void bind(CoreChannel const* core, WideChannel const* wide);
   void forgetTiles();

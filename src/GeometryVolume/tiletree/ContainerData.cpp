@@ -88,7 +88,7 @@ void ContainerData<TraitsT>::memUse(std::uint64_t& used, std::uint64_t& allocate
   // Used counts the grid alone; what goes with it is an aid, but it takes memory.
   if (auto const table = lookupTable())
     allocated +=
-        table->cells.capacity() * sizeof(std::int64_t) + table->places.capacity() * sizeof(std::int32_t);
+        table->cells.capacity() * sizeof(std::int32_t) + table->places.capacity() * sizeof(std::int32_t);
   used += m_allThreadLocal.size() * sizeof(m_allThreadLocal[0]);
   allocated += m_allThreadLocal.capacity() * sizeof(m_allThreadLocal[0]);
   for (auto const& scratch : m_allThreadLocal) {

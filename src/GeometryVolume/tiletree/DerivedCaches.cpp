@@ -2,6 +2,7 @@
 
 #include "GeometryVolume/tiletree/TileHalo.h"
 
+#include <bit>
 #include <cmath>
 
 namespace VLN::TileTree3D {
@@ -183,7 +184,8 @@ void fillCells(Container<TraitsT> const& tree, Grid const& grid, TileLookupTable
               grid.origin.x + i * w, grid.origin.y + static_cast<int>(row % grid.size[1]) * w,
               grid.origin.z + static_cast<int>(row / grid.size[1]) * w, grid.depth, false);
         }
-        if (at.index >= 0) table.cells[cell] = at.index * table.kDepthUnit + at.depth;
+        if (at.index >= 0)
+          table.cells[cell] = static_cast<std::int32_t>(at.index * table.kDepthUnit + at.depth);
       }
   });
 }
@@ -217,8 +219,8 @@ std::shared_ptr<TileLookupTable<TraitsT> const> computeLookupTable(Container<Tra
                                                                    Grid const& grid) {
   using Table = TileLookupTable<TraitsT>;
   int const g = grid.depth, last = std::min(g + Table::kLevels, TraitsT::kMaxDepth);
-  for (int d = g; d <= last; ++d) {
-    if (tree.tileCount(d) > Table::kMostTiles) return nullptr;
+  for (int d = 0; d <= last; ++d) {
+    if (tree.tileCount(d) > (d <= g ? Table::kMostCellTiles : Table::kMostTiles)) return nullptr;
   }
   auto table = std::make_shared<Table>();
   table->gridDepth = g, table->lastDepth = last;
@@ -229,7 +231,12 @@ std::shared_ptr<TileLookupTable<TraitsT> const> computeLookupTable(Container<Tra
     auto const axis = static_cast<std::size_t>(a);
     table->first[axis] = TraitsT::quotient(TraitsT::offset(grid.origin[a]), g);
     table->size[axis] = static_cast<std::uint32_t>(grid.size[axis]);
+    table->low[axis] = static_cast<std::uint32_t>(grid.origin[a]);
   }
+  auto const lastWidth = static_cast<std::uint32_t>(TraitsT::width(last));
+  table->placeBits = static_cast<std::uint32_t>(std::countr_zero(lastWidth));
+  table->placeMask = table->placeWidth - 1;
+  table->widthMask = ~(lastWidth - 1);
   table->cells.assign(grid.tiles.size(), Table::kNoTile);
   markDeeperRoots(tree, *table);
   fillCells(tree, grid, *table);

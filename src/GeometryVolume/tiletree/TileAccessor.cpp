@@ -73,8 +73,22 @@ template <class TraitsT>
 TreeIndex ConstTileAccessorOf<TraitsT>::find(int i, int j, int k, int depth, bool exact) const {
   if (!m_container || depth < 0 || !TraitsT::inDomain(i, j, k)) return {};
   TreeIndex at;
-  if (auto const* table = m_container->lookupTable(); table && depth >= table->lastDepth)
+  if (auto const* table = m_container->lookupTable()) {
     at = table->find(i, j, k);
+    if (at.depth == table->kNoTile) return {};
+    // Few levels up are a shorter way than one down from above. A root on the way is no answer.
+    constexpr int kFewLevels = 3;
+    if (at.depth > depth && at.depth - depth <= kFewLevels) {
+      while (at.depth > depth && at.index >= 0) at = {m_container->tile(at).parentIndex(), at.depth - 1};
+      if (at.index < 0) at = {};
+    }
+    // A tile of the last depth may have deeper ones below it; other answers are complete.
+    if (at.depth == depth || (at.depth >= 0 && at.depth < depth && at.depth < table->lastDepth)) {
+      setCursor(at, i, j, k);
+      return exact && at.depth != depth ? TreeIndex{} : at;
+    }
+    if (at.depth > depth) at = {};
+  }
   if (at.valid())
     m_pathTop = at.depth;
   else

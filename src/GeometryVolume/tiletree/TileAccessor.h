@@ -44,13 +44,15 @@ public:
   /// @cost As tile(), without touching the tile's record.
   TreeIndex treeIndex(int i, int j, int k, int depth, bool exact) const {
     if (depth == m_depth && holds(i, j, k)) return {m_index, m_depth};
-    if (auto const* table = m_container ? m_container->lookupTable() : nullptr) {
-      // Complete answers alone: a tile of the last depth may have deeper ones below it.
-      TreeIndex const at = depth >= table->lastDepth ? table->find(i, j, k) : TreeIndex{};
-      if (at.depth == table->kNoTile) return {};
-      if (at.depth >= 0 && (at.depth < table->lastDepth || at.depth == depth)) {
-        setCursor(at, i, j, k);
-        return exact && at.depth != depth ? TreeIndex{} : at;
+    if constexpr (TraitsT::kTW == 2) {
+      auto const* const table = m_container ? m_container->lookupTable() : nullptr;
+      if (table && depth == table->lastDepth) [[likely]] {
+        if (std::int64_t const n = table->indexAtLast(i, j, k); n >= 0) [[likely]] {
+          auto const mask = static_cast<int>(table->widthMask);
+          m_corner.x = i & mask, m_corner.y = j & mask, m_corner.z = k & mask;
+          m_depth = m_pathTop = depth, m_index = m_path[depth] = n;
+          return {n, depth};
+        }
       }
     }
     return find(i, j, k, depth, exact);

@@ -28,7 +28,7 @@ public:
   /// @cost In the block of the last one: a test, and one load. Elsewhere two loads more.
   FinestSample find(int i, int j, int k) {
     seek(i, j, k);
-    std::uint32_t const x = within(i, m_corner.x), y = within(j, m_corner.y), z = within(k, m_corner.z);
+    auto const [x, y, z] = steps(i, j, k);
     constexpr std::uint32_t w = TraitsT::kTDW, slots = TraitsT::kTW;
     // Sums of whole tile widths before the division: powers of two need one shift then.
     return {m_block->tiles[((x - x % w) + slots * ((y - y % w) + slots * (z - z % w))) / w], x % w, y % w,
@@ -37,45 +37,82 @@ public:
 
   /// The same for tiles whose elements lie kWidth in a row from element kFirst on.
   /// @return The element itself; null where there is no such tile.
+  /// @cost As find(). Where blocks are read one after another, what they hold is fetched ahead.
   template <class T, int kWidth, int kFirst> T const* element(int i, int j, int k) {
-    seek(i, j, k);
-    auto const at = BlockPlaces<TraitsT::kTW, TraitsT::kTDW, kWidth, kFirst>::find(
-        within(i, m_corner.x), within(j, m_corner.y), within(k, m_corner.z));
-    auto const* const tile = static_cast<T const*>(m_block->tiles[at.slot()]);
-    return tile ? tile + at.element() : nullptr;
+    Steps at = steps(i, j, k);
+    ++m_reads;
+    if (!at.inBlock()) [[unlikely]] {
+      move<sizeof(T) * kWidth * kWidth * kWidth>(i, j, k);
+      at = steps(i, j, k);
+    }
+    auto const place = BlockPlaces<TraitsT::kTW, TraitsT::kTDW, kWidth, kFirst>::find(at.x, at.y, at.z);
+    auto const* const tile = static_cast<T const*>(m_block->tiles[place.slot()]);
+    return tile ? tile + place.element() : nullptr;
   }
 
   /// Moves to the block of a point.
   void seek(int i, int j, int k) {
-    if (inBlock(i, j, k)) [[likely]]
-      return;
-    m_block = m_tables->block(i, j, k);
-    // Out of the domain, too, the corner is less than a block away, and the block is the empty one.
-    m_corner = TraitsT::align(int3{i, j, k}, Tables::kBlockDepth);
+    if (!steps(i, j, k).inBlock()) [[unlikely]]
+      move<0>(i, j, k);
   }
   void prefetch() const { __builtin_prefetch(m_block); }
 
 private:
   static constexpr auto kBlockWidth = std::uint32_t(Tables::kBlockWidth);
+  /// Blocks of a power of two lie at multiples of their width: within one, a coordinate and the corner's
+  /// differ in the lowest bits alone, and these are the distance.
+  static constexpr bool kBits = TraitsT::kTW == 2;
 
-  /// Distance from the corner of the point's block.
-  static std::uint32_t within(int c, int corner) {
-    if constexpr (TraitsT::kTW == 2)
-      return static_cast<std::uint32_t>(c) % kBlockWidth; // blocks lie at multiples of their width
-    else
-      return static_cast<std::uint32_t>(c) - static_cast<std::uint32_t>(corner);
+  /// From the corner of the block, on each axis.
+  struct Steps {
+    std::uint32_t x, y, z;
+    bool inBlock() const {
+      return kBits ? (x | y | z) < kBlockWidth : x < kBlockWidth && y < kBlockWidth && z < kBlockWidth;
+    }
+  };
+  Steps steps(int i, int j, int k) const { return {step(i, m_x), step(j, m_y), step(k, m_z)}; }
+  static std::uint32_t step(int c, int corner) {
+    auto const a = static_cast<std::uint32_t>(c), b = static_cast<std::uint32_t>(corner);
+    return kBits ? a ^ b : a - b;
   }
-  bool inBlock(int i, int j, int k) const {
-    if constexpr (TraitsT::kTW == 2)
-      return static_cast<std::uint32_t>((i ^ m_corner.x) | (j ^ m_corner.y) | (k ^ m_corner.z)) < kBlockWidth;
+  /// @param kBytes Of the elements of a tile; 0 for reads that fetch what they need themselves.
+  template <std::size_t kBytes> [[gnu::always_inline]] void move(int i, int j, int k) {
+    auto const* const block = m_tables->block(i, j, k);
+    // Out of the domain, too, the corner is less than a block away, and the block is the empty one.
+    int const x = alignToBlock(i), y = alignToBlock(j), z = alignToBlock(k);
+    if constexpr (kBits && kBytes > 0 && kBytes <= kMostBytes) {
+      if (m_reads > kManyReads) [[unlikely]]
+        m_fetched = m_tables->fetch(*block, m_fetched, next(x, m_x), next(y, m_y), next(z, m_z), kBytes);
+      m_reads /= 2;
+    }
+    m_block = block, m_x = x, m_y = y, m_z = z;
+  }
+  /// One step on from `c`, which came from `before`.
+  static int next(int c, int before) {
+    return static_cast<int>(2 * static_cast<std::uint32_t>(c) - static_cast<std::uint32_t>(before));
+  }
+  static int alignToBlock(int c) {
+    if constexpr (kBits)
+      return c & -int(kBlockWidth);
     else
-      return within(i, m_corner.x) < kBlockWidth && within(j, m_corner.y) < kBlockWidth &&
-             within(k, m_corner.z) < kBlockWidth;
+      return TraitsT::align(c, Tables::kBlockDepth);
   }
 
+  /// In the last blocks, so that much of the next one will be read as well. Rows of a box and short walks
+  /// read less in one go.
+  static constexpr std::uint32_t kManyReads = 48;
+  /// Of a tile that is fetched ahead: a block of larger ones would drive out what is read now.
+  static constexpr std::size_t kMostBytes = 512;
+
+  // The corner's coordinates lie apart, or the compiler stores two at once, for which reads of one have to
+  // wait.
+  int m_x = TraitsT::kMinTileCoord;
+  std::uint32_t m_reads = 0; ///< by element() in the block, and half of those before, and so on
   Tables const* m_tables = nullptr;
+  int m_y = TraitsT::kMinTileCoord;
   typename Tables::Block const* m_block = nullptr;
-  int3 m_corner{TraitsT::kMinTileCoord, TraitsT::kMinTileCoord, TraitsT::kMinTileCoord};
+  typename Tables::Block const* m_fetched = nullptr; ///< the one ahead
+  int m_z = TraitsT::kMinTileCoord;
 };
 
 /// Tables that several readers make together: see SharedReadTablesImpl.h.

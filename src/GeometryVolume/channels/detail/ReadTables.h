@@ -33,20 +33,18 @@ public:
   /// The block that holds the point; noBlock() where no tile of the deepest depth is near, and out of the
   /// domain.
   Block const* block(int i, int j, int k) const {
-    std::uint32_t const u[3] = {TraitsT::offset(i), TraitsT::offset(j), TraitsT::offset(k)};
-    std::size_t cell = 0;
-    bool inside = true;
-    for (std::size_t a = 3; a-- > 0;) {
-      std::uint32_t const q = TraitsT::quotient(u[a], m_cellDepth) - m_origin[a];
-      inside &= q < m_size[a];
-      cell = cell * m_size[a] + q;
-    }
-    if (!inside) return &noBlock();
-    std::int32_t id = m_cells[cell];
-    for (int d = m_cellDepth + 1; d <= kBlockDepth; ++d)
-      id = m_nodes[static_cast<std::size_t>(id)][slot(u, d)];
-    return &m_blocks[static_cast<std::size_t>(id)];
+    if (m_cellDepth != kBlockDepth) return blockInNodes(i, j, k);
+    // A cell for each block: depth and so the divisions are known here.
+    std::uint32_t const x = cellOf(i, 0), y = cellOf(j, 1), z = cellOf(k, 2);
+    if (x >= m_size[0] || y >= m_size[1] || z >= m_size[2]) return &noBlock();
+    std::size_t const cell = x + m_size[0] * (y + std::size_t(m_size[1]) * z);
+    return &m_blocks[static_cast<std::size_t>(m_cells[cell])];
   }
+  /// Asks for the elements of a block's tiles, unless that is `fetched`, and for those of the block at a
+  /// point.
+  /// @return The latter.
+  Block const* fetch(Block const& here, Block const* fetched, int i, int j, int k,
+                     std::size_t tileBytes) const;
   /// A block without tiles.
   Block const& noBlock() const { return m_blocks.front(); }
   std::uint64_t memUsage() const;
@@ -64,12 +62,23 @@ private:
     }
     return n;
   }
+  /// Of blocks: beyond the last one where there is none.
+  std::uint32_t cellOf(int c, std::size_t axis) const {
+    // Blocks lie at multiples of their width. The domain is a quarter of all integers: positions below the
+    // box wrap to far above it.
+    if constexpr (TraitsT::kTW == 2)
+      return (static_cast<std::uint32_t>(c) - m_low[axis]) / std::uint32_t(kBlockWidth);
+    else
+      return TraitsT::quotient(TraitsT::offset(c), kBlockDepth) - m_origin[axis];
+  }
+  Block const* blockInNodes(int i, int j, int k) const;
   void chooseCells(Container<TraitsT> const& tree);
   /// The block of a tile's corner, made when there is none.
   Block& makeBlock(int3 const& corner);
 
   int m_cellDepth = 0;
-  std::array<std::uint32_t, 3> m_origin{0, 0, 0}, m_size{0, 0, 0};
+  std::array<std::uint32_t, 3> m_origin{0, 0, 0}, m_size{0, 0, 0}; ///< in cells
+  std::array<std::uint32_t, 3> m_low{0, 0, 0};                     ///< corner in tile space
   // The first node leads to itself and the first block is empty, so that a missing entry is a 0.
   std::vector<std::int32_t> m_cells;
   std::vector<Node> m_nodes;

@@ -40,9 +40,10 @@ struct CellCorners {
 /// What lies on the high sides of a tile, as far as it was asked for.
 struct HighSides {
   std::int64_t tile = -1;
-  std::uint32_t known = 0; ///< bits of the directions below that were looked up
-  std::uint32_t gaps = 0;  ///< cells that needed a coarser tile
-  /// Of the tile itself, and at 1, 2 and 4 on along x, y and z; null: none.
+  std::uint32_t known = 0;   ///< bits of the directions below that were looked up
+  std::uint32_t missing = 0; ///< those where there is no tile
+  std::uint32_t gaps = 0;    ///< cells that needed a coarser tile
+  /// Of the tile itself, and at 1, 2 and 4 on along x, y and z; the tile's own where one is missing.
   std::array<float const*, 8> data;
 };
 

@@ -37,13 +37,38 @@ template <class TraitsT> struct TileLookupTable {
   std::array<std::uint32_t, 3> first{}, size{};
   /// index * kDepthUnit + depth of the deepest tile at or above the grid's depth; kNoTile and
   /// kUnknown else.
-  std::vector<std::int64_t> cells;
+  std::vector<std::int32_t> cells;
   /// For each tile of the grid's depth a block of index * kLevelUnit + levels below the grid.
   std::vector<std::int32_t> places;
 
-  static constexpr std::int64_t kDepthUnit = 32;
+  // The same for shapes of powers of two, see indexAtLast().
+  std::array<std::uint32_t, 3> low{}; ///< the grid's low corner in tile space
+  std::uint32_t placeBits = 0, placeMask = 0, widthMask = 0;
+
+  static constexpr std::int32_t kDepthUnit = 32;
   static constexpr std::uint32_t kLevelUnit = 4;
-  static constexpr std::int64_t kMostTiles = INT32_MAX / 4;
+  static constexpr std::int64_t kMostTiles = INT32_MAX / 4, kMostCellTiles = INT32_MAX / kDepthUnit;
+
+  /// Index of the tile of lastDepth that holds the point; below 0 where there may be none.
+  /// @cost Half of the instructions of find(). Reads at random wait for memory side by side, as many as the
+  /// processor holds.
+  std::int64_t indexAtLast(int i, int j, int k) const requires(TraitsT::kTW == 2) {
+    // The domain is a quarter of all integers: positions below the grid wrap to far above it.
+    std::uint32_t const x = static_cast<std::uint32_t>(i) - low[0],
+                        y = static_cast<std::uint32_t>(j) - low[1],
+                        z = static_cast<std::uint32_t>(k) - low[2];
+    std::uint32_t const px = x >> placeBits, py = y >> placeBits, pz = z >> placeBits;
+    std::uint32_t const place =
+        ((((pz & placeMask) << levels) | (py & placeMask)) << levels) | (px & placeMask);
+    std::uint32_t const ci = px >> levels, cj = py >> levels, ck = pz >> levels;
+    if (ci >= size[0] || cj >= size[1] || ck >= size[2]) return -1;
+    std::int32_t const cell = cells[ci + std::size_t(size[0]) * (cj + std::size_t(size[1]) * ck)];
+    if ((cell & (kDepthUnit - 1)) != gridDepth) return -1;
+    std::uint32_t const tile = static_cast<std::uint32_t>(cell) / kDepthUnit;
+    if (levels == 0) return tile;
+    auto const found = static_cast<std::uint32_t>(places[std::size_t(tile) * blockSize + place]);
+    return found % kLevelUnit == levels ? std::int64_t(found / kLevelUnit) : -1;
+  }
 
   /// The deepest tile that holds the point, down to lastDepth; else with depth kNoTile or kUnknown.
   TreeIndex find(int i, int j, int k) const {
@@ -52,10 +77,10 @@ template <class TraitsT> struct TileLookupTable {
                         cj = TraitsT::quotient(uj, gridDepth) - first[1],
                         ck = TraitsT::quotient(uk, gridDepth) - first[2];
     if (ci >= size[0] || cj >= size[1] || ck >= size[2]) return {-1, kUnknown};
-    std::int64_t const cell = cells[ci + std::size_t(size[0]) * (cj + std::size_t(size[1]) * ck)];
-    if (cell < 0) return {-1, static_cast<std::int32_t>(cell)};
-    auto const depth = static_cast<std::int32_t>(cell & (kDepthUnit - 1));
-    std::uint64_t const tile = static_cast<std::uint64_t>(cell) / kDepthUnit;
+    std::int32_t const cell = cells[ci + std::size_t(size[0]) * (cj + std::size_t(size[1]) * ck)];
+    if (cell < 0) return {-1, cell};
+    std::int32_t const depth = cell & (kDepthUnit - 1);
+    std::uint32_t const tile = static_cast<std::uint32_t>(cell) / kDepthUnit;
     if (depth != gridDepth) return {static_cast<std::int64_t>(tile), depth};
     auto const at = [this](std::uint32_t u, std::uint32_t c) {
       return TraitsT::quotient(u, lastDepth) - placeWidth * c;
