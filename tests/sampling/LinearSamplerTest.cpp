@@ -193,6 +193,37 @@ TYPED_TEST(LinearSamplerTest, CornerCellsBetweenTilesAreReadInPlace) {
   EXPECT_LT(changes, 40) << "widened in the end";
 }
 
+// boundary: a tile whose data were cleared is as one that is not there
+TYPED_TEST(LinearSamplerTest, ClearedTilesBesideACellAreGaps) {
+  using Traits = TypeParam;
+  constexpr int D = Traits::kTDW, deep = Traits::kMaxDepth;
+  float expected[3][3][3];
+  for (bool const cleared : {false, true}) {
+    SamplerVolume<Traits> volume;
+    volume.add({0, 0, 0}, deep, deep - 1);
+    if (cleared)
+      for (int n = 1; n < 8; ++n) {
+        int const w = Traits::width(deep);
+        volume.add({n & 1 ? w : 0, n & 2 ? w : 0, n & 4 ? w : 0}, deep, deep - 1);
+      }
+    volume.fill(wavyField, 0.0f);
+    auto const accessor = std::as_const(volume.tree).tileAccessor();
+    TreeIndex const at = accessor.treeIndex(0, 0, 0, deep, true);
+    for (std::int64_t n = 0; n < volume.tree.tileCount(deep); ++n)
+      if (n != at.index) volume.core->tileData(n, deep).clear();
+    Sampler<Traits> const sampler(volume.tree, volume.topology, *volume.core);
+    for (int c = 0; c < 27; ++c) {
+      int3 const cell{c % 3 + D - 3, c / 3 % 3 + D - 3, c / 9 + D - 3};
+      float& value = expected[c % 3][c / 3 % 3][c / 9];
+      float const got = sampler.sample(at, cell, {0.25f, 0.5f, 0.75f});
+      if (cleared)
+        EXPECT_EQ(got, value) << c;
+      else
+        value = got;
+    }
+  }
+}
+
 // requirement: a sampler that has made tables of its channel gives what a new one gives, bit for bit, for
 // every offset type, one by one and many at once; so do its copies
 TYPED_TEST(LinearSamplerTest, TablesAndPortionsChangeNothing) {

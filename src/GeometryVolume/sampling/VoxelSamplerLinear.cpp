@@ -244,16 +244,14 @@ VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::sampleGradient(Position const* positions,
 VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::findHighSide(TreeIndex const& tile, HighSides& sides,
                                                     unsigned direction) const {
   if (sides.known >> direction & 1) return;
+  static_assert(D * D * D <= 125); // see HighSides::set()
   int3 const corner =
       this->m_last.tile() == tile ? Internal::toInt3(this->m_last.corner()) : m_container->tile(tile).tijk();
   int const w = TraitsT::width(tile.depth);
   auto const on = [&](unsigned bit) { return direction & bit ? w : 0; };
   TreeIndex const at =
       m_tileAccessor.treeIndex(corner.x + on(1), corner.y + on(2), corner.z + on(4), tile.depth, true);
-  sides.known |= 1u << direction;
-  if (!at.valid()) sides.missing |= 1u << direction;
-  // Something to read in any case.
-  sides.data[direction] = at.valid() ? dataOf(*m_channelCore, at) : sides.data[0];
+  sides.set(direction, at.valid() ? dataOf(*m_channelCore, at) : nullptr);
 }
 
 // The eight samples of a cell of corner samples, x fastest.
@@ -277,8 +275,8 @@ VLN_SAMPLER_TEMPLATE bool VLN_SAMPLER::edgeCorners(TreeIndex const& tile, int3 c
                                                    int& budget) const {
   auto& sides = m_highSides[tile.depth];
   if (sides.tile != tile.index) {
-    sides.tile = tile.index, sides.known = 1, sides.missing = 0, sides.gaps = 0;
-    sides.data[0] = dataOf(*m_channelCore, tile);
+    sides.tile = tile.index, sides.known = sides.missing = sides.gaps = 0;
+    sides.set(0, dataOf(*m_channelCore, tile));
   }
   unsigned const edge =
       unsigned(low.x == D - 1) | unsigned(low.y == D - 1) << 1 | unsigned(low.z == D - 1) << 2;

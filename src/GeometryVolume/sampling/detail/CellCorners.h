@@ -43,8 +43,17 @@ struct HighSides {
   std::uint32_t known = 0;   ///< bits of the directions below that were looked up
   std::uint32_t missing = 0; ///< those where there is no tile
   std::uint32_t gaps = 0;    ///< cells that needed a coarser tile
-  /// Of the tile itself, and at 1, 2 and 4 on along x, y and z; the tile's own where one is missing.
+  /// Of the tile itself, and at 1, 2 and 4 on along x, y and z. Where one is missing, numbers without
+  /// meaning, so that they can be read without a test.
   std::array<float const*, 8> data;
+
+  /// @param samples Null for a tile that is not there, or holds nothing.
+  void set(unsigned direction, float const* samples) {
+    static constexpr std::array<float, 125> kNone{}; // of the largest tile
+    known |= 1u << direction;
+    if (!samples) missing |= 1u << direction;
+    data[direction] = samples ? samples : kNone.data();
+  }
 };
 
 } // namespace VLN::TileTree3D::Internal
