@@ -36,18 +36,92 @@ template <class TraitsT> void HaloDriver<TraitsT>::setTile(TileType const& tile)
 }
 
 template <class TraitsT>
-void HaloDriver<TraitsT>::findNeighbor(NeighborCache& cache, NeighborDirection step) {
+void HaloDriver<TraitsT>::findNeighbors(NeighborCache& cache, std::uint32_t steps) {
   auto const& tile = m_accessor.tile(cache.tile);
-  TreeIndex found = cache.tile;
-  if (step != kNeighborSelf) {
-    int const n = slotInParentBlock(tile) + blockSlot(neighborOffset(step)) - blockSlot({0, 0, 0});
-    found =
-        tile.isRoot() ? searchNeighbor(tile, step) : childAt(cacheOf(tile.parentTreeIndex()), n, tile, step);
+  NeighborCache* const parent = tile.isRoot() ? nullptr : &cacheOf(tile.parentTreeIndex());
+  int const slot = slotInParentBlock(tile);
+  cache.known |= steps;
+  for (; steps; steps &= steps - 1) {
+    auto const step = static_cast<NeighborDirection>(std::countr_zero(steps));
+    TreeIndex found = cache.tile;
+    if (step != kNeighborSelf)
+      found = parent ? childAt(*parent, slot + blockSlot(neighborOffset(step)) - blockSlot({0, 0, 0}), tile,
+                               step)
+                     : searchNeighbor(tile, step);
+    auto const* children = found.depth == tile.depth() ? m_accessor.tile(found).children() : nullptr;
+    cache.around[static_cast<std::size_t>(step)] = {
+        found.index, children ? children : kNoChildren<TraitsT::kTileSize>.data(), found.depth};
   }
-  auto const* children = found.depth == tile.depth() ? m_accessor.tile(found).children() : nullptr;
-  cache.around[static_cast<std::size_t>(step)] = {
-      found.index, children ? children : kNoChildren<TraitsT::kTileSize>.data(), found.depth};
-  cache.known |= 1u << step;
+}
+
+namespace {
+
+// What is read in place of a tile that is not there: as many bytes as the largest of all tiles has.
+alignas(64) constexpr std::byte
+    kNoElements[std::size_t(HaloTable::kLargestWidth) * HaloTable::kLargestWidth * HaloTable::kLargestWidth *
+                kLargestElement]{};
+
+} // namespace
+
+template <class TraitsT> void HaloDriver<TraitsT>::completeBlock(int depth, std::uint32_t owners) {
+  NeighborCache& cache = *m_parentCache;
+  if (owners & ~cache.known) findNeighbors(cache, owners & ~cache.known);
+  m_blockKnown |= owners;
+  std::array<std::int64_t, Block::kSize> indices;
+  std::array<std::uint8_t, Block::kSize> places;
+  std::size_t count = 0;
+  for (; owners; owners &= owners - 1) {
+    auto const d = static_cast<std::size_t>(std::countr_zero(owners));
+    OwnerTile const& owner = cache.around[d];
+    if (owner.depth < 0) m_blockBeyond |= 1u << d;
+    for (NeighborPlace const& at : kNeighborPlaces<TraitsT::kTW>[d]) {
+      if (at.place == 0xff) break;
+      indices[count] = owner.children[at.slot];
+      places[count++] = at.place;
+    }
+  }
+  std::array<void const*, Block::kSize> found;
+  m_source.elements(depth, indices.data(), static_cast<int>(count), found.data());
+  for (std::size_t n = 0; n < count; ++n) {
+    m_block.at[places[n]] = found[n] ? found[n] : kNoElements;
+    m_block.present |= std::uint64_t(found[n] != nullptr) << places[n];
+  }
+}
+
+template <class TraitsT> void HaloDriver<TraitsT>::findAlone(TileType const& tile) {
+  std::array<std::int64_t, 27> indices;
+  std::array<void const*, 27> found;
+  auto const count = static_cast<std::size_t>(m_table.regionCount);
+  for (std::size_t n = 0; n < count; ++n) indices[n] = neighborIndex(tile, m_table.regions[n]);
+  indices[count] = tile.index();
+  m_source.elements(tile.depth(), indices.data(), m_table.regionCount + 1, found.data());
+  m_alone.present = 0;
+  for (std::size_t n = 0; n <= count; ++n) {
+    auto const place = static_cast<std::size_t>(Block::kFirst + (n < count ? m_table.regions[n].around : 0));
+    m_alone.at[place] = found[n] ? found[n] : kNoElements;
+    m_alone.present |= std::uint64_t(found[n] != nullptr) << place;
+  }
+}
+
+template <class TraitsT>
+auto HaloDriver<TraitsT>::elementsAround(TileType const& tile) -> Around {
+  Elements const* block = &m_alone;
+  int own = Block::kFirst;
+  if constexpr (Block::kOfParent) {
+    if (m_parentCache) {
+      TreeIndex const parent = tile.parentTreeIndex();
+      if (parent != m_blockParent)
+        m_blockParent = parent, m_blockKnown = 0, m_blockBeyond = 0, m_block.present = 0;
+      std::uint32_t owners = kOwnersRound<TraitsT::kTW>[static_cast<std::size_t>(m_blockSlot)];
+      if (m_table.halo == 0) owners &= kOwnersAhead;
+      if (owners & ~m_blockKnown) completeBlock(tile.depth(), owners & ~m_blockKnown);
+      if (!(owners & m_blockBeyond) || m_accessor.container()->rootCount(tile.depth()) == 0)
+        block = &m_block, own = m_blockSlot;
+    }
+  }
+  if (block == &m_alone) findAlone(tile);
+  std::uint64_t const present = block->present >> (own - Block::kFirst);
+  return {block->at.data() + own, m_table.around & ~present, bool(present >> Block::kFirst & 1)};
 }
 
 template <class TraitsT>
@@ -127,55 +201,38 @@ void HaloDriver<TraitsT>::sample(HaloBox const& box, TileType const& tile, void*
 }
 
 template <class TraitsT>
-std::uint32_t HaloDriver<TraitsT>::findNeighbors(TileType const& tile, std::array<void const*, 26>& found) {
-  std::array<std::int64_t, 26> indices;
-  auto const count = static_cast<std::size_t>(m_table.regionCount);
-  for (std::size_t n = 0; n < count; ++n) indices[n] = neighborIndex(tile, m_table.regions[n]);
-  m_source.elements(tile.depth(), indices.data(), m_table.regionCount, found.data());
-  std::uint32_t missing = 0;
-  for (std::size_t n = 0; n < count; ++n) missing |= std::uint32_t(!found[n]) << n;
-  return missing;
-}
-
-template <class TraitsT>
-void HaloDriver<TraitsT>::copyWholeTile(void* target, void const* own,
-                                        std::array<void const*, 26> const& found) const {
-  TileMove move;
-  move.target = target;
-  move.sourceWidth = m_table.sourceWidth, move.offsets = m_table.offsets.data();
-  move.sources[kNeighborSelf] = own;
-  for (std::size_t n = 0; n < static_cast<std::size_t>(m_table.regionCount); ++n)
-    move.sources[m_table.regions[n].direction] = found[n] ? found[n] : own;
+void HaloDriver<TraitsT>::copyWholeTile(void* target, Around const& around) const {
   auto const& kernels = *m_source.ops->kernels;
-  (TraitsT::kTDW == 4 ? kernels.tile4 : kernels.tile5)[m_table.kind](move);
+  (TraitsT::kTDW == 4 ? kernels.tile4 : kernels.tile5)[m_table.kind](
+      {target, m_table.sourceWidth, m_table.offsets.data(), around.elements});
 }
 
 template <class TraitsT> void HaloDriver<TraitsT>::fill(HaloTarget<TraitsT> const& target, HaloMode mode) {
   TileType const& tile = target.tile;
-  void const* const own = m_source.elements(tile.treeIndex());
-  bool const whole = own && m_table.kind != kHaloTileOther;
-  if (!whole) {
+  auto const fillCore = [&](void const* own) {
     if (own)
       copy(m_table.core, target.elements, own);
     else
       set(m_table.core, target.elements, m_source.defaultValue);
-  }
-  if (m_table.regionCount == 0) return;
+  };
+  if (m_table.regionCount == 0) return fillCore(m_source.elements(tile.treeIndex()));
 
   setTile(tile);
-  std::array<void const*, 26> found;
-  std::uint32_t missing = findNeighbors(tile, found);
-  if (whole) {
-    copyWholeTile(target.elements, own, found);
+  Around const around = elementsAround(tile);
+  if (around.own && m_table.kind != kHaloTileOther) {
+    copyWholeTile(target.elements, around);
   } else {
-    for (std::size_t n = 0; n < static_cast<std::size_t>(m_table.regionCount); ++n)
-      if (found[n]) copy(m_table.regions[n], target.elements, found[n]);
+    fillCore(around.ownElements());
+    for (std::uint64_t there = m_table.around & ~around.missing; there; there &= there - 1) {
+      HaloRegion const& region = regionOf(there);
+      copy(region, target.elements, around.elements[region.around]);
+    }
   }
-  if (!missing) return;
+  if (!around.missing) return;
 
   void const* const parent = target.parentData();
-  for (; missing; missing &= missing - 1) {
-    HaloRegion const& region = m_table.regions[static_cast<std::size_t>(std::countr_zero(missing))];
+  for (std::uint64_t missing = around.missing; missing; missing &= missing - 1) {
+    HaloRegion const& region = regionOf(missing);
     if (parent)
       blend(region, target, parent);
     else if (mode == kHaloModeReplicate)
@@ -220,16 +277,14 @@ template <class TraitsT>
 void HaloDriver<TraitsT>::fill(TileType const& tile, void* target, HaloFill const& fill,
                                HaloSampler<TraitsT>& sampler) {
   if (!isHaloMode(fill.mode)) return;
+  setTile(tile);
   if (fill.type == kHaloAll && fill.mode != kHaloModeDeepOnly && m_table.kind != kHaloTileOther) {
     // Every region is written, so what has no tile beside may hold other bytes for a moment.
-    if (void const* const own = m_source.elements(tile.treeIndex())) {
-      setTile(tile);
-      std::array<void const*, 26> found;
-      std::uint32_t missing = findNeighbors(tile, found);
-      copyWholeTile(target, own, found);
-      for (; missing; missing &= missing - 1)
-        fillRegion(m_table.regions[static_cast<std::size_t>(std::countr_zero(missing))], tile, target, fill,
-                   sampler);
+    Around const around = elementsAround(tile);
+    if (around.own) {
+      copyWholeTile(target, around);
+      for (std::uint64_t missing = around.missing; missing; missing &= missing - 1)
+        fillRegion(regionOf(missing), tile, target, fill, sampler);
       return;
     }
   }
@@ -241,7 +296,6 @@ void HaloDriver<TraitsT>::fill(TileType const& tile, void* target, HaloFill cons
     else
       set(m_table.core, target, m_source.defaultValue);
   }
-  setTile(tile);
   for (int n = 0; n < m_table.regionCount; ++n) {
     HaloRegion const& region = m_table.regions[static_cast<std::size_t>(n)];
     if (!(fill.type & (region.face ? kHaloFaces : kHaloEdges)) || fill.type & haloSkip(region.direction))

@@ -4,6 +4,8 @@
 
 #include "GeometryVolume/channels/HaloSamplerImpl.h"
 
+#include <bit>
+
 namespace VLN::TileTree3D::Internal {
 
 /// What the form with modes is asked for.
@@ -81,11 +83,12 @@ private:
     if (cache.tile != at) cache.tile = at, cache.known = 0;
     return cache;
   }
-  /// Finds the tile beside that of the cache through its parent, and so through all its ancestors if need be.
-  void findNeighbor(NeighborCache& cache, NeighborDirection step);
+  /// Finds tiles beside that of the cache, a bit for each direction, through its parent, and so through all
+  /// its ancestors if need be.
+  void findNeighbors(NeighborCache& cache, std::uint32_t steps);
   /// The tile that owns a slot of the block: of the cached tile's children and those round them.
   OwnerTile const& ownerOf(NeighborCache& cache, NeighborSlot const& in) {
-    if (!(cache.known >> in.direction & 1)) findNeighbor(cache, in.direction);
+    if (!(cache.known >> in.direction & 1)) findNeighbors(cache, 1u << in.direction);
     return cache.around[static_cast<std::size_t>(in.direction)];
   }
   static NeighborSlot const& neighborSlot(int blockSlot) {
@@ -115,12 +118,31 @@ private:
   }
   /// neighborIndex() or neighbor() by a search from the accessor's last tile.
   TreeIndex searchNeighbor(TileType const& tile, NeighborDirection step) const;
-  /// The source's elements of the tiles of the same depth beside, by region; null where there are none.
+  /// The source's elements of tiles of one depth, by place; kNoElements where there are none.
+  using Block = PointerBlock<TraitsT::kTW>;
+  struct Elements {
+    std::array<void const*, Block::kSize> at;
+    std::uint64_t present = 0; ///< a bit for each place that has some
+  };
+  /// What a tile reads: its own elements' place in a block, and bits of the regions' places without a source.
+  struct Around {
+    void const* const* elements;
+    std::uint64_t missing;
+    bool own; ///< whether the tile itself has elements
+
+    void const* ownElements() const { return own ? *elements : nullptr; }
+  };
   /// @pre setTile(tile).
-  /// @return Bits of the regions without.
-  std::uint32_t findNeighbors(TileType const& tile, std::array<void const*, 26>& found);
-  /// Core and regions in one go. A region without a tile beside takes any bytes of the tile's own.
-  void copyWholeTile(void* target, void const* own, std::array<void const*, 26> const& found) const;
+  Around elementsAround(TileType const& tile);
+  /// Fills what the parent's block lacks round the tile.
+  void completeBlock(int depth, std::uint32_t owners);
+  /// Fills a block for one tile alone, which lies at its first child's place.
+  void findAlone(TileType const& tile);
+  HaloRegion const& regionOf(std::uint64_t missing) const {
+    return m_table.regions[m_table.regionAt[static_cast<std::size_t>(std::countr_zero(missing))]];
+  }
+  /// Core and regions in one go. A region without a tile beside takes bytes without meaning.
+  void copyWholeTile(void* target, Around const& around) const;
   /// The tile itself, or its deepest ancestor whose data the source holds.
   TileType const* ancestorWithData(TileType const* tile, void const*& elements) const;
 
@@ -152,6 +174,11 @@ private:
   static int slotInParentBlock(TileType const& tile);
 
   NeighborCache* m_parentCache = nullptr; ///< of the tile's parent; null for a root
+  // The block of a parent's children, as far as was asked for.
+  TreeIndex m_blockParent;
+  std::uint32_t m_blockKnown = 0;  ///< owners whose slots are filled
+  std::uint32_t m_blockBeyond = 0; ///< owners where no tile lies, so that roots may
+  Elements m_block, m_alone;
   int m_blockSlot = blockSlot({0, 0, 0}); ///< of the tile among the parent's children and those round them
   // One for each depth. The coarser, the more seldom it changes.
   PerDepth<NeighborCache, TraitsT::kDepths> m_caches;
