@@ -118,6 +118,14 @@ template <class T> struct TypedElementOps {
     }
   }
 
+  static void fetchRecords(void const* tileArrays, int depth, std::int64_t const* indices, int n) {
+    auto const& tiles = (*static_cast<TileArrays<T> const*>(tileArrays))[static_cast<std::size_t>(depth)];
+    for (int i = 0; i < n; ++i) {
+      auto const index = static_cast<std::size_t>(indices[i]);
+      __builtin_prefetch(tiles.data() + (index < tiles.size() ? index : 0));
+    }
+  }
+
   static void blendParent(ParentBlend const& b) {
     if constexpr (std::is_same_v<T, float>) return blendFloats(b);
     auto* const target = static_cast<T*>(b.target);
@@ -159,9 +167,11 @@ template <class T> struct TypedElementOps {
     static_assert(std::find(kHaloElementSizes.begin(), kHaloElementSizes.end(), sizeof(T)) !=
                       kHaloElementSizes.end(),
                   "elements of a new size: add it to kHaloElementSizes");
-    static ElementOps const ops{
-        sizeof(T), &haloKernels(sizeof(T)), elements, elementsOf, blendParent, blendCorners, scale, broadcast,
-        distance};
+    static ElementOps const ops{sizeof(T),    &haloKernels(sizeof(T)),
+                                elements,     elementsOf,
+                                fetchRecords, blendParent,
+                                blendCorners, scale,
+                                broadcast,    distance};
     return ops;
   }
 };

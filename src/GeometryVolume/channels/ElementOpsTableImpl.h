@@ -37,6 +37,8 @@ struct ElementOps {
   /// @cost Without branches that depend on which there are.
   void (*elementsOf)(void const* tileArrays, int depth, std::int64_t const* indices, int n, int count,
                      void const** found);
+  /// Begins to read what elementsOf() will.
+  void (*fetchRecords)(void const* tileArrays, int depth, std::int64_t const* indices, int n);
   void (*blendParent)(ParentBlend const&);
   void (*blendCorners)(CornerBlend const&, void* out);
   /// Every component of an element times a factor, in place.
@@ -64,6 +66,9 @@ struct UntypedTiles {
       ops->elementsOf(arrays, depth, indices, n, tileSize, found);
     else
       for (int i = 0; i < n; ++i) found[i] = nullptr;
+  }
+  void fetchRecords(int depth, std::int64_t const* indices, int n) const {
+    if (inRange(depth)) ops->fetchRecords(arrays, depth, indices, n);
   }
 };
 

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <bit>
+#include <utility>
 
 namespace VLN::TileTree3D::Internal {
 
@@ -31,61 +32,122 @@ template <class TraitsT> int HaloDriver<TraitsT>::slotInParentBlock(TileType con
 }
 
 template <class TraitsT> void HaloDriver<TraitsT>::setTile(TileType const& tile) {
-  m_parentCache = tile.isRoot() ? nullptr : &cacheOf(tile.parentTreeIndex());
+  if constexpr (Block::kOfParent)
+    m_parentCache = tile.isRoot() ? nullptr : &blockOf(tile).cache;
+  else
+    m_parentCache = tile.isRoot() ? nullptr : &cacheOf(tile.parentTreeIndex());
   m_blockSlot = slotInParentBlock(tile);
 }
 
-template <class TraitsT>
-void HaloDriver<TraitsT>::findNeighbors(NeighborCache& cache, std::uint32_t steps) {
+template <class TraitsT> void HaloDriver<TraitsT>::findPlaces(NeighborCache& cache, std::uint32_t steps) {
   auto const& tile = m_accessor.tile(cache.tile);
   NeighborCache* const parent = tile.isRoot() ? nullptr : &cacheOf(tile.parentTreeIndex());
   int const slot = slotInParentBlock(tile);
-  cache.known |= steps;
+  cache.known |= steps, cache.open |= steps;
   for (; steps; steps &= steps - 1) {
     auto const step = static_cast<NeighborDirection>(std::countr_zero(steps));
     TreeIndex found = cache.tile;
     if (step != kNeighborSelf)
-      found = parent ? childAt(*parent, slot + blockSlot(neighborOffset(step)) - blockSlot({0, 0, 0}), tile,
-                               step)
-                     : searchNeighbor(tile, step);
-    auto const* children = found.depth == tile.depth() ? m_accessor.tile(found).children() : nullptr;
-    cache.around[static_cast<std::size_t>(step)] = {
-        found.index, children ? children : kNoChildren<TraitsT::kTileSize>.data(), found.depth};
+      found =
+          parent ? childAt(*parent, slot + blockSlot(neighborOffset(step)) - blockSlot({0, 0, 0}), tile, step)
+                 : searchNeighbor(tile, step);
+    OwnerTile& owner = cache.around[static_cast<std::size_t>(step)];
+    owner = {found.index, nullptr, found.depth};
+    if (found.depth == cache.tile.depth) __builtin_prefetch(&m_accessor.tile(found));
+  }
+}
+
+template <class TraitsT> void HaloDriver<TraitsT>::findChildren(NeighborCache& cache) {
+  for (std::uint32_t steps = std::exchange(cache.open, 0); steps; steps &= steps - 1) {
+    OwnerTile& owner = cache.around[static_cast<std::size_t>(std::countr_zero(steps))];
+    if (owner.depth == cache.tile.depth) owner.children = m_accessor.tile(owner.at()).children();
+    if (!owner.children) owner.children = kNoChildren<TraitsT::kTileSize>.data();
+    __builtin_prefetch(owner.children);
+    __builtin_prefetch(owner.children + TraitsT::kTileSize - 1);
   }
 }
 
 namespace {
 
 // What is read in place of a tile that is not there: as many bytes as the largest of all tiles has.
-alignas(64) constexpr std::byte
-    kNoElements[std::size_t(HaloTable::kLargestWidth) * HaloTable::kLargestWidth * HaloTable::kLargestWidth *
-                kLargestElement]{};
+alignas(64) constexpr std::byte kNoElements[std::size_t(HaloTable::kLargestWidth) * HaloTable::kLargestWidth *
+                                            HaloTable::kLargestWidth * kLargestElement]{};
 
 } // namespace
 
-template <class TraitsT> void HaloDriver<TraitsT>::completeBlock(int depth, std::uint32_t owners) {
-  NeighborCache& cache = *m_parentCache;
-  if (owners & ~cache.known) findNeighbors(cache, owners & ~cache.known);
-  m_blockKnown |= owners;
-  std::array<std::int64_t, Block::kSize> indices;
-  std::array<std::uint8_t, Block::kSize> places;
-  std::size_t count = 0;
-  for (; owners; owners &= owners - 1) {
+template <class TraitsT>
+void HaloDriver<TraitsT>::listIndices(ParentBlock const& block, BlockIndices& to) const {
+  to.count = 0;
+  for (std::uint32_t owners = block.wanted & ~block.filled; owners; owners &= owners - 1) {
     auto const d = static_cast<std::size_t>(std::countr_zero(owners));
-    OwnerTile const& owner = cache.around[d];
-    if (owner.depth < 0) m_blockBeyond |= 1u << d;
+    std::int64_t const* const children = block.cache.around[d].children;
     for (NeighborPlace const& at : kNeighborPlaces<TraitsT::kTW>[d]) {
-      if (at.place == 0xff) break;
-      indices[count] = owner.children[at.slot];
-      places[count++] = at.place;
+      if (at.place == NeighborPlace::kEnd) break;
+      auto const n = static_cast<std::size_t>(to.count++);
+      to.index[n] = children[at.slot], to.place[n] = at.place;
     }
   }
-  std::array<void const*, Block::kSize> found;
-  m_source.elements(depth, indices.data(), static_cast<int>(count), found.data());
-  for (std::size_t n = 0; n < count; ++n) {
-    m_block.at[places[n]] = found[n] ? found[n] : kNoElements;
-    m_block.present |= std::uint64_t(found[n] != nullptr) << places[n];
+}
+
+template <class TraitsT>
+void HaloDriver<TraitsT>::completeBlocks(int depth, ParentBlock* blocks, std::size_t count) {
+  std::array<BlockIndices, kBlocks> lists;
+  for (std::size_t b = 0; b < count; ++b)
+    findPlaces(blocks[b].cache, blocks[b].wanted & ~blocks[b].cache.known);
+  for (std::size_t b = 0; b < count; ++b) findChildren(blocks[b].cache);
+  for (std::size_t b = 0; b < count; ++b) {
+    listIndices(blocks[b], lists[b]);
+    m_source.fetchRecords(depth, lists[b].index.data(), lists[b].count);
   }
+  for (std::size_t b = 0; b < count; ++b) {
+    ParentBlock& block = blocks[b];
+    BlockIndices const& list = lists[b];
+    std::array<void const*, 64> found;
+    m_source.elements(depth, list.index.data(), list.count, found.data());
+    for (std::size_t n = 0; n < static_cast<std::size_t>(list.count); ++n) {
+      block.elements.at[list.place[n]] = found[n] ? found[n] : kNoElements;
+      block.elements.present |= std::uint64_t(found[n] != nullptr) << list.place[n];
+      if (found[n] && count > 1)
+        for (int line = 0; line < 4; ++line)
+          __builtin_prefetch(static_cast<std::byte const*>(found[n]) + 64 * line);
+    }
+    for (std::uint32_t owners = block.wanted & ~block.filled; owners; owners &= owners - 1) {
+      int const d = std::countr_zero(owners);
+      block.beyond |= std::uint32_t(block.cache.around[static_cast<std::size_t>(d)].depth < 0) << d;
+    }
+    block.filled |= block.wanted;
+  }
+}
+
+template <class TraitsT> auto HaloDriver<TraitsT>::blockOf(TileType const& tile) -> ParentBlock& {
+  TreeIndex const parent = tile.parentTreeIndex();
+  for (; m_block < m_blockCount; ++m_block)
+    if (m_blocks[m_block].cache.tile == parent) return m_blocks[m_block];
+  m_block = 0, m_blockCount = 1;
+  return startBlock(m_blocks[0], parent);
+}
+
+template <class TraitsT> void HaloDriver<TraitsT>::prepare(TileType const& first) {
+  if (!Block::kOfParent || first.isRoot()) return;
+  TreeIndex const parent = first.parentTreeIndex();
+  for (std::size_t b = m_block; b < m_blockCount; ++b)
+    if (m_blocks[b].cache.tile == parent) return;
+  auto const& tree = *m_accessor.container();
+  int const depth = first.depth();
+  std::int64_t const end =
+      std::min(tree.tileCount(depth), first.index() + std::int64_t(kBlocks) * TraitsT::kTileSize);
+  m_block = m_blockCount = 0;
+  for (std::int64_t n = first.index(); n < end; ++n) {
+    TileType const& tile = tree.tile(n, depth);
+    if (!tile.valid() || tile.isRoot()) continue;
+    TreeIndex const at = tile.parentTreeIndex();
+    if (m_blockCount == 0 || m_blocks[m_blockCount - 1].cache.tile != at) {
+      if (m_blockCount == kBlocks) break;
+      startBlock(m_blocks[m_blockCount++], at);
+    }
+    m_blocks[m_blockCount - 1].wanted |= ownersRound(slotInParentBlock(tile));
+  }
+  completeBlocks(depth, m_blocks.data(), m_blockCount);
 }
 
 template <class TraitsT> void HaloDriver<TraitsT>::findAlone(TileType const& tile) {
@@ -103,20 +165,16 @@ template <class TraitsT> void HaloDriver<TraitsT>::findAlone(TileType const& til
   }
 }
 
-template <class TraitsT>
-auto HaloDriver<TraitsT>::elementsAround(TileType const& tile) -> Around {
+template <class TraitsT> auto HaloDriver<TraitsT>::elementsAround(TileType const& tile) -> Around {
   Elements const* block = &m_alone;
   int own = Block::kFirst;
   if constexpr (Block::kOfParent) {
     if (m_parentCache) {
-      TreeIndex const parent = tile.parentTreeIndex();
-      if (parent != m_blockParent)
-        m_blockParent = parent, m_blockKnown = 0, m_blockBeyond = 0, m_block.present = 0;
-      std::uint32_t owners = kOwnersRound<TraitsT::kTW>[static_cast<std::size_t>(m_blockSlot)];
-      if (m_table.halo == 0) owners &= kOwnersAhead;
-      if (owners & ~m_blockKnown) completeBlock(tile.depth(), owners & ~m_blockKnown);
-      if (!(owners & m_blockBeyond) || m_accessor.container()->rootCount(tile.depth()) == 0)
-        block = &m_block, own = m_blockSlot;
+      ParentBlock& there = m_blocks[m_block];
+      std::uint32_t const owners = ownersRound(m_blockSlot);
+      if (owners & ~there.filled) there.wanted |= owners, completeBlocks(tile.depth(), &there, 1);
+      if (!(owners & there.beyond) || m_accessor.container()->rootCount(tile.depth()) == 0)
+        block = &there.elements, own = m_blockSlot;
     }
   }
   if (block == &m_alone) findAlone(tile);
@@ -200,8 +258,7 @@ void HaloDriver<TraitsT>::sample(HaloBox const& box, TileType const& tile, void*
       }
 }
 
-template <class TraitsT>
-void HaloDriver<TraitsT>::copyWholeTile(void* target, Around const& around) const {
+template <class TraitsT> void HaloDriver<TraitsT>::copyWholeTile(void* target, Around const& around) const {
   auto const& kernels = *m_source.ops->kernels;
   (TraitsT::kTDW == 4 ? kernels.tile4 : kernels.tile5)[m_table.kind](
       {target, m_table.sourceWidth, m_table.offsets.data(), around.elements});
@@ -328,6 +385,7 @@ public:
   void beginTile(TileType const& tile) override {
     void* const target = const_cast<void*>(m_pass.target.elements(tile.treeIndex()));
     if (!target) return;
+    m_driver.prepare(tile);
     if (m_fill) return m_driver.fill(tile, target, *m_fill, m_sampler);
     HaloTarget<TraitsT> plain{tile, target};
     if (!tile.isRoot() && tile.depth() > m_pass.firstDepth) {

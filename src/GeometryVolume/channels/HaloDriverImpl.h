@@ -47,6 +47,9 @@ public:
   /// The core, then each region: from the neighbour of the same depth; else blended from the parent; else,
   /// without a parent, replicated in mode kHaloModeReplicate and the default value in any other.
   void fill(HaloTarget<TraitsT> const& target, HaloMode mode);
+  /// Finds what tiles read that are filled next, in the order of their indices.
+  /// @pre The tree stays as it is until they are filled.
+  void prepare(TileType const& first);
   /// What `fill.type` names, as `fill.mode` says.
   void fill(TileType const& tile, void* target, HaloFill const& fill, HaloSampler<TraitsT>& sampler);
 
@@ -59,6 +62,12 @@ private:
     std::int32_t depth;
 
     TreeIndex at() const { return {index, depth}; }
+  };
+  /// Indices of tiles that a block is filled with, and where each goes.
+  struct BlockIndices {
+    std::array<std::int64_t, 64> index;
+    std::array<std::uint8_t, 64> place;
+    int count = 0;
   };
   /// Makes `tile` the one whose neighbours are asked for.
   void setTile(TileType const& tile);
@@ -75,7 +84,8 @@ private:
   /// What lies round one tile, as far as it was asked for.
   struct NeighborCache {
     TreeIndex tile;
-    std::uint32_t known = 0;
+    std::uint32_t known = 0; ///< directions that were looked up
+    std::uint32_t open = 0;  ///< those of them whose child table was not
     std::array<OwnerTile, kNeighborCount> around;
   };
   NeighborCache& cacheOf(TreeIndex const& at) {
@@ -85,10 +95,12 @@ private:
   }
   /// Finds tiles beside that of the cache, a bit for each direction, through its parent, and so through all
   /// its ancestors if need be.
-  void findNeighbors(NeighborCache& cache, std::uint32_t steps);
+  void findPlaces(NeighborCache& cache, std::uint32_t steps);
+  /// And their child tables.
+  void findChildren(NeighborCache& cache);
   /// The tile that owns a slot of the block: of the cached tile's children and those round them.
   OwnerTile const& ownerOf(NeighborCache& cache, NeighborSlot const& in) {
-    if (!(cache.known >> in.direction & 1)) findNeighbors(cache, 1u << in.direction);
+    if (!(cache.known >> in.direction & 1)) findPlaces(cache, 1u << in.direction), findChildren(cache);
     return cache.around[static_cast<std::size_t>(in.direction)];
   }
   static NeighborSlot const& neighborSlot(int blockSlot) {
@@ -124,6 +136,15 @@ private:
     std::array<void const*, Block::kSize> at;
     std::uint64_t present = 0; ///< a bit for each place that has some
   };
+  /// A parent, what lies round it, and the block of its children and those round them, as far as was asked
+  /// for.
+  struct ParentBlock {
+    NeighborCache cache;
+    std::uint32_t wanted = 0; ///< owners whose slots are to be filled
+    std::uint32_t filled = 0; ///< owners whose slots are filled
+    std::uint32_t beyond = 0; ///< owners where no tile lies, so that roots may
+    Elements elements;
+  };
   /// What a tile reads: its own elements' place in a block, and bits of the regions' places without a source.
   struct Around {
     void const* const* elements;
@@ -134,8 +155,22 @@ private:
   };
   /// @pre setTile(tile).
   Around elementsAround(TileType const& tile);
-  /// Fills what the parent's block lacks round the tile.
-  void completeBlock(int depth, std::uint32_t owners);
+  /// Owners of what a child of the tile at this slot of the block reads.
+  std::uint32_t ownersRound(int slot) const {
+    std::uint32_t const owners = kOwnersRound<TraitsT::kTW>[static_cast<std::size_t>(slot)];
+    return m_table.halo == 0 ? owners & kOwnersAhead : owners;
+  }
+  /// The block of a tile's parent: the one before, one that is ready, or a new one.
+  ParentBlock& blockOf(TileType const& tile);
+  static ParentBlock& startBlock(ParentBlock& block, TreeIndex const& parent) {
+    block.cache.tile = parent, block.cache.known = 0;
+    block.wanted = block.filled = block.beyond = 0, block.elements.present = 0;
+    return block;
+  }
+  /// Fills what is wanted of blocks. Each step is taken for all of them before the next one, so that what the
+  /// next one reads is on its way.
+  void completeBlocks(int depth, ParentBlock* blocks, std::size_t count);
+  void listIndices(ParentBlock const& block, BlockIndices& to) const;
   /// Fills a block for one tile alone, which lies at its first child's place.
   void findAlone(TileType const& tile);
   HaloRegion const& regionOf(std::uint64_t missing) const {
@@ -174,14 +209,16 @@ private:
   static int slotInParentBlock(TileType const& tile);
 
   NeighborCache* m_parentCache = nullptr; ///< of the tile's parent; null for a root
-  // The block of a parent's children, as far as was asked for.
-  TreeIndex m_blockParent;
-  std::uint32_t m_blockKnown = 0;  ///< owners whose slots are filled
-  std::uint32_t m_blockBeyond = 0; ///< owners where no tile lies, so that roots may
-  Elements m_block, m_alone;
   int m_blockSlot = blockSlot({0, 0, 0}); ///< of the tile among the parent's children and those round them
   // One for each depth. The coarser, the more seldom it changes.
   PerDepth<NeighborCache, TraitsT::kDepths> m_caches;
+
+  // Parents in the order of their children: enough to have many reads under way, few enough to stay in the
+  // nearest cache.
+  static constexpr std::size_t kBlocks = Block::kOfParent ? 8 : 1;
+  std::array<ParentBlock, kBlocks> m_blocks;
+  std::size_t m_block = 0, m_blockCount = 0; ///< the last one that was asked for; those in use
+  Elements m_alone;
 };
 
 /// A pass over the tiles of a range of depths, coarse to fine.

@@ -151,9 +151,9 @@ constexpr ChannelLayout haloLayout(int tileDataWidth, int extended, int halo) {
 }
 
 template <class TraitsT, int SourceExtended, int SourceHalo, int TargetExtended, int TargetHalo>
-inline constexpr HaloTable kHaloTable =
-    makeHaloTable<TraitsT::kTW>(haloLayout(TraitsT::kTDW, SourceExtended, SourceHalo),
-                                haloLayout(TraitsT::kTDW, TargetExtended, TargetHalo));
+inline constexpr HaloTable
+    kHaloTable = makeHaloTable<TraitsT::kTW>(haloLayout(TraitsT::kTDW, SourceExtended, SourceHalo),
+                                             haloLayout(TraitsT::kTDW, TargetExtended, TargetHalo));
 
 // Where a slot of the block lies: the parent, or the tile beside it in a direction, and the child's slot
 // there.
@@ -177,9 +177,11 @@ template <int Width> constexpr auto makeNeighborSlots() {
 }
 template <int Width> inline constexpr auto kNeighborSlots = makeNeighborSlots<Width>();
 
-/// By direction of an owner: the slots of the block that it owns, ended by a place of 0xff.
+/// By direction of an owner: the slots of the block that it owns, ended by kEnd.
 struct NeighborPlace {
-  std::uint8_t place = 0xff; ///< in the block
+  static constexpr std::uint8_t kEnd = 0xff;
+
+  std::uint8_t place = kEnd; ///< in the block
   std::uint8_t slot = 0;     ///< among the owner's children
 };
 template <int Width> constexpr auto makeNeighborPlaces() {
