@@ -4,10 +4,8 @@
 #include "GeometryVolume/channels/ChannelData.h"
 #include "GeometryVolume/channels/ElementOpsTableImpl.h"
 #include "GeometryVolume/channels/ElementTraits.h"
-#include "GeometryVolume/core/detail/SimdLanes.h"
 
 #include <algorithm>
-#include <cstring>
 
 namespace VLN::TileTree3D::Internal {
 
@@ -39,57 +37,8 @@ inline T blendEight(Corner const& corner, typename ElementTraits<T>::Blend fi,
   return result;
 }
 
-/// Columns of a box, V a number or lanes of them: `row` blends a parent's row along i, once for each row.
-/// Each blend is that of blendEight.
-template <class V, class Row, class Store>
-inline void blendColumns(ParentBlend const& b, Row const& row, Store const& store) {
-  constexpr std::size_t n = HaloTable::kLargestTileWidth;
-  auto const lerp = [](V x, V y, float t) { return (y - x) * t + x; };
-  int const firstJ = b.j[0].at, rows = b.j[b.count[1] - 1].at + 2 - firstJ;
-  int const firstK = b.k[0].at, planes = b.k[b.count[2] - 1].at + 2 - firstK;
-  auto const* low = static_cast<float const*>(b.parent) + (firstJ + firstK * b.width) * b.width;
-  V blended[n + 1][n];
-  for (int k = 0; k < planes; ++k, low += b.width * b.width) {
-    V line[n + 1];
-    for (int j = 0; j < rows; ++j) line[j] = row(low + j * b.width);
-    for (int j = 0; j < b.count[1]; ++j) {
-      V const* const at = line + (b.j[j].at - firstJ);
-      blended[k][j] = lerp(at[0], at[1], b.j[j].fraction);
-    }
-  }
-  for (int k = 0; k < b.count[2]; ++k) {
-    auto const* const at = blended + (b.k[k].at - firstK);
-    auto* target = static_cast<float*>(b.target) + k * b.width * b.width;
-    for (int j = 0; j < b.count[1]; ++j, target += b.width)
-      store(target, lerp(at[0][j], at[1][j], b.k[k].fraction));
-  }
-}
-
-inline void blendFloats(ParentBlend b) {
-  auto* const target = static_cast<float*>(b.target);
-  for (int i = 0; i < b.count[0];) {
-    HaloAxis const* const axis = b.i + i;
-    b.target = target + i;
-    if (b.count[0] - i < 4) {
-      blendColumns<float>(
-          b, [x = *axis](float const* row) { return (row[x.at + 1] - row[x.at]) * x.fraction + row[x.at]; },
-          [](float* to, float v) { *to = v; });
-      ++i;
-    } else {
-      int const at[4] = {axis[0].at, axis[1].at, axis[2].at, axis[3].at};
-      FloatLanes const t{axis[0].fraction, axis[1].fraction, axis[2].fraction, axis[3].fraction};
-      blendColumns<FloatLanes>(
-          b,
-          [&at, t](float const* row) {
-            FloatLanes const low{row[at[0]], row[at[1]], row[at[2]], row[at[3]]};
-            FloatLanes const high{row[at[0] + 1], row[at[1] + 1], row[at[2] + 1], row[at[3] + 1]};
-            return lerpLanes(low, high, t);
-          },
-          [](float* to, FloatLanes const& v) { std::memcpy(to, &v, sizeof(v)); });
-      i += 4;
-    }
-  }
-}
+/// blendEight() for all of a box of floats.
+void blendFloats(ParentBlend const& b);
 
 template <class T> struct TypedElementOps {
   using Traits = ElementTraits<T>;

@@ -20,6 +20,7 @@ struct ParentBlend {
   HaloAxis const* j;
   HaloAxis const* k;
   std::array<int, 3> count;
+  std::size_t longAxes = kNoLongAxes; ///< HaloRegion::longAxes
 };
 
 /// One trilinear read: the corners with i fastest, and the fractions.

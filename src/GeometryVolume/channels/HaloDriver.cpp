@@ -216,16 +216,19 @@ template <class TraitsT> void HaloDriver<TraitsT>::replicate(HaloBox const& box,
 }
 
 template <class TraitsT>
-void HaloDriver<TraitsT>::blend(HaloBox const& box, HaloTarget<TraitsT> const& target,
-                                void const* parent) const {
-  int const slot[3] = {m_blockSlot % kAcross - 1, m_blockSlot / kAcross % kAcross - 1,
-                       m_blockSlot / (kAcross * kAcross) - 1};
-  auto const axis = [&](std::size_t a) {
-    auto const child = static_cast<std::size_t>(slot[a]);
-    return &m_table.parentAxis[child][static_cast<std::size_t>(box.low[a] + m_table.halo)];
+void HaloDriver<TraitsT>::blend(std::uint64_t missing, void* target, void const* parent) const {
+  auto const axis = [&](int slot) {
+    return m_table.parentAxis[static_cast<std::size_t>(slot % kAcross - 1)].data() + m_table.halo;
   };
-  m_source.ops->blendParent({at(target.elements, box.target), at(parent, m_table.targetOrigin),
-                             m_table.targetWidth, axis(0), axis(1), axis(2), box.count});
+  HaloAxis const* const i = axis(m_blockSlot);
+  HaloAxis const* const j = axis(m_blockSlot / kAcross);
+  HaloAxis const* const k = axis(m_blockSlot / (kAcross * kAcross));
+  parent = at(parent, m_table.targetOrigin);
+  for (; missing; missing &= missing - 1) {
+    HaloRegion const& box = regionOf(missing);
+    m_source.ops->blendParent({at(target, box.target), parent, m_table.targetWidth, i + box.low[0],
+                               j + box.low[1], k + box.low[2], box.count, box.longAxes});
+  }
 }
 
 template <class TraitsT>
@@ -287,12 +290,10 @@ template <class TraitsT> void HaloDriver<TraitsT>::fill(HaloTarget<TraitsT> cons
   }
   if (!around.missing) return;
 
-  void const* const parent = target.parentData();
+  if (void const* const parent = target.parentData()) return blend(around.missing, target.elements, parent);
   for (std::uint64_t missing = around.missing; missing; missing &= missing - 1) {
     HaloRegion const& region = regionOf(missing);
-    if (parent)
-      blend(region, target, parent);
-    else if (mode == kHaloModeReplicate)
+    if (mode == kHaloModeReplicate)
       replicate(region, target.elements);
     else
       set(region, target.elements, m_source.defaultValue);

@@ -190,7 +190,8 @@ private:
   void copy(HaloBox const& box, void* target, void const* source) const;
   void set(HaloBox const& box, void* target, void const* value) const;
   void replicate(HaloBox const& box, void* target) const;
-  void blend(HaloBox const& box, HaloTarget<TraitsT> const& target, void const* parent) const;
+  /// Regions without a source, from the parent's finished tile.
+  void blend(std::uint64_t missing, void* target, void const* parent) const;
   void nearest(HaloBox const& box, TileType const& tile, void* target, TileType const& coarse,
                void const* source) const;
   void sample(HaloBox const& box, TileType const& tile, void* target, float scale,

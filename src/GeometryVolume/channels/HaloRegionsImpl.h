@@ -28,11 +28,16 @@ struct HaloBox {
   int source = 0;             ///< and in the source's tile in that direction
 };
 
+/// For a tile of four samples and two children along an edge: a bit for each axis along which a region is as
+/// long as the core, where it is one sample wide along all the others. Anything else has this in their place.
+inline constexpr std::size_t kNoLongAxes = 8;
+
 struct HaloRegion : HaloBox {
   NeighborDirection direction = kNeighborSelf;
   bool face = false;
   int blockSlot = 0; ///< steps in a block of children with one layer round them, i fastest
   int around = 0;    ///< steps in a PointerBlock
+  std::size_t longAxes = kNoLongAxes;
 };
 
 /// How the elements of tiles are kept together: by place, i fastest, one pointer for each. With two children
@@ -119,6 +124,11 @@ constexpr HaloTable makeHaloTable(ChannelLayout const& source, ChannelLayout con
       r.target += r.low[a] * targetStride;
       r.source += (r.low[a] - steps[a] * w) * sourceStride;
       targetStride *= t.targetWidth, sourceStride *= t.sourceWidth;
+    }
+    if (TileWidth == 2 && w == 4) {
+      r.longAxes = 0;
+      for (std::size_t a = 0; a < 3; ++a)
+        r.longAxes |= r.count[a] == w ? std::size_t(1) << a : r.count[a] == 1 ? 0 : kNoLongAxes;
     }
     t.offsets[r.direction] = r.source;
     r.around = Block::steps(step.x, step.y, step.z);

@@ -1,0 +1,124 @@
+// Blends of a parent's samples, for floats: lanes along i, and for the common boxes constant counts.
+#include "GeometryVolume/channels/ElementOpsImpl.h"
+#include "GeometryVolume/core/detail/SimdLanes.h"
+
+#include <array>
+#include <cstring>
+#include <type_traits>
+
+namespace VLN::TileTree3D::Internal {
+
+namespace {
+
+// Columns of a box, V a number or lanes of them: `row` blends a parent's row along i, once for each row.
+// Each blend is that of blendEight().
+template <class V, class Row, class Store>
+void blendColumns(ParentBlend const& b, Row const& row, Store const& store) {
+  constexpr std::size_t n = HaloTable::kLargestTileWidth;
+  auto const lerp = [](V x, V y, float t) { return (y - x) * t + x; };
+  int const firstJ = b.j[0].at, rows = b.j[b.count[1] - 1].at + 2 - firstJ;
+  int const firstK = b.k[0].at, planes = b.k[b.count[2] - 1].at + 2 - firstK;
+  auto const* low = static_cast<float const*>(b.parent) + (firstJ + firstK * b.width) * b.width;
+  V blended[n + 1][n];
+  for (int k = 0; k < planes; ++k, low += b.width * b.width) {
+    V line[n + 1];
+    for (int j = 0; j < rows; ++j) line[j] = row(low + j * b.width);
+    for (int j = 0; j < b.count[1]; ++j) {
+      V const* const at = line + (b.j[j].at - firstJ);
+      blended[k][j] = lerp(at[0], at[1], b.j[j].fraction);
+    }
+  }
+  for (int k = 0; k < b.count[2]; ++k) {
+    auto const* const at = blended + (b.k[k].at - firstK);
+    auto* target = static_cast<float*>(b.target) + k * b.width * b.width;
+    for (int j = 0; j < b.count[1]; ++j, target += b.width)
+      store(target, lerp(at[0][j], at[1][j], b.k[k].fraction));
+  }
+}
+
+void blendAny(ParentBlend b) {
+  auto* const target = static_cast<float*>(b.target);
+  for (int i = 0; i < b.count[0];) {
+    HaloAxis const* const axis = b.i + i;
+    b.target = target + i;
+    if (b.count[0] - i < 4) {
+      blendColumns<float>(
+          b, [x = *axis](float const* row) { return (row[x.at + 1] - row[x.at]) * x.fraction + row[x.at]; },
+          [](float* to, float v) { *to = v; });
+      ++i;
+    } else {
+      int const at[4] = {axis[0].at, axis[1].at, axis[2].at, axis[3].at};
+      FloatLanes const t{axis[0].fraction, axis[1].fraction, axis[2].fraction, axis[3].fraction};
+      blendColumns<FloatLanes>(
+          b,
+          [&at, t](float const* row) {
+            FloatLanes const low{row[at[0]], row[at[1]], row[at[2]], row[at[3]]};
+            FloatLanes const high{row[at[0] + 1], row[at[1] + 1], row[at[2] + 1], row[at[3] + 1]};
+            return lerpLanes(low, high, t);
+          },
+          [](float* to, FloatLanes const& v) { std::memcpy(to, &v, sizeof(v)); });
+      i += 4;
+    }
+  }
+}
+
+// Along an axis a box of a halo is one sample wide, anywhere between two of the parent's, or as long as the
+// core: four samples, each second one on one of the parent's and the others half way between.
+template <class V> V blendTwo(V const& a, V const& b, float t) { return (b - a) * t + a; }
+
+template <bool Long, class V> void blendAlong(V const* in, float fraction, V* out) {
+  if constexpr (Long) {
+    out[0] = blendTwo(in[0], in[1], 0.0f), out[1] = blendTwo(in[0], in[1], 0.5f);
+    out[2] = blendTwo(in[1], in[2], 0.0f), out[3] = blendTwo(in[1], in[2], 0.5f);
+  } else {
+    out[0] = blendTwo(in[0], in[1], fraction);
+  }
+}
+
+template <bool Long> auto blendRow(float const* row, float fraction) {
+  if constexpr (Long) {
+    FloatLanes const low{row[0], row[0], row[1], row[1]}, high{row[1], row[1], row[2], row[2]};
+    return lerpLanes(low, high, FloatLanes{0.0f, 0.5f, 0.0f, 0.5f});
+  } else {
+    return blendTwo(row[0], row[1], fraction);
+  }
+}
+
+template <bool I, bool J, bool K> void blendHalves(ParentBlend const& b) {
+  using V = std::conditional_t<I, FloatLanes, float>;
+  constexpr int kRows = J ? 3 : 2, kPlanes = K ? 3 : 2, kCountJ = J ? 4 : 1, kCountK = K ? 4 : 1;
+  std::ptrdiff_t const w = b.width;
+  auto const* const low = static_cast<float const*>(b.parent) + b.i->at + (b.j->at + b.k->at * w) * w;
+  auto* const target = static_cast<float*>(b.target);
+  V columns[kCountJ][kPlanes];
+#pragma GCC unroll 4
+  for (int k = 0; k < kPlanes; ++k) {
+    V rows[kRows], blended[kCountJ];
+#pragma GCC unroll 4
+    for (int j = 0; j < kRows; ++j) rows[j] = blendRow<I>(low + (j + k * w) * w, b.i->fraction);
+    blendAlong<J>(rows, b.j->fraction, blended);
+#pragma GCC unroll 4
+    for (int j = 0; j < kCountJ; ++j) columns[j][k] = blended[j];
+  }
+#pragma GCC unroll 4
+  for (int j = 0; j < kCountJ; ++j) {
+    V blended[kCountK];
+    blendAlong<K>(columns[j], b.k->fraction, blended);
+#pragma GCC unroll 4
+    for (int k = 0; k < kCountK; ++k) std::memcpy(target + (j + k * w) * w, &blended[k], sizeof(V));
+  }
+}
+
+} // namespace
+
+void blendFloats(ParentBlend const& b) {
+  // By HaloRegion::longAxes.
+  static constexpr std::array<void (*)(ParentBlend const&), 7> kHalves{
+      blendHalves<false, false, false>, blendHalves<true, false, false>, blendHalves<false, true, false>,
+      blendHalves<true, true, false>,   blendHalves<false, false, true>, blendHalves<true, false, true>,
+      blendHalves<false, true, true>};
+  if (b.longAxes < kHalves.size()) return kHalves[b.longAxes](b);
+  blendAny(b);
+}
+
+} // namespace VLN::TileTree3D::Internal
