@@ -6,6 +6,7 @@
 #include "GeometryVolume/channels/ElementTraits.h"
 
 #include <algorithm>
+#include <memory>
 
 namespace VLN::TileTree3D::Internal {
 
@@ -37,8 +38,8 @@ inline T blendEight(Corner const& corner, typename ElementTraits<T>::Blend fi,
   return result;
 }
 
-/// blendEight() for all of a box of floats.
-void blendFloats(ParentBlend const& b);
+/// TypedElementOps::blendParent() of floats.
+void blendFloats(ParentBlend const& b, std::uint64_t regions);
 
 template <class T> struct TypedElementOps {
   using Traits = ElementTraits<T>;
@@ -54,7 +55,7 @@ template <class T> struct TypedElementOps {
   static void elementsOf(void const* tileArrays, int depth, std::int64_t const* indices, int n, int count,
                          void const** found) {
     auto const& tiles = (*static_cast<TileArrays<T> const*>(tileArrays))[static_cast<std::size_t>(depth)];
-    std::size_t const size = tiles.size();
+    std::size_t const size = tiles.size(), bytes = static_cast<std::size_t>(count) * sizeof(T);
     for (int i = 0; i < n; ++i) {
       // The first tile in place of one that is not there.
       auto const index = static_cast<std::size_t>(indices[i]);
@@ -62,8 +63,10 @@ template <class T> struct TypedElementOps {
       found[i] = nullptr;
       if (size == 0) continue;
       auto const& tile = tiles[index & (0 - exists)];
-      std::size_t const holds = exists & std::size_t(tile.size() >= static_cast<std::size_t>(count));
-      found[i] = reinterpret_cast<void const*>(reinterpret_cast<std::uintptr_t>(tile.data()) & (0 - holds));
+      auto const begin = reinterpret_cast<std::uintptr_t>(tile.data());
+      auto const end = reinterpret_cast<std::uintptr_t>(std::to_address(tile.end()));
+      std::size_t const holds = exists & std::size_t(end - begin >= bytes);
+      found[i] = reinterpret_cast<void const*>(begin & (0 - holds));
     }
   }
 
@@ -75,20 +78,23 @@ template <class T> struct TypedElementOps {
     }
   }
 
-  static void blendParent(ParentBlend const& b) {
-    if constexpr (std::is_same_v<T, float>) return blendFloats(b);
-    auto* const target = static_cast<T*>(b.target);
-    auto const* const parent = static_cast<T const*>(b.parent);
-    int const w = b.width;
+  static void blendParent(ParentBlend const& b, std::uint64_t regions) {
+    if constexpr (std::is_same_v<T, float>) return blendFloats(b, regions);
+    int const w = b.table->targetWidth;
     int const offsets[8] = {0, 1, w, w + 1, w * w, w * w + 1, w * w + w, w * w + w + 1};
-    for (int k = 0; k < b.count[2]; ++k)
-      for (int j = 0; j < b.count[1]; ++j)
-        for (int i = 0; i < b.count[0]; ++i) {
-          T const* const low = parent + b.i[i].at + (b.j[j].at + b.k[k].at * w) * w;
-          target[i + (j + k * w) * w] =
-              blendEight<T>([&](int n) -> T const& { return low[offsets[n]]; }, Blend(b.i[i].fraction),
-                            Blend(b.j[j].fraction), Blend(b.k[k].fraction));
-        }
+    for (; regions; regions &= regions - 1) {
+      HaloRegion const& box = b.table->regionOf(regions);
+      auto* const target = static_cast<T*>(b.target) + box.target;
+      HaloAxis const *const ai = b.i + box.low[0], *const aj = b.j + box.low[1], *const ak = b.k + box.low[2];
+      for (int k = 0; k < box.count[2]; ++k)
+        for (int j = 0; j < box.count[1]; ++j)
+          for (int i = 0; i < box.count[0]; ++i) {
+            T const* const low = static_cast<T const*>(b.parent) + ai[i].at + (aj[j].at + ak[k].at * w) * w;
+            target[i + (j + k * w) * w] =
+                blendEight<T>([&](int n) -> T const& { return low[offsets[n]]; }, Blend(ai[i].fraction),
+                              Blend(aj[j].fraction), Blend(ak[k].fraction));
+          }
+    }
   }
 
   static void blendCorners(CornerBlend const& b, void* out) {

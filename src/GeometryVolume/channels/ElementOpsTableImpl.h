@@ -11,16 +11,14 @@
 
 namespace VLN::TileTree3D::Internal {
 
-/// A box of a target tile, filled by trilinear reads of its parent's tile of the same layout.
+/// A target tile whose regions are filled by trilinear reads of its parent's tile of the same layout.
 struct ParentBlend {
-  void* target;       ///< first element of the box
+  void* target;
   void const* parent; ///< coordinate (0,0,0) of the parent's tile
-  int width;          ///< of both tiles
-  HaloAxis const* i;
+  HaloTable const* table;
+  HaloAxis const* i; ///< by coordinate, that of the halo before it
   HaloAxis const* j;
   HaloAxis const* k;
-  std::array<int, 3> count;
-  std::size_t longAxes = kNoLongAxes; ///< HaloRegion::longAxes
 };
 
 /// One trilinear read: the corners with i fastest, and the fractions.
@@ -40,7 +38,8 @@ struct ElementOps {
                      void const** found);
   /// Begins to read what elementsOf() will.
   void (*fetchRecords)(void const* tileArrays, int depth, std::int64_t const* indices, int n);
-  void (*blendParent)(ParentBlend const&);
+  /// Regions by HaloTable::around.
+  void (*blendParent)(ParentBlend const&, std::uint64_t regions);
   void (*blendCorners)(CornerBlend const&, void* out);
   /// Every component of an element times a factor, in place.
   void (*scale)(void* element, float factor);

@@ -10,15 +10,37 @@ namespace VLN::TileTree3D::Internal {
 
 namespace {
 
+// A box of a target tile.
+struct FloatBox {
+  float* target;        // its first element
+  float const* parent;  // coordinate (0,0,0) of the parent's tile
+  std::ptrdiff_t width; // of both tiles
+  HaloAxis const* i;
+  HaloAxis const* j;
+  HaloAxis const* k;
+  std::array<int, 3> count;
+};
+
+FloatBox boxOf(ParentBlend const& b, std::uint64_t regions) {
+  HaloRegion const& r = b.table->regionOf(regions);
+  return {static_cast<float*>(b.target) + r.target,
+          static_cast<float const*>(b.parent),
+          b.table->targetWidth,
+          b.i + r.low[0],
+          b.j + r.low[1],
+          b.k + r.low[2],
+          r.count};
+}
+
 // Columns of a box, V a number or lanes of them: `row` blends a parent's row along i, once for each row.
 // Each blend is that of blendEight().
 template <class V, class Row, class Store>
-void blendColumns(ParentBlend const& b, Row const& row, Store const& store) {
+void blendColumns(FloatBox const& b, Row const& row, Store const& store) {
   constexpr std::size_t n = HaloTable::kLargestTileWidth;
   auto const lerp = [](V x, V y, float t) { return (y - x) * t + x; };
   int const firstJ = b.j[0].at, rows = b.j[b.count[1] - 1].at + 2 - firstJ;
   int const firstK = b.k[0].at, planes = b.k[b.count[2] - 1].at + 2 - firstK;
-  auto const* low = static_cast<float const*>(b.parent) + (firstJ + firstK * b.width) * b.width;
+  auto const* low = b.parent + (firstJ + firstK * b.width) * b.width;
   V blended[n + 1][n];
   for (int k = 0; k < planes; ++k, low += b.width * b.width) {
     V line[n + 1];
@@ -30,14 +52,14 @@ void blendColumns(ParentBlend const& b, Row const& row, Store const& store) {
   }
   for (int k = 0; k < b.count[2]; ++k) {
     auto const* const at = blended + (b.k[k].at - firstK);
-    auto* target = static_cast<float*>(b.target) + k * b.width * b.width;
+    auto* target = b.target + k * b.width * b.width;
     for (int j = 0; j < b.count[1]; ++j, target += b.width)
       store(target, lerp(at[0][j], at[1][j], b.k[k].fraction));
   }
 }
 
-void blendAny(ParentBlend b) {
-  auto* const target = static_cast<float*>(b.target);
+void blendBox(FloatBox b) {
+  auto* const target = b.target;
   for (int i = 0; i < b.count[0];) {
     HaloAxis const* const axis = b.i + i;
     b.target = target + i;
@@ -84,12 +106,11 @@ template <bool Long> auto blendRow(float const* row, float fraction) {
   }
 }
 
-template <bool I, bool J, bool K> void blendHalves(ParentBlend const& b) {
+template <bool I, bool J, bool K> void blendHalves(FloatBox const& b) {
   using V = std::conditional_t<I, FloatLanes, float>;
   constexpr int kRows = J ? 3 : 2, kPlanes = K ? 3 : 2, kCountJ = J ? 4 : 1, kCountK = K ? 4 : 1;
   std::ptrdiff_t const w = b.width;
-  auto const* const low = static_cast<float const*>(b.parent) + b.i->at + (b.j->at + b.k->at * w) * w;
-  auto* const target = static_cast<float*>(b.target);
+  auto const* const low = b.parent + b.i->at + (b.j->at + b.k->at * w) * w;
   V columns[kCountJ][kPlanes];
 #pragma GCC unroll 4
   for (int k = 0; k < kPlanes; ++k) {
@@ -105,20 +126,27 @@ template <bool I, bool J, bool K> void blendHalves(ParentBlend const& b) {
     V blended[kCountK];
     blendAlong<K>(columns[j], b.k->fraction, blended);
 #pragma GCC unroll 4
-    for (int k = 0; k < kCountK; ++k) std::memcpy(target + (j + k * w) * w, &blended[k], sizeof(V));
+    for (int k = 0; k < kCountK; ++k) std::memcpy(b.target + (j + k * w) * w, &blended[k], sizeof(V));
   }
+}
+
+template <bool I, bool J, bool K> std::uint64_t blendAll(ParentBlend const& b, std::uint64_t regions) {
+  std::uint64_t const these = regions & b.table->aroundByLength[I + 2 * J + 4 * K];
+  for (std::uint64_t left = these; left; left &= left - 1) blendHalves<I, J, K>(boxOf(b, left));
+  return regions & ~these;
 }
 
 } // namespace
 
-void blendFloats(ParentBlend const& b) {
-  // By HaloRegion::longAxes.
-  static constexpr std::array<void (*)(ParentBlend const&), 7> kHalves{
-      blendHalves<false, false, false>, blendHalves<true, false, false>, blendHalves<false, true, false>,
-      blendHalves<true, true, false>,   blendHalves<false, false, true>, blendHalves<true, false, true>,
-      blendHalves<false, true, true>};
-  if (b.longAxes < kHalves.size()) return kHalves[b.longAxes](b);
-  blendAny(b);
+void blendFloats(ParentBlend const& b, std::uint64_t regions) {
+  regions = blendAll<false, false, false>(b, regions);
+  regions = blendAll<true, false, false>(b, regions);
+  regions = blendAll<false, true, false>(b, regions);
+  regions = blendAll<false, false, true>(b, regions);
+  regions = blendAll<true, true, false>(b, regions);
+  regions = blendAll<true, false, true>(b, regions);
+  regions = blendAll<false, true, true>(b, regions);
+  for (; regions; regions &= regions - 1) blendBox(boxOf(b, regions));
 }
 
 } // namespace VLN::TileTree3D::Internal

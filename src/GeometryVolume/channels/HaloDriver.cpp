@@ -26,6 +26,7 @@ template <class TraitsT> int HaloDriver<TraitsT>::slotInParentBlock(TileType con
   if (d == 0) return blockSlot({0, 0, 0});
   auto const slot = [d](int c) {
     std::uint32_t const u = TraitsT::offset(c);
+    if constexpr (TraitsT::kTW == 2) return static_cast<int>(TraitsT::quotient(u, d) & 1);
     return static_cast<int>(TraitsT::quotient(u, d) - TraitsT::kTW * TraitsT::quotient(u, d - 1));
   };
   return blockSlot({slot(tile.ti()), slot(tile.tj()), slot(tile.tk())});
@@ -42,26 +43,39 @@ template <class TraitsT> void HaloDriver<TraitsT>::setTile(TileType const& tile)
 template <class TraitsT> void HaloDriver<TraitsT>::findPlaces(NeighborCache& cache, std::uint32_t steps) {
   auto const& tile = m_accessor.tile(cache.tile);
   NeighborCache* const parent = tile.isRoot() ? nullptr : &cacheOf(tile.parentTreeIndex());
-  int const slot = slotInParentBlock(tile);
+  int const own = slotInParentBlock(tile), depth = cache.tile.depth;
+  TileType const* const first = &m_accessor.container()->tile(0, depth);
   cache.known |= steps, cache.open |= steps;
   for (; steps; steps &= steps - 1) {
     auto const step = static_cast<NeighborDirection>(std::countr_zero(steps));
-    TreeIndex found = cache.tile;
-    if (step != kNeighborSelf)
-      found =
-          parent ? childAt(*parent, slot + blockSlot(neighborOffset(step)) - blockSlot({0, 0, 0}), tile, step)
-                 : searchNeighbor(tile, step);
-    OwnerTile& owner = cache.around[static_cast<std::size_t>(step)];
-    owner = {found.index, nullptr, found.depth};
-    if (found.depth == cache.tile.depth) __builtin_prefetch(&m_accessor.tile(found));
+    OwnerTile& found = cache.around[static_cast<std::size_t>(step)];
+    found.children = nullptr;
+    if (step == kNeighborSelf) {
+      found.index = cache.tile.index, found.depth = depth;
+      continue;
+    }
+    int const slot = own + kBlockSteps<TraitsT::kTW>[static_cast<std::size_t>(step)];
+    NeighborSlot const& in = neighborSlot(slot);
+    std::int64_t const child = parent ? ownerOf(*parent, in).children[in.slot] : -1;
+    if (child >= 0) {
+      found.index = child, found.depth = depth;
+      __builtin_prefetch(first + child);
+    } else {
+      TreeIndex const there = parent ? childAt(*parent, slot, tile, step) : searchNeighbor(tile, step);
+      found.index = there.index, found.depth = there.depth;
+    }
   }
 }
 
 template <class TraitsT> void HaloDriver<TraitsT>::findChildren(NeighborCache& cache) {
+  TileType const* const first = &m_accessor.container()->tile(0, cache.tile.depth);
   for (std::uint32_t steps = std::exchange(cache.open, 0); steps; steps &= steps - 1) {
     OwnerTile& owner = cache.around[static_cast<std::size_t>(std::countr_zero(steps))];
-    if (owner.depth == cache.tile.depth) owner.children = m_accessor.tile(owner.at()).children();
-    if (!owner.children) owner.children = kNoChildren<TraitsT::kTileSize>.data();
+    if (owner.depth == cache.tile.depth) owner.children = first[owner.index].children();
+    if (!owner.children) {
+      owner.children = kNoChildren<TraitsT::kTileSize>.data();
+      continue;
+    }
     __builtin_prefetch(owner.children);
     __builtin_prefetch(owner.children + TraitsT::kTileSize - 1);
   }
@@ -75,18 +89,20 @@ alignas(64) constexpr std::byte kNoElements[std::size_t(HaloTable::kLargestWidth
 
 } // namespace
 
-template <class TraitsT>
-void HaloDriver<TraitsT>::listIndices(ParentBlock const& block, BlockIndices& to) const {
-  to.count = 0;
+template <class TraitsT> void HaloDriver<TraitsT>::listIndices(ParentBlock& block, BlockIndices& to) const {
+  std::size_t count = 0;
   for (std::uint32_t owners = block.wanted & ~block.filled; owners; owners &= owners - 1) {
     auto const d = static_cast<std::size_t>(std::countr_zero(owners));
-    std::int64_t const* const children = block.cache.around[d].children;
+    OwnerTile const& owner = block.cache.around[d];
+    if (owner.depth < 0) block.beyond |= 1u << d;
+    if (owner.depth != block.cache.tile.depth) continue;
     for (NeighborPlace const& at : kNeighborPlaces<TraitsT::kTW>[d]) {
       if (at.place == NeighborPlace::kEnd) break;
-      auto const n = static_cast<std::size_t>(to.count++);
-      to.index[n] = children[at.slot], to.place[n] = at.place;
+      to.index[count] = owner.children[at.slot], to.place[count] = at.place;
+      count += to.index[count] >= 0;
     }
   }
+  to.count = static_cast<int>(count);
 }
 
 template <class TraitsT>
@@ -102,18 +118,15 @@ void HaloDriver<TraitsT>::completeBlocks(int depth, ParentBlock* blocks, std::si
   for (std::size_t b = 0; b < count; ++b) {
     ParentBlock& block = blocks[b];
     BlockIndices const& list = lists[b];
-    std::array<void const*, 64> found;
+    std::array<void const*, Block::kSize> found;
     m_source.elements(depth, list.index.data(), list.count, found.data());
     for (std::size_t n = 0; n < static_cast<std::size_t>(list.count); ++n) {
-      block.elements.at[list.place[n]] = found[n] ? found[n] : kNoElements;
-      block.elements.present |= std::uint64_t(found[n] != nullptr) << list.place[n];
-      if (found[n] && count > 1)
+      if (!found[n]) continue;
+      block.elements.at[list.place[n]] = found[n];
+      block.elements.present |= std::uint64_t(1) << list.place[n];
+      if (count > 1)
         for (int line = 0; line < 4; ++line)
           __builtin_prefetch(static_cast<std::byte const*>(found[n]) + 64 * line);
-    }
-    for (std::uint32_t owners = block.wanted & ~block.filled; owners; owners &= owners - 1) {
-      int const d = std::countr_zero(owners);
-      block.beyond |= std::uint32_t(block.cache.around[static_cast<std::size_t>(d)].depth < 0) << d;
     }
     block.filled |= block.wanted;
   }
@@ -125,6 +138,15 @@ template <class TraitsT> auto HaloDriver<TraitsT>::blockOf(TileType const& tile)
     if (m_blocks[m_block].cache.tile == parent) return m_blocks[m_block];
   m_block = 0, m_blockCount = 1;
   return startBlock(m_blocks[0], parent);
+}
+
+template <class TraitsT>
+auto HaloDriver<TraitsT>::startBlock(ParentBlock& block, TreeIndex const& parent) -> ParentBlock& {
+  block.cache.tile = parent, block.cache.known = 0;
+  block.wanted = block.filled = block.beyond = 0;
+  block.elements.present = 0;
+  block.elements.at.fill(kNoElements);
+  return block;
 }
 
 template <class TraitsT> void HaloDriver<TraitsT>::prepare(TileType const& first) {
@@ -223,12 +245,7 @@ void HaloDriver<TraitsT>::blend(std::uint64_t missing, void* target, void const*
   HaloAxis const* const i = axis(m_blockSlot);
   HaloAxis const* const j = axis(m_blockSlot / kAcross);
   HaloAxis const* const k = axis(m_blockSlot / (kAcross * kAcross));
-  parent = at(parent, m_table.targetOrigin);
-  for (; missing; missing &= missing - 1) {
-    HaloRegion const& box = regionOf(missing);
-    m_source.ops->blendParent({at(target, box.target), parent, m_table.targetWidth, i + box.low[0],
-                               j + box.low[1], k + box.low[2], box.count, box.longAxes});
-  }
+  m_source.ops->blendParent({target, at(parent, m_table.targetOrigin), &m_table, i, j, k}, missing);
 }
 
 template <class TraitsT>

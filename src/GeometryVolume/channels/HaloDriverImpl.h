@@ -162,20 +162,14 @@ private:
   }
   /// The block of a tile's parent: the one before, one that is ready, or a new one.
   ParentBlock& blockOf(TileType const& tile);
-  static ParentBlock& startBlock(ParentBlock& block, TreeIndex const& parent) {
-    block.cache.tile = parent, block.cache.known = 0;
-    block.wanted = block.filled = block.beyond = 0, block.elements.present = 0;
-    return block;
-  }
+  static ParentBlock& startBlock(ParentBlock& block, TreeIndex const& parent);
   /// Fills what is wanted of blocks. Each step is taken for all of them before the next one, so that what the
   /// next one reads is on its way.
   void completeBlocks(int depth, ParentBlock* blocks, std::size_t count);
-  void listIndices(ParentBlock const& block, BlockIndices& to) const;
+  void listIndices(ParentBlock& block, BlockIndices& to) const;
   /// Fills a block for one tile alone, which lies at its first child's place.
   void findAlone(TileType const& tile);
-  HaloRegion const& regionOf(std::uint64_t missing) const {
-    return m_table.regions[m_table.regionAt[static_cast<std::size_t>(std::countr_zero(missing))]];
-  }
+  HaloRegion const& regionOf(std::uint64_t places) const { return m_table.regionOf(places); }
   /// Core and regions in one go. A region without a tile beside takes bytes without meaning.
   void copyWholeTile(void* target, Around const& around) const;
   /// The tile itself, or its deepest ancestor whose data the source holds.

@@ -101,6 +101,7 @@ std::byte* copyRows(TileMove const& m, int k, std::byte* to) {
   std::byte const* const low = Low > 0 ? Sources::template first<-1, J, K>(m) + plane : nullptr;
   std::byte const* const core = Sources::template first<0, J, K>(m) + plane;
   std::byte const* const high = Sources::template first<1, J, K>(m) + plane;
+#pragma GCC unroll 5
   for (int j = 0; j < kRows; ++j, to += (Low + W + High) * Size) {
     if constexpr (Low > 0) std::memcpy(to, low + j * stride, Low * Size);
     std::memcpy(to + Low * Size, core + j * stride, W * Size);

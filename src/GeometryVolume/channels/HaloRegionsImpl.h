@@ -15,6 +15,7 @@
 
 #include <algorithm>
 #include <array>
+#include <bit>
 
 namespace VLN::TileTree3D::Internal {
 
@@ -28,16 +29,11 @@ struct HaloBox {
   int source = 0;             ///< and in the source's tile in that direction
 };
 
-/// For a tile of four samples and two children along an edge: a bit for each axis along which a region is as
-/// long as the core, where it is one sample wide along all the others. Anything else has this in their place.
-inline constexpr std::size_t kNoLongAxes = 8;
-
 struct HaloRegion : HaloBox {
   NeighborDirection direction = kNeighborSelf;
   bool face = false;
   int blockSlot = 0; ///< steps in a block of children with one layer round them, i fastest
   int around = 0;    ///< steps in a PointerBlock
-  std::size_t longAxes = kNoLongAxes;
 };
 
 /// How the elements of tiles are kept together: by place, i fastest, one pointer for each. With two children
@@ -74,11 +70,19 @@ struct HaloTable {
   int regionCount = 0;
   std::uint64_t around = 0; ///< a bit for each region's place in a PointerBlock, the tile's own at kFirst
   std::array<std::uint8_t, 64> regionAt{}; ///< which region such a bit stands for
+  /// Regions, as such bits, of a tile of four samples and two children along an edge, by the axes along which
+  /// they are as long as the core, where they are one sample wide along all others. A bit for each axis.
+  std::array<std::uint64_t, 7> aroundByLength{};
   std::array<int, kNeighborCount>
       offsets{}; ///< by direction: where the core's and the regions' source begins
   /// For a tile that is child c of its parent along an axis: where each coordinate lies in the parent, whose
   /// tile has the target's layout. [c][coordinate + halo]
   std::array<std::array<HaloAxis, kLargestWidth>, kLargestTileWidth> parentAxis{};
+
+  /// The region of the lowest bit of some places.
+  HaloRegion const& regionOf(std::uint64_t places) const {
+    return regions[regionAt[static_cast<std::size_t>(std::countr_zero(places))]];
+  }
 };
 
 /// Where coordinate `at` of child `child` lies among the samples of the parent, with samples on low corners.
@@ -125,15 +129,14 @@ constexpr HaloTable makeHaloTable(ChannelLayout const& source, ChannelLayout con
       r.source += (r.low[a] - steps[a] * w) * sourceStride;
       targetStride *= t.targetWidth, sourceStride *= t.sourceWidth;
     }
-    if (TileWidth == 2 && w == 4) {
-      r.longAxes = 0;
-      for (std::size_t a = 0; a < 3; ++a)
-        r.longAxes |= r.count[a] == w ? std::size_t(1) << a : r.count[a] == 1 ? 0 : kNoLongAxes;
-    }
     t.offsets[r.direction] = r.source;
     r.around = Block::steps(step.x, step.y, step.z);
     auto const place = static_cast<std::size_t>(Block::kFirst + r.around);
     t.around |= std::uint64_t(1) << place;
+    std::size_t longAxes = TileWidth == 2 && w == 4 ? 0 : 8;
+    for (std::size_t a = 0; a < 3; ++a)
+      longAxes |= r.count[a] == w ? std::size_t(1) << a : r.count[a] == 1 ? 0 : 8;
+    if (longAxes < 8) t.aroundByLength[longAxes] |= std::uint64_t(1) << place;
     t.regionAt[place] = static_cast<std::uint8_t>(t.regionCount);
     t.regions[static_cast<std::size_t>(t.regionCount++)] = r;
   };
@@ -186,6 +189,18 @@ template <int Width> constexpr auto makeNeighborSlots() {
   return table;
 }
 template <int Width> inline constexpr auto kNeighborSlots = makeNeighborSlots<Width>();
+
+/// By direction: steps from slot to slot of the block.
+template <int Width> constexpr auto makeBlockSteps() {
+  constexpr int across = Width + 2;
+  std::array<int, kNeighborCount> table{};
+  for (int d = 0; d < kNeighborCount; ++d) {
+    int3 const step = neighborOffset(d);
+    table[static_cast<std::size_t>(d)] = step.x + across * (step.y + across * step.z);
+  }
+  return table;
+}
+template <int Width> inline constexpr auto kBlockSteps = makeBlockSteps<Width>();
 
 /// By direction of an owner: the slots of the block that it owns, ended by kEnd.
 struct NeighborPlace {
