@@ -7,6 +7,7 @@
 #include "GeometryVolume/core/Export.h"
 #include "GeometryVolume/tiletree/TreeIndex.h"
 
+#include <algorithm>
 #include <cstddef>
 
 namespace VLN::TileTree3D::Internal {
@@ -66,6 +67,14 @@ struct UntypedTiles {
       ops->elementsOf(arrays, depth, indices, n, tileSize, found);
     else
       for (int i = 0; i < n; ++i) found[i] = nullptr;
+  }
+  /// Begins to read or write a tile's elements.
+  void fetch(TreeIndex const& at) const {
+    auto const* const first = static_cast<std::byte const*>(elements(at));
+    if (!first) return;
+    constexpr std::size_t kLine = 64, kMost = 16;
+    std::size_t const lines = (static_cast<std::size_t>(tileSize) * ops->size + kLine - 1) / kLine;
+    for (std::size_t n = 0; n < std::min(lines, kMost); ++n) __builtin_prefetch(first + n * kLine, 1);
   }
   void fetchRecords(int depth, std::int64_t const* indices, int n) const {
     if (inRange(depth)) ops->fetchRecords(arrays, depth, indices, n);

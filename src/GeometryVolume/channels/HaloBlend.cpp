@@ -106,33 +106,35 @@ template <bool Long> auto blendRow(float const* row, float fraction) {
   }
 }
 
-template <bool I, bool J, bool K> void blendHalves(FloatBox const& b) {
+template <bool I, bool J, bool K> void blendHalves(ParentBlend const& b, HaloRegion const& region) {
   using V = std::conditional_t<I, FloatLanes, float>;
   constexpr int kRows = J ? 3 : 2, kPlanes = K ? 3 : 2, kCountJ = J ? 4 : 1, kCountK = K ? 4 : 1;
-  std::ptrdiff_t const w = b.width;
-  auto const* const low = b.parent + b.i->at + (b.j->at + b.k->at * w) * w;
+  std::ptrdiff_t const w = b.table->targetWidth;
+  HaloAxis const &i = b.i[region.low[0]], &j = b.j[region.low[1]], &k = b.k[region.low[2]];
+  auto const* const low = static_cast<float const*>(b.parent) + i.at + (j.at + k.at * w) * w;
+  auto* const target = static_cast<float*>(b.target) + region.target;
   V columns[kCountJ][kPlanes];
 #pragma GCC unroll 4
-  for (int k = 0; k < kPlanes; ++k) {
+  for (int z = 0; z < kPlanes; ++z) {
     V rows[kRows], blended[kCountJ];
 #pragma GCC unroll 4
-    for (int j = 0; j < kRows; ++j) rows[j] = blendRow<I>(low + (j + k * w) * w, b.i->fraction);
-    blendAlong<J>(rows, b.j->fraction, blended);
+    for (int y = 0; y < kRows; ++y) rows[y] = blendRow<I>(low + (y + z * w) * w, i.fraction);
+    blendAlong<J>(rows, j.fraction, blended);
 #pragma GCC unroll 4
-    for (int j = 0; j < kCountJ; ++j) columns[j][k] = blended[j];
+    for (int y = 0; y < kCountJ; ++y) columns[y][z] = blended[y];
   }
 #pragma GCC unroll 4
-  for (int j = 0; j < kCountJ; ++j) {
+  for (int y = 0; y < kCountJ; ++y) {
     V blended[kCountK];
-    blendAlong<K>(columns[j], b.k->fraction, blended);
+    blendAlong<K>(columns[y], k.fraction, blended);
 #pragma GCC unroll 4
-    for (int k = 0; k < kCountK; ++k) std::memcpy(b.target + (j + k * w) * w, &blended[k], sizeof(V));
+    for (int z = 0; z < kCountK; ++z) std::memcpy(target + (y + z * w) * w, &blended[z], sizeof(V));
   }
 }
 
 template <bool I, bool J, bool K> std::uint64_t blendAll(ParentBlend const& b, std::uint64_t regions) {
   std::uint64_t const these = regions & b.table->aroundByLength[I + 2 * J + 4 * K];
-  for (std::uint64_t left = these; left; left &= left - 1) blendHalves<I, J, K>(boxOf(b, left));
+  for (std::uint64_t left = these; left; left &= left - 1) blendHalves<I, J, K>(b, b.table->regionOf(left));
   return regions & ~these;
 }
 

@@ -149,7 +149,8 @@ auto HaloDriver<TraitsT>::startBlock(ParentBlock& block, TreeIndex const& parent
   return block;
 }
 
-template <class TraitsT> void HaloDriver<TraitsT>::prepare(TileType const& first) {
+template <class TraitsT>
+void HaloDriver<TraitsT>::prepare(TileType const& first, UntypedTiles const& target) {
   if (!Block::kOfParent || first.isRoot()) return;
   TreeIndex const parent = first.parentTreeIndex();
   for (std::size_t b = m_block; b < m_blockCount; ++b)
@@ -170,6 +171,7 @@ template <class TraitsT> void HaloDriver<TraitsT>::prepare(TileType const& first
     m_blocks[m_blockCount - 1].wanted |= ownersRound(slotInParentBlock(tile));
   }
   completeBlocks(depth, m_blocks.data(), m_blockCount);
+  for (std::size_t b = 0; b < m_blockCount; ++b) target.fetch(m_blocks[b].cache.tile);
 }
 
 template <class TraitsT> void HaloDriver<TraitsT>::findAlone(TileType const& tile) {
@@ -403,7 +405,8 @@ public:
   void beginTile(TileType const& tile) override {
     void* const target = const_cast<void*>(m_pass.target.elements(tile.treeIndex()));
     if (!target) return;
-    m_driver.prepare(tile);
+    m_driver.prepare(tile, m_pass.target);
+    m_pass.target.fetch({tile.index() + kTilesAhead, tile.depth()});
     if (m_fill) return m_driver.fill(tile, target, *m_fill, m_sampler);
     HaloTarget<TraitsT> plain{tile, target};
     if (!tile.isRoot() && tile.depth() > m_pass.firstDepth) {
@@ -414,6 +417,8 @@ public:
   }
 
 private:
+  static constexpr std::int64_t kTilesAhead = 4; // whose elements are fetched
+
   HaloPass const& m_pass;
   HaloFill const* m_fill;
   Container<TraitsT> const& m_tree;

@@ -47,9 +47,10 @@ public:
   /// The core, then each region: from the neighbour of the same depth; else blended from the parent; else,
   /// without a parent, replicated in mode kHaloModeReplicate and the default value in any other.
   void fill(HaloTarget<TraitsT> const& target, HaloMode mode);
-  /// Finds what tiles read that are filled next, in the order of their indices.
+  /// Finds what tiles read that are filled next, in the order of their indices, in the source and in the
+  /// parents' tiles of the target.
   /// @pre The tree stays as it is until they are filled.
-  void prepare(TileType const& first);
+  void prepare(TileType const& first, UntypedTiles const& target);
   /// What `fill.type` names, as `fill.mode` says.
   void fill(TileType const& tile, void* target, HaloFill const& fill, HaloSampler<TraitsT>& sampler);
 
