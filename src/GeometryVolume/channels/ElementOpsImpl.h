@@ -103,6 +103,20 @@ template <class T> struct TypedElementOps {
                       Blend(b.fraction[0]), Blend(b.fraction[1]), Blend(b.fraction[2]));
   }
 
+  static void blendBox(BoxBlend const& b) {
+    int const rows = b.samplesI, planes = b.samplesI * b.samplesJ, w = b.targetWidth;
+    int const offsets[8] = {0, 1, rows, rows + 1, planes, planes + 1, planes + rows, planes + rows + 1};
+    for (int k = 0; k < b.count[2]; ++k)
+      for (int j = 0; j < b.count[1]; ++j)
+        for (int i = 0; i < b.count[0]; ++i) {
+          void const* const* const low = b.samples + b.at[0][i] + b.at[1][j] * rows + b.at[2][k] * planes;
+          T& out = static_cast<T*>(b.target)[i + (j + k * w) * w];
+          out = blendEight<T>([&](int n) -> T const& { return *static_cast<T const*>(low[offsets[n]]); },
+                              Blend(b.fraction[0][i]), Blend(b.fraction[1][j]), Blend(b.fraction[2][k]));
+          if (b.scale != 1.0f) scale(&out, b.scale);
+        }
+  }
+
   static void scale(void* element, float factor) {
     auto& value = *static_cast<T*>(element);
     value = Traits::scaled(value, Blend(factor));
@@ -125,8 +139,9 @@ template <class T> struct TypedElementOps {
     static ElementOps const ops{sizeof(T),    &haloKernels(sizeof(T)),
                                 elements,     elementsOf,
                                 fetchRecords, blendParent,
-                                blendCorners, scale,
-                                broadcast,    distance};
+                                blendCorners, blendBox,
+                                scale,        broadcast,
+                                distance};
     return ops;
   }
 };

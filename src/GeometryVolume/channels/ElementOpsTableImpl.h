@@ -28,6 +28,18 @@ struct CornerBlend {
   double fraction[3];
 };
 
+/// Trilinear reads for a box of a target tile, of samples that lie anywhere.
+struct BoxBlend {
+  void* target; ///< first element of the box
+  int targetWidth;
+  std::array<int, 3> count;
+  void const* const* samples;   ///< with i fastest
+  int samplesI, samplesJ;       ///< along these axes
+  std::array<int const*, 3> at; ///< along an axis, which sample is the low one of an element
+  std::array<double const*, 3> fraction;
+  float scale;
+};
+
 struct ElementOps {
   std::size_t size;
   HaloKernels const* kernels;
@@ -42,6 +54,8 @@ struct ElementOps {
   /// Regions by HaloTable::around.
   void (*blendParent)(ParentBlend const&, std::uint64_t regions);
   void (*blendCorners)(CornerBlend const&, void* out);
+  /// blendCorners() for a box, and scale() where the scale is not 1.
+  void (*blendBox)(BoxBlend const&);
   /// Every component of an element times a factor, in place.
   void (*scale)(void* element, float factor);
   /// The constant in every component.

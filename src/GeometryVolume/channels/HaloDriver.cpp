@@ -268,16 +268,33 @@ void HaloDriver<TraitsT>::nearest(HaloBox const& box, TileType const& tile, void
 }
 
 template <class TraitsT>
-void HaloDriver<TraitsT>::sample(HaloBox const& box, TileType const& tile, void* target, float scale,
-                                 HaloSampler<TraitsT>& sampler) const {
+void HaloDriver<TraitsT>::sample(HaloBox const& box, TileType const& tile, TreeIndex const& there,
+                                 void* target, float scale, HaloSampler<TraitsT>& sampler) {
   int const s = tile.voxelDataWidth(), w = m_table.targetWidth;
+  int3 const first{tile.ti() + s * box.low[0], tile.tj() + s * box.low[1], tile.tk() + s * box.low[2]};
+  TileType const* const from = solelyCovered(tile, there);
+  if (from && sampler.sampleBox(*from, {first, s, box.count, at(target, box.target), w}, scale)) return;
   for (int k = 0; k < box.count[2]; ++k)
     for (int j = 0; j < box.count[1]; ++j)
-      for (int i = 0; i < box.count[0]; ++i) {
-        int3 const p{tile.ti() + s * (box.low[0] + i), tile.tj() + s * (box.low[1] + j),
-                     tile.tk() + s * (box.low[2] + k)};
-        sampler.sample(p, scale, at(target, box.target + i + (j + k * w) * w));
-      }
+      for (int i = 0; i < box.count[0]; ++i)
+        sampler.sample(int3{first.x + s * i, first.y + s * j, first.z + s * k}, scale,
+                       at(target, box.target + i + (j + k * w) * w));
+}
+
+template <class TraitsT>
+auto HaloDriver<TraitsT>::solelyCovered(TileType const& tile, TreeIndex const& there) -> TileType const* {
+  if (!there.valid() || there.depth >= tile.depth()) return nullptr;
+  auto const& tree = *m_accessor.container();
+  if (m_deepestRoot == kUnknownDepth)
+    for (m_deepestRoot = TraitsT::kMaxDepth; m_deepestRoot >= 0; --m_deepestRoot)
+      if (tree.rootCount(m_deepestRoot) > 0) break;
+  if (m_deepestRoot > there.depth) return nullptr;
+  TileType const* from = &m_accessor.tile(there);
+  while (from->depth() > m_source.maxDepth) {
+    if (from->isRoot()) return nullptr;
+    from = &m_accessor.tile(from->parentTreeIndex());
+  }
+  return from;
 }
 
 template <class TraitsT> void HaloDriver<TraitsT>::copyWholeTile(void* target, Around const& around) const {
@@ -328,7 +345,7 @@ void HaloDriver<TraitsT>::fillRegion(HaloRegion const& region, TileType const& t
     return set(region, target, m_source.defaultValue);
   switch (fill.mode) {
   case kHaloModeDeepOnly:
-    if (there.depth > m_source.maxDepth) sample(region, tile, target, fill.scale, sampler);
+    if (there.depth > m_source.maxDepth) sample(region, tile, there, target, fill.scale, sampler);
     return;
   case kHaloModeReplicate:
     return replicate(region, target);
@@ -339,7 +356,7 @@ void HaloDriver<TraitsT>::fillRegion(HaloRegion const& region, TileType const& t
     return set(region, target, m_source.defaultValue);
   }
   case kHaloModeLinearCoarse:
-    return sample(region, tile, target, fill.scale, sampler);
+    return sample(region, tile, there, target, fill.scale, sampler);
   case kHaloModeConstant: {
     alignas(16) std::byte value[kLargestElement];
     m_source.ops->broadcast(fill.constant, value);
@@ -367,7 +384,8 @@ void HaloDriver<TraitsT>::fill(TileType const& tile, void* target, HaloFill cons
   }
   if (fill.type & kHaloCore) {
     if (tile.depth() > m_source.maxDepth)
-      sample(m_table.core, tile, target, fill.scale, sampler);
+      sample(m_table.core, tile, tile.isRoot() ? TreeIndex{} : tile.parentTreeIndex(), target, fill.scale,
+             sampler);
     else if (void const* const own = m_source.elements(tile.treeIndex()))
       copy(m_table.core, target, own);
     else

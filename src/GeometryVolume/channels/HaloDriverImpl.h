@@ -189,8 +189,12 @@ private:
   void blend(std::uint64_t missing, void* target, void const* parent) const;
   void nearest(HaloBox const& box, TileType const& tile, void* target, TileType const& coarse,
                void const* source) const;
-  void sample(HaloBox const& box, TileType const& tile, void* target, float scale,
-              HaloSampler<TraitsT>& sampler) const;
+  /// @param there The deepest tile above `tile` where the box lies, if it is known.
+  void sample(HaloBox const& box, TileType const& tile, TreeIndex const& there, void* target, float scale,
+              HaloSampler<TraitsT>& sampler);
+  /// The deepest tile that the source covers at `there` and at all places in it where no tile of the depth of
+  /// `tile` lies; null where that is not known.
+  TileType const* solelyCovered(TileType const& tile, TreeIndex const& there);
   void fillRegion(HaloRegion const& region, TileType const& tile, void* target, HaloFill const& fill,
                   HaloSampler<TraitsT>& sampler);
 
@@ -205,6 +209,8 @@ private:
   static int slotInParentBlock(TileType const& tile);
 
   NeighborCache* m_parentCache = nullptr; ///< of the tile's parent; null for a root
+  static constexpr int kUnknownDepth = -2;
+  int m_deepestRoot = kUnknownDepth;      ///< -1 without roots
   int m_blockSlot = blockSlot({0, 0, 0}); ///< of the tile among the parent's children and those round them
   // One for each depth. The coarser, the more seldom it changes.
   PerDepth<NeighborCache, TraitsT::kDepths> m_caches;
