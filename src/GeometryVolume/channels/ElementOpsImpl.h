@@ -40,6 +40,9 @@ inline T blendEight(Corner const& corner, typename ElementTraits<T>::Blend fi,
 
 /// TypedElementOps::blendParent() of floats.
 void blendFloats(ParentBlend const& b, std::uint64_t regions);
+/// TypedElementOps::blendBox() of floats.
+/// @pre The scale is 1.
+void blendFloats(BoxBlend const& b);
 
 template <class T> struct TypedElementOps {
   using Traits = ElementTraits<T>;
@@ -104,7 +107,9 @@ template <class T> struct TypedElementOps {
   }
 
   static void blendBox(BoxBlend const& b) {
-    int const rows = b.samplesI, planes = b.samplesI * b.samplesJ, w = b.targetWidth;
+    if constexpr (std::is_same_v<T, float>)
+      if (b.scale == 1.0f) return blendFloats(b);
+    int const rows = b.sampleCount[0], planes = rows * b.sampleCount[1], w = b.targetWidth;
     int const offsets[8] = {0, 1, rows, rows + 1, planes, planes + 1, planes + rows, planes + rows + 1};
     for (int k = 0; k < b.count[2]; ++k)
       for (int j = 0; j < b.count[1]; ++j)

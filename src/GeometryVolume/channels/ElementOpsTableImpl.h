@@ -33,12 +33,15 @@ struct BoxBlend {
   void* target; ///< first element of the box
   int targetWidth;
   std::array<int, 3> count;
-  void const* const* samples;   ///< with i fastest
-  int samplesI, samplesJ;       ///< along these axes
+  void const* const* samples; ///< with i fastest
+  std::array<int, 3> sampleCount;
   std::array<int const*, 3> at; ///< along an axis, which sample is the low one of an element
   std::array<double const*, 3> fraction;
   float scale;
 };
+
+/// Most elements of such a box along an axis.
+inline constexpr int kLargestBlend = HaloTable::kLargestTileWidth;
 
 struct ElementOps {
   std::size_t size;

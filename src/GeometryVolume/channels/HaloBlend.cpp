@@ -151,4 +151,58 @@ void blendFloats(ParentBlend const& b, std::uint64_t regions) {
   for (; regions; regions &= regions - 1) blendBox(boxOf(b, regions));
 }
 
+namespace {
+
+// Along i for each row of samples, along j for each of their planes, along k for each element. The counts are
+// constants, or else the box's own: 0.
+template <int I, int J, int K> void blendCounts(BoxBlend const& b) {
+  constexpr int kMostI = I ? I : kLargestBlend, kMostJ = J ? J : kLargestBlend;
+  int const countI = I ? I : b.count[0], countJ = J ? J : b.count[1], countK = K ? K : b.count[2];
+  int const sampleRows = J == 1 ? 2 : b.sampleCount[1], samplePlanes = K == 1 ? 2 : b.sampleCount[2];
+  float columns[(K == 1 ? 1 : kLargestBlend) + 1][kMostJ][kMostI];
+  auto const* samples = b.samples;
+  for (int k = 0; k < samplePlanes; ++k) {
+    float rows[(J == 1 ? 1 : kLargestBlend) + 1][kMostI];
+    for (int j = 0; j < sampleRows; ++j, samples += b.sampleCount[0])
+#pragma GCC unroll 4
+      for (int i = 0; i < countI; ++i) {
+        auto const value = [&](int at) { return *static_cast<float const*>(samples[at]); };
+        int const at = I == 1 ? 0 : b.at[0][i];
+        rows[j][i] = blendTwo(value(at), value(at + 1), static_cast<float>(b.fraction[0][i]));
+      }
+    for (int j = 0; j < countJ; ++j) {
+      auto const* const low = rows + (J == 1 ? 0 : b.at[1][j]);
+      auto const t = static_cast<float>(b.fraction[1][j]);
+#pragma GCC unroll 4
+      for (int i = 0; i < countI; ++i) columns[k][j][i] = blendTwo(low[0][i], low[1][i], t);
+    }
+  }
+  for (int k = 0; k < countK; ++k) {
+    auto const* const low = columns + (K == 1 ? 0 : b.at[2][k]);
+    auto const t = static_cast<float>(b.fraction[2][k]);
+    for (int j = 0; j < countJ; ++j) {
+      auto* const target = static_cast<float*>(b.target) + (j + k * b.targetWidth) * b.targetWidth;
+#pragma GCC unroll 4
+      for (int i = 0; i < countI; ++i) target[i] = blendTwo(low[0][j][i], low[1][j][i], t);
+    }
+  }
+}
+
+} // namespace
+
+void blendFloats(BoxBlend const& b) {
+  // Edges and corners of one layer are the most.
+  if (b.count[1] == 1 && b.count[2] == 1) {
+    if (b.count[0] == 1) return blendCounts<1, 1, 1>(b);
+    if (b.count[0] == 4) return blendCounts<4, 1, 1>(b);
+  } else if (b.count[0] == 1 && b.count[2] == 1) {
+    return blendCounts<1, 0, 1>(b);
+  } else if (b.count[0] == 1 && b.count[1] == 1) {
+    return blendCounts<1, 1, 0>(b);
+  } else if (b.count[0] == 4) {
+    return blendCounts<4, 0, 0>(b);
+  }
+  blendCounts<0, 0, 0>(b);
+}
+
 } // namespace VLN::TileTree3D::Internal

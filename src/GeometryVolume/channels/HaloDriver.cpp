@@ -272,8 +272,12 @@ void HaloDriver<TraitsT>::sample(HaloBox const& box, TileType const& tile, TreeI
                                  void* target, float scale, HaloSampler<TraitsT>& sampler) {
   int const s = tile.voxelDataWidth(), w = m_table.targetWidth;
   int3 const first{tile.ti() + s * box.low[0], tile.tj() + s * box.low[1], tile.tk() + s * box.low[2]};
+  std::array<int, 3> sides;
+  for (std::size_t a = 0; a < 3; ++a)
+    sides[a] = box.low[a] < 0 ? -1 : box.low[a] >= m_table.tileDataWidth ? 1 : 0;
   TileType const* const from = solelyCovered(tile, there);
-  if (from && sampler.sampleBox(*from, {first, s, box.count, at(target, box.target), w}, scale)) return;
+  if (from && sampler.sampleBox(*from, {first, s, box.count, sides, at(target, box.target), w}, scale))
+    return;
   for (int k = 0; k < box.count[2]; ++k)
     for (int j = 0; j < box.count[1]; ++j)
       for (int i = 0; i < box.count[0]; ++i)

@@ -103,71 +103,96 @@ template <class TraitsT> void const* HaloSampler<TraitsT>::corner(int3 const& at
   return flat(m_at->elements, {nearest(at.x), nearest(at.y), nearest(at.z)});
 }
 
+template <class TraitsT> void HaloSampler<TraitsT>::Axis::set(AxisPlaces const& to, std::ptrdiff_t stride) {
+  places = to;
+  // As samplePlace(), without its division where a product gives the same.
+  auto const samplesTo = [&](int p) {
+    double const distance = double(p) - double(to.corner);
+    if constexpr (TraitsT::kTW == 2) return distance * (1.0 / to.width);
+    return distance / to.width;
+  };
+  int p = to.first;
+  for (int n = 0; n < to.count; ++n, p += to.step) {
+    double const l = samplesTo(p) - double(to.offset);
+    int const low = static_cast<int>(l) - (l < static_cast<int>(l)); // the place lies in the tile
+    if (n == 0) first = low;
+    at[n] = low - first, fraction[n] = l - low;
+  }
+  constexpr int w = TraitsT::kTDW;
+  count = at[to.count - 1] + 2;
+  zoneCount = 0;
+  int const ends[3] = {std::clamp(-first, 0, count), std::clamp(w - first, 0, count), count};
+  for (int side = 0, begin = 0; side < 3; begin = ends[side++])
+    if (ends[side] > begin) zones[zoneCount++] = {side - 1, begin, ends[side]};
+  for (int n = 0; n < count; ++n) {
+    int const c = first + n;
+    wrapped[n] = (c < 0 ? c + w : c >= w ? c - w : c) * stride;
+    nearest[n] = std::clamp(c, 0, w - 1) * stride;
+  }
+}
+
 template <class TraitsT>
 bool HaloSampler<TraitsT>::sampleBox(TileType const& from, Places const& places, float scale) {
   m_at = &aroundOf(from);
   m_extent = 0; // the next sample() looks for its tile
   if (!m_at->elements) return false;
 
-  // Each sample that any place blends, once: where it lies, along each axis.
-  constexpr int kReads = kMost + 1;
-  struct Axis {
-    int at[kMost]; // a place's low sample
-    double fraction[kMost];
-    int first, count;                                // samples that are read
-    int side[kReads];                                // of the tile
-    std::ptrdiff_t wrapped[kReads], nearest[kReads]; // bytes into the tile there, and into this one
-  } axes[3];
-  auto stride = static_cast<std::ptrdiff_t>(m_source.ops->size);
-  for (int a = 0; a < 3; ++a, stride *= m_width) {
-    Axis& axis = axes[a];
-    int const count = places.count[static_cast<std::size_t>(a)];
-    for (int n = 0; n < count; ++n) {
-      auto const at =
-          samplePlace(places.first[a] + places.step * n, from.tijk()[a], from.voxelDataWidth(), m_offset[a]);
-      if (n == 0) axis.first = at.low;
-      axis.at[n] = at.low - axis.first, axis.fraction[n] = at.fraction;
-    }
-    axis.count = axis.at[count - 1] + 2;
-    for (int n = 0; n < axis.count; ++n) {
-      int const at = axis.first + n;
-      axis.side[n] = sideOf<TraitsT>(at);
-      axis.wrapped[n] = (at - axis.side[n] * TraitsT::kTDW) * stride;
-      axis.nearest[n] = std::clamp(at, 0, TraitsT::kTDW - 1) * stride;
-    }
-  }
-
-  void const* corners[kReads * kReads * kReads];
-  auto const origin = m_origin * static_cast<std::ptrdiff_t>(m_source.ops->size);
-  auto const in = [&](void const* elements, std::ptrdiff_t bytes) {
-    return static_cast<std::byte const*>(elements) + origin + bytes;
+  auto const size = static_cast<std::ptrdiff_t>(m_source.ops->size);
+  auto const axisOf = [&](std::size_t a, std::ptrdiff_t stride) -> Axis const& {
+    int const n = static_cast<int>(a);
+    AxisPlaces const wanted{places.count[a], places.first[n],       places.step,
+                            from.tijk()[n],  from.voxelDataWidth(), m_offset[n]};
+    Axis& axis = m_axes[a][static_cast<std::size_t>(places.side[a] + 1)];
+    if (axis.places != wanted) axis.set(wanted, stride * size);
+    return axis;
   };
-  auto* next = corners;
-  for (int k = 0; k < axes[2].count; ++k)
-    for (int j = 0; j < axes[1].count; ++j)
-      for (int i = 0; i < axes[0].count; ++i, ++next) {
-        auto const direction = neighborDirection(axes[0].side[i], axes[1].side[j], axes[2].side[k]);
+  Axis const &x = axisOf(0, 1), &y = axisOf(1, m_width), &z = axisOf(2, m_width * m_width);
+
+  // Samples in the tile or in one of the same depth beside it lie alike; those of one tile are taken
+  // together.
+  void const* samples[kReads * kReads * kReads];
+  int const acrossI = x.count, acrossJ = y.count;
+  auto const forZone = [&](Zone const& zi, Zone const& zj, Zone const& zk, auto const& sampleAt) {
+    for (int k = zk.begin; k < zk.end; ++k)
+      for (int j = zj.begin; j < zj.end; ++j) {
+        void const** const row = samples + (k * acrossJ + j) * acrossI;
+        auto const at = sampleAt(j, k);
+        for (int i = zi.begin; i < zi.end; ++i) row[i] = at(i);
+      }
+  };
+  auto const alike = [&](Zone const& zi, Zone const& zj, Zone const& zk, void const* elements,
+                         std::ptrdiff_t const* i, std::ptrdiff_t const* j, std::ptrdiff_t const* k) {
+    auto const* const first = static_cast<std::byte const*>(elements) + m_origin * size;
+    forZone(zi, zj, zk,
+            [=](int nj, int nk) { return [i, row = first + j[nj] + k[nk]](int ni) { return row + i[ni]; }; });
+  };
+  for (int nk = 0; nk < z.zoneCount; ++nk)
+    for (int nj = 0; nj < y.zoneCount; ++nj)
+      for (int ni = 0; ni < x.zoneCount; ++ni) {
+        Zone const &zi = x.zones[ni], &zj = y.zones[nj], &zk = z.zones[nk];
+        auto const direction = neighborDirection(zi.side, zj.side, zk.side);
         if (direction == kNeighborSelf) {
-          *next = in(m_at->elements, axes[0].wrapped[i] + axes[1].wrapped[j] + axes[2].wrapped[k]);
+          alike(zi, zj, zk, m_at->elements, x.wrapped, y.wrapped, z.wrapped);
           continue;
         }
-        int3 const at{axes[0].first + i, axes[1].first + j, axes[2].first + k};
-        auto const& there = beside(*m_at, direction, at);
+        Beside const& there =
+            beside(*m_at, direction, {x.first + zi.begin, y.first + zj.begin, z.first + zk.begin});
         if (!there.elements)
-          *next = in(m_at->elements, axes[0].nearest[i] + axes[1].nearest[j] + axes[2].nearest[k]);
+          alike(zi, zj, zk, m_at->elements, x.nearest, y.nearest, z.nearest);
         else if (there.tile->depth() == from.depth())
-          *next = in(there.elements, axes[0].wrapped[i] + axes[1].wrapped[j] + axes[2].wrapped[k]);
+          alike(zi, zj, zk, there.elements, x.wrapped, y.wrapped, z.wrapped);
         else
-          *next = corner(at);
+          forZone(zi, zj, zk, [&](int j, int k) {
+            return [&, j, k](int i) { return corner({x.first + i, y.first + j, z.first + k}); };
+          });
       }
   m_source.ops->blendBox({places.target,
                           places.targetWidth,
                           places.count,
-                          corners,
-                          axes[0].count,
-                          axes[1].count,
-                          {axes[0].at, axes[1].at, axes[2].at},
-                          {axes[0].fraction, axes[1].fraction, axes[2].fraction},
+                          samples,
+                          {x.count, y.count, z.count},
+                          {x.at, y.at, z.at},
+                          {x.fraction, y.fraction, z.fraction},
                           scale});
   return true;
 }

@@ -38,21 +38,49 @@ public:
     int3 first; ///< place of the first one
     int step;   ///< from place to place
     std::array<int, 3> count;
-    void* target; ///< element of the first one
+    std::array<int, 3> side; ///< -1, 0, 1: on which side of what they are for, or none
+    void* target;            ///< element of the first one
     int targetWidth;
   };
   /// sample() at all of some places.
-  /// @pre `from` is the deepest tile there that the channel covers, and at most kMost places lie along an
-  /// axis.
+  /// @pre `from` is the deepest tile there that the channel covers, with samples wider than a step, and at
+  /// most kMost places lie along an axis.
   /// @return False if the channel has no data there; then nothing is written.
   bool sampleBox(TileType const& from, Places const& places, float scale);
-  static constexpr int kMost = HaloTable::kLargestTileWidth;
+  static constexpr int kMost = kLargestBlend;
 
 private:
   /// What lies beside the tile in a direction, at its depth or above: the same tile for every sample there.
   struct Beside {
     TileType const* tile;
     void const* elements;
+  };
+
+  /// Places in a row along one axis, and the tile that they lie in.
+  struct AxisPlaces {
+    int count = 0; // first: without places the rest is not compared
+    int first, step;
+    int corner, width;
+    float offset;
+
+    bool operator==(AxisPlaces const&) const = default;
+  };
+  /// Samples before a tile, in it, or behind it: side -1, 0, 1.
+  struct Zone {
+    int side, begin, end;
+  };
+  /// The samples that such places blend.
+  static constexpr int kReads = kMost + 1;
+  struct Axis {
+    AxisPlaces places;
+    int at[kMost]; ///< a place's low sample
+    double fraction[kMost];
+    int first, count; ///< samples that are read
+    int zoneCount;
+    Zone zones[3];
+    std::ptrdiff_t wrapped[kReads], nearest[kReads]; ///< bytes into the tile there, and into this one
+
+    void set(AxisPlaces const& to, std::ptrdiff_t stride);
   };
 
   /// A tile, its elements, and what lies beside it as far as it was asked for.
@@ -97,6 +125,8 @@ private:
   std::uint32_t m_extent = 0;
   static constexpr std::size_t kRecent = 32;
   std::array<Around, kRecent> m_recent;
+  /// By axis and side: regions of a tile on the same side have the same places there.
+  std::array<std::array<Axis, 3>, 3> m_axes;
 };
 
 } // namespace VLN::TileTree3D::Internal
