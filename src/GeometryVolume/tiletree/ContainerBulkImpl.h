@@ -63,14 +63,15 @@ public:
   Groups const& groups(int depth) const { return m_groups[depth]; }
 
   /// Adds the tiles between a wanted one and the next coarser one above, wanted or there.
-  void addBetween(ConstTileAccessorOf<TraitsT> const& treeAccessor) {
+  /// @param makeAccessor One for each thread.
+  template <class MakeAccessor> void addBetween(MakeAccessor const& makeAccessor) {
     for (int d = kMaxDepth; d > 1; --d) {
       Groups const& here = groups(d);
       if (here.empty()) continue;
       std::vector<CoverageQuery> const above = coverageAbove(d - 1);
       join(d - 1, listed(static_cast<std::int64_t>(here.size()), kGroupGrain,
                          [&](std::int64_t begin, std::int64_t end, Groups& to) {
-                           auto const accessor = treeAccessor; // each moves its own
+                           auto const accessor = makeAccessor();
                            std::vector<CoverageQuery> queries = above;
                            for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end);
                                 ++n) {
@@ -216,7 +217,7 @@ template <class TraitsT>
 void ContainerBuilder<TraitsT>::addTilesInBulk(TileLists const& corners, TileLists* newTiles) {
   m_tree.tilesAdded();
   Internal::WantedTiles<TraitsT> wanted(corners);
-  wanted.addBetween(m_tree.growthAccessor());
+  wanted.addBetween([&] { return m_tree.growthAccessor(); });
   Growth growth(data(), newTiles);
   constexpr int kLow = TraitsT::kMinTileCoord;
   if (wanted.domain() && !m_tree.tileIndex(kLow, kLow, kLow, 0).valid()) {
