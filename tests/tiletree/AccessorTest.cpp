@@ -2,11 +2,14 @@
 #include "support/Print.h"
 #include "support/RandomForest.h"
 #include "support/Shapes.h"
+#include "support/TreeModel.h"
 
+#include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/tiletree/TileHalo.h"
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <limits>
 #include <utility>
 #include <vector>
@@ -216,6 +219,31 @@ TYPED_TEST(Accessor, AddTileOfABoxOutsideGivesTheInvalidTile) {
     EXPECT_EQ(&accessor.addTile(int3{0, 0, 0}, int3{0, 0, extreme}), &tree.invalidTile());
   }
   EXPECT_EQ(tree.tileCount(-1), 0);
+}
+
+// requirement: lists are taken in parts, by several threads; neither they nor the order of the list show
+TYPED_TEST(Accessor, RequirementManyTilesInAnyOrderMakeOneTree) {
+  using T = TypeParam;
+  Support::TilePlaces<T> places(31);
+  typename Container<T>::TileLists ordered;
+  for (VoxelCoord const& at : places.some(30000))
+    ordered[static_cast<std::size_t>(at.depth)].append(at.ijk());
+  auto shuffled = ordered;
+  for (auto& list : shuffled) {
+    auto const twice = list;
+    for (int3 const& p : twice) list.append(p);
+    std::shuffle(list.begin(), list.end(), places.random());
+  }
+  Container<T> first;
+  VLN::withThreads(1, [&] { first.tileAccessor().addTiles(ordered); });
+  EXPECT_TRUE(first.checkConsistency(false));
+  for (int const threads : {1, 2, 8}) {
+    for (auto const* lists : {&ordered, &shuffled}) {
+      Container<T> tree;
+      VLN::withThreads(threads, [&] { tree.tileAccessor().addTiles(*lists); });
+      EXPECT_EQ(Support::treeContents(tree), Support::treeContents(first)) << threads;
+    }
+  }
 }
 
 // boundary

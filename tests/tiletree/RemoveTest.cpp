@@ -3,6 +3,8 @@
 #include "support/Shapes.h"
 #include "support/TreeModel.h"
 
+#include <algorithm>
+
 using namespace Support;
 using namespace VLN::TileTree3D;
 
@@ -285,6 +287,42 @@ TYPED_TEST(Remove, BytesAreEqualAtAnyNumberOfThreads) {
     EXPECT_TRUE(this->tree.checkConsistency(false));
     if (first.empty()) first = treeContents(this->tree);
     EXPECT_EQ(treeContents(this->tree), first) << threads;
+  }
+}
+
+// requirement: tiles without children, listed by rising index, go in parallel; in any other order one by one.
+// Both leave the same tree and tell the same moves
+TYPED_TEST(Remove, RequirementTheOrderOfAListChangesNothing) {
+  Container<TypeParam> source;
+  auto accessor = source.tileAccessor();
+  TilePlaces<TypeParam> places(23);
+  for (VoxelCoord const& at : places.some(6000)) accessor.addTile(at);
+  for (int const part : {2, 3, 40}) {
+    TileIndexLists rising(static_cast<std::size_t>(TypeParam::kDepths));
+    for (int d = 0; d <= TypeParam::kMaxDepth; ++d) {
+      for (std::int64_t n = 0; n < source.tileCount(d); ++n) {
+        auto const& t = std::as_const(source).tile(n, d);
+        if (!t.isRoot() && t.isLeaf() && places.below(part) == 0)
+          rising[static_cast<std::size_t>(d)].push_back(n);
+      }
+    }
+    auto falling = rising;
+    for (auto& list : falling) std::reverse(list.begin(), list.end());
+    for (bool const compacts : {true, false}) {
+      Container<TypeParam> slow = source;
+      slow.setCompactOnRemoval(compacts);
+      TileMoves slowMoves;
+      slow.tileAccessor().removeTiles(falling, true, &slowMoves);
+      EXPECT_EQ(slow.checkConsistency(false), compacts) << "dead tiles stay, and are told";
+      for (int const threads : {1, 2, 8}) {
+        Container<TypeParam> fast = source;
+        fast.setCompactOnRemoval(compacts);
+        TileMoves made;
+        VLN::withThreads(threads, [&] { fast.tileAccessor().removeTiles(rising, threads == 2, &made); });
+        EXPECT_EQ(treeContents(fast), treeContents(slow)) << threads;
+        EXPECT_EQ(made, slowMoves) << threads;
+      }
+    }
   }
 }
 

@@ -4,10 +4,9 @@
 #include "GeometryVolume/channels/ChannelData.h"
 #include "GeometryVolume/channels/ElementOpsTableImpl.h"
 #include "GeometryVolume/channels/ElementTraits.h"
-#include "GeometryVolume/core/detail/SimdLanes.h"
 
 #include <algorithm>
-#include <cstring>
+#include <memory>
 
 namespace VLN::TileTree3D::Internal {
 
@@ -39,57 +38,11 @@ inline T blendEight(Corner const& corner, typename ElementTraits<T>::Blend fi,
   return result;
 }
 
-/// Columns of a box, V a number or lanes of them: `row` blends a parent's row along i, once for each row.
-/// Each blend is that of blendEight.
-template <class V, class Row, class Store>
-inline void blendColumns(ParentBlend const& b, Row const& row, Store const& store) {
-  constexpr std::size_t n = HaloTable::kLargestTileWidth;
-  auto const lerp = [](V x, V y, float t) { return (y - x) * t + x; };
-  int const firstJ = b.j[0].at, rows = b.j[b.count[1] - 1].at + 2 - firstJ;
-  int const firstK = b.k[0].at, planes = b.k[b.count[2] - 1].at + 2 - firstK;
-  auto const* low = static_cast<float const*>(b.parent) + (firstJ + firstK * b.width) * b.width;
-  V blended[n + 1][n];
-  for (int k = 0; k < planes; ++k, low += b.width * b.width) {
-    V line[n + 1];
-    for (int j = 0; j < rows; ++j) line[j] = row(low + j * b.width);
-    for (int j = 0; j < b.count[1]; ++j) {
-      V const* const at = line + (b.j[j].at - firstJ);
-      blended[k][j] = lerp(at[0], at[1], b.j[j].fraction);
-    }
-  }
-  for (int k = 0; k < b.count[2]; ++k) {
-    auto const* const at = blended + (b.k[k].at - firstK);
-    auto* target = static_cast<float*>(b.target) + k * b.width * b.width;
-    for (int j = 0; j < b.count[1]; ++j, target += b.width)
-      store(target, lerp(at[0][j], at[1][j], b.k[k].fraction));
-  }
-}
-
-inline void blendFloats(ParentBlend b) {
-  auto* const target = static_cast<float*>(b.target);
-  for (int i = 0; i < b.count[0];) {
-    HaloAxis const* const axis = b.i + i;
-    b.target = target + i;
-    if (b.count[0] - i < 4) {
-      blendColumns<float>(
-          b, [x = *axis](float const* row) { return (row[x.at + 1] - row[x.at]) * x.fraction + row[x.at]; },
-          [](float* to, float v) { *to = v; });
-      ++i;
-    } else {
-      int const at[4] = {axis[0].at, axis[1].at, axis[2].at, axis[3].at};
-      FloatLanes const t{axis[0].fraction, axis[1].fraction, axis[2].fraction, axis[3].fraction};
-      blendColumns<FloatLanes>(
-          b,
-          [&at, t](float const* row) {
-            FloatLanes const low{row[at[0]], row[at[1]], row[at[2]], row[at[3]]};
-            FloatLanes const high{row[at[0] + 1], row[at[1] + 1], row[at[2] + 1], row[at[3] + 1]};
-            return lerpLanes(low, high, t);
-          },
-          [](float* to, FloatLanes const& v) { std::memcpy(to, &v, sizeof(v)); });
-      i += 4;
-    }
-  }
-}
+/// TypedElementOps::blendParent() of floats.
+void blendFloats(ParentBlend const& b, std::uint64_t regions);
+/// TypedElementOps::blendBox() of floats.
+/// @pre The scale is 1.
+void blendFloats(BoxBlend const& b);
 
 template <class T> struct TypedElementOps {
   using Traits = ElementTraits<T>;
@@ -105,7 +58,7 @@ template <class T> struct TypedElementOps {
   static void elementsOf(void const* tileArrays, int depth, std::int64_t const* indices, int n, int count,
                          void const** found) {
     auto const& tiles = (*static_cast<TileArrays<T> const*>(tileArrays))[static_cast<std::size_t>(depth)];
-    std::size_t const size = tiles.size();
+    std::size_t const size = tiles.size(), bytes = static_cast<std::size_t>(count) * sizeof(T);
     for (int i = 0; i < n; ++i) {
       // The first tile in place of one that is not there.
       auto const index = static_cast<std::size_t>(indices[i]);
@@ -113,31 +66,60 @@ template <class T> struct TypedElementOps {
       found[i] = nullptr;
       if (size == 0) continue;
       auto const& tile = tiles[index & (0 - exists)];
-      std::size_t const holds = exists & std::size_t(tile.size() >= static_cast<std::size_t>(count));
-      found[i] = reinterpret_cast<void const*>(reinterpret_cast<std::uintptr_t>(tile.data()) & (0 - holds));
+      auto const begin = reinterpret_cast<std::uintptr_t>(tile.data());
+      auto const end = reinterpret_cast<std::uintptr_t>(std::to_address(tile.end()));
+      std::size_t const holds = exists & std::size_t(end - begin >= bytes);
+      found[i] = reinterpret_cast<void const*>(begin & (0 - holds));
     }
   }
 
-  static void blendParent(ParentBlend const& b) {
-    if constexpr (std::is_same_v<T, float>) return blendFloats(b);
-    auto* const target = static_cast<T*>(b.target);
-    auto const* const parent = static_cast<T const*>(b.parent);
-    int const w = b.width;
+  static void fetchRecords(void const* tileArrays, int depth, std::int64_t const* indices, int n) {
+    auto const& tiles = (*static_cast<TileArrays<T> const*>(tileArrays))[static_cast<std::size_t>(depth)];
+    for (int i = 0; i < n; ++i) {
+      auto const index = static_cast<std::size_t>(indices[i]);
+      __builtin_prefetch(tiles.data() + (index < tiles.size() ? index : 0));
+    }
+  }
+
+  static void blendParent(ParentBlend const& b, std::uint64_t regions) {
+    if constexpr (std::is_same_v<T, float>) return blendFloats(b, regions);
+    int const w = b.table->targetWidth;
     int const offsets[8] = {0, 1, w, w + 1, w * w, w * w + 1, w * w + w, w * w + w + 1};
-    for (int k = 0; k < b.count[2]; ++k)
-      for (int j = 0; j < b.count[1]; ++j)
-        for (int i = 0; i < b.count[0]; ++i) {
-          T const* const low = parent + b.i[i].at + (b.j[j].at + b.k[k].at * w) * w;
-          target[i + (j + k * w) * w] =
-              blendEight<T>([&](int n) -> T const& { return low[offsets[n]]; }, Blend(b.i[i].fraction),
-                            Blend(b.j[j].fraction), Blend(b.k[k].fraction));
-        }
+    for (; regions; regions &= regions - 1) {
+      HaloRegion const& box = b.table->regionOf(regions);
+      auto* const target = static_cast<T*>(b.target) + box.target;
+      HaloAxis const *const ai = b.i + box.low[0], *const aj = b.j + box.low[1], *const ak = b.k + box.low[2];
+      for (int k = 0; k < box.count[2]; ++k)
+        for (int j = 0; j < box.count[1]; ++j)
+          for (int i = 0; i < box.count[0]; ++i) {
+            T const* const low = static_cast<T const*>(b.parent) + ai[i].at + (aj[j].at + ak[k].at * w) * w;
+            target[i + (j + k * w) * w] =
+                blendEight<T>([&](int n) -> T const& { return low[offsets[n]]; }, Blend(ai[i].fraction),
+                              Blend(aj[j].fraction), Blend(ak[k].fraction));
+          }
+    }
   }
 
   static void blendCorners(CornerBlend const& b, void* out) {
     *static_cast<T*>(out) =
         blendEight<T>([&](int n) -> T const& { return *static_cast<T const*>(b.corners[n]); },
                       Blend(b.fraction[0]), Blend(b.fraction[1]), Blend(b.fraction[2]));
+  }
+
+  static void blendBox(BoxBlend const& b) {
+    if constexpr (std::is_same_v<T, float>)
+      if (b.scale == 1.0f) return blendFloats(b);
+    int const rows = b.sampleCount[0], planes = rows * b.sampleCount[1], w = b.targetWidth;
+    int const offsets[8] = {0, 1, rows, rows + 1, planes, planes + 1, planes + rows, planes + rows + 1};
+    for (int k = 0; k < b.count[2]; ++k)
+      for (int j = 0; j < b.count[1]; ++j)
+        for (int i = 0; i < b.count[0]; ++i) {
+          void const* const* const low = b.samples + b.at[0][i] + b.at[1][j] * rows + b.at[2][k] * planes;
+          T& out = static_cast<T*>(b.target)[i + (j + k * w) * w];
+          out = blendEight<T>([&](int n) -> T const& { return *static_cast<T const*>(low[offsets[n]]); },
+                              Blend(b.fraction[0][i]), Blend(b.fraction[1][j]), Blend(b.fraction[2][k]));
+          if (b.scale != 1.0f) scale(&out, b.scale);
+        }
   }
 
   static void scale(void* element, float factor) {
@@ -159,9 +141,12 @@ template <class T> struct TypedElementOps {
     static_assert(std::find(kHaloElementSizes.begin(), kHaloElementSizes.end(), sizeof(T)) !=
                       kHaloElementSizes.end(),
                   "elements of a new size: add it to kHaloElementSizes");
-    static ElementOps const ops{
-        sizeof(T), &haloKernels(sizeof(T)), elements, elementsOf, blendParent, blendCorners, scale, broadcast,
-        distance};
+    static ElementOps const ops{sizeof(T),    &haloKernels(sizeof(T)),
+                                elements,     elementsOf,
+                                fetchRecords, blendParent,
+                                blendCorners, blendBox,
+                                scale,        broadcast,
+                                distance};
     return ops;
   }
 };

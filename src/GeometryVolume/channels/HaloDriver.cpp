@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <bit>
+#include <utility>
 
 namespace VLN::TileTree3D::Internal {
 
@@ -25,29 +26,184 @@ template <class TraitsT> int HaloDriver<TraitsT>::slotInParentBlock(TileType con
   if (d == 0) return blockSlot({0, 0, 0});
   auto const slot = [d](int c) {
     std::uint32_t const u = TraitsT::offset(c);
+    if constexpr (TraitsT::kTW == 2) return static_cast<int>(TraitsT::quotient(u, d) & 1);
     return static_cast<int>(TraitsT::quotient(u, d) - TraitsT::kTW * TraitsT::quotient(u, d - 1));
   };
   return blockSlot({slot(tile.ti()), slot(tile.tj()), slot(tile.tk())});
 }
 
 template <class TraitsT> void HaloDriver<TraitsT>::setTile(TileType const& tile) {
-  m_parentCache = tile.isRoot() ? nullptr : &cacheOf(tile.parentTreeIndex());
+  if constexpr (Block::kOfParent)
+    m_parentCache = tile.isRoot() ? nullptr : &blockOf(tile).cache;
+  else
+    m_parentCache = tile.isRoot() ? nullptr : &cacheOf(tile.parentTreeIndex());
   m_blockSlot = slotInParentBlock(tile);
 }
 
-template <class TraitsT>
-void HaloDriver<TraitsT>::findNeighbor(NeighborCache& cache, NeighborDirection step) {
+template <class TraitsT> void HaloDriver<TraitsT>::findPlaces(NeighborCache& cache, std::uint32_t steps) {
   auto const& tile = m_accessor.tile(cache.tile);
-  TreeIndex found = cache.tile;
-  if (step != kNeighborSelf) {
-    int const n = slotInParentBlock(tile) + blockSlot(neighborOffset(step)) - blockSlot({0, 0, 0});
-    found =
-        tile.isRoot() ? searchNeighbor(tile, step) : childAt(cacheOf(tile.parentTreeIndex()), n, tile, step);
+  NeighborCache* const parent = tile.isRoot() ? nullptr : &cacheOf(tile.parentTreeIndex());
+  int const own = slotInParentBlock(tile), depth = cache.tile.depth;
+  TileType const* const first = &m_accessor.container()->tile(0, depth);
+  cache.known |= steps, cache.open |= steps;
+  for (; steps; steps &= steps - 1) {
+    auto const step = static_cast<NeighborDirection>(std::countr_zero(steps));
+    OwnerTile& found = cache.around[static_cast<std::size_t>(step)];
+    found.children = nullptr;
+    if (step == kNeighborSelf) {
+      found.index = cache.tile.index, found.depth = depth;
+      continue;
+    }
+    int const slot = own + kBlockSteps<TraitsT::kTW>[static_cast<std::size_t>(step)];
+    NeighborSlot const& in = neighborSlot(slot);
+    std::int64_t const child = parent ? ownerOf(*parent, in).children[in.slot] : -1;
+    if (child >= 0) {
+      found.index = child, found.depth = depth;
+      __builtin_prefetch(first + child);
+    } else {
+      TreeIndex const there = parent ? childAt(*parent, slot, tile, step) : searchNeighbor(tile, step);
+      found.index = there.index, found.depth = there.depth;
+    }
   }
-  auto const* children = found.depth == tile.depth() ? m_accessor.tile(found).children() : nullptr;
-  cache.around[static_cast<std::size_t>(step)] = {
-      found.index, children ? children : kNoChildren<TraitsT::kTileSize>.data(), found.depth};
-  cache.known |= 1u << step;
+}
+
+template <class TraitsT> void HaloDriver<TraitsT>::findChildren(NeighborCache& cache) {
+  TileType const* const first = &m_accessor.container()->tile(0, cache.tile.depth);
+  for (std::uint32_t steps = std::exchange(cache.open, 0); steps; steps &= steps - 1) {
+    OwnerTile& owner = cache.around[static_cast<std::size_t>(std::countr_zero(steps))];
+    if (owner.depth == cache.tile.depth) owner.children = first[owner.index].children();
+    if (!owner.children) {
+      owner.children = kNoChildren<TraitsT::kTileSize>.data();
+      continue;
+    }
+    __builtin_prefetch(owner.children);
+    __builtin_prefetch(owner.children + TraitsT::kTileSize - 1);
+  }
+}
+
+namespace {
+
+// What is read in place of a tile that is not there: as many bytes as the largest of all tiles has.
+alignas(64) constexpr std::byte kNoElements[std::size_t(HaloTable::kLargestWidth) * HaloTable::kLargestWidth *
+                                            HaloTable::kLargestWidth * kLargestElement]{};
+
+} // namespace
+
+template <class TraitsT> void HaloDriver<TraitsT>::listIndices(ParentBlock& block, BlockIndices& to) const {
+  std::size_t count = 0;
+  for (std::uint32_t owners = block.wanted & ~block.filled; owners; owners &= owners - 1) {
+    auto const d = static_cast<std::size_t>(std::countr_zero(owners));
+    OwnerTile const& owner = block.cache.around[d];
+    if (owner.depth < 0) block.beyond |= 1u << d;
+    if (owner.depth != block.cache.tile.depth) continue;
+    for (NeighborPlace const& at : kNeighborPlaces<TraitsT::kTW>[d]) {
+      if (at.place == NeighborPlace::kEnd) break;
+      to.index[count] = owner.children[at.slot], to.place[count] = at.place;
+      count += to.index[count] >= 0;
+    }
+  }
+  to.count = static_cast<int>(count);
+}
+
+template <class TraitsT>
+void HaloDriver<TraitsT>::completeBlocks(int depth, ParentBlock* blocks, std::size_t count) {
+  std::array<BlockIndices, kBlocks> lists;
+  for (std::size_t b = 0; b < count; ++b)
+    findPlaces(blocks[b].cache, blocks[b].wanted & ~blocks[b].cache.known);
+  for (std::size_t b = 0; b < count; ++b) findChildren(blocks[b].cache);
+  for (std::size_t b = 0; b < count; ++b) {
+    listIndices(blocks[b], lists[b]);
+    m_source.fetchRecords(depth, lists[b].index.data(), lists[b].count);
+  }
+  for (std::size_t b = 0; b < count; ++b) {
+    ParentBlock& block = blocks[b];
+    BlockIndices const& list = lists[b];
+    std::array<void const*, Block::kSize> found;
+    m_source.elements(depth, list.index.data(), list.count, found.data());
+    for (std::size_t n = 0; n < static_cast<std::size_t>(list.count); ++n) {
+      if (!found[n]) continue;
+      block.elements.at[list.place[n]] = found[n];
+      block.elements.present |= std::uint64_t(1) << list.place[n];
+      if (count > 1)
+        for (int line = 0; line < 4; ++line)
+          __builtin_prefetch(static_cast<std::byte const*>(found[n]) + 64 * line);
+    }
+    block.filled |= block.wanted;
+  }
+}
+
+template <class TraitsT> auto HaloDriver<TraitsT>::blockOf(TileType const& tile) -> ParentBlock& {
+  TreeIndex const parent = tile.parentTreeIndex();
+  for (; m_block < m_blockCount; ++m_block)
+    if (m_blocks[m_block].cache.tile == parent) return m_blocks[m_block];
+  m_block = 0, m_blockCount = 1;
+  return startBlock(m_blocks[0], parent);
+}
+
+template <class TraitsT>
+auto HaloDriver<TraitsT>::startBlock(ParentBlock& block, TreeIndex const& parent) -> ParentBlock& {
+  block.cache.tile = parent, block.cache.known = 0;
+  block.wanted = block.filled = block.beyond = 0;
+  block.elements.present = 0;
+  block.elements.at.fill(kNoElements);
+  return block;
+}
+
+template <class TraitsT>
+void HaloDriver<TraitsT>::prepare(TileType const& first, UntypedTiles const& target) {
+  if (!Block::kOfParent || first.isRoot()) return;
+  TreeIndex const parent = first.parentTreeIndex();
+  for (std::size_t b = m_block; b < m_blockCount; ++b)
+    if (m_blocks[b].cache.tile == parent) return;
+  auto const& tree = *m_accessor.container();
+  int const depth = first.depth();
+  std::int64_t const end =
+      std::min(tree.tileCount(depth), first.index() + std::int64_t(kBlocks) * TraitsT::kTileSize);
+  m_block = m_blockCount = 0;
+  for (std::int64_t n = first.index(); n < end; ++n) {
+    TileType const& tile = tree.tile(n, depth);
+    if (!tile.valid() || tile.isRoot()) continue;
+    TreeIndex const at = tile.parentTreeIndex();
+    if (m_blockCount == 0 || m_blocks[m_blockCount - 1].cache.tile != at) {
+      if (m_blockCount == kBlocks) break;
+      startBlock(m_blocks[m_blockCount++], at);
+    }
+    m_blocks[m_blockCount - 1].wanted |= ownersRound(slotInParentBlock(tile));
+  }
+  completeBlocks(depth, m_blocks.data(), m_blockCount);
+  for (std::size_t b = 0; b < m_blockCount; ++b) target.fetch(m_blocks[b].cache.tile);
+}
+
+template <class TraitsT> void HaloDriver<TraitsT>::findAlone(TileType const& tile) {
+  std::array<std::int64_t, 27> indices;
+  std::array<void const*, 27> found;
+  auto const count = static_cast<std::size_t>(m_table.regionCount);
+  for (std::size_t n = 0; n < count; ++n) indices[n] = neighborIndex(tile, m_table.regions[n]);
+  indices[count] = tile.index();
+  m_source.elements(tile.depth(), indices.data(), m_table.regionCount + 1, found.data());
+  m_alone.present = 0;
+  for (std::size_t n = 0; n <= count; ++n) {
+    auto const place = static_cast<std::size_t>(Block::kFirst + (n < count ? m_table.regions[n].around : 0));
+    m_alone.at[place] = found[n] ? found[n] : kNoElements;
+    m_alone.present |= std::uint64_t(found[n] != nullptr) << place;
+  }
+}
+
+template <class TraitsT> auto HaloDriver<TraitsT>::elementsAround(TileType const& tile) -> Around {
+  Elements const* block = &m_alone;
+  int own = Block::kFirst;
+  if constexpr (Block::kOfParent) {
+    if (m_parentCache) {
+      ParentBlock& there = m_blocks[m_block];
+      std::uint32_t const owners = ownersRound(m_blockSlot);
+      if (owners & ~there.filled) there.wanted |= owners, completeBlocks(tile.depth(), &there, 1);
+      if (!(owners & there.beyond) || m_accessor.container()->rootCount(tile.depth()) == 0)
+        block = &there.elements, own = m_blockSlot;
+    }
+  }
+  if (block == &m_alone) findAlone(tile);
+  std::uint64_t const present = block->present >> (own - Block::kFirst);
+  return {block->at.data() + own, m_table.around & ~present, bool(present >> Block::kFirst & 1)};
 }
 
 template <class TraitsT>
@@ -84,16 +240,14 @@ template <class TraitsT> void HaloDriver<TraitsT>::replicate(HaloBox const& box,
 }
 
 template <class TraitsT>
-void HaloDriver<TraitsT>::blend(HaloBox const& box, HaloTarget<TraitsT> const& target,
-                                void const* parent) const {
-  int const slot[3] = {m_blockSlot % kAcross - 1, m_blockSlot / kAcross % kAcross - 1,
-                       m_blockSlot / (kAcross * kAcross) - 1};
-  auto const axis = [&](std::size_t a) {
-    auto const child = static_cast<std::size_t>(slot[a]);
-    return &m_table.parentAxis[child][static_cast<std::size_t>(box.low[a] + m_table.halo)];
+void HaloDriver<TraitsT>::blend(std::uint64_t missing, void* target, void const* parent) const {
+  auto const axis = [&](int slot) {
+    return m_table.parentAxis[static_cast<std::size_t>(slot % kAcross - 1)].data() + m_table.halo;
   };
-  m_source.ops->blendParent({at(target.elements, box.target), at(parent, m_table.targetOrigin),
-                             m_table.targetWidth, axis(0), axis(1), axis(2), box.count});
+  HaloAxis const* const i = axis(m_blockSlot);
+  HaloAxis const* const j = axis(m_blockSlot / kAcross);
+  HaloAxis const* const k = axis(m_blockSlot / (kAcross * kAcross));
+  m_source.ops->blendParent({target, at(parent, m_table.targetOrigin), &m_table, i, j, k}, missing);
 }
 
 template <class TraitsT>
@@ -114,71 +268,72 @@ void HaloDriver<TraitsT>::nearest(HaloBox const& box, TileType const& tile, void
 }
 
 template <class TraitsT>
-void HaloDriver<TraitsT>::sample(HaloBox const& box, TileType const& tile, void* target, float scale,
-                                 HaloSampler<TraitsT>& sampler) const {
+void HaloDriver<TraitsT>::sample(HaloBox const& box, TileType const& tile, TreeIndex const& there,
+                                 void* target, float scale, HaloSampler<TraitsT>& sampler) {
   int const s = tile.voxelDataWidth(), w = m_table.targetWidth;
+  int3 const first{tile.ti() + s * box.low[0], tile.tj() + s * box.low[1], tile.tk() + s * box.low[2]};
+  std::array<int, 3> sides;
+  for (std::size_t a = 0; a < 3; ++a)
+    sides[a] = box.low[a] < 0 ? -1 : box.low[a] >= m_table.tileDataWidth ? 1 : 0;
+  TileType const* const from = solelyCovered(tile, there);
+  if (from && sampler.sampleBox(*from, {first, s, box.count, sides, at(target, box.target), w}, scale))
+    return;
   for (int k = 0; k < box.count[2]; ++k)
     for (int j = 0; j < box.count[1]; ++j)
-      for (int i = 0; i < box.count[0]; ++i) {
-        int3 const p{tile.ti() + s * (box.low[0] + i), tile.tj() + s * (box.low[1] + j),
-                     tile.tk() + s * (box.low[2] + k)};
-        sampler.sample(p, scale, at(target, box.target + i + (j + k * w) * w));
-      }
+      for (int i = 0; i < box.count[0]; ++i)
+        sampler.sample(int3{first.x + s * i, first.y + s * j, first.z + s * k}, scale,
+                       at(target, box.target + i + (j + k * w) * w));
 }
 
 template <class TraitsT>
-std::uint32_t HaloDriver<TraitsT>::findNeighbors(TileType const& tile, std::array<void const*, 26>& found) {
-  std::array<std::int64_t, 26> indices;
-  auto const count = static_cast<std::size_t>(m_table.regionCount);
-  for (std::size_t n = 0; n < count; ++n) indices[n] = neighborIndex(tile, m_table.regions[n]);
-  m_source.elements(tile.depth(), indices.data(), m_table.regionCount, found.data());
-  std::uint32_t missing = 0;
-  for (std::size_t n = 0; n < count; ++n) missing |= std::uint32_t(!found[n]) << n;
-  return missing;
+auto HaloDriver<TraitsT>::solelyCovered(TileType const& tile, TreeIndex const& there) -> TileType const* {
+  if (!there.valid() || there.depth >= tile.depth()) return nullptr;
+  auto const& tree = *m_accessor.container();
+  if (m_deepestRoot == kUnknownDepth)
+    for (m_deepestRoot = TraitsT::kMaxDepth; m_deepestRoot >= 0; --m_deepestRoot)
+      if (tree.rootCount(m_deepestRoot) > 0) break;
+  if (m_deepestRoot > there.depth) return nullptr;
+  TileType const* from = &m_accessor.tile(there);
+  while (from->depth() > m_source.maxDepth) {
+    if (from->isRoot()) return nullptr;
+    from = &m_accessor.tile(from->parentTreeIndex());
+  }
+  return from;
 }
 
-template <class TraitsT>
-void HaloDriver<TraitsT>::copyWholeTile(void* target, void const* own,
-                                        std::array<void const*, 26> const& found) const {
-  TileMove move;
-  move.target = target;
-  move.sourceWidth = m_table.sourceWidth, move.offsets = m_table.offsets.data();
-  move.sources[kNeighborSelf] = own;
-  for (std::size_t n = 0; n < static_cast<std::size_t>(m_table.regionCount); ++n)
-    move.sources[m_table.regions[n].direction] = found[n] ? found[n] : own;
+template <class TraitsT> void HaloDriver<TraitsT>::copyWholeTile(void* target, Around const& around) const {
   auto const& kernels = *m_source.ops->kernels;
-  (TraitsT::kTDW == 4 ? kernels.tile4 : kernels.tile5)[m_table.kind](move);
+  (TraitsT::kTDW == 4 ? kernels.tile4 : kernels.tile5)[m_table.kind](
+      {target, m_table.sourceWidth, m_table.offsets.data(), around.elements});
 }
 
 template <class TraitsT> void HaloDriver<TraitsT>::fill(HaloTarget<TraitsT> const& target, HaloMode mode) {
   TileType const& tile = target.tile;
-  void const* const own = m_source.elements(tile.treeIndex());
-  bool const whole = own && m_table.kind != kHaloTileOther;
-  if (!whole) {
+  auto const fillCore = [&](void const* own) {
     if (own)
       copy(m_table.core, target.elements, own);
     else
       set(m_table.core, target.elements, m_source.defaultValue);
-  }
-  if (m_table.regionCount == 0) return;
+  };
+  if (m_table.regionCount == 0) return fillCore(m_source.elements(tile.treeIndex()));
 
   setTile(tile);
-  std::array<void const*, 26> found;
-  std::uint32_t missing = findNeighbors(tile, found);
-  if (whole) {
-    copyWholeTile(target.elements, own, found);
+  Around const around = elementsAround(tile);
+  if (around.own && m_table.kind != kHaloTileOther) {
+    copyWholeTile(target.elements, around);
   } else {
-    for (std::size_t n = 0; n < static_cast<std::size_t>(m_table.regionCount); ++n)
-      if (found[n]) copy(m_table.regions[n], target.elements, found[n]);
+    fillCore(around.ownElements());
+    for (std::uint64_t there = m_table.around & ~around.missing; there; there &= there - 1) {
+      HaloRegion const& region = regionOf(there);
+      copy(region, target.elements, around.elements[region.around]);
+    }
   }
-  if (!missing) return;
+  if (!around.missing) return;
 
-  void const* const parent = target.parentData();
-  for (; missing; missing &= missing - 1) {
-    HaloRegion const& region = m_table.regions[static_cast<std::size_t>(std::countr_zero(missing))];
-    if (parent)
-      blend(region, target, parent);
-    else if (mode == kHaloModeReplicate)
+  if (void const* const parent = target.parentData()) return blend(around.missing, target.elements, parent);
+  for (std::uint64_t missing = around.missing; missing; missing &= missing - 1) {
+    HaloRegion const& region = regionOf(missing);
+    if (mode == kHaloModeReplicate)
       replicate(region, target.elements);
     else
       set(region, target.elements, m_source.defaultValue);
@@ -194,7 +349,7 @@ void HaloDriver<TraitsT>::fillRegion(HaloRegion const& region, TileType const& t
     return set(region, target, m_source.defaultValue);
   switch (fill.mode) {
   case kHaloModeDeepOnly:
-    if (there.depth > m_source.maxDepth) sample(region, tile, target, fill.scale, sampler);
+    if (there.depth > m_source.maxDepth) sample(region, tile, there, target, fill.scale, sampler);
     return;
   case kHaloModeReplicate:
     return replicate(region, target);
@@ -205,7 +360,7 @@ void HaloDriver<TraitsT>::fillRegion(HaloRegion const& region, TileType const& t
     return set(region, target, m_source.defaultValue);
   }
   case kHaloModeLinearCoarse:
-    return sample(region, tile, target, fill.scale, sampler);
+    return sample(region, tile, there, target, fill.scale, sampler);
   case kHaloModeConstant: {
     alignas(16) std::byte value[kLargestElement];
     m_source.ops->broadcast(fill.constant, value);
@@ -220,28 +375,26 @@ template <class TraitsT>
 void HaloDriver<TraitsT>::fill(TileType const& tile, void* target, HaloFill const& fill,
                                HaloSampler<TraitsT>& sampler) {
   if (!isHaloMode(fill.mode)) return;
+  setTile(tile);
   if (fill.type == kHaloAll && fill.mode != kHaloModeDeepOnly && m_table.kind != kHaloTileOther) {
     // Every region is written, so what has no tile beside may hold other bytes for a moment.
-    if (void const* const own = m_source.elements(tile.treeIndex())) {
-      setTile(tile);
-      std::array<void const*, 26> found;
-      std::uint32_t missing = findNeighbors(tile, found);
-      copyWholeTile(target, own, found);
-      for (; missing; missing &= missing - 1)
-        fillRegion(m_table.regions[static_cast<std::size_t>(std::countr_zero(missing))], tile, target, fill,
-                   sampler);
+    Around const around = elementsAround(tile);
+    if (around.own) {
+      copyWholeTile(target, around);
+      for (std::uint64_t missing = around.missing; missing; missing &= missing - 1)
+        fillRegion(regionOf(missing), tile, target, fill, sampler);
       return;
     }
   }
   if (fill.type & kHaloCore) {
     if (tile.depth() > m_source.maxDepth)
-      sample(m_table.core, tile, target, fill.scale, sampler);
+      sample(m_table.core, tile, tile.isRoot() ? TreeIndex{} : tile.parentTreeIndex(), target, fill.scale,
+             sampler);
     else if (void const* const own = m_source.elements(tile.treeIndex()))
       copy(m_table.core, target, own);
     else
       set(m_table.core, target, m_source.defaultValue);
   }
-  setTile(tile);
   for (int n = 0; n < m_table.regionCount; ++n) {
     HaloRegion const& region = m_table.regions[static_cast<std::size_t>(n)];
     if (!(fill.type & (region.face ? kHaloFaces : kHaloEdges)) || fill.type & haloSkip(region.direction))
@@ -274,6 +427,8 @@ public:
   void beginTile(TileType const& tile) override {
     void* const target = const_cast<void*>(m_pass.target.elements(tile.treeIndex()));
     if (!target) return;
+    m_driver.prepare(tile, m_pass.target);
+    m_pass.target.fetch({tile.index() + kTilesAhead, tile.depth()});
     if (m_fill) return m_driver.fill(tile, target, *m_fill, m_sampler);
     HaloTarget<TraitsT> plain{tile, target};
     if (!tile.isRoot() && tile.depth() > m_pass.firstDepth) {
@@ -284,6 +439,8 @@ public:
   }
 
 private:
+  static constexpr std::int64_t kTilesAhead = 4; // whose elements are fetched
+
   HaloPass const& m_pass;
   HaloFill const* m_fill;
   Container<TraitsT> const& m_tree;

@@ -4,6 +4,8 @@
 
 #include "GeometryVolume/channels/HaloSamplerImpl.h"
 
+#include <bit>
+
 namespace VLN::TileTree3D::Internal {
 
 /// What the form with modes is asked for.
@@ -45,6 +47,10 @@ public:
   /// The core, then each region: from the neighbour of the same depth; else blended from the parent; else,
   /// without a parent, replicated in mode kHaloModeReplicate and the default value in any other.
   void fill(HaloTarget<TraitsT> const& target, HaloMode mode);
+  /// Finds what tiles read that are filled next, in the order of their indices, in the source and in the
+  /// parents' tiles of the target.
+  /// @pre The tree stays as it is until they are filled.
+  void prepare(TileType const& first, UntypedTiles const& target);
   /// What `fill.type` names, as `fill.mode` says.
   void fill(TileType const& tile, void* target, HaloFill const& fill, HaloSampler<TraitsT>& sampler);
 
@@ -57,6 +63,12 @@ private:
     std::int32_t depth;
 
     TreeIndex at() const { return {index, depth}; }
+  };
+  /// Indices of tiles that a block is filled with, and where each goes.
+  struct BlockIndices {
+    std::array<std::int64_t, 64> index;
+    std::array<std::uint8_t, 64> place;
+    int count = 0;
   };
   /// Makes `tile` the one whose neighbours are asked for.
   void setTile(TileType const& tile);
@@ -73,7 +85,8 @@ private:
   /// What lies round one tile, as far as it was asked for.
   struct NeighborCache {
     TreeIndex tile;
-    std::uint32_t known = 0;
+    std::uint32_t known = 0; ///< directions that were looked up
+    std::uint32_t open = 0;  ///< those of them whose child table was not
     std::array<OwnerTile, kNeighborCount> around;
   };
   NeighborCache& cacheOf(TreeIndex const& at) {
@@ -81,11 +94,14 @@ private:
     if (cache.tile != at) cache.tile = at, cache.known = 0;
     return cache;
   }
-  /// Finds the tile beside that of the cache through its parent, and so through all its ancestors if need be.
-  void findNeighbor(NeighborCache& cache, NeighborDirection step);
+  /// Finds tiles beside that of the cache, a bit for each direction, through its parent, and so through all
+  /// its ancestors if need be.
+  void findPlaces(NeighborCache& cache, std::uint32_t steps);
+  /// And their child tables.
+  void findChildren(NeighborCache& cache);
   /// The tile that owns a slot of the block: of the cached tile's children and those round them.
   OwnerTile const& ownerOf(NeighborCache& cache, NeighborSlot const& in) {
-    if (!(cache.known >> in.direction & 1)) findNeighbor(cache, in.direction);
+    if (!(cache.known >> in.direction & 1)) findPlaces(cache, 1u << in.direction), findChildren(cache);
     return cache.around[static_cast<std::size_t>(in.direction)];
   }
   static NeighborSlot const& neighborSlot(int blockSlot) {
@@ -115,12 +131,48 @@ private:
   }
   /// neighborIndex() or neighbor() by a search from the accessor's last tile.
   TreeIndex searchNeighbor(TileType const& tile, NeighborDirection step) const;
-  /// The source's elements of the tiles of the same depth beside, by region; null where there are none.
+  /// The source's elements of tiles of one depth, by place; kNoElements where there are none.
+  using Block = PointerBlock<TraitsT::kTW>;
+  struct Elements {
+    std::array<void const*, Block::kSize> at;
+    std::uint64_t present = 0; ///< a bit for each place that has some
+  };
+  /// A parent, what lies round it, and the block of its children and those round them, as far as was asked
+  /// for.
+  struct ParentBlock {
+    NeighborCache cache;
+    std::uint32_t wanted = 0; ///< owners whose slots are to be filled
+    std::uint32_t filled = 0; ///< owners whose slots are filled
+    std::uint32_t beyond = 0; ///< owners where no tile lies, so that roots may
+    Elements elements;
+  };
+  /// What a tile reads: its own elements' place in a block, and bits of the regions' places without a source.
+  struct Around {
+    void const* const* elements;
+    std::uint64_t missing;
+    bool own; ///< whether the tile itself has elements
+
+    void const* ownElements() const { return own ? *elements : nullptr; }
+  };
   /// @pre setTile(tile).
-  /// @return Bits of the regions without.
-  std::uint32_t findNeighbors(TileType const& tile, std::array<void const*, 26>& found);
-  /// Core and regions in one go. A region without a tile beside takes any bytes of the tile's own.
-  void copyWholeTile(void* target, void const* own, std::array<void const*, 26> const& found) const;
+  Around elementsAround(TileType const& tile);
+  /// Owners of what a child of the tile at this slot of the block reads.
+  std::uint32_t ownersRound(int slot) const {
+    std::uint32_t const owners = kOwnersRound<TraitsT::kTW>[static_cast<std::size_t>(slot)];
+    return m_table.halo == 0 ? owners & kOwnersAhead : owners;
+  }
+  /// The block of a tile's parent: the one before, one that is ready, or a new one.
+  ParentBlock& blockOf(TileType const& tile);
+  static ParentBlock& startBlock(ParentBlock& block, TreeIndex const& parent);
+  /// Fills what is wanted of blocks. Each step is taken for all of them before the next one, so that what the
+  /// next one reads is on its way.
+  void completeBlocks(int depth, ParentBlock* blocks, std::size_t count);
+  void listIndices(ParentBlock& block, BlockIndices& to) const;
+  /// Fills a block for one tile alone, which lies at its first child's place.
+  void findAlone(TileType const& tile);
+  HaloRegion const& regionOf(std::uint64_t places) const { return m_table.regionOf(places); }
+  /// Core and regions in one go. A region without a tile beside takes bytes without meaning.
+  void copyWholeTile(void* target, Around const& around) const;
   /// The tile itself, or its deepest ancestor whose data the source holds.
   TileType const* ancestorWithData(TileType const* tile, void const*& elements) const;
 
@@ -133,11 +185,16 @@ private:
   void copy(HaloBox const& box, void* target, void const* source) const;
   void set(HaloBox const& box, void* target, void const* value) const;
   void replicate(HaloBox const& box, void* target) const;
-  void blend(HaloBox const& box, HaloTarget<TraitsT> const& target, void const* parent) const;
+  /// Regions without a source, from the parent's finished tile.
+  void blend(std::uint64_t missing, void* target, void const* parent) const;
   void nearest(HaloBox const& box, TileType const& tile, void* target, TileType const& coarse,
                void const* source) const;
-  void sample(HaloBox const& box, TileType const& tile, void* target, float scale,
-              HaloSampler<TraitsT>& sampler) const;
+  /// @param there The deepest tile above `tile` where the box lies, if it is known.
+  void sample(HaloBox const& box, TileType const& tile, TreeIndex const& there, void* target, float scale,
+              HaloSampler<TraitsT>& sampler);
+  /// The deepest tile that the source covers at `there` and at all places in it where no tile of the depth of
+  /// `tile` lies; null where that is not known.
+  TileType const* solelyCovered(TileType const& tile, TreeIndex const& there);
   void fillRegion(HaloRegion const& region, TileType const& tile, void* target, HaloFill const& fill,
                   HaloSampler<TraitsT>& sampler);
 
@@ -152,9 +209,18 @@ private:
   static int slotInParentBlock(TileType const& tile);
 
   NeighborCache* m_parentCache = nullptr; ///< of the tile's parent; null for a root
+  static constexpr int kUnknownDepth = -2;
+  int m_deepestRoot = kUnknownDepth;      ///< -1 without roots
   int m_blockSlot = blockSlot({0, 0, 0}); ///< of the tile among the parent's children and those round them
   // One for each depth. The coarser, the more seldom it changes.
   PerDepth<NeighborCache, TraitsT::kDepths> m_caches;
+
+  // Parents in the order of their children: enough to have many reads under way, few enough to stay in the
+  // nearest cache.
+  static constexpr std::size_t kBlocks = Block::kOfParent ? 8 : 1;
+  std::array<ParentBlock, kBlocks> m_blocks;
+  std::size_t m_block = 0, m_blockCount = 0; ///< the last one that was asked for; those in use
+  Elements m_alone;
 };
 
 /// A pass over the tiles of a range of depths, coarse to fine.

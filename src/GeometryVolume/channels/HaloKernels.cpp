@@ -1,4 +1,5 @@
 #include "GeometryVolume/channels/HaloKernelsImpl.h"
+#include "GeometryVolume/channels/HaloRegionsImpl.h"
 
 #include <algorithm>
 #include <cassert>
@@ -75,39 +76,63 @@ template <std::size_t Size> void gatherBox(BoxGather const& m) {
     }
 }
 
-// The rows of one plane and one step along j. Every count is a constant, and all that changes is a local.
-template <std::size_t Size, int W, int Low, int High, int Rows>
-std::byte* copyRows(TileMove const& m, int jk, std::ptrdiff_t plane, std::byte* to) {
-  auto const first = [&](int direction) {
-    auto const d = static_cast<std::size_t>(direction);
-    return static_cast<std::byte const*>(m.sources[d]) + m.offsets[d] * std::ptrdiff_t(Size) + plane;
-  };
-  std::byte const* low = Low ? first(jk) : nullptr;
-  std::byte const* core = first(9 + jk);
-  std::byte const* high = first(18 + jk);
-  std::ptrdiff_t const stride = m.sourceWidth * std::ptrdiff_t(Size);
-  for (int j = 0; j < Rows; ++j, core += stride, high += stride, to += (Low + W + High) * Size) {
-    if constexpr (Low > 0) {
-      std::memcpy(to, low, Low * Size);
-      low += stride;
-    }
-    std::memcpy(to + Low * Size, core, W * Size);
-    std::memcpy(to + (Low + W) * Size, high, High * Size);
+// Where the sources of one step along j and k are read: low, core and high along i. With plain sources, which
+// are nothing but the tree's samples, every offset is a constant.
+template <std::size_t Size, int W, int Low, bool Plain> struct RowSources {
+  using Block = PointerBlock<(W == PowerOfTwoTraits::kTDW ? PowerOfTwoTraits::kTW : OddTraits::kTW)>;
+
+  template <int I, int J, int K> static std::byte const* first(TileMove const& m) {
+    auto const* const elements = static_cast<std::byte const*>(m.around[Block::steps(I, J, K)]);
+    constexpr auto kNearest = [](int step) { return step < 0 ? W - Low : 0; };
+    if constexpr (Plain)
+      return elements + (kNearest(I) + W * (kNearest(J) + W * kNearest(K))) * std::ptrdiff_t(Size);
+    else
+      return elements + m.offsets[neighborDirection(I, J, K)] * std::ptrdiff_t(Size);
+  }
+};
+
+// The rows of one plane and one step along j. Every count is a constant.
+template <std::size_t Size, int W, int Low, int High, bool Plain, int J, int K>
+std::byte* copyRows(TileMove const& m, int k, std::byte* to) {
+  using Sources = RowSources<Size, W, Low, Plain>;
+  constexpr int kRows = J < 0 ? Low : J > 0 ? High : W;
+  std::ptrdiff_t const stride = (Plain ? W : m.sourceWidth) * std::ptrdiff_t(Size);
+  std::ptrdiff_t const plane = k * (Plain ? W : m.sourceWidth) * stride;
+  std::byte const* const low = Low > 0 ? Sources::template first<-1, J, K>(m) + plane : nullptr;
+  std::byte const* const core = Sources::template first<0, J, K>(m) + plane;
+  std::byte const* const high = Sources::template first<1, J, K>(m) + plane;
+#pragma GCC unroll 5
+  for (int j = 0; j < kRows; ++j, to += (Low + W + High) * Size) {
+    if constexpr (Low > 0) std::memcpy(to, low + j * stride, Low * Size);
+    std::memcpy(to + Low * Size, core + j * stride, W * Size);
+    std::memcpy(to + (Low + W) * Size, high + j * stride, High * Size);
   }
   return to;
 }
 
+template <std::size_t Size, int W, int Low, int High, bool Plain, int K>
+std::byte* copyPlanes(TileMove const& m, std::byte* to) {
+  for (int k = 0; k < (K < 0 ? Low : K > 0 ? High : W); ++k) {
+    if constexpr (Low > 0) to = copyRows<Size, W, Low, High, Plain, -1, K>(m, k, to);
+    to = copyRows<Size, W, Low, High, Plain, 0, K>(m, k, to);
+    to = copyRows<Size, W, Low, High, Plain, 1, K>(m, k, to);
+  }
+  return to;
+}
+
+template <std::size_t Size, int W, int Low, int High, bool Plain> void copyPlanesOf(TileMove const& m) {
+  auto* to = static_cast<std::byte*>(m.target);
+  if constexpr (Low > 0) to = copyPlanes<Size, W, Low, High, Plain, -1>(m, to);
+  to = copyPlanes<Size, W, Low, High, Plain, 0>(m, to);
+  copyPlanes<Size, W, Low, High, Plain, 1>(m, to);
+}
+
 // The target is written from its first byte to its last.
 template <std::size_t Size, int W, int Low, int High> void copyTile(TileMove const& m) {
-  auto* to = static_cast<std::byte*>(m.target);
-  std::ptrdiff_t const plane = m.sourceWidth * m.sourceWidth * std::ptrdiff_t(Size);
-  constexpr int kCounts[3] = {Low, W, High};
-  for (int step = Low ? 0 : 1; step < 3; ++step)
-    for (int k = 0; k < kCounts[step]; ++k) {
-      if constexpr (Low > 0) to = copyRows<Size, W, Low, High, Low>(m, step, k * plane, to);
-      to = copyRows<Size, W, Low, High, W>(m, 3 + step, k * plane, to);
-      to = copyRows<Size, W, Low, High, High>(m, 6 + step, k * plane, to);
-    }
+  if (m.sourceWidth == W)
+    copyPlanesOf<Size, W, Low, High, true>(m);
+  else
+    copyPlanesOf<Size, W, Low, High, false>(m);
 }
 
 template <std::size_t Size>

@@ -27,13 +27,13 @@ struct BoxGather {
   std::array<int, 3> count;
 };
 
-/// A whole target tile from the 27 source tiles round it and its own. Directions that the layout lacks are
-/// not read.
+/// A whole target tile from its own source tile and those round it. Directions that the layout lacks are not
+/// read.
 struct TileMove {
   void* target;
   int sourceWidth;
-  int const* offsets;                  ///< by direction: flat index of the first element that is read there
-  std::array<void const*, 27> sources; ///< by direction: elements of the tile
+  int const* offsets;        ///< by direction: flat index of the first element that is read there
+  void const* const* around; ///< the tile's place in a PointerBlock, all of whose pointers can be read
 };
 
 /// Layouts of a target that TileMove has kernels for.

@@ -15,6 +15,7 @@
 
 #include <algorithm>
 #include <array>
+#include <bit>
 
 namespace VLN::TileTree3D::Internal {
 
@@ -32,6 +33,20 @@ struct HaloRegion : HaloBox {
   NeighborDirection direction = kNeighborSelf;
   bool face = false;
   int blockSlot = 0; ///< steps in a block of children with one layer round them, i fastest
+  int around = 0;    ///< steps in a PointerBlock
+};
+
+/// How the elements of tiles are kept together: by place, i fastest, one pointer for each. With two children
+/// along an edge, those of a tile and one layer round them; a block of more would be filled for nothing where
+/// few of the children are there, so that else it is a tile and those round it.
+template <int TileWidth> struct PointerBlock {
+  static constexpr bool kOfParent = TileWidth == 2;
+  static constexpr int kAcross = kOfParent ? TileWidth + 2 : 3;
+  static constexpr int kSize = kAcross * kAcross * kAcross;
+  static constexpr int kFirst = 1 + kAcross * (1 + kAcross); ///< the first child, or the tile
+  static_assert(kSize <= 64, "one bit for each place");
+
+  static constexpr int steps(int i, int j, int k) { return i + kAcross * (j + kAcross * k); }
 };
 
 /// One axis of a read from the parent: the low one of two samples, and the fraction of the high one.
@@ -53,11 +68,21 @@ struct HaloTable {
   HaloBox core;
   std::array<HaloRegion, 26> regions{}; ///< those without a negative step first, beginning with +i, +j, +k
   int regionCount = 0;
+  std::uint64_t around = 0; ///< a bit for each region's place in a PointerBlock, the tile's own at kFirst
+  std::array<std::uint8_t, 64> regionAt{}; ///< which region such a bit stands for
+  /// Regions, as such bits, of a tile of four samples and two children along an edge, by the axes along which
+  /// they are as long as the core, where they are one sample wide along all others. A bit for each axis.
+  std::array<std::uint64_t, 7> aroundByLength{};
   std::array<int, kNeighborCount>
       offsets{}; ///< by direction: where the core's and the regions' source begins
   /// For a tile that is child c of its parent along an axis: where each coordinate lies in the parent, whose
   /// tile has the target's layout. [c][coordinate + halo]
   std::array<std::array<HaloAxis, kLargestWidth>, kLargestTileWidth> parentAxis{};
+
+  /// The region of the lowest bit of some places.
+  HaloRegion const& regionOf(std::uint64_t places) const {
+    return regions[regionAt[static_cast<std::size_t>(std::countr_zero(places))]];
+  }
 };
 
 /// Where coordinate `at` of child `child` lies among the samples of the parent, with samples on low corners.
@@ -72,8 +97,10 @@ constexpr HaloAxis parentAxisAt(int child, int at, int tileDataWidth, int tileWi
   return {low, x - static_cast<float>(low)};
 }
 
-/// @param tileWidth Children along a tile's edge.
-constexpr HaloTable makeHaloTable(ChannelLayout const& source, ChannelLayout const& target, int tileWidth) {
+template <int TileWidth>
+constexpr HaloTable makeHaloTable(ChannelLayout const& source, ChannelLayout const& target) {
+  constexpr int tileWidth = TileWidth; // children along a tile's edge
+  using Block = PointerBlock<TileWidth>;
   HaloTable t;
   int const w = target.tileDataWidth;
   t.tileDataWidth = w;
@@ -103,6 +130,14 @@ constexpr HaloTable makeHaloTable(ChannelLayout const& source, ChannelLayout con
       targetStride *= t.targetWidth, sourceStride *= t.sourceWidth;
     }
     t.offsets[r.direction] = r.source;
+    r.around = Block::steps(step.x, step.y, step.z);
+    auto const place = static_cast<std::size_t>(Block::kFirst + r.around);
+    t.around |= std::uint64_t(1) << place;
+    std::size_t longAxes = TileWidth == 2 && w == 4 ? 0 : 8;
+    for (std::size_t a = 0; a < 3; ++a)
+      longAxes |= r.count[a] == w ? std::size_t(1) << a : r.count[a] == 1 ? 0 : 8;
+    if (longAxes < 8) t.aroundByLength[longAxes] |= std::uint64_t(1) << place;
+    t.regionAt[place] = static_cast<std::uint8_t>(t.regionCount);
     t.regions[static_cast<std::size_t>(t.regionCount++)] = r;
   };
   for (int3 const step : {int3{1, 0, 0}, int3{0, 1, 0}, int3{0, 0, 1}, int3{1, 1, 0}, int3{1, 0, 1},
@@ -129,9 +164,9 @@ constexpr ChannelLayout haloLayout(int tileDataWidth, int extended, int halo) {
 }
 
 template <class TraitsT, int SourceExtended, int SourceHalo, int TargetExtended, int TargetHalo>
-inline constexpr HaloTable kHaloTable = makeHaloTable(haloLayout(TraitsT::kTDW, SourceExtended, SourceHalo),
-                                                      haloLayout(TraitsT::kTDW, TargetExtended, TargetHalo),
-                                                      TraitsT::kTW);
+inline constexpr HaloTable
+    kHaloTable = makeHaloTable<TraitsT::kTW>(haloLayout(TraitsT::kTDW, SourceExtended, SourceHalo),
+                                             haloLayout(TraitsT::kTDW, TargetExtended, TargetHalo));
 
 // Where a slot of the block lies: the parent, or the tile beside it in a direction, and the child's slot
 // there.
@@ -154,6 +189,65 @@ template <int Width> constexpr auto makeNeighborSlots() {
   return table;
 }
 template <int Width> inline constexpr auto kNeighborSlots = makeNeighborSlots<Width>();
+
+/// By direction: steps from slot to slot of the block.
+template <int Width> constexpr auto makeBlockSteps() {
+  constexpr int across = Width + 2;
+  std::array<int, kNeighborCount> table{};
+  for (int d = 0; d < kNeighborCount; ++d) {
+    int3 const step = neighborOffset(d);
+    table[static_cast<std::size_t>(d)] = step.x + across * (step.y + across * step.z);
+  }
+  return table;
+}
+template <int Width> inline constexpr auto kBlockSteps = makeBlockSteps<Width>();
+
+/// By direction of an owner: the slots of the block that it owns, ended by kEnd.
+struct NeighborPlace {
+  static constexpr std::uint8_t kEnd = 0xff;
+
+  std::uint8_t place = kEnd; ///< in the block
+  std::uint8_t slot = 0;     ///< among the owner's children
+};
+template <int Width> constexpr auto makeNeighborPlaces() {
+  std::array<std::array<NeighborPlace, std::size_t(Width) * Width * Width + 1>, kNeighborCount> table{};
+  std::array<std::size_t, kNeighborCount> count{};
+  for (std::size_t n = 0; n < kNeighborSlots<Width>.size(); ++n) {
+    auto const& in = kNeighborSlots<Width>[n];
+    auto const d = static_cast<std::size_t>(in.direction);
+    table[d][count[d]++] = {static_cast<std::uint8_t>(n), in.slot};
+  }
+  return table;
+}
+template <int Width> inline constexpr auto kNeighborPlaces = makeNeighborPlaces<Width>();
+
+/// By slot of a child in the block: the tiles that own the 27 slots round it.
+template <int Width> constexpr auto makeOwnersRound() {
+  constexpr int across = Width + 2;
+  std::array<std::uint32_t, std::size_t(across) * across * across> table{};
+  for (int k = 0; k < Width; ++k)
+    for (int j = 0; j < Width; ++j)
+      for (int i = 0; i < Width; ++i)
+        for (int d = 0; d < kNeighborCount; ++d) {
+          int3 const step = neighborOffset(d);
+          auto const slot = [](int3 const& p) {
+            return static_cast<std::size_t>((p.x + 1) + across * ((p.y + 1) + across * (p.z + 1)));
+          };
+          auto const& in = kNeighborSlots<Width>[slot({i + step.x, j + step.y, k + step.z})];
+          table[slot({i, j, k})] |= 1u << in.direction;
+        }
+  return table;
+}
+template <int Width> inline constexpr auto kOwnersRound = makeOwnersRound<Width>();
+/// The tile itself and those without a negative step: the owners of all that a target without halo reads.
+inline constexpr std::uint32_t kOwnersAhead = [] {
+  std::uint32_t owners = 0;
+  for (int d = 0; d < kNeighborCount; ++d) {
+    int3 const step = neighborOffset(d);
+    if (step.x >= 0 && step.y >= 0 && step.z >= 0) owners |= 1u << d;
+  }
+  return owners;
+}();
 
 template <int N>
 constexpr auto kNoChildren = [] {

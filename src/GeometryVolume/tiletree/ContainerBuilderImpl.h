@@ -86,6 +86,14 @@ private:
                               std::vector<std::int64_t> const& starts);
   /// Hangs roots deeper than `depth` below roots of `depth` that hold them.
   void adoptDeeperRoots(int depth, Growth& growth);
+  /// Whether all listed tiles are alive, not roots, without children, and listed once by rising index: then
+  /// they can go in any order.
+  bool areRisingLeaves(TileIndexLists const& lists) const;
+  /// removeTiles() of such lists, in parallel.
+  void removeLeaves(TileIndexLists& lists, TileMoves* moves);
+  /// Takes tiles without children out of the tree.
+  /// @threads Each tile by one thread; ancestors may be shared.
+  void unlinkLeaves(std::int64_t const* indices, std::int64_t count, int depth);
   /// Adds the tiles of a branch to the counts of their depths, until `budget` of them are counted.
   void countBranch(TreeIndex const& at, Counts& counts, std::int64_t& budget) const;
   /// Takes a tile or its branch out of the tree; returns how many tiles died.

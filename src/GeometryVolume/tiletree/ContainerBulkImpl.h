@@ -19,6 +19,8 @@ namespace Internal {
 
 /// Groups that one task takes.
 inline constexpr std::int64_t kGroupGrain = 128;
+/// Listed tiles that one task takes.
+inline constexpr std::int64_t kPointGrain = 4096;
 
 /// Tiles of one depth with a common parent, which need not exist.
 template <class TraitsT> struct Siblings {
@@ -45,10 +47,12 @@ public:
   explicit WantedTiles(typename Container<TraitsT>::TileLists const& points) {
     for (int3 const& p : points[0]) m_domain = m_domain || TraitsT::inDomain(p);
     for (int d = 1; d <= kMaxDepth; ++d) {
-      for (int3 const& p : points[d]) {
-        if (TraitsT::inDomain(p)) add(p, d);
-      }
-      join(groups(d));
+      auto const* const list = points[d].data();
+      join(d, listed(static_cast<std::int64_t>(points[d].size()), kPointGrain,
+                     [&](std::int64_t begin, std::int64_t end, Groups& to) {
+                       for (std::int64_t n = begin; n < end; ++n)
+                         if (TraitsT::inDomain(list[n])) add(list[n], d, to);
+                     }));
     }
   }
 
@@ -59,21 +63,27 @@ public:
   Groups const& groups(int depth) const { return m_groups[depth]; }
 
   /// Adds the tiles between a wanted one and the next coarser one above, wanted or there.
-  void addBetween(ConstTileAccessorOf<TraitsT> const& accessor) {
+  /// @param makeAccessor One for each thread.
+  template <class MakeAccessor> void addBetween(MakeAccessor const& makeAccessor) {
     for (int d = kMaxDepth; d > 1; --d) {
-      Groups& here = groups(d);
+      Groups const& here = groups(d);
       if (here.empty()) continue;
-      bool added = false;
-      std::vector<CoverageQuery> queries = coverageAbove(d - 1);
-      for (Group const& group : here) {
-        int3 const& p = group.parent;
-        TreeIndex const above = accessor.treeIndex(p.x, p.y, p.z, d - 1, false);
-        if (above.depth == d - 1) continue;
-        if (above.valid() || m_domain ||
-            std::any_of(queries.begin(), queries.end(), [&](CoverageQuery& c) { return c.holds(p); }))
-          add(p, d - 1), added = true;
-      }
-      if (added) join(groups(d - 1));
+      std::vector<CoverageQuery> const above = coverageAbove(d - 1);
+      join(d - 1, listed(static_cast<std::int64_t>(here.size()), kGroupGrain,
+                         [&](std::int64_t begin, std::int64_t end, Groups& to) {
+                           auto const accessor = makeAccessor();
+                           std::vector<CoverageQuery> queries = above;
+                           for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end);
+                                ++n) {
+                             int3 const& p = here[n].parent;
+                             TreeIndex const there = accessor.treeIndex(p.x, p.y, p.z, d - 1, false);
+                             if (there.depth == d - 1) continue;
+                             if (there.valid() || m_domain ||
+                                 std::any_of(queries.begin(), queries.end(),
+                                             [&](CoverageQuery& c) { return c.holds(p); }))
+                               add(p, d - 1, to);
+                           }
+                         }));
     }
   }
 
@@ -87,28 +97,83 @@ private:
     return static_cast<std::size_t>(digit(0) + TraitsT::kTW * (digit(1) + TraitsT::kTW * digit(2)));
   }
 
-  void add(int3 const& p, int depth) {
-    Groups& list = groups(depth);
+  static void add(int3 const& p, int depth, Groups& to) {
     int3 const parent = TraitsT::align(p, depth - 1);
-    if (list.empty() || list.back().parent != parent) list.push_back({{}, parent, {}});
-    list.back().slots.set(slotOf(p, parent, depth));
+    if (to.empty() || to.back().parent != parent) to.push_back({{}, parent, {}});
+    to.back().slots.set(slotOf(p, parent, depth));
   }
-  /// Sorts a list, and makes one group of those with the same parent.
-  static void join(Groups& list) {
-    std::vector<SortRecord> order(list.size());
-    for (std::size_t n = 0; n < list.size(); ++n)
-      list[n].key = order[n] = mortonRecord<TraitsT>(list[n].parent, static_cast<std::int64_t>(n));
-    parallelSort(order.data(), static_cast<std::int64_t>(order.size()));
-    Groups sorted;
-    sorted.reserve(list.size());
-    for (SortRecord const& record : order) {
-      Group const& group = list[static_cast<std::size_t>(record.value)];
-      if (!sorted.empty() && sorted.back().parent == group.parent)
-        sorted.back().slots |= group.slots;
-      else
-        sorted.push_back(group);
-    }
-    list.swap(sorted);
+  /// Groups that chunks of a range make, in the range's order.
+  template <class Make>
+  static std::vector<Groups> listed(std::int64_t count, std::int64_t grain, Make const& make) {
+    std::vector<Groups> parts(static_cast<std::size_t>(chunkCount(0, count, grain)));
+    parallelChunks(0, count, grain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+      make(begin, end, parts[static_cast<std::size_t>(chunk)]);
+    });
+    return parts;
+  }
+  /// Sorts a depth's groups and others, and makes one group of those with the same parent.
+  void join(int depth, std::vector<Groups> parts) {
+    if (std::all_of(parts.begin(), parts.end(), [](Groups const& part) { return part.empty(); })) return;
+    parts.push_back(std::move(groups(depth)));
+    std::vector<std::size_t> starts{0};
+    for (Groups const& part : parts) starts.push_back(starts.back() + part.size());
+    std::vector<SortRecord> order(starts.back());
+    parallelFor(0, static_cast<std::int64_t>(parts.size()), [&](std::int64_t first, std::int64_t last) {
+      for (std::int64_t part = first; part < last; ++part) {
+        std::size_t next = starts[static_cast<std::size_t>(part)];
+        std::int64_t value = part << kPartShift;
+        for (Group& group : parts[static_cast<std::size_t>(part)])
+          group.key = order[next++] = mortonRecord<TraitsT>(group.parent, value++);
+      }
+    });
+    if (!rises(order)) parallelSort(order.data(), static_cast<std::int64_t>(order.size()));
+    groups(depth) = united(parts, order);
+  }
+  /// Where a sorted group lies: its part, and its place there.
+  static constexpr int kPartShift = 32;
+  static Group const& groupOf(std::vector<Groups> const& parts, SortRecord const& record) {
+    return parts[static_cast<std::size_t>(record.value >> kPartShift)]
+                [static_cast<std::size_t>(record.value & ((std::int64_t(1) << kPartShift) - 1))];
+  }
+  static bool sameParent(SortRecord const& a, SortRecord const& b) {
+    return a.high == b.high && a.low == b.low;
+  }
+  static bool rises(std::vector<SortRecord> const& order) {
+    return parallelReduce(
+        1, std::max<std::int64_t>(1, static_cast<std::int64_t>(order.size())), kPointGrain, true,
+        [&](std::int64_t begin, std::int64_t end) {
+          for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+            SortRecord const &a = order[n - 1], &b = order[n];
+            if (a.high != b.high ? a.high > b.high : a.low > b.low) return false;
+          }
+          return true;
+        },
+        [](bool a, bool b) { return a && b; });
+  }
+  /// The groups in their order, those with the same parent as one.
+  static Groups united(std::vector<Groups> const& parts, std::vector<SortRecord> const& order) {
+    auto const isFirst = [&](std::size_t n) { return n == 0 || !sameParent(order[n - 1], order[n]); };
+    auto const count = static_cast<std::int64_t>(order.size());
+    std::vector<std::size_t> starts(static_cast<std::size_t>(chunkCount(0, count, kPointGrain)));
+    parallelChunks(0, count, kPointGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+      std::size_t firsts = 0;
+      for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n)
+        firsts += isFirst(n);
+      starts[static_cast<std::size_t>(chunk)] = firsts;
+    });
+    std::size_t total = 0;
+    for (std::size_t& start : starts) total += std::exchange(start, total);
+    Groups sorted(total);
+    parallelChunks(0, count, kPointGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+      std::size_t next = starts[static_cast<std::size_t>(chunk)];
+      for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+        if (!isFirst(n)) continue;
+        Group& group = sorted[next++] = groupOf(parts, order[n]);
+        for (std::size_t same = n + 1; same < order.size() && !isFirst(same); ++same)
+          group.slots |= groupOf(parts, order[same]).slots;
+      }
+    });
+    return sorted;
   }
 
   /// Whether a depth's wanted tiles hold a point. Remembers the last answer.
@@ -152,7 +217,7 @@ template <class TraitsT>
 void ContainerBuilder<TraitsT>::addTilesInBulk(TileLists const& corners, TileLists* newTiles) {
   m_tree.tilesAdded();
   Internal::WantedTiles<TraitsT> wanted(corners);
-  wanted.addBetween(m_tree.growthAccessor());
+  wanted.addBetween([&] { return m_tree.growthAccessor(); });
   Growth growth(data(), newTiles);
   constexpr int kLow = TraitsT::kMinTileCoord;
   if (wanted.domain() && !m_tree.tileIndex(kLow, kLow, kLow, 0).valid()) {

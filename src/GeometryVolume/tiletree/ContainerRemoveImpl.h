@@ -7,6 +7,7 @@
 #include "GeometryVolume/tiletree/ContainerBuilderImpl.h"
 #include "GeometryVolume/tiletree/Morton.h"
 
+#include <atomic>
 #include <cstdlib>
 #include <utility>
 #include <vector>
@@ -14,6 +15,9 @@
 namespace VLN::TileTree3D {
 
 namespace Internal {
+
+/// Removed tiles that one task takes.
+inline constexpr std::int64_t kRemovalGrain = 1024;
 
 /// Whether two occupied slots lie within one step of each other on each axis.
 template <class TileType> bool hasAdjacentChildren(TileType const& tile) {
@@ -87,8 +91,79 @@ void ContainerBuilder<TraitsT>::reserveMoves(TileIndexLists const& lists, TileMo
   for (std::size_t d = 0; d < lists.size(); ++d) moves[d].reserve(lists[d].capacity());
 }
 
+template <class TraitsT> bool ContainerBuilder<TraitsT>::areRisingLeaves(TileIndexLists const& lists) const {
+  for (int d = 0; d <= kMaxDepth && d < static_cast<int>(lists.size()); ++d) {
+    auto const& list = lists[static_cast<std::size_t>(d)];
+    bool const all = parallelReduce(
+        0, static_cast<std::int64_t>(list.size()), Internal::kRemovalGrain, true,
+        [&](std::int64_t begin, std::int64_t end) {
+          for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+            TreeIndex const at{list[n], d};
+            if (at.index < 0 || at.index >= tileCount(d) || (n > 0 && list[n - 1] >= at.index)) return false;
+            TileType const& t = tile(at);
+            if (!t.valid() || t.isRoot() || !t.isLeaf()) return false;
+          }
+          return true;
+        },
+        [](bool a, bool b) { return a && b; });
+    if (!all) return false;
+  }
+  return true;
+}
+
+template <class TraitsT>
+void ContainerBuilder<TraitsT>::unlinkLeaves(std::int64_t const* indices, std::int64_t count, int depth) {
+  // The ancestors of the tile before, and what their branches have lost meanwhile: neighbours in the list
+  // have most ancestors in common, which are written once for all of them.
+  PerDepth<std::int64_t, TraitsT::kDepths> above, lost;
+  for (int d = 0; d < depth; ++d) above[d] = -1, lost[d] = 0;
+  auto const leave = [&](int d) {
+    std::atomic_ref<std::int64_t> size(editTile({above[d], d}).m_branchSize);
+    size.fetch_sub(lost[d], std::memory_order_relaxed);
+    if (d > 0 && above[d - 1] >= 0) lost[d - 1] += lost[d];
+    above[d] = -1, lost[d] = 0;
+  };
+  for (std::int64_t n = 0; n < count; ++n) {
+    TileType& t = editTile({indices[n], depth});
+    editTile(t.parentTreeIndex()).childIndex(t) = -1;
+    int d = depth - 1;
+    for (std::int64_t at = t.parentIndex(); d >= 0 && at != above[d]; --d) {
+      if (above[d] >= 0) leave(d);
+      above[d] = at;
+      if (at >= 0) at = tile({at, d}).parentIndex();
+    }
+    lost[depth - 1] += t.branchSize();
+    t.invalidate();
+  }
+  for (int d = depth - 1; d >= 0 && above[d] >= 0; --d) leave(d);
+}
+
+template <class TraitsT>
+void ContainerBuilder<TraitsT>::removeLeaves(TileIndexLists& lists, TileMoves* moves) {
+  lists.resize(static_cast<std::size_t>(kMaxDepth) + 1);
+  TileMoves ownMoves;
+  TileMoves& made = moves ? *moves : ownMoves;
+  reserveMoves(lists, made);
+  data().detachTiles();
+  std::int64_t count = 0;
+  for (int d = 1; d <= kMaxDepth; ++d) {
+    auto const& list = lists[static_cast<std::size_t>(d)];
+    auto const n = static_cast<std::int64_t>(list.size());
+    parallelFor(
+        0, n,
+        [&](std::int64_t begin, std::int64_t end) { unlinkLeaves(list.data() + begin, end - begin, d); },
+        {.grain = Internal::kRemovalGrain});
+    count += n;
+  }
+  if (count == 0) return;
+  data().m_tileCountTotal -= count;
+  if (m_tree.compactOnRemoval()) fillHoles(lists, made);
+  m_tree.tilesRemoved(&made);
+}
+
 template <class TraitsT>
 void ContainerBuilder<TraitsT>::removeTiles(TileIndexLists& lists, bool withBranch, TileMoves* moves) {
+  if (areRisingLeaves(lists)) return removeLeaves(lists, moves);
   // All memory that is needed comes first. Branches of listed tiles may hold listed ones: where more would be
   // counted than there are tiles, room is made for all.
   Counts counts{};
@@ -146,7 +221,7 @@ template <class TraitsT> void ContainerBuilder<TraitsT>::fillHoles(TileIndexList
   for (int d = 0; d <= kMaxDepth; ++d) {
     auto& holes = lists[static_cast<std::size_t>(d)];
     if (holes.empty()) continue;
-    std::sort(holes.begin(), holes.end());
+    if (!std::is_sorted(holes.begin(), holes.end())) std::sort(holes.begin(), holes.end());
     holes.erase(std::unique(holes.begin(), holes.end()), holes.end());
     auto const& tiles = data().tiles(d);
     auto& made = moves[static_cast<std::size_t>(d)];
@@ -163,18 +238,25 @@ template <class TraitsT> void ContainerBuilder<TraitsT>::fillHoles(TileIndexList
       filled = hole;
       dropDead();
     }
+    std::atomic<bool> anyRoot{false};
     parallelFor(0, static_cast<std::int64_t>(made.size()), [&](std::int64_t begin, std::int64_t end) {
       for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
         auto const [dst, src] = made[n];
         data().editTiles(d).relocate(dst, src);
         TileType& t = editTile({dst, d});
         t.setIndex(dst);
-        if (!t.isRoot()) editTile(t.parentTreeIndex()).childIndex(t) = dst;
+        if (t.isRoot())
+          anyRoot.store(true, std::memory_order_relaxed);
+        else
+          editTile(t.parentTreeIndex()).childIndex(t) = dst;
         for (auto child = t.begin(); child != t.end(); ++child)
           editTile(child.treeIndex()).setParentIndex(dst);
       }
     });
-    m_tree.resize(last + 1, d);
+    // What lies behind is dead, or was moved: it owns nothing.
+    data().editTiles(d).shrinkRaw(last + 1);
+    data().m_tileCounts[d] = last + 1;
+    if (!anyRoot.load(std::memory_order_relaxed)) continue;
     for (auto const& [dst, src] : made) {
       TileType const& t = tile({dst, d});
       if (t.isRoot()) data().m_roots.find(t.voxelCoord())->second = {dst, d};
