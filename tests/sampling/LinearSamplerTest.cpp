@@ -210,7 +210,7 @@ TYPED_TEST(LinearSamplerTest, ClearedTilesBesideACellAreGaps) {
     auto const accessor = std::as_const(volume.tree).tileAccessor();
     TreeIndex const at = accessor.treeIndex(0, 0, 0, deep, true);
     for (std::int64_t n = 0; n < volume.tree.tileCount(deep); ++n)
-      if (n != at.index) volume.core->tileData(n, deep).clear();
+      if (n != at.index) volume.core->tileDataAccessor().tileData(TreeIndex{n, deep}).clear();
     Sampler<Traits> const sampler(volume.tree, volume.topology, *volume.core);
     for (int c = 0; c < 27; ++c) {
       int3 const cell{c % 3 + D - 3, c / 3 % 3 + D - 3, c / 9 + D - 3};
