@@ -1,5 +1,5 @@
-// libFuzzer target: the bytes of .vdb files, read in the process itself: no child stands between what the walk
-// lets through and OpenVDB's own nodes.
+// libFuzzer target: the bytes of .vdb files, read in the process itself: no child stands between what the
+// walk lets through and OpenVDB's own nodes.
 #include "Interop/VdbCheckedImpl.h"
 #include "support/FuzzCheck.h"
 #include "support/TempFolder.h"
