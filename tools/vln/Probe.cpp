@@ -47,11 +47,11 @@ public:
 // Values with gradients, back through the whole transform.
 class FloatProber final : public Prober {
 public:
-  FloatProber(VdbVolume const& volume, FloatChannel const& channel)
+  FloatProber(VdbVolume const& volume, Container const& tree, Topology const& topology,
+              FloatChannel const& channel)
       : m_volume(volume)
-      , m_tree(volume.object->component<Container>(kVdbContainerName))
-      , m_topology(volume.object->component<Topology>(kVdbTopologyName))
-      , m_sampler(*m_tree, *m_topology, channel) {}
+      , m_tree(tree)
+      , m_sampler(tree, topology, channel) {}
 
   std::unique_ptr<Prober> clone() const override { return std::make_unique<FloatProber>(*this); }
   std::string columns() const override { return "value,gx,gy,gz"; }
@@ -60,15 +60,14 @@ public:
     float const value = m_sampler.sampleGradient(
         {static_cast<float>(index.x), static_cast<float>(index.y), static_cast<float>(index.z)},
         VLN::TileTree3D::kSamplerTileSpace, &g);
-    g *= m_tree->voxelSize(); // by which the sampler divided
+    g *= m_tree.voxelSize(); // by which the sampler divided
     double3 const w = m_volume.indexToWorld.gradientToWorld({g.x, g.y, g.z}, index);
     fmt::format_to(std::back_inserter(text), ",{:.9g},{:.9g},{:.9g},{:.9g}", value, w.x, w.y, w.z);
   }
 
 private:
   VdbVolume const& m_volume;
-  Ostil::Ptr<Container> m_tree;
-  Ostil::Ptr<Topology> m_topology;
+  Container const& m_tree;
   Sampler m_sampler;
 };
 
@@ -99,8 +98,10 @@ private:
 };
 
 std::unique_ptr<Prober> proberOf(VdbVolume const& volume, std::string const& channel) {
-  if (auto const floats = volume.object->component<FloatChannel>(channel))
-    return std::make_unique<FloatProber>(volume, *floats);
+  auto const tree = volume.object->component<Container>(kVdbContainerName);
+  auto const topology = volume.object->component<Topology>(kVdbTopologyName);
+  auto const floats = volume.object->component<FloatChannel>(channel);
+  if (tree && topology && floats) return std::make_unique<FloatProber>(volume, *tree, *topology, *floats);
   auto values = ChannelValues::of(volume, channel);
   if (!values) throw std::runtime_error("channel '" + channel + "' has a type that cannot be printed");
   return std::make_unique<AnyProber>(std::move(values));

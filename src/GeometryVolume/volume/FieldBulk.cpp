@@ -24,8 +24,7 @@ struct Chunk {
 std::size_t shareOf(int3 const& at, std::size_t shares) {
   auto const x = static_cast<std::uint32_t>(at.x) >> 5, y = static_cast<std::uint32_t>(at.y) >> 5,
              z = static_cast<std::uint32_t>(at.z) >> 5;
-  std::uint64_t const mixed = (x + 3 * y + 5 * z) * 0x9e3779b9u;
-  return static_cast<std::size_t>(mixed * shares >> 32);
+  return (x + 3 * y + 5 * z) % shares;
 }
 
 /// Four positions as they lie in memory: x y z x, y z x y, z x y z.
