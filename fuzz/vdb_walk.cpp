@@ -3,7 +3,7 @@
 #include "Interop/VdbCheckedImpl.h"
 #include "support/FuzzCheck.h"
 #include "support/TempFolder.h"
-#include "support/VdbCase.h"
+#include "vdb_mutator.h"
 
 #include <openvdb/openvdb.h>
 
@@ -20,14 +20,4 @@ extern "C" int LLVMFuzzerTestOneInput(std::uint8_t const* data, std::size_t size
     Support::demand(box.empty() == (grid->activeVoxelCount() == 0), "a grid is not whole");
   }
   return 0;
-}
-
-extern "C" std::size_t LLVMFuzzerMutate(std::uint8_t* data, std::size_t size, std::size_t most);
-
-extern "C" std::size_t LLVMFuzzerCustomMutator(std::uint8_t* data, std::size_t size, std::size_t most,
-                                               unsigned seed) {
-  // Now and then without any knowledge of the format.
-  if (seed % 8 == 0) return LLVMFuzzerMutate(data, size, most);
-  Support::VdbCase::mutate(data, size, seed);
-  return size;
 }
