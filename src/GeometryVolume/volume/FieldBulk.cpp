@@ -157,7 +157,8 @@ private:
   }
   /// The block that holds a position, with tiles at `slots`. Null beyond the domain.
   SeenBlock* see(int3 const& p, std::uint32_t slots) {
-    SeenBlock& seen = m_seen[static_cast<std::size_t>((p.x >> 3) + 7 * (p.y >> 3) + 49 * (p.z >> 3)) % 256];
+    auto const block = [](int c) { return static_cast<std::uint32_t>(c) >> 3; };
+    SeenBlock& seen = m_seen[(block(p.x) + 7 * block(p.y) + 49 * block(p.z)) % 256];
     bool const known = inBlock(seen.corner, p) && !(slots & ~seen.known);
     return known || lookUp(p, slots, seen) ? &seen : nullptr;
   }
