@@ -15,7 +15,8 @@ namespace {
 
 /// What a chunk of positions lacks, each tile once.
 struct Chunk {
-  std::vector<BlockTiles> missing;
+  std::vector<BlockTiles> missing; ///< with blocks that are the chunk's own
+  std::size_t first = 0;           ///< among those of its round
   int3 const* outside = nullptr;
 };
 
@@ -77,6 +78,24 @@ std::uint32_t straight(int3 const* p, std::uint32_t count, int axis) {
   return static_cast<std::uint32_t>(next - p);
 }
 
+/// Where a chunk remembers a block. No two blocks of a plane of 32 x 32, across any axis, or of a cube of 8
+/// meet in one place.
+struct MemoPlace {
+  static constexpr std::uint32_t kWidth = 32;
+  std::uint32_t low, high;
+
+  explicit MemoPlace(int3 const& p)
+      : low(column(p.x) + 11 * column(p.z))
+      , high(column(p.y) + 7 * column(p.z)) {}
+  static std::uint32_t column(int c) { return static_cast<std::uint32_t>(c) >> 3; }
+  std::size_t index() const { return low % kWidth + kWidth * (high % kWidth); }
+  /// To the next block along an axis.
+  void advance(int axis) {
+    low += axis == 0 ? 1 : axis == 1 ? 0 : 11;
+    high += axis == 0 ? 0 : axis == 1 ? 1 : 7;
+  }
+};
+
 bool inBlock(int3 const& corner, int3 const& p) {
   return static_cast<std::uint32_t>((p.x ^ corner.x) | (p.y ^ corner.y) | (p.z ^ corner.z)) <
          static_cast<std::uint32_t>(FieldBlock::kWidth);
@@ -108,11 +127,9 @@ public:
       int const axis = n + 1 < count ? axisBetween(p[0], p[1]) : -1;
       n += axis < 0 ? addLoose(p, n, count - n) : addRow(p, n, straight(p, count - n, axis), axis);
     }
-    for (BlockTiles& tiles : m_out.missing) {
-      FieldBlock const& block = *m_made.find(tiles.position.x, tiles.position.y, tiles.position.z);
-      for (std::size_t slot = 0; slot < block.tiles.size(); ++slot)
-        if (block.tiles[slot].loadRelaxed()) tiles.slots |= 1u << slot;
-    }
+    for (BlockTiles& tiles : m_out.missing)
+      for (std::size_t slot = 0; slot < tiles.block->tiles.size(); ++slot)
+        if (tiles.block->tiles[slot].loadRelaxed()) tiles.slots |= 1u << slot;
     return std::move(m_out);
   }
 
@@ -131,13 +148,15 @@ private:
                   static_cast<std::uint8_t>(axis),
                   static_cast<std::uint8_t>(place.slot()),
                   static_cast<std::uint8_t>(place.element())};
+      MemoPlace memo(p[done]);
       do { // whole blocks in a row differ in nothing else
-        SeenBlock* const seen = see(p[done], slots);
+        SeenBlock* const seen = see(p[done], slots, memo);
         if (!seen) return length;
         run.block = seen->block;
         run.begin = begin + done;
         seen->list->push_back(run);
         done += count;
+        memo.advance(axis);
       } while (count == 8 && length - done >= 8);
     }
     return length;
@@ -145,7 +164,7 @@ private:
   /// @return How many positions the run took: up to the next row or block.
   [[gnu::noinline]] std::uint32_t addLoose(int3 const* p, std::uint32_t begin, std::uint32_t most) {
     auto const slotOf = [](int3 const& at) { return 1u << FieldBlock::place(at.x, at.y, at.z).slot(); };
-    SeenBlock* const seen = see(p[0], slotOf(p[0]));
+    SeenBlock* const seen = see(p[0], slotOf(p[0]), MemoPlace(p[0]));
     if (!seen) return 1;
     std::uint32_t count = 1;
     for (most = std::min(most, 255u); count < most && inBlock(seen->corner, p[count]); ++count) {
@@ -156,9 +175,8 @@ private:
     return count;
   }
   /// The block that holds a position, with tiles at `slots`. Null beyond the domain.
-  SeenBlock* see(int3 const& p, std::uint32_t slots) {
-    auto const block = [](int c) { return static_cast<std::uint32_t>(c) >> 3; };
-    SeenBlock& seen = m_seen[(block(p.x) + 7 * block(p.y) + 49 * block(p.z)) % 256];
+  SeenBlock* see(int3 const& p, std::uint32_t slots, MemoPlace const& memo) {
+    SeenBlock& seen = m_seen[memo.index()];
     bool const known = inBlock(seen.corner, p) && !(slots & ~seen.known);
     return known || lookUp(p, slots, seen) ? &seen : nullptr;
   }
@@ -187,14 +205,13 @@ private:
   FieldBlock& list(int3 const& p) {
     FieldBlock* const block = m_made.find(p.x, p.y, p.z);
     if (block != FieldBlocks::noBlock()) return *block;
-    m_out.missing.push_back({p, 0});
-    return m_made.make(p);
+    return *m_out.missing.emplace_back(BlockTiles{p, 0, &m_made.make(p)}).block;
   }
   FieldBlocks const& m_blocks;
   FieldBlocks& m_made;
   std::size_t m_shares;
   std::vector<BulkRun>* m_lists;
-  std::array<SeenBlock, 256> m_seen{};
+  std::array<SeenBlock, MemoPlace::kWidth * MemoPlace::kWidth> m_seen{};
   Chunk m_out;
 };
 
@@ -222,21 +239,24 @@ BulkRuns planBulk(VolumeData& volume, FieldSlot& slot, std::span<int3 const> pos
     };
     forEachChunk([&](std::size_t c) {
       auto const part = positions.subspan(c * out.grain);
-      found[c] = RunFinder(slot.blocks, out.made[c], out.shares, &out.list(c, 0))
+      // The thread's own until they are full: lists of neighbours share lines of the cache.
+      std::vector<std::vector<BulkRun>> lists(out.shares);
+      found[c] = RunFinder(slot.blocks, out.made[c], out.shares, lists.data())
                      .find(part.first(std::min(part.size(), out.grain)));
+      std::move(lists.begin(), lists.end(), &out.list(c, 0));
     });
     missing.clear();
     for (std::size_t c = first; c < last; ++c) {
       if (found[c].outside) throwOutside(*found[c].outside);
+      found[c].first = missing.size();
       missing.insert(missing.end(), found[c].missing.begin(), found[c].missing.end());
     }
     if (missing.empty()) continue;
     slot.makePending(volume, missing);
     forEachChunk([&](std::size_t c) {
-      for (BlockTiles const& tiles : found[c].missing) {
-        int3 const& p = tiles.position;
-        FieldBlock const& from = *slot.blocks.find(p.x, p.y, p.z);
-        FieldBlock& to = *out.made[c].find(p.x, p.y, p.z);
+      for (std::size_t t = 0; t < found[c].missing.size(); ++t) {
+        FieldBlock const& from = *missing[found[c].first + t].block;
+        FieldBlock& to = *found[c].missing[t].block;
         for (std::size_t n = 0; n < to.tiles.size(); ++n)
           to.tiles[n].storeRelaxed(from.tiles[n].loadAcquire());
       }

@@ -9,13 +9,13 @@
 #include "GeometryVolume/sampling/VoxelSamplerLinear.h"
 #include "GeometryVolume/topology/Command.h"
 #include "GeometryVolume/volume/FieldBulkImpl.h"
+#include "GeometryVolume/volume/FieldPendingImpl.h"
 #include "GeometryVolume/volume/Volume.h"
 
 #include <algorithm>
 #include <array>
 #include <bit>
 #include <cstring>
-#include <deque>
 #include <stdexcept>
 #include <utility>
 
@@ -25,6 +25,8 @@ namespace Internal {
 
 inline constexpr int kFinest = VolumeShape::kMaxDepth;
 inline constexpr std::size_t kTileElements = 64;
+/// Blocks whose missing tiles a thread makes at a time.
+inline constexpr std::int64_t kGroup = 64;
 
 template <class T> struct TypedSlot final : FieldSlot {
   using ChannelType = Channel<VolumeShape, T, 4, 0>;
@@ -82,44 +84,44 @@ template <class T> struct TypedSlot final : FieldSlot {
 
   bool hasPending() const override { return !m_pending.empty(); }
   void listPending(Ostil::Array<int3>& corners) const override {
-    for (PendingTile const& tile : m_pending) corners.append(tile.corner);
+    for (std::size_t n = 0; n < m_pending.groupCount(); ++n)
+      for (PendingTile<T> const& tile : m_pending.group(n)) corners.append(tile.corner);
   }
 
-  void makePending(VolumeData& volume, std::span<BlockTiles const> tiles) override {
-    std::size_t const first = m_pending.size();
-    VLN::Internal::Rollback added([&] {
-      for (; m_pending.size() > first; m_pending.pop_back()) m_pending.back().entry->storeRelaxed(nullptr);
+  void makePending(VolumeData& volume, std::span<BlockTiles> tiles) override {
+    std::size_t entered = 0;
+    VLN::Internal::Rollback entries([&] {
+      for (BlockTiles const& made : tiles.first(entered))
+        for (std::uint32_t left = made.slots; left; left &= left - 1)
+          made.block->tiles[static_cast<std::size_t>(std::countr_zero(left))].storeRelaxed(nullptr);
     });
     if (tiles.size() > 1) blocks.reserve(tiles.size());
-    for (BlockTiles const& wanted : tiles) {
-      FieldBlock& block = blocks.make(wanted.position);
+    for (BlockTiles& wanted : tiles) {
+      wanted.block = &blocks.make(wanted.position);
       for (std::uint32_t left = wanted.slots; left; left &= left - 1) {
-        auto const slot = static_cast<std::size_t>(std::countr_zero(left));
-        auto& entry = block.tiles[slot];
-        if (entry.loadRelaxed()) continue;
-        PendingTile& made = m_pending.emplace_back();
-        made.corner = FieldBlock::tileCorner(wanted.position, slot);
-        made.entry = &entry;
-        entry.storeRelaxed(this); // so that it is listed once
+        auto& entry = wanted.block->tiles[static_cast<std::size_t>(std::countr_zero(left))];
+        if (entry.loadRelaxed())
+          wanted.slots &= ~(left & -left);
+        else
+          entry.storeRelaxed(this); // so that it is listed once
       }
+      ++entered;
     }
-    VolumeTree const& tree = *volume.tree;
-    auto const body = [&](VolumeTree::ConstTileAccessor const& accessor, std::int64_t begin,
-                          std::int64_t end) {
-      bool const grown = tree.tileCount(-1) > 0;
-      for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
-        int3 const& p = m_pending[n].corner;
-        makeElements(tree, m_pending[n],
-                     grown ? accessor.treeIndex(p.x, p.y, p.z, kFinest, false) : TreeIndex());
-      }
-    };
-    auto const begin = static_cast<std::int64_t>(first), end = static_cast<std::int64_t>(m_pending.size());
-    if (end - begin < kFewTiles)
-      body(volume.reader(), begin, end);
+    if (tiles.size() == 1)
+      m_pending.appendOne([&](auto& group) { makeElements(*volume.tree, volume.reader(), tiles, group); });
     else
-      parallelFor(begin, end, [&](std::int64_t b, std::int64_t e) { body(tree.tileAccessor(), b, e); },
-                  {.grain = kFewTiles});
-    added.dismiss();
+      m_pending.append(static_cast<std::size_t>(chunkCount(0, std::ssize(tiles), kGroup)), [&](auto* groups) {
+        parallelChunks(
+            0, std::ssize(tiles), kGroup, [&](std::int64_t n, std::int64_t begin, std::int64_t end) {
+              auto const part =
+                  tiles.subspan(static_cast<std::size_t>(begin), static_cast<std::size_t>(end - begin));
+              std::size_t count = 0;
+              for (BlockTiles const& wanted : part) count += std::size_t(std::popcount(wanted.slots));
+              groups[n].reserve(count);
+              makeElements(*volume.tree, volume.tree->tileAccessor(), part, groups[n]);
+            });
+      });
+    entries.dismiss();
     volume.pending.store(true, std::memory_order_release);
   }
 
@@ -202,38 +204,47 @@ private:
           ConstTileData<T, 4, 0>::index(p[n >> 1 & 1].x, p[n >> 3 & 1].y, p[n >> 5].z))];
   }
 
-  /// Tiles that a write made and the tree lacks, in the order of the writes.
-  struct PendingTile {
-    int3 corner;
-    FieldBlock::Entry* entry; ///< of the table
-    TileVector<T> elements;
-    std::int64_t arrival = -1; ///< place among the tiles that are being adopted
-  };
-  /// @param above The deepest tile of the tree there.
-  void makeElements(VolumeTree const& tree, PendingTile& made, TreeIndex const& above) {
-    made.elements = m_channel->newTile();
-    if (above.depth == kFinest || made.elements.size() < kTileElements)
-      throw std::logic_error("field \"" + name + "\": a tile holds no elements");
-    if (above.valid()) fillFromCoarse(tree, above, made.corner, made.elements);
-    made.entry->storeRelease(made.elements.data());
+  /// Makes elements and enters them.
+  /// @param out Has room for the tiles.
+  void makeElements(VolumeTree const& tree, VolumeTree::ConstTileAccessor const& accessor,
+                    std::span<BlockTiles const> tiles, typename PendingTiles<T>::Group& out) {
+    bool const grown = tree.tileCount(-1) > 0;
+    for (BlockTiles const& block : tiles) {
+      TreeIndex above; // the deepest tile of the tree there
+      bool ofAll = !grown;
+      for (std::uint32_t left = block.slots; left; left &= left - 1) {
+        auto const slot = static_cast<std::size_t>(std::countr_zero(left));
+        PendingTile<T> made{FieldBlock::tileCorner(block.position, slot), m_channel->newTile()};
+        int3 const& p = made.corner;
+        if (!ofAll) above = accessor.treeIndex(p.x, p.y, p.z, kFinest, false);
+        ofAll = ofAll || above.depth < kFinest - 1; // the block is a tile of that depth
+        if (above.depth == kFinest || made.elements.size() < kTileElements)
+          throw std::logic_error("field \"" + name + "\": a tile holds no elements");
+        if (above.valid()) fillFromCoarse(tree, above, p, made.elements);
+        out.push_back(std::move(made));
+        block.block->tiles[slot].storeRelease(out.back().elements.data());
+      }
+    }
   }
   /// Makes the finest tiles of the tree that the channel lacks, pending ones by handing over their elements.
   /// What is thrown leaves all as it was.
   void adoptPending(VolumeTree const& tree) {
     auto const first = static_cast<std::int64_t>(tiles()[static_cast<std::size_t>(kFinest)].size());
     std::vector<TileVector<T>> arriving(static_cast<std::size_t>(tree.tileCount(kFinest) - first));
-    parallelFor(0, static_cast<std::int64_t>(m_pending.size()),
+    parallelFor(0, static_cast<std::int64_t>(m_pending.groupCount()),
                 [&](std::int64_t begin, std::int64_t end) {
                   auto const accessor = tree.tileAccessor();
-                  for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
-                    int3 const& p = m_pending[n].corner;
-                    m_pending[n].arrival = accessor.treeIndex(p.x, p.y, p.z, kFinest, true).index - first;
-                  }
+                  for (auto n = begin; n < end; ++n)
+                    for (PendingTile<T>& tile : m_pending.group(static_cast<std::size_t>(n))) {
+                      int3 const& p = tile.corner;
+                      tile.arrival = accessor.treeIndex(p.x, p.y, p.z, kFinest, true).index - first;
+                    }
                 },
-                {.grain = 1024});
+                {.grain = 4});
     auto const swapAll = [&] {
-      for (PendingTile& tile : m_pending)
-        arriving[static_cast<std::size_t>(tile.arrival)].swap(tile.elements);
+      for (std::size_t n = 0; n < m_pending.groupCount(); ++n)
+        for (PendingTile<T>& tile : m_pending.group(n))
+          arriving[static_cast<std::size_t>(tile.arrival)].swap(tile.elements);
     };
     swapAll();
     VLN::Internal::Rollback swapped(swapAll);
@@ -275,7 +286,7 @@ private:
   TileArrays<T>* m_tiles = nullptr; ///< of the channel, while it is exclusive
   DepthCounts m_filled{};           ///< tiles that hold what they should
   std::int64_t m_entered = 0;       ///< finest tiles in the table
-  std::deque<PendingTile> m_pending;
+  PendingTiles<T> m_pending;
 };
 
 } // namespace Internal
@@ -332,7 +343,7 @@ template <class T> T* Field<T>::make(int i, int j, int k) {
   if (!m_block->tile(i, j, k)) {
     int3 const p{i, j, k};
     if (!Internal::VolumeShape::inDomain(p)) Internal::throwOutside(p);
-    Internal::BlockTiles const tile{p, 1u << Internal::FieldBlock::place(i, j, k).slot()};
+    Internal::BlockTiles tile{p, 1u << Internal::FieldBlock::place(i, j, k).slot()};
     Internal::typed<T>(*m_slot).makePending(*m_volume, {&tile, 1});
     findBlock(i, j, k);
   }

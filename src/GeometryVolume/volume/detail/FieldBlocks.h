@@ -49,6 +49,7 @@ struct alignas(64) FieldBlock {
 struct BlockTiles {
   int3 position;
   std::uint32_t slots;
+  FieldBlock* block = nullptr; ///< of the table that they are looked for in
 };
 
 /// @threads As a container of the standard library.

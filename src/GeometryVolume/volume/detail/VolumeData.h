@@ -49,10 +49,11 @@ struct VLN_API FieldSlot {
   virtual bool hasPending() const = 0;
   /// Makes elements for tiles that neither the tree nor another write has made yet, with the values that are
   /// read there. In parallel.
-  /// @param tiles In the domain; some may come more than once, or have elements.
+  /// @param tiles In the domain; some may come more than once, or have elements. Gets the blocks, and which
+  /// tiles were made.
   /// @pre The slot is in step and exclusive.
   /// @error What is thrown leaves all as it was.
-  virtual void makePending(VolumeData& volume, std::span<BlockTiles const> tiles) = 0;
+  virtual void makePending(VolumeData& volume, std::span<BlockTiles> tiles) = 0;
   /// Appends the corners of tiles that have elements, but are not in the tree yet.
   virtual void listPending(Ostil::Array<int3>& corners) const = 0;
   /// Makes the channel and its elements the volume's alone.
