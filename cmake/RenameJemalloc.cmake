@@ -1,5 +1,5 @@
 # Makes one object file out of jemalloc's static library, whose every symbol bears the prefix
-# vljei_ and whose only global symbols are the six that vljemalloc.cpp calls. Linked into the
+# vljei_ and whose only global symbols are the seven that vljemalloc.cpp calls. Linked into the
 # library it cannot meet malloc, free or operator new of the process, nor another jemalloc.
 #
 # In: ARCHIVE, OUTPUT, AR, LD, NM, OBJCOPY.
@@ -34,7 +34,7 @@ file(WRITE "${base}.map" "${map}")
 run("${OBJCOPY}" "--redefine-syms=${base}.map" "${base}_all.o" "${base}_renamed.tmp")
 
 set(keep)
-foreach(function aligned_alloc mallocx xallocx free mallctl malloc_stats_print)
+foreach(function malloc aligned_alloc mallocx xallocx free mallctl malloc_stats_print)
   list(APPEND keep "--keep-global-symbol=vljei_${function}")
 endforeach()
 run("${OBJCOPY}" --strip-debug ${keep} "${base}_renamed.tmp" "${OUTPUT}")

@@ -57,6 +57,7 @@ void vlje_malloc_stats_print(void (*write)(void*, const char*), void* opaque, co
 // visibility that any of its inputs asks for.
 #define VLJEI(result, name, ...)                                                                             \
   extern "C" __attribute__((visibility("hidden"))) result vljei_##name(__VA_ARGS__)
+VLJEI(void*, malloc, size_t);
 VLJEI(void*, aligned_alloc, size_t, size_t);
 VLJEI(void*, mallocx, size_t, int);
 VLJEI(size_t, xallocx, void*, size_t, size_t, int);
@@ -66,6 +67,15 @@ VLJEI(void, malloc_stats_print, void (*)(void*, const char*), void*, const char*
 #undef VLJEI
 #define VLJE_CALL(name) vljei_##name
 
+namespace {
+// Blocks lie at multiples of the largest power of two in the size of their class, and the class of a multiple
+// of 64 bytes is one too: the way without an alignment, which is much shorter, gives the same block.
+void* allocate(size_t alignment, size_t size) {
+  if (alignment == 64 && size != 0 && size % 64 == 0) return vljei_malloc(size);
+  return vljei_aligned_alloc(alignment, size);
+}
+} // namespace
+
 #elif VLJE_BACKEND_LINKED
 
 #include <jemalloc/jemalloc.h>
@@ -73,11 +83,11 @@ VLJEI(void, malloc_stats_print, void (*)(void*, const char*), void*, const char*
 // Only names that the C library does not have: with those it has, the load order would decide
 // whose function is called, and a block could be freed into the wrong heap.
 namespace {
-namespace linked {
-void* aligned_alloc(size_t alignment, size_t size) {
+void* allocate(size_t alignment, size_t size) {
   if (alignment == 0 || (alignment & (alignment - 1)) != 0) return nullptr;
   return mallocx(size ? size : 1, MALLOCX_ALIGN(alignment));
 }
+namespace linked {
 void free(void* ptr) {
   if (ptr) dallocx(ptr, 0);
 }
@@ -93,7 +103,7 @@ using ::xallocx;
 #error "the build must choose a back end: VLJE_BACKEND_PREFIXED, VLJE_BACKEND_LINKED or VLJE_BACKEND_SYSTEM"
 #endif
 
-void* vlje_aligned_alloc(size_t alignment, size_t size) { return VLJE_CALL(aligned_alloc)(alignment, size); }
+void* vlje_aligned_alloc(size_t alignment, size_t size) { return allocate(alignment, size); }
 
 void* vlje_mallocx(size_t size, int flags) { return VLJE_CALL(mallocx)(size, flags); }
 

@@ -61,6 +61,32 @@ TEST(Vljemalloc, AlignedAllocGivesWritableAlignedBlocks) {
   }
 }
 
+// requirement: whatever the class of the size
+TEST(Vljemalloc, AlignedAllocOfWholeLines) {
+  std::vector<void*> blocks;
+  for (std::size_t size = 64; size <= 80 * 1024; size += 64)
+    for (int n = 0; n < 3; ++n) {
+      blocks.push_back(vlje_aligned_alloc(64, size));
+      ASSERT_NE(blocks.back(), nullptr) << size;
+      ASSERT_TRUE(isAligned(blocks.back(), 64)) << size;
+      std::memset(blocks.back(), 0x5a, size);
+    }
+  for (std::size_t size = 64 << 10; size <= 64 << 20; size *= 2)
+    for (std::size_t const more : {64, 192, 4096 + 64}) {
+      blocks.push_back(vlje_aligned_alloc(64, size + more));
+      ASSERT_NE(blocks.back(), nullptr) << size;
+      ASSERT_TRUE(isAligned(blocks.back(), 64)) << size;
+    }
+  for (void* block : blocks) vlje_free(block);
+}
+
+// boundary: of no bytes
+TEST(Vljemalloc, AlignedAllocOfNothing) {
+  void* block = vlje_aligned_alloc(64, 0);
+  EXPECT_TRUE(isAligned(block, 64));
+  vlje_free(block);
+}
+
 // boundary
 TEST(Vljemalloc, AlignedAllocSmallestAlignment) {
   void* ptr = vlje_aligned_alloc(1, 3);
