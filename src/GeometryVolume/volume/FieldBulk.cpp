@@ -238,11 +238,13 @@ BulkRuns planBulk(VolumeData& volume, FieldSlot& slot, std::span<int3 const> pos
                   });
     };
     forEachChunk([&](std::size_t c) {
-      auto const part = positions.subspan(c * out.grain);
+      std::size_t const begin = c * out.grain;
+      auto const part = positions.subspan(begin, std::min(positions.size() - begin, out.grain));
       // The thread's own until they are full: lists of neighbours share lines of the cache.
       std::vector<std::vector<BulkRun>> lists(out.shares);
-      found[c] = RunFinder(slot.blocks, out.made[c], out.shares, lists.data())
-                     .find(part.first(std::min(part.size(), out.grain)));
+      // Enough for whole rows.
+      for (auto& list : lists) list.reserve(part.size() / (6 * out.shares));
+      found[c] = RunFinder(slot.blocks, out.made[c], out.shares, lists.data()).find(part);
       std::move(lists.begin(), lists.end(), &out.list(c, 0));
     });
     missing.clear();
