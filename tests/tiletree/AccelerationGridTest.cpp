@@ -214,6 +214,34 @@ TYPED_TEST(AccelerationGrid, FarSearchesMakeTheTableOfPlaces) {
   EXPECT_EQ(data.m_lookup.loadAcquire(), nullptr);
 }
 
+// requirement: reading tile by tile and branch by branch, again and again, makes the table as well
+TYPED_TEST(AccelerationGrid, PassesInOrderMakeTheTableOfPlaces) {
+  using T = TypeParam;
+  Support::RandomForest<T> forest(79);
+  auto adding = forest.tree().tileAccessor();
+  constexpr int kLevels = T::kTW == 2 ? 5 : 2;
+  int const w = T::width(T::kMaxDepth), x = T::align(5000, T::kMaxDepth - kLevels);
+  std::vector<int3> places;
+  for (int n = 0, count = T::width(T::kMaxDepth - kLevels) / w; n < count * count * count; ++n) {
+    int3 p{0, 0, 0};
+    for (int digits = n, scale = w; digits > 0; scale *= T::kTW)
+      for (int a = 0; a < 3; ++a, digits /= T::kTW) p[a] += digits % T::kTW * scale;
+    places.push_back(p + int3{x, x, x});
+  }
+  adding.addTile({x, x, x}, T::kMaxDepth - kLevels - 1);
+  for (int3 const& p : places) adding.addTile(p, T::kMaxDepth);
+  auto const& tree = std::as_const(forest.tree());
+  auto const plain = tree; // a copy of its own, which nobody searches
+  auto const cursor = tree.tileAccessor();
+  int passes = 0;
+  for (; passes < 200 && !Access::data(tree).m_lookup.loadAcquire(); ++passes)
+    for (int3 const& p : places)
+      ASSERT_EQ(cursor.treeIndex(p.x, p.y, p.z, T::kMaxDepth, false),
+                Access::tileIndex(plain, p, T::kMaxDepth));
+  EXPECT_GT(passes, 1);
+  EXPECT_NE(Access::data(tree).m_lookup.loadAcquire(), nullptr);
+}
+
 // requirement: whoever searches meanwhile, on any thread, gets the same answers
 TYPED_TEST(AccelerationGrid, ThreadsSearchWhileTheTableOfPlacesIsMade) {
   using T = TypeParam;

@@ -101,8 +101,8 @@ TreeIndex ConstTileAccessorOf<TraitsT>::find(int i, int j, int k, int depth, boo
     at = descend(at, i, j, k, depth);
     far |= at.depth - start >= kLongSearch;
   }
-  if (far && m_countsSearches && ++m_longSearches == kSearchesTold)
-    m_longSearches = 0, m_container->countLongSearches(kSearchesTold);
+  if (m_countsSearches && (m_searches += far ? kShortInLong : 1) >= kShortInLong * kSearchesTold)
+    m_searches = 0, m_container->countLongSearches(kSearchesTold);
   return exact && at.depth != depth ? TreeIndex{} : at;
 }
 
@@ -152,7 +152,7 @@ template <class TraitsT>
 auto TileAccessorOf<TraitsT>::addTile(int i, int j, int k, int depth) -> TileType const& {
   ContainerT& tree = *m_mutableContainer;
   if (!TraitsT::isDepth(depth) || !TraitsT::inDomain(i, j, k)) return tree.invalidTile();
-  if (depth == this->m_depth && this->holds(i, j, k)) return this->current();
+  if (depth == this->m_depth && this->holds(i, j, k, depth)) return this->current();
   TreeIndex at = this->findNear(i, j, k, depth);
   if (!at.valid()) return this->setCursor(tree.tile(tree.addTile(i, j, k, depth)));
   at = this->descend(at, i, j, k, depth);

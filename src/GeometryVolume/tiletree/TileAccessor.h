@@ -42,20 +42,9 @@ public:
   }
   /// Index of the tile that tile() finds; invalid when there is none.
   /// @cost As tile(), without touching the tile's record.
-  TreeIndex treeIndex(int i, int j, int k, int depth, bool exact) const {
-    if (depth == m_depth && holds(i, j, k)) return {m_index, m_depth};
-    if constexpr (TraitsT::kTW == 2) {
-      auto const* const table = m_container ? m_container->lookupTable() : nullptr;
-      if (table && depth == table->lastDepth) [[likely]] {
-        if (std::int64_t const n = table->indexAtLast(i, j, k); n >= 0) [[likely]] {
-          auto const mask = static_cast<int>(table->widthMask);
-          m_corner.x = i & mask, m_corner.y = j & mask, m_corner.z = k & mask;
-          m_depth = m_pathTop = depth, m_index = m_path[depth] = n;
-          return {n, depth};
-        }
-      }
-    }
-    return find(i, j, k, depth, exact);
+  [[gnu::always_inline]] TreeIndex treeIndex(int i, int j, int k, int depth, bool exact) const {
+    if (depth == m_depth && holds(i, j, k, depth)) return {m_index, depth};
+    return look(i, j, k, depth, exact);
   }
 
   // Access by index; the cursor stays
@@ -105,14 +94,32 @@ protected:
       : m_container(&container)
       , m_countsSearches(countsSearches) {}
 
+  /// The way of a miss of the cursor: out of line, so that a hit is a few instructions where it is asked for.
+  [[gnu::noinline]] TreeIndex look(int i, int j, int k, int depth, bool exact) const {
+    if constexpr (TraitsT::kTW == 2) {
+      auto const* const table = m_container ? m_container->lookupTable() : nullptr;
+      if (table && depth == table->lastDepth) [[likely]] {
+        if (std::int64_t const n = table->indexAtLast(i, j, k); n >= 0) [[likely]] {
+          auto const mask = static_cast<int>(table->widthMask);
+          m_corner.x = i & mask, m_corner.y = j & mask, m_corner.z = k & mask;
+          m_depth = m_pathTop = depth, m_index = m_path[depth] = n;
+          return {n, depth};
+        }
+      }
+    }
+    return find(i, j, k, depth, exact);
+  }
   /// The search behind a miss of the cursor; moves the cursor to the deepest tile that it reaches.
   TreeIndex find(int i, int j, int k, int depth, bool exact) const;
   /// Appends the live tiles of a depth range.
   void tiles(std::vector<TreeIndex>& list, int minDepth, int maxDepth) const;
 
-  bool holds(int i, int j, int k) const {
-    auto const w = static_cast<std::uint32_t>(TraitsT::width(m_depth));
-    return distance(i, m_corner.x) < w && distance(j, m_corner.y) < w && distance(k, m_corner.z) < w;
+  /// @param depth That of the cursor's tile.
+  bool holds(int i, int j, int k, int depth) const {
+    auto const w = static_cast<std::uint32_t>(TraitsT::width(depth));
+    std::uint32_t const x = distance(i, m_corner.x), y = distance(j, m_corner.y), z = distance(k, m_corner.z);
+    if constexpr (TraitsT::kTW == 2) return (x | y | z) < w; // a power of two
+    return x < w && y < w && z < w;
   }
   static std::uint32_t distance(int c, int corner) {
     return static_cast<std::uint32_t>(c) - static_cast<std::uint32_t>(corner);
@@ -139,8 +146,9 @@ protected:
 
   /// Depth of a cursor without a tile. Asked for, it "hits" and gives the invalid index, which is the answer.
   static constexpr std::int32_t kNoDepth = -1;
-  /// Levels of a long search, and how many are counted before the container is told.
-  static constexpr int kLongSearch = 3, kSearchesTold = 64;
+  /// Levels of a long search, how many are counted before the container is told, and how many short ones
+  /// count as one: reading in order, again and again, gains by the table as well.
+  static constexpr int kLongSearch = 3, kSearchesTold = 64, kShortInLong = 8;
 
   ContainerT const* m_container = nullptr;
   mutable int3 m_corner{0, 0, 0};
@@ -148,7 +156,7 @@ protected:
   mutable std::int64_t m_index = -1;
   /// Indices of the cursor's tile and its ancestors, known from depth m_pathTop on.
   mutable std::int32_t m_pathTop = kNoDepth;
-  mutable std::int32_t m_longSearches = 0;
+  mutable std::int32_t m_searches = 0; ///< in short ones
   bool m_countsSearches = true;
   mutable PerDepth<std::int64_t, TraitsT::kDepths> m_path;
 };
