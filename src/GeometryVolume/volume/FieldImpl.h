@@ -26,7 +26,7 @@ namespace Internal {
 inline constexpr int kFinest = VolumeShape::kMaxDepth;
 inline constexpr std::size_t kTileElements = 64;
 /// Blocks whose missing tiles a thread makes at a time.
-inline constexpr std::int64_t kGroup = 64;
+inline constexpr std::int64_t kGroupBlocks = 64;
 
 template <class T> struct TypedSlot final : FieldSlot {
   using ChannelType = Channel<VolumeShape, T, 4, 0>;
@@ -110,17 +110,12 @@ template <class T> struct TypedSlot final : FieldSlot {
     if (tiles.size() == 1)
       m_pending.appendOne([&](auto& group) { makeElements(*volume.tree, volume.reader(), tiles, group); });
     else
-      m_pending.append(static_cast<std::size_t>(chunkCount(0, std::ssize(tiles), kGroup)), [&](auto* groups) {
-        parallelChunks(
-            0, std::ssize(tiles), kGroup, [&](std::int64_t n, std::int64_t begin, std::int64_t end) {
-              auto const part =
-                  tiles.subspan(static_cast<std::size_t>(begin), static_cast<std::size_t>(end - begin));
-              std::size_t count = 0;
-              for (BlockTiles const& wanted : part) count += std::size_t(std::popcount(wanted.slots));
-              groups[n].reserve(count);
-              makeElements(*volume.tree, volume.tree->tileAccessor(), part, groups[n]);
+      m_pending.append(
+          static_cast<std::size_t>(chunkCount(0, std::ssize(tiles), kGroupBlocks)), [&](auto* groups) {
+            parallelChunks(0, std::ssize(tiles), kGroupBlocks, [&](auto n, auto begin, auto end) {
+              makeGroup(*volume.tree, tiles.subspan(std::size_t(begin), std::size_t(end - begin)), groups[n]);
             });
-      });
+          });
     entries.dismiss();
     volume.pending.store(true, std::memory_order_release);
   }
@@ -204,6 +199,13 @@ private:
           ConstTileData<T, 4, 0>::index(p[n >> 1 & 1].x, p[n >> 3 & 1].y, p[n >> 5].z))];
   }
 
+  void makeGroup(VolumeTree const& tree, std::span<BlockTiles const> tiles,
+                 typename PendingTiles<T>::Group& out) {
+    std::size_t count = 0;
+    for (BlockTiles const& block : tiles) count += static_cast<std::size_t>(std::popcount(block.slots));
+    out.reserve(count);
+    makeElements(tree, tree.tileAccessor(), tiles, out);
+  }
   /// Makes elements and enters them.
   /// @param out Has room for the tiles.
   void makeElements(VolumeTree const& tree, VolumeTree::ConstTileAccessor const& accessor,
