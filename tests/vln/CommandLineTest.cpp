@@ -17,7 +17,7 @@ using namespace VLN::Test;
 class CommandLineTest : public testing::Test {
 protected:
   std::string torus(std::string const& voxels = "20000") {
-    std::string const path = m_folder / "torus.vdb";
+    std::string path = m_folder / "torus.vdb";
     EXPECT_EQ(vln({"make", "torus", path, "--voxels", voxels}).code, 0);
     return path;
   }
