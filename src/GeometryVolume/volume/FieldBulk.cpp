@@ -96,6 +96,15 @@ struct MemoPlace {
   }
 };
 
+/// The axis of a row that begins here, or -1. Short rows are not worth finding their ends: those of a thin
+/// band have other lengths each, which no processor foresees.
+int rowAxis(int3 const* p, std::uint32_t count) {
+  constexpr std::uint32_t kShort = 8;
+  if (count < kShort) return -1;
+  int const axis = axisBetween(p[0], p[1]);
+  return axis >= 0 && std::int64_t(p[kShort - 1][axis]) - p[0][axis] == kShort - 1 ? axis : -1;
+}
+
 bool inBlock(int3 const& corner, int3 const& p) {
   return static_cast<std::uint32_t>((p.x ^ corner.x) | (p.y ^ corner.y) | (p.z ^ corner.z)) <
          static_cast<std::uint32_t>(FieldBlock::kWidth);
@@ -124,7 +133,7 @@ public:
     auto const count = static_cast<std::uint32_t>(positions.size());
     for (std::uint32_t n = 0; n < count && !m_out.outside;) {
       int3 const* const p = positions.data() + n;
-      int const axis = n + 1 < count ? axisBetween(p[0], p[1]) : -1;
+      int const axis = rowAxis(p, count - n);
       n += axis < 0 ? addLoose(p, n, count - n) : addRow(p, n, straight(p, count - n, axis), axis);
     }
     for (BlockTiles& tiles : m_out.missing)
@@ -161,14 +170,13 @@ private:
     }
     return length;
   }
-  /// @return How many positions the run took: up to the next row or block.
+  /// @return How many positions the run took: those that follow in the block.
   [[gnu::noinline]] std::uint32_t addLoose(int3 const* p, std::uint32_t begin, std::uint32_t most) {
     auto const slotOf = [](int3 const& at) { return 1u << FieldBlock::place(at.x, at.y, at.z).slot(); };
     SeenBlock* const seen = see(p[0], slotOf(p[0]), MemoPlace(p[0]));
     if (!seen) return 1;
     std::uint32_t count = 1;
     for (most = std::min(most, 255u); count < most && inBlock(seen->corner, p[count]); ++count) {
-      if (count + 1 < most && axisBetween(p[count], p[count + 1]) >= 0) break;
       if (std::uint32_t const slots = slotOf(p[count]); slots & ~seen->known) lookUp(p[count], slots, *seen);
     }
     seen->list->push_back({seen->block, begin, static_cast<std::uint8_t>(count), BulkRun::kLoose, 0, 0});
