@@ -63,6 +63,8 @@ ROWS = [
     ("write one value again, at random", "volume", "BM_FieldSet/1/1", ["BM_VdbSetValue/1/1"]),
     ("write in bulk, new, in order, 2 threads", "volume", "BM_FieldSetBulk/0/0/2/real_time",
      ["BM_VdbSetValue/0/0"]),
+    ("write in bulk, new, a band by leaves, 2 threads", "volume", "BM_FieldSetBulk/2/0/2/real_time",
+     ["BM_VdbSetValue/2/0"]),
     ("flatten float, bunny, 2 threads", "flatten", "bunny_ls_512_half/flatten/ours float/threads:2/real_time",
      ["bunny_ls_512_half/flatten/NanoVDB float/threads:2/real_time"]),
     ("flatten Fp8, bunny, 2 threads", "flatten", "bunny_ls_512_half/flatten/ours Fp8/threads:2/real_time",
