@@ -77,6 +77,11 @@ std::vector<Order> orders() {
   Order lingering{"lingering", {}};
   for (int n = 0; n < 2000; ++n) lingering.positions.push_back({n * 5 % 8, n * 3 % 8, n % 2});
   all.push_back(lingering);
+  // Neighbours in memory that only high bits of their coordinates tell apart.
+  Order apart{"far apart", {}};
+  for (int n = 0; n < 600; ++n)
+    apart.positions.push_back({n % 7 + (n % 3) * (1 << 16), n % 5 + (n % 2) * (1 << 20), (n / 50 % 2) << 24});
+  all.push_back(apart);
   Order ends{"ends of the domain", boxOf({kHigh - 9, kHigh - 2, kLow}, {10, 3, 3}, 0, 1)};
   for (int3 const& p : boxOf({kLow, kLow, kHigh - 20}, {2, 2, 21}, 2, 0)) ends.positions.push_back(p);
   all.push_back(ends);
@@ -153,6 +158,22 @@ TEST(BulkSetTest, RequirementSomeTilesThereAndSomeNot) {
   field.set(box, values);
   for (std::size_t n = 0; n < box.size(); ++n) ASSERT_EQ(field.get(box[n]), values[n]) << n;
   EXPECT_EQ(field.get(-10, -9, -9), 0.0f);
+}
+
+/// Many tiles have been made by the time the position beyond is met.
+TEST(BulkSetTest, NegativeBeyondTheDomainAfterManyTiles) {
+  auto positions = boxOf({-30, -30, -30}, {70, 70, 70}, 2, 0);
+  positions.push_back({kHigh + 1, 0, 0});
+  std::vector<float> const values(positions.size(), 1.0f);
+  for (int const threads : {1, 2, 3}) {
+    Volume volume;
+    auto field = volume.addField<float>("f", 7);
+    field.set(3, 3, 3, 5);
+    VLN::withThreads(threads, [&] { EXPECT_THROW(field.set(positions, values), std::out_of_range); });
+    EXPECT_EQ(field.get(3, 3, 3), 5.0f);
+    field.set(3, 3, 3, 7);
+    for (float const& element : field.channel()) ASSERT_EQ(element, 7.0f) << threads << " threads";
+  }
 }
 
 /// The first position that is beyond names itself, wherever in a row it is, and nothing is written.

@@ -1,7 +1,9 @@
 // Writing many elements: which lie in which block, and which tiles are missing.
 #include "GeometryVolume/core/Parallel.h"
+#include "GeometryVolume/core/RollbackImpl.h"
 #include "GeometryVolume/core/detail/SimdLanes.h"
 #include "GeometryVolume/volume/FieldBulkImpl.h"
+#include "GeometryVolume/volume/PartPlacesImpl.h"
 
 #include <algorithm>
 #include <array>
@@ -15,18 +17,10 @@ namespace {
 
 /// What a chunk of positions lacks, each tile once.
 struct Chunk {
-  std::vector<BlockTiles> missing; ///< with blocks that are the chunk's own
+  std::vector<BlockTiles> missing; ///< in the order of the positions, with blocks that are the chunk's own
   std::size_t first = 0;           ///< among those of its round
   int3 const* outside = nullptr;
 };
-
-/// Which share writes a block. Shares are made of cubes of 32 samples: small enough to balance, and wide
-/// enough that positions in order are read in order.
-std::size_t shareOf(int3 const& at, std::size_t shares) {
-  auto const x = static_cast<std::uint32_t>(at.x) >> 5, y = static_cast<std::uint32_t>(at.y) >> 5,
-             z = static_cast<std::uint32_t>(at.z) >> 5;
-  return (x + 3 * y + 5 * z) % shares;
-}
 
 /// Four positions as they lie in memory: x y z x, y z x y, z x y z.
 struct FourPositions {
@@ -99,7 +93,7 @@ struct MemoPlace {
 /// The axis of a row that begins here, or -1. Short rows are not worth finding their ends: those of a thin
 /// band have other lengths each, which no processor foresees.
 int rowAxis(int3 const* p, std::uint32_t count) {
-  constexpr std::uint32_t kShort = 8;
+  constexpr std::uint32_t kShort = 16;
   if (count < kShort) return -1;
   int const axis = axisBetween(p[0], p[1]);
   return axis >= 0 && std::int64_t(p[kShort - 1][axis]) - p[0][axis] == kShort - 1 ? axis : -1;
@@ -113,28 +107,31 @@ bool inBlock(int3 const& corner, int3 const& p) {
 /// A block that positions were in. Rows of a field come back to the same blocks again and again.
 struct SeenBlock {
   int3 corner{0, 0, 0};
-  std::uint32_t known = 0;              ///< tiles that exist or are listed as missing
-  FieldBlock* block = nullptr;          ///< the field's, or one made for it
-  FieldBlock* listed = nullptr;         ///< entered there are the tiles that are missing
-  std::vector<BulkRun>* list = nullptr; ///< null: no block
+  std::uint16_t share = 0;
+  bool isMade = false;                  ///< whether the block was made for it
+  SlotBytes unknown = SlotBytes::all(); ///< neither there nor listed as missing
+  FieldBlock* block = nullptr;          ///< null: none has been seen
 };
 
 class RunFinder {
 public:
   /// @param made Gets blocks for those that the field lacks.
   /// @param lists One for each share.
-  RunFinder(FieldBlocks const& blocks, FieldBlocks& made, std::size_t shares, std::vector<BulkRun>* lists)
+  RunFinder(FieldBlocks const& blocks, FieldBlocks& made, BulkRuns const& plan, std::vector<BulkRun>* lists)
       : m_blocks(blocks)
       , m_made(made)
-      , m_shares(shares)
+      , m_plan(plan)
       , m_lists(lists) {}
 
-  Chunk find(std::span<int3 const> positions) {
+  /// @param places Gets those of loose positions.
+  Chunk find(std::span<int3 const> positions, BulkPlace* places) {
+    m_positions = positions.data();
     auto const count = static_cast<std::uint32_t>(positions.size());
     for (std::uint32_t n = 0; n < count && !m_out.outside;) {
       int3 const* const p = positions.data() + n;
       int const axis = rowAxis(p, count - n);
-      n += axis < 0 ? addLoose(p, n, count - n) : addRow(p, n, straight(p, count - n, axis), axis);
+      n += axis < 0 ? addLoose(p, n, std::min(count - n, PartPlaces::kMost), places + n)
+                    : addRow(p, n, straight(p, count - n, axis), axis);
     }
     for (BlockTiles& tiles : m_out.missing)
       for (std::size_t slot = 0; slot < tiles.block->tiles.size(); ++slot)
@@ -159,66 +156,77 @@ private:
                   static_cast<std::uint8_t>(place.element())};
       MemoPlace memo(p[done]);
       do { // whole blocks in a row differ in nothing else
-        SeenBlock* const seen = see(p[done], slots, memo);
+        SeenBlock* const seen = see(p[done], SlotBytes{slots}, memo);
         if (!seen) return length;
         run.block = seen->block;
         run.begin = begin + done;
-        seen->list->push_back(run);
+        m_lists[seen->share].push_back(run);
         done += count;
         memo.advance(axis);
       } while (count == 8 && length - done >= 8);
     }
     return length;
   }
-  /// @return How many positions the run took: those that follow in the block.
-  [[gnu::noinline]] std::uint32_t addLoose(int3 const* p, std::uint32_t begin, std::uint32_t most) {
-    auto const slotOf = [](int3 const& at) { return 1u << FieldBlock::place(at.x, at.y, at.z).slot(); };
-    SeenBlock* const seen = see(p[0], slotOf(p[0]), MemoPlace(p[0]));
-    if (!seen) return 1;
-    std::uint32_t count = 1;
-    for (most = std::min(most, 255u); count < most && inBlock(seen->corner, p[count]); ++count) {
-      if (std::uint32_t const slots = slotOf(p[count]); slots & ~seen->known) lookUp(p[count], slots, *seen);
+  /// @return `count`.
+  [[gnu::noinline]] std::uint32_t addLoose(int3 const* p, std::uint32_t begin, std::uint32_t count,
+                                           BulkPlace* places) {
+    m_part.find(p, count, places);
+    std::uint32_t const* const starts = m_part.runStarts();
+    for (std::uint32_t run = 0; starts[run] < count; ++run) {
+      std::uint32_t first = starts[run], length = starts[run + 1] - first;
+      SeenBlock* const seen = see(p[first], m_part.slotsOf(first, length), MemoPlace(p[first]));
+      if (!seen) break;
+      auto& list = m_lists[seen->share];
+      for (; length > 255; first += 255, length -= 255)
+        list.push_back({seen->block, begin + first, 255, BulkRun::kLoose, 0, 0});
+      list.push_back({seen->block, begin + first, static_cast<std::uint8_t>(length), BulkRun::kLoose, 0, 0});
     }
-    seen->list->push_back({seen->block, begin, static_cast<std::uint8_t>(count), BulkRun::kLoose, 0, 0});
     return count;
   }
   /// The block that holds a position, with tiles at `slots`. Null beyond the domain.
-  SeenBlock* see(int3 const& p, std::uint32_t slots, MemoPlace const& memo) {
+  SeenBlock* see(int3 const& p, SlotBytes slots, MemoPlace const& memo) {
     SeenBlock& seen = m_seen[memo.index()];
-    bool const known = inBlock(seen.corner, p) && !(slots & ~seen.known);
+    bool const known = inBlock(seen.corner, p) && !slots.anyOf(seen.unknown);
     return known || lookUp(p, slots, seen) ? &seen : nullptr;
   }
-  [[gnu::noinline]] bool lookUp(int3 const& p, std::uint32_t slots, SeenBlock& seen) {
-    if (!seen.list || !inBlock(seen.corner, p)) {
+  [[gnu::noinline]] bool lookUp(int3 const& p, SlotBytes slots, SeenBlock& seen) {
+    if (!seen.block || !inBlock(seen.corner, p)) {
       if (!VolumeShape::inDomain(p)) {
         m_out.outside = &p;
         return false;
       }
       seen = {{p.x & ~7, p.y & ~7, p.z & ~7},
-              0,
-              m_blocks.find(p.x, p.y, p.z),
-              nullptr,
-              &m_lists[shareOf(p, m_shares)]};
-      if (seen.block == FieldBlocks::noBlock()) seen.block = seen.listed = &list(p);
+              static_cast<std::uint16_t>(m_plan.shareOf(p)),
+              false,
+              SlotBytes::all(),
+              m_blocks.find(p.x, p.y, p.z)};
+      seen.isMade = seen.block == FieldBlocks::noBlock();
+      if (seen.isMade) seen.block = &list(p);
+      std::uint32_t there = 0;
+      for (std::size_t slot = 0; slot < seen.block->tiles.size(); ++slot)
+        there |= std::uint32_t(seen.block->tiles[slot].loadAcquire() != nullptr) << slot;
+      seen.unknown.drop(there);
     }
-    for (std::uint32_t left = slots & ~seen.known; left; left &= left - 1) {
-      auto const slot = static_cast<std::size_t>(std::countr_zero(left));
-      if (seen.block->tiles[slot].loadAcquire()) continue;
-      if (!seen.listed) seen.listed = &list(p);
-      seen.listed->tiles[slot].storeRelaxed(this);
-    }
-    seen.known |= slots;
+    if (!slots.anyOf(seen.unknown)) return true;
+    FieldBlock& listed = seen.isMade ? *seen.block : list(p);
+    std::uint32_t const missing = slots.bits() & seen.unknown.bits();
+    for (std::uint32_t left = missing; left; left &= left - 1)
+      listed.tiles[static_cast<std::size_t>(std::countr_zero(left))].storeRelaxed(this);
+    seen.unknown.drop(missing);
     return true;
   }
   FieldBlock& list(int3 const& p) {
     FieldBlock* const block = m_made.find(p.x, p.y, p.z);
     if (block != FieldBlocks::noBlock()) return *block;
-    return *m_out.missing.emplace_back(BlockTiles{p, 0, &m_made.make(p)}).block;
+    auto const number = static_cast<std::uint32_t>(&p - m_positions);
+    return *m_out.missing.emplace_back(BlockTiles{p, 0, &m_made.make(p), number}).block;
   }
   FieldBlocks const& m_blocks;
   FieldBlocks& m_made;
-  std::size_t m_shares;
+  BulkRuns const& m_plan;
   std::vector<BulkRun>* m_lists;
+  int3 const* m_positions = nullptr;
+  PartPlaces m_part;
   std::array<SeenBlock, MemoPlace::kWidth * MemoPlace::kWidth> m_seen{};
   Chunk m_out;
 };
@@ -233,11 +241,17 @@ BulkRuns planBulk(VolumeData& volume, FieldSlot& slot, std::span<int3 const> pos
   out.shares = static_cast<std::size_t>(parallelThreads());
   out.lists.resize(out.chunks * out.shares);
   out.made.resize(out.chunks);
-  std::vector<Chunk> found(out.chunks);
+  out.tilesMade.resize(out.chunks);
   // Round by round, each as long as all before it: positions at random ask for the same tiles over and over,
   // and those that the first rounds have made are not listed again.
   std::vector<BlockTiles> missing;
-  for (std::size_t first = 0, last = 1; first < out.chunks; first = last, last *= 2) {
+  VLN::Internal::Rollback unwritten([&] {
+    out.writeBackground(slot);
+    for (BlockTiles& tiles : missing) slot.writeBackground(tiles);
+  });
+  out.places.reset(new BulkPlace[positions.size()]);
+  std::vector<Chunk> found(out.chunks);
+  for (std::size_t first = 0, last = out.shares; first < out.chunks; first = last, last *= 2) {
     last = std::min(last, out.chunks);
     auto const forEachChunk = [&](FunctionRef<void(std::size_t)> body) {
       parallelFor(static_cast<std::int64_t>(first), static_cast<std::int64_t>(last),
@@ -250,9 +264,9 @@ BulkRuns planBulk(VolumeData& volume, FieldSlot& slot, std::span<int3 const> pos
       auto const part = positions.subspan(begin, std::min(positions.size() - begin, out.grain));
       // The thread's own until they are full: lists of neighbours share lines of the cache.
       std::vector<std::vector<BulkRun>> lists(out.shares);
-      // Enough for whole rows.
-      for (auto& list : lists) list.reserve(part.size() / (6 * out.shares));
-      found[c] = RunFinder(slot.blocks, out.made[c], out.shares, lists.data()).find(part);
+      // Enough for short rows.
+      for (auto& list : lists) list.reserve(part.size() / (2 * out.shares));
+      found[c] = RunFinder(slot.blocks, out.made[c], out, lists.data()).find(part, &out.places[begin]);
       std::move(lists.begin(), lists.end(), &out.list(c, 0));
     });
     missing.clear();
@@ -262,16 +276,18 @@ BulkRuns planBulk(VolumeData& volume, FieldSlot& slot, std::span<int3 const> pos
       missing.insert(missing.end(), found[c].missing.begin(), found[c].missing.end());
     }
     if (missing.empty()) continue;
-    slot.makePending(volume, missing);
+    slot.makePending(volume, missing, true);
+    for (std::size_t c = first; c < last; ++c) out.tilesMade[c].swap(found[c].missing);
     forEachChunk([&](std::size_t c) {
-      for (std::size_t t = 0; t < found[c].missing.size(); ++t) {
-        FieldBlock const& from = *missing[found[c].first + t].block;
-        FieldBlock& to = *found[c].missing[t].block;
-        for (std::size_t n = 0; n < to.tiles.size(); ++n)
-          to.tiles[n].storeRelaxed(from.tiles[n].loadAcquire());
+      auto made = missing.begin() + static_cast<std::ptrdiff_t>(found[c].first);
+      for (BlockTiles& tiles : out.tilesMade[c]) {
+        FieldBlock& copy = *std::exchange(tiles, *made++).block;
+        for (std::size_t n = 0; n < copy.tiles.size(); ++n)
+          copy.tiles[n].storeRelaxed(tiles.block->tiles[n].loadAcquire());
       }
     });
   }
+  unwritten.dismiss();
   return out;
 }
 

@@ -1,11 +1,13 @@
 // BulkRuns: many positions, grouped so that threads may write their elements without meeting.
 #pragma once
 
+#include "GeometryVolume/volume/PartPlacesImpl.h"
 #include "GeometryVolume/volume/detail/VolumeData.h"
 
 #include <algorithm>
 #include <cstddef>
 #include <cstdint>
+#include <memory>
 #include <span>
 #include <vector>
 
@@ -27,10 +29,27 @@ struct BulkRun {
 /// shares.
 struct BulkRuns {
   std::size_t grain = 0, chunks = 0, shares = 1;
+  std::unique_ptr<BulkPlace[]> places; ///< of loose positions
   std::vector<std::vector<BulkRun>> lists;
   std::vector<FieldBlocks>
       made; ///< for each chunk, copies of blocks that were not there when it was looked at
 
+  /// For each chunk the tiles that were made for it; the first of its runs in one writes their background.
+  /// Before, they are unwritten: memory is written when it is about to be written again.
+  std::vector<std::vector<BlockTiles>> tilesMade;
+
+  /// To all tiles that are still unwritten.
+  void writeBackground(FieldSlot const& slot) {
+    for (auto& chunk : tilesMade)
+      for (BlockTiles& tiles : chunk) slot.writeBackground(tiles);
+  }
+  /// Which share writes a block. Shares are made of cubes of 32 samples: small enough to balance, and wide
+  /// enough that positions in order are read in order.
+  std::size_t shareOf(int3 const& at) const {
+    auto const x = static_cast<std::uint32_t>(at.x) >> 5, y = static_cast<std::uint32_t>(at.y) >> 5,
+               z = static_cast<std::uint32_t>(at.z) >> 5;
+    return (x + 3 * y + 5 * z) % shares;
+  }
   std::vector<BulkRun>& list(std::size_t chunk, std::size_t share) { return lists[chunk * shares + share]; }
   std::vector<BulkRun> const& list(std::size_t chunk, std::size_t share) const {
     return lists[chunk * shares + share];
@@ -66,9 +85,9 @@ template <int kAxis, class T>
   for (std::size_t n = inTile; n < count; ++n) to[(n - inTile) * kStride] = values[n];
 }
 
-/// Writes the elements of a run, whose positions and values these are.
+/// Writes the elements of a run, whose places and values these are.
 template <class T>
-[[gnu::always_inline]] inline void writeRun(BulkRun const& run, int3 const* positions, T const* values) {
+[[gnu::always_inline]] inline void writeRun(BulkRun const& run, BulkPlace const* places, T const* values) {
   switch (run.axis) {
   case 0:
     return writeRow<0>(run, values);
@@ -77,10 +96,10 @@ template <class T>
   case 2:
     return writeRow<2>(run, values);
   default:
-    for (std::size_t n = 0; n < run.count; ++n) {
-      auto const at = FieldBlock::place(positions[n].x, positions[n].y, positions[n].z);
-      static_cast<T*>(run.block->tile(at))[at.element()] = values[n];
-    }
+    auto const& tiles = run.block->tiles;
+    std::size_t const count = run.count;
+    for (std::size_t n = 0; n < count; ++n)
+      static_cast<T*>(tiles[places[n].slot].loadAcquire())[places[n].element] = values[n];
   }
 }
 

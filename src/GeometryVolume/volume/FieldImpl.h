@@ -88,15 +88,20 @@ template <class T> struct TypedSlot final : FieldSlot {
       for (PendingTile<T> const& tile : m_pending.group(n)) corners.append(tile.corner);
   }
 
-  void makePending(VolumeData& volume, std::span<BlockTiles> tiles) override {
+  void makePending(VolumeData& volume, std::span<BlockTiles> tiles, bool later) override {
     std::size_t entered = 0;
     VLN::Internal::Rollback entries([&] {
-      for (BlockTiles const& made : tiles.first(entered))
+      for (BlockTiles& made : tiles.first(entered)) {
         for (std::uint32_t left = made.slots; left; left &= left - 1)
           made.block->tiles[static_cast<std::size_t>(std::countr_zero(left))].storeRelaxed(nullptr);
+        made.unwritten = 0;
+      }
     });
     if (tiles.size() > 1) blocks.reserve(tiles.size());
-    for (BlockTiles& wanted : tiles) {
+    constexpr std::size_t kAhead = 8;
+    for (std::size_t n = 0; n < tiles.size(); ++n) {
+      if (n + kAhead < tiles.size()) blocks.prefetch(tiles[n + kAhead].position);
+      BlockTiles& wanted = tiles[n];
       wanted.block = &blocks.make(wanted.position);
       for (std::uint32_t left = wanted.slots; left; left &= left - 1) {
         auto& entry = wanted.block->tiles[static_cast<std::size_t>(std::countr_zero(left))];
@@ -108,16 +113,26 @@ template <class T> struct TypedSlot final : FieldSlot {
       ++entered;
     }
     if (tiles.size() == 1)
-      m_pending.appendOne([&](auto& group) { makeElements(*volume.tree, volume.reader(), tiles, group); });
+      m_pending.appendOne(
+          [&](auto& group) { makeElements(*volume.tree, volume.reader(), tiles, later, group); });
     else
       m_pending.append(
           static_cast<std::size_t>(chunkCount(0, std::ssize(tiles), kGroupBlocks)), [&](auto* groups) {
             parallelChunks(0, std::ssize(tiles), kGroupBlocks, [&](auto n, auto begin, auto end) {
-              makeGroup(*volume.tree, tiles.subspan(std::size_t(begin), std::size_t(end - begin)), groups[n]);
+              makeGroup(*volume.tree, tiles.subspan(std::size_t(begin), std::size_t(end - begin)), later,
+                        groups[n]);
             });
           });
     entries.dismiss();
     volume.pending.store(true, std::memory_order_release);
+  }
+
+  void writeBackground(BlockTiles& tiles) const override {
+    for (; tiles.unwritten; tiles.unwritten &= tiles.unwritten - 1) {
+      auto const slot = static_cast<std::size_t>(std::countr_zero(tiles.unwritten));
+      std::fill_n(static_cast<T*>(tiles.block->tiles[slot].loadAcquire()), kTileElements,
+                  m_channel->defaultValue());
+    }
   }
 
   void tilesRemoved(VolumeData& volume, TileRemovalList const& moves) override {
@@ -199,32 +214,34 @@ private:
           ConstTileData<T, 4, 0>::index(p[n >> 1 & 1].x, p[n >> 3 & 1].y, p[n >> 5].z))];
   }
 
-  void makeGroup(VolumeTree const& tree, std::span<BlockTiles const> tiles,
+  void makeGroup(VolumeTree const& tree, std::span<BlockTiles> tiles, bool later,
                  typename PendingTiles<T>::Group& out) {
     std::size_t count = 0;
     for (BlockTiles const& block : tiles) count += static_cast<std::size_t>(std::popcount(block.slots));
     out.reserve(count);
-    makeElements(tree, tree.tileAccessor(), tiles, out);
+    makeElements(tree, tree.tileAccessor(), tiles, later, out);
   }
   /// Makes elements and enters them.
   /// @param out Has room for the tiles.
   void makeElements(VolumeTree const& tree, VolumeTree::ConstTileAccessor const& accessor,
-                    std::span<BlockTiles const> tiles, typename PendingTiles<T>::Group& out) {
+                    std::span<BlockTiles> tiles, bool later, typename PendingTiles<T>::Group& out) {
     bool const grown = tree.tileCount(-1) > 0;
-    for (BlockTiles const& block : tiles) {
+    for (BlockTiles& block : tiles) {
       TreeIndex above; // the deepest tile of the tree there
       bool ofAll = !grown;
       for (std::uint32_t left = block.slots; left; left &= left - 1) {
         auto const slot = static_cast<std::size_t>(std::countr_zero(left));
-        PendingTile<T> made{FieldBlock::tileCorner(block.position, slot), m_channel->newTile()};
-        int3 const& p = made.corner;
+        int3 const p = FieldBlock::tileCorner(block.position, slot);
         if (!ofAll) above = accessor.treeIndex(p.x, p.y, p.z, kFinest, false);
         ofAll = ofAll || above.depth < kFinest - 1; // the block is a tile of that depth
+        bool const unwritten = later && !above.valid();
+        PendingTile<T> made{p, unwritten ? m_channel->unwrittenTile() : m_channel->newTile()};
         if (above.depth == kFinest || made.elements.size() < kTileElements)
           throw std::logic_error("field \"" + name + "\": a tile holds no elements");
         if (above.valid()) fillFromCoarse(tree, above, p, made.elements);
         out.push_back(std::move(made));
         block.block->tiles[slot].storeRelease(out.back().elements.data());
+        if (unwritten) block.unwritten |= left & -left;
       }
     }
   }
@@ -346,7 +363,7 @@ template <class T> T* Field<T>::make(int i, int j, int k) {
     int3 const p{i, j, k};
     if (!Internal::VolumeShape::inDomain(p)) Internal::throwOutside(p);
     Internal::BlockTiles tile{p, 1u << Internal::FieldBlock::place(i, j, k).slot()};
-    Internal::typed<T>(*m_slot).makePending(*m_volume, {&tile, 1});
+    Internal::typed<T>(*m_slot).makePending(*m_volume, {&tile, 1}, false);
     findBlock(i, j, k);
   }
   return static_cast<T*>(m_block->tile(i, j, k));
@@ -377,16 +394,24 @@ template <class T> void Field<T>::set(std::span<int3 const> positions, std::span
   if (positions.size() != values.size())
     throw std::invalid_argument("field \"" + m_slot->name + "\": " + std::to_string(positions.size()) +
                                 " positions with " + std::to_string(values.size()) + " values");
-  BulkRuns const plan = planBulk(*m_volume, *m_slot, positions);
+  BulkRuns plan = planBulk(*m_volume, *m_slot, positions);
   m_volume->valuesChanged(*m_slot);
+  auto const& slot = typed<T>(*m_slot);
+  VLN::Internal::Rollback unwritten([&] { plan.writeBackground(slot); });
   parallelFor(0, static_cast<std::int64_t>(plan.shares), [&](std::int64_t begin, std::int64_t end) {
     for (auto share = static_cast<std::size_t>(begin); share < static_cast<std::size_t>(end); ++share)
       for (std::size_t chunk = 0; chunk < plan.chunks; ++chunk) {
         std::size_t const first = chunk * plan.grain;
-        for (BulkRun const& run : plan.list(chunk, share))
-          writeRun(run, positions.data() + first + run.begin, values.data() + first + run.begin);
+        auto made = plan.tilesMade[chunk].begin();
+        auto const madeEnd = plan.tilesMade[chunk].end();
+        for (BulkRun const& run : plan.list(chunk, share)) {
+          for (; made != madeEnd && made->number <= run.begin; ++made)
+            if (plan.shareOf(made->position) == share) slot.writeBackground(*made);
+          writeRun(run, &plan.places[first + run.begin], values.data() + first + run.begin);
+        }
       }
   });
+  unwritten.dismiss();
 }
 
 template <class T> void Field<T>::fill(T const& value) {

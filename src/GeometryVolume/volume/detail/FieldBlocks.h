@@ -50,6 +50,8 @@ struct BlockTiles {
   int3 position;
   std::uint32_t slots;
   FieldBlock* block = nullptr; ///< of the table that they are looked for in
+  std::uint32_t number = 0;    ///< of the position, where it is one of many
+  std::uint32_t unwritten = 0; ///< those of the slots whose elements are as the memory held them
 };
 
 /// @threads As a container of the standard library.
@@ -70,6 +72,10 @@ public:
   /// The tile at a position, to be entered. It stays where it is.
   FieldBlock::Entry& entry(int3 const& position) {
     return make(position).tiles[FieldBlock::place(position.x, position.y, position.z).slot()];
+  }
+  /// Fetches what make() looks at.
+  void prefetch(int3 const& position) const {
+    __builtin_prefetch(&m_slots[hash({position.x >> 3, position.y >> 3, position.z >> 3}) & m_mask]);
   }
   void clear();
   /// Makes room, so that making `blocks` blocks more moves no slots.

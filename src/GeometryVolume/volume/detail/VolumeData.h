@@ -51,9 +51,12 @@ struct VLN_API FieldSlot {
   /// read there. In parallel.
   /// @param tiles In the domain; some may come more than once, or have elements. Gets the blocks, and which
   /// tiles were made.
+  /// @param later Leaves those unwritten that writeBackground() is to write: where no coarser tile is.
   /// @pre The slot is in step and exclusive.
   /// @error What is thrown leaves all as it was.
-  virtual void makePending(VolumeData& volume, std::span<BlockTiles> tiles) = 0;
+  virtual void makePending(VolumeData& volume, std::span<BlockTiles> tiles, bool later) = 0;
+  /// Writes the background to all elements that are unwritten. Any thread may, each to other tiles.
+  virtual void writeBackground(BlockTiles& tiles) const = 0;
   /// Appends the corners of tiles that have elements, but are not in the tree yet.
   virtual void listPending(Ostil::Array<int3>& corners) const = 0;
   /// Makes the channel and its elements the volume's alone.
