@@ -20,6 +20,7 @@
 
 #include <algorithm>
 #include <bit>
+#include <cmath>
 #include <filesystem>
 #include <functional>
 #include <map>
@@ -234,11 +235,18 @@ public:
   using Visitor::beginTile;
   void beginTile(TileType const& tile) override {
     if (!tile.atMaxDepth()) return;
-    // Four sums, so that an addition need not wait for the one before.
-    double sums[4] = {};
+    // First what counts, then the sums: both in lanes. Four sums, so that none waits for the one before.
+    float counted[Values::kSize];
     float const* const values = m_values.tileData(tile.treeIndex()).data()->data();
-    for (int n = 0; n < Values::kSize; ++n)
-      sums[n % 4] += isActive(values[n]) ? static_cast<double>(values[n]) : 0;
+    float const background = m_background;
+    if (background > 0)
+      for (int n = 0; n < Values::kSize; ++n)
+        counted[n] = std::abs(values[n]) < background ? values[n] : 0.0f;
+    else
+      for (int n = 0; n < Values::kSize; ++n) counted[n] = values[n] != background ? values[n] : 0.0f;
+    double sums[4] = {};
+    for (int n = 0; n < Values::kSize; n += 4)
+      for (int lane = 0; lane < 4; ++lane) sums[lane] += static_cast<double>(counted[n + lane]);
     m_sum += (sums[0] + sums[1]) + (sums[2] + sums[3]);
   }
   void join(Visitor const& other) override { m_sum += static_cast<SumVisitor const&>(other).m_sum; }
@@ -246,11 +254,6 @@ public:
   double sum() const { return m_sum; }
 
 private:
-  bool isActive(float v) const {
-    // Without branches: which values are active is hard to foretell.
-    return m_background > 0 ? (v < m_background) & (v > -m_background) : v != m_background;
-  }
-
   Values const& m_values;
   float m_background;
   double m_sum = 0;

@@ -27,6 +27,8 @@ inline constexpr int kFinest = VolumeShape::kMaxDepth;
 inline constexpr std::size_t kTileElements = 64;
 /// Blocks whose missing tiles a thread makes at a time.
 inline constexpr std::int64_t kGroupBlocks = 64;
+/// How many blocks before its turn one is fetched.
+inline constexpr std::size_t kAhead = 8;
 
 template <class T> struct TypedSlot final : FieldSlot {
   using ChannelType = Channel<VolumeShape, T, 4, 0>;
@@ -98,7 +100,6 @@ template <class T> struct TypedSlot final : FieldSlot {
       }
     });
     if (tiles.size() > 1) blocks.reserve(tiles.size());
-    constexpr std::size_t kAhead = 8;
     for (std::size_t n = 0; n < tiles.size(); ++n) {
       if (n + kAhead < tiles.size()) blocks.prefetch(tiles[n + kAhead].position);
       BlockTiles& wanted = tiles[n];
@@ -226,7 +227,10 @@ private:
   void makeElements(VolumeTree const& tree, VolumeTree::ConstTileAccessor const& accessor,
                     std::span<BlockTiles> tiles, bool later, typename PendingTiles<T>::Group& out) {
     bool const grown = tree.tileCount(-1) > 0;
-    for (BlockTiles& block : tiles) {
+    for (std::size_t n = 0; n < tiles.size(); ++n) {
+      if (n + kAhead < tiles.size())
+        __builtin_prefetch(tiles[n + kAhead].block, 1); // another thread's so far
+      BlockTiles& block = tiles[n];
       TreeIndex above; // the deepest tile of the tree there
       bool ofAll = !grown;
       for (std::uint32_t left = block.slots; left; left &= left - 1) {
