@@ -233,7 +233,7 @@ private:
     std::shared_ptr<PackedLeaves> packed;
     if (m_leafMemory == LeafMemory::kPacked) {
       openvdb::Index32 next = 0;
-      forEachInOrder(
+      forEachInOrder<LeadingAxis::kZ>(
           tree, [&](Leaf& leaf) { leaf.setTransientData(next++); }, [](auto const&...) {});
       packed = std::make_shared<PackedLeaves>(leaves.size() * Leaf::SIZE * sizeof(Value));
     }

@@ -25,7 +25,7 @@ public:
     forEachInOrder(
         m_grid->tree(),
         [&](Leaf& leaf) {
-          leaf.setTransientData(static_cast<openvdb::Index32>(m_leaves.size()));
+          if (!m_packed) leaf.setTransientData(static_cast<openvdb::Index32>(m_leaves.size()));
           m_leaves.push_back(&leaf);
         },
         [&](Coord const& c, int width, Value const& value, bool active) {
@@ -67,7 +67,7 @@ public:
         std::int64_t(m_leaves.size()), 256,
         [&](std::int64_t n, Search& search, auto& blocks, auto& blocksBefore) {
           Leaf const& leaf = *m_leaves[static_cast<std::size_t>(n)];
-          auto const& digest = m_digests[static_cast<std::size_t>(n)];
+          auto const& digest = m_digests[leaf.transientData()];
           Places places = placesRound(search, leaf.origin());
           unsigned const active = activeBlocks(leaf);
           for (int b = 0; b < 8; ++b) {
@@ -120,10 +120,12 @@ public:
                                                   VdbTopology const& topology,
                                                   FilledTiles filled) const override {
     Element const background = toElement(m_background);
-    auto channel = makeOn<ChannelT>(name, background, topology);
+    auto channel = makeEmptyOn<ChannelT>(name, background, topology);
+    auto tiles = channel->tileDataAccessor();
     constexpr std::int64_t kPart = 1 << 16, kPiece = 1 << 14;
     // The deepest tiles come last, and read the voxels leaf by leaf.
-    bool const drops = m_packed && tilesFollowLeaves(container);
+    std::vector<Leaf const*> const packed =
+        m_packed && tilesFollowLeaves(container) ? leavesByNumber() : std::vector<Leaf const*>();
     for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth) {
       std::int64_t const count = container.tileCount(depth);
       for (std::int64_t first = 0, told = 0; first < count; first += kPiece) {
@@ -134,11 +136,12 @@ public:
                       LastPlace place;
                       for (std::int64_t n = begin; n < end; ++n)
                         fillTile(search, place, container.tile(n, depth).tijk(), depth,
-                                 &*channel->tileData(n, depth).begin());
+                                 newSamples(*channel, tiles, {n, depth}));
                     },
                     {.grain = 256});
-        if (drops && depth == VdbTraits::kMaxDepth && last < count)
-          m_packed->drop(leavesBefore(container.tile(last, depth).tijk()) * Leaf::SIZE * sizeof(Value));
+        if (!packed.empty() && depth == VdbTraits::kMaxDepth && last < count)
+          m_packed->drop(leavesBefore(packed, container.tile(last, depth).tijk()) * Leaf::SIZE *
+                         sizeof(Value));
         if (last - told < kPart && last < count) continue;
         filled(last - told);
         told = last;
@@ -150,14 +153,15 @@ public:
 
   Ostil::Ptr<StateChannel> makeStateChannel(std::string const& name, VdbContainer const& container,
                                             VdbTopology const& topology) const override {
-    auto channel = makeOn<StateChannel>(name, static_cast<unsigned char>(0), topology);
+    auto channel = makeEmptyOn<StateChannel>(name, static_cast<unsigned char>(0), topology);
+    auto tiles = channel->tileDataAccessor();
     for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth)
       parallelFor(0, container.tileCount(depth),
                   [&](std::int64_t begin, std::int64_t end) {
                     Search search(m_grid->tree());
                     for (std::int64_t n = begin; n < end; ++n)
                       fillState(search, container.tile(n, depth).tijk(), depth,
-                                &*channel->tileData(n, depth).begin());
+                                newSamples(*channel, tiles, {n, depth}));
                   },
                   {.grain = 256});
     return channel;
@@ -257,7 +261,7 @@ private:
   void lookAt(std::size_t n, Findings& found) {
     Leaf const& leaf = *m_leaves[n];
     LeafValues<Leaf> const values(leaf, valuesOf(leaf));
-    m_digests[n] = digestOf(values.data());
+    m_digests[leaf.transientData()] = digestOf(values.data());
     growBy(found.summary.stored, leaf.origin(), Leaf::DIM);
     found.summary.activeVoxels += std::int64_t(leaf.onVoxelCount());
     if (IndexBox const box = activeBox(leaf); !box.empty())
@@ -431,31 +435,47 @@ private:
         1, std::max<std::int64_t>(1, container.tileCount(kDepth)), 4096, true,
         [&](std::int64_t begin, std::int64_t end) {
           for (std::int64_t n = begin; n < end; ++n)
-            if (TileTree3D::mortonLess(placeOf(container.tile(n, kDepth).tijk()),
-                                       placeOf(container.tile(n - 1, kDepth).tijk())))
+            if (comesBefore<LeadingAxis::kZ>(placeOf(container.tile(n, kDepth).tijk()),
+                                             placeOf(container.tile(n - 1, kDepth).tijk())))
               return false;
           return true;
         },
         [](bool a, bool b) { return a && b; });
   }
   static int3 placeOf(int3 const& c) { return {c.x & -kLeafWidth, c.y & -kLeafWidth, c.z & -kLeafWidth}; }
-  /// The number of leaves before the place of a tile.
-  std::size_t leavesBefore(int3 const& corner) const {
+  std::vector<Leaf const*> leavesByNumber() const {
+    std::vector<Leaf const*> leaves(m_leaves.size());
+    for (Leaf const* leaf : m_leaves) leaves[leaf->transientData()] = leaf;
+    return leaves;
+  }
+  /// How many packed leaves lie before the place of a tile.
+  static std::size_t leavesBefore(std::vector<Leaf const*> const& packed, int3 const& corner) {
     int3 const place = placeOf(corner);
-    auto const found = std::partition_point(m_leaves.begin(), m_leaves.end(), [&](Leaf const* leaf) {
-      return TileTree3D::mortonLess(toInt3(leaf->origin()), place);
+    auto const found = std::partition_point(packed.begin(), packed.end(), [&](Leaf const* leaf) {
+      return comesBefore<LeadingAxis::kZ>(toInt3(leaf->origin()), place);
     });
-    return static_cast<std::size_t>(found - m_leaves.begin());
+    return static_cast<std::size_t>(found - packed.begin());
   }
 
+  /// A channel whose tiles have no samples yet: memory that is written for the first time is best written
+  /// once.
   template <class C, class T>
-  static Ostil::Ptr<C> makeOn(std::string const& name, T const& value, VdbTopology const& topology) {
+  static Ostil::Ptr<C> makeEmptyOn(std::string const& name, T const& value, VdbTopology const& topology) {
     auto channel =
         Ostil::makePtr<C>(name, &value, TileTree3D::kInitializeNone, false, true, 0, VdbTraits::kMaxDepth);
     channel->setTargetName(topology.name());
     channel->setOwner(topology.getTargetName());
+    channel->enableAllocateEmptyTileData();
     channel->update(topology);
+    channel->disableAllocateEmptyTileData();
     return channel;
+  }
+  /// Gives a tile samples of the channel's default value.
+  template <class C>
+  static auto* newSamples(C const& channel, typename C::TileDataAccessor& tiles, TreeIndex const& at) {
+    auto* const samples = tiles.tileData(at).data();
+    *samples = channel.newTile();
+    return samples->data();
   }
 
   /// The place of a leaf that was looked up last: tiles that are filled one after another share it.
@@ -537,9 +557,9 @@ private:
   typename GridT::ConstPtr m_grid;
   std::shared_ptr<PackedLeaves> m_packed; ///< null where leaves have buffers
   Value m_background;
-  std::vector<Leaf const*> m_leaves; ///< along the Z-shaped curve: a leaf's number is its place here
-  std::vector<LeafDigest<Value>> m_digests;
-  std::vector<WideTile> m_wide; ///< likewise
+  std::vector<Leaf const*> m_leaves;        ///< along the Z-shaped curve
+  std::vector<LeafDigest<Value>> m_digests; ///< by the leaves' numbers, their transient data
+  std::vector<WideTile> m_wide;             ///< likewise
   std::optional<std::string> m_whyNot;
   GridSummary m_summary;
   VdbActiveRule m_rule = VdbActiveRule::kChannel;

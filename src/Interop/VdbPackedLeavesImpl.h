@@ -5,8 +5,9 @@
 
 namespace VLN::Interop {
 
-/// Leaf n of a tree, counted along the Z-shaped curve, has its voxels behind those of the leaves before it,
-/// and n for its transient data. Pages come huge where the system has such, and may go before the block does.
+/// Leaf n of a tree, counted in the order of the tiles made of it, has its voxels behind those of the leaves
+/// before it, and n for its transient data. Pages come huge where the system has such, and may go before the
+/// block does.
 class PackedLeaves {
 public:
   /// @error std::bad_alloc.
