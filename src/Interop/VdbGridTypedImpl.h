@@ -191,6 +191,12 @@ private:
     else
       return leaf.buffer().data();
   }
+  /// Has the voxels of a leaf fetched: leaves are small, and mostly over before the processor sees a pattern.
+  static void fetchAhead(Value const* values) {
+    if constexpr (!std::is_same_v<Value, bool>)
+      for (std::size_t byte = 0; byte < Leaf::SIZE * sizeof(Value); byte += 64)
+        __builtin_prefetch(reinterpret_cast<char const*>(values) + byte);
+  }
   Value valueAt(Search& search, Coord const& c) const {
     auto const place = search.at(c);
     if (!place.leaf) return place.value;
@@ -226,7 +232,10 @@ private:
         0, std::int64_t(m_leaves.size()), 64, Findings{},
         [&](std::int64_t begin, std::int64_t end) {
           Findings part;
-          for (std::int64_t n = begin; n < end; ++n) lookAt(static_cast<std::size_t>(n), part);
+          for (std::int64_t n = begin; n < end; ++n) {
+            if (n + 1 < end) fetchAhead(valuesOf(*m_leaves[static_cast<std::size_t>(n) + 1]));
+            lookAt(static_cast<std::size_t>(n), part);
+          }
           return part;
         },
         [](Findings a, Findings const& b) {
@@ -306,16 +315,9 @@ private:
       if (places.at(-step[0], -step[1], -step[2]).digest) continue;
       // On an axis with a step the one block before, on the others the leaf's two.
       for (int slot = 0; slot < 8; ++slot) {
-        int const at[3] = {slot & 1, slot >> 1 & 1, slot >> 2};
-        int block[3];
-        bool once = true;
-        for (int a = 0; a < 3; ++a) {
-          once = once && !(step[a] && at[a]);
-          block[a] = step[a] ? -1 : at[a];
-        }
-        if (once)
-          collectUnlessUniform(places, blockOf(origin, block[0], block[1], block[2]), block[0], block[1],
-                               block[2], out);
+        if (slot & n) continue;
+        int const x = (slot & 1) - step[0], y = (slot >> 1 & 1) - step[1], z = (slot >> 2) - step[2];
+        collectUnlessUniform(places, blockOf(origin, x, y, z), x, y, z, out);
       }
     }
   }

@@ -186,9 +186,14 @@ public:
   /// @param block In blocks from the leaf's origin, each -1, 0 or 1.
   bool isUniform(int x, int y, int z) {
     Value const first = valueAt(x, y, z);
+    bool const inLeaf = at(x >> 1, y >> 1, z >> 1).digest;
+    int const leaving =
+        4 * (x & 1) + 2 * (y & 1) + (z & 1); // the axes on which the place ends with the block
     // The few voxels beyond edges first: where values change, they mostly tell.
-    for (int layer = 7; layer >= 0; --layer)
+    for (int layer = 7; layer >= 0; --layer) {
+      if (!inLeaf && !(layer & leaving)) continue; // in the same tile, which is of one value
       if (!holds(x + (layer >> 2), y + (layer >> 1 & 1), z + (layer & 1), layer, first)) return false;
+    }
     return true;
   }
   /// The first voxel of a block.

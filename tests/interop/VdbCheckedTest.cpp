@@ -193,9 +193,12 @@ TEST(VdbChecked, SurvivesChangedBytes) {
           bytes[at] = static_cast<char>(random());
       }
       writeAll(path, bytes);
+      auto const packed = readChecked(path, bytes.size(), kMuch, {}, LeafMemory::kPacked);
       if (auto const file = walked(path)) {
+        ASSERT_TRUE(packed);
         for (auto const& grid : file->grids) EXPECT_GE(grid->activeVoxelCount(), 0u);
       } else {
+        EXPECT_FALSE(packed);
         ++refused;
       }
     }
