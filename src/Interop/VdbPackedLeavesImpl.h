@@ -6,8 +6,8 @@
 namespace VLN::Interop {
 
 /// Leaf n of a tree, counted in the order of the tiles made of it, has its voxels behind those of the leaves
-/// before it, and n for its transient data. Pages come huge where the system has such, and may go before the
-/// block does.
+/// before it, and n for its transient data. Pages of large blocks come huge where the system has such, and may
+/// go before the block does.
 class PackedLeaves {
 public:
   /// @error std::bad_alloc.
@@ -21,6 +21,8 @@ public:
   void drop(std::size_t bytes);
 
 private:
+  void dropAll();
+
   char* m_begin = nullptr;
   std::size_t m_size;
   std::size_t m_dropped = 0;
