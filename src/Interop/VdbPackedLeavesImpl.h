@@ -6,8 +6,8 @@
 namespace VLN::Interop {
 
 /// Leaf n of a tree, counted in the order of the tiles made of it, has its voxels behind those of the leaves
-/// before it, and n for its transient data. Pages of large blocks come huge where the system has such, and may
-/// go before the block does.
+/// before it, and n for its transient data. Pages of large blocks come huge where the system has such, and
+/// may go before the block does.
 class PackedLeaves {
 public:
   /// @error std::bad_alloc.
