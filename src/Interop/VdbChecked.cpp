@@ -1,6 +1,8 @@
 #include "Interop/VdbCheckedImpl.h"
 
 #include "GeometryVolume/core/Parallel.h"
+#include "Interop/HalfFloatsImpl.h"
+#include "Interop/VdbGridNodesImpl.h"
 #include "Interop/VdbWalkImpl.h"
 
 #include <openvdb/io/Archive.h>
@@ -24,6 +26,8 @@ namespace {
 
 using openvdb::GridBase;
 
+constexpr std::size_t kLeafVoxels = 512;
+
 // Reads bytes in memory, from a place on, and throws where they end.
 class MemoryStream : private std::streambuf, public std::istream {
 public:
@@ -37,10 +41,33 @@ public:
   std::size_t place() const { return static_cast<std::size_t>(gptr() - eback()); }
 };
 
+/// Reads values that have been walked through.
+template <class Value>
+void readValues(MemoryStream& in, std::uint32_t count, ValueCoding const& coding, Value* values) {
+  using Half = openvdb::io::RealToHalf<Value>;
+  if constexpr (Half::isReal) {
+    if (coding.half) {
+      if (count == 0) return;
+      using Written = typename Half::HalfT;
+      constexpr std::size_t kReals = sizeof(Written) / sizeof(std::uint16_t); // in a value
+      using Real = std::conditional_t<sizeof(Value) == kReals * sizeof(float), float, double>;
+      static_assert(sizeof(Value) == kReals * sizeof(Real));
+      std::uint16_t halves[kReals * kLeafVoxels];
+      // Bytes are bytes, whatever they stand for.
+      openvdb::io::readData<Written>(in, reinterpret_cast<Written*>(halves), count, coding.compression);
+      widenHalves(halves, kReals * count, reinterpret_cast<Real*>(values));
+      return;
+    }
+  }
+  openvdb::io::readData<Value>(in, values, count, coding.compression);
+}
+
 /// Reads the buffers of a leaf, which have been walked through.
+/// @param out Where its values go.
 template <class Leaf>
 void readLeaf(Leaf& leaf, WalkedBytes bytes, std::size_t place, MemoryStream& in, ValueCoding const& coding,
-              typename Leaf::ValueType const& background) {
+              typename Leaf::ValueType const& background, typename Leaf::ValueType* out) {
+  static_assert(Leaf::SIZE == kLeafVoxels);
   using Value = typename Leaf::ValueType;
   in.goTo(place);
   typename Leaf::NodeMaskType mask;
@@ -48,15 +75,10 @@ void readLeaf(Leaf& leaf, WalkedBytes bytes, std::size_t place, MemoryStream& in
   leaf.setValueMask(mask);
   bytes.take(place);
   WrittenValues const values = walkBuffers<Leaf>(bytes, coding);
-  Value* const out = leaf.buffer().data();
   Value some[Leaf::SIZE];
   Value* const written = values.count == Leaf::SIZE ? out : some;
   in.goTo(values.place);
-  if (coding.half)
-    openvdb::io::HalfReader<openvdb::io::RealToHalf<Value>::isReal, Value>::read(in, written, values.count,
-                                                                                 coding.compression);
-  else
-    openvdb::io::readData<Value>(in, written, values.count, coding.compression);
+  readValues(in, values.count, coding, written);
   if (written != out) spreadValues(values, bytes.data() + place, written, background, out);
 }
 
@@ -92,8 +114,10 @@ struct ReadingStopped {
 
 class CheckedReader : public openvdb::io::Archive {
 public:
-  CheckedReader(WalkedBytes bytes, std::uint64_t memoryBytes, std::function<void(double)> const& told)
-      : m_bytes(bytes)
+  CheckedReader(WalkedBytes bytes, std::uint64_t memoryBytes, std::function<void(double)> const& told,
+                LeafMemory leafMemory)
+      : m_leafMemory(leafMemory)
+      , m_bytes(bytes)
       , m_in(bytes)
       , m_memoryLeft(memoryBytes)
       , m_told(told) {}
@@ -109,7 +133,7 @@ public:
     openvdb::io::setVersion(m_in, libraryVersion(), fileVersion());
     file.metadata = std::make_shared<openvdb::MetaMap>();
     readMetadata(*file.metadata);
-    for (auto count = m_bytes.number<std::int32_t>(); count > 0; --count) file.grids.push_back(readGrid());
+    for (auto count = m_bytes.number<std::int32_t>(); count > 0; --count) readGrid(file);
   }
 
 private:
@@ -150,7 +174,7 @@ private:
     m_bytes.take(m_in.place() - m_bytes.place());
   }
 
-  GridBase::Ptr readGrid() {
+  void readGrid(VdbFile& file) {
     // What a grid takes by itself: many small ones are more in memory than in a file.
     constexpr std::uint64_t kGrid = 8192;
     walkOnlyIf(m_memoryLeft >= kGrid);
@@ -172,7 +196,8 @@ private:
     bool done = false;
     auto const attempt = [&]<class GridT>(GridT const*) {
       if (!done && grid->isType<GridT>()) {
-        readTree(static_cast<GridT&>(*grid).tree(), coding);
+        if (auto packed = readTree(static_cast<GridT&>(*grid).tree(), coding))
+          file.packed.emplace(grid.get(), std::move(packed));
         done = true;
       }
     };
@@ -182,11 +207,12 @@ private:
     VLN_ATTEMPT(Int64Grid) // bytes of a file may be no bools
 #undef VLN_ATTEMPT
     walkOnlyIf(done);
-    return grid;
+    file.grids.push_back(std::move(grid));
   }
 
-  template <class TreeT> void readTree(TreeT& tree, ValueCoding const& coding) {
+  template <class TreeT> std::shared_ptr<PackedLeaves> readTree(TreeT& tree, ValueCoding const& coding) {
     using Leaf = typename TreeT::LeafNodeType;
+    using Value = typename TreeT::ValueType;
     std::size_t const begin = m_bytes.place();
     std::uint64_t const memory = walkTopology<TreeT>(m_bytes, coding);
     walkOnlyIf(memory <= m_memoryLeft);
@@ -204,6 +230,17 @@ private:
       places.push_back(m_bytes.place());
       walkBuffers<Leaf>(m_bytes, coding);
     }
+    std::shared_ptr<PackedLeaves> packed;
+    if (m_leafMemory == LeafMemory::kPacked) {
+      openvdb::Index32 next = 0;
+      forEachInOrder<LeadingAxis::kZ>(
+          tree, [&](Leaf& leaf) { leaf.setTransientData(next++); }, [](auto const&...) {});
+      packed = std::make_shared<PackedLeaves>(leaves.size() * Leaf::SIZE * sizeof(Value));
+    }
+    auto const valuesOf = [&](Leaf& leaf) {
+      return packed ? static_cast<Value*>(packed->begin()) + std::size_t(leaf.transientData()) * Leaf::SIZE
+                    : leaf.buffer().data();
+    };
     WalkedBytes const all(m_bytes.data(), m_bytes.size());
     auto const count = std::int64_t(leaves.size());
     for (std::int64_t done = 0, next = 0; done < count; done = next) {
@@ -213,10 +250,12 @@ private:
                   [&](std::int64_t first, std::int64_t last) {
                     MemoryStream in(all);
                     for (auto n = static_cast<std::size_t>(first); n < static_cast<std::size_t>(last); ++n)
-                      readLeaf(*leaves[n], all, places[n], in, coding, tree.background());
+                      readLeaf(*leaves[n], all, places[n], in, coding, tree.background(),
+                               valuesOf(*leaves[n]));
                   },
                   {.grain = 64});
     }
+    return packed;
   }
 
   void tell(std::size_t place) const {
@@ -228,6 +267,7 @@ private:
 
   static constexpr std::int64_t kLeavesAtOnce = 16384; ///< some hundredths of a second
 
+  LeafMemory m_leafMemory;
   WalkedBytes m_bytes;
   MemoryStream m_in;
   std::uint64_t m_memoryLeft;
@@ -237,7 +277,7 @@ private:
 } // namespace
 
 std::optional<VdbFile> readChecked(std::string const& path, std::uint64_t fileSize, std::uint64_t memoryBytes,
-                                   std::function<void(double)> const& told) {
+                                   std::function<void(double)> const& told, LeafMemory leafMemory) {
   if (fileSize > memoryBytes) return std::nullopt;
   try {
     auto const size = static_cast<std::size_t>(fileSize);
@@ -246,7 +286,7 @@ std::optional<VdbFile> readChecked(std::string const& path, std::uint64_t fileSi
     VdbFile file;
     file.path = path;
     file.memoryBytes = memoryBytes;
-    CheckedReader(WalkedBytes(bytes.get(), size), memoryBytes - fileSize, told).read(file);
+    CheckedReader(WalkedBytes(bytes.get(), size), memoryBytes - fileSize, told, leafMemory).read(file);
     return file;
   } catch (ReadingStopped const& stopped) {
     std::rethrow_exception(stopped.reason);

@@ -19,6 +19,7 @@ namespace VLN::Interop {
 /// @param told Told now and then what share has been read; what it throws ends the reading, and comes out.
 VLN_API std::optional<VdbFile> readChecked(std::string const& path, std::uint64_t fileSize,
                                            std::uint64_t memoryBytes,
-                                           std::function<void(double)> const& told = {});
+                                           std::function<void(double)> const& told = {},
+                                           LeafMemory leafMemory = LeafMemory::kOwn);
 
 } // namespace VLN::Interop

@@ -61,8 +61,19 @@ template <class V> bool followsRule(VdbActiveRule rule, V const& value, V const&
 
 // --- Nodes ---
 
-/// The slots of a node along the Z-shaped curve: x leads, then y.
-template <int Log2Dim> class SlotOrder {
+/// The axis that leads along the Z-shaped curve, before y: x in files, whose leaves have z fastest, and z
+/// among the tiles of a tree, whose samples have x fastest.
+enum class LeadingAxis { kX, kZ };
+
+template <LeadingAxis kLeads> bool comesBefore(int3 const& a, int3 const& b) {
+  if constexpr (kLeads == LeadingAxis::kX)
+    return TileTree3D::mortonLess(a, b);
+  else
+    return TileTree3D::mortonLess({a.z, a.y, a.x}, {b.z, b.y, b.x});
+}
+
+/// The slots of a node along the Z-shaped curve.
+template <int Log2Dim, LeadingAxis kLeads> class SlotOrder {
 public:
   static constexpr int kSlots = 1 << 3 * Log2Dim;
 
@@ -70,7 +81,8 @@ public:
     for (unsigned slot = 0; slot < kSlots; ++slot) {
       unsigned rank = 0;
       for (int bit = 0; bit < Log2Dim; ++bit)
-        for (int a = 0; a < 3; ++a) rank |= (slot >> (Log2Dim * a + bit) & 1) << (3 * bit + a);
+        for (int a = 0; a < 3; ++a) // z, y, x
+          rank |= (slot >> (Log2Dim * a + bit) & 1) << (3 * bit + (kLeads == LeadingAxis::kX ? a : 2 - a));
       m_rank[slot] = static_cast<std::uint16_t>(rank);
       m_slot[rank] = static_cast<std::uint16_t>(slot);
     }
@@ -98,7 +110,7 @@ private:
 
 /// Goes through a file's tree along the Z-shaped curve: calls `onLeaf(leaf)`, and `onTile(corner, width,
 /// value, active)` for each tile that is active or has another value than the background.
-template <class TreeT, class OnLeaf, class OnTile>
+template <LeadingAxis kLeads = LeadingAxis::kX, class TreeT, class OnLeaf, class OnTile>
 void forEachInOrder(TreeT const& tree, OnLeaf const& onLeaf, OnTile const& onTile) {
   using Upper = typename TreeT::RootNodeType::ChildNodeType;
   using Value = typename TreeT::ValueType;
@@ -107,7 +119,7 @@ void forEachInOrder(TreeT const& tree, OnLeaf const& onLeaf, OnTile const& onTil
     auto const* const table = node.getTable();
     auto const& children = node.getChildMask();
     auto const& active = node.getValueMask();
-    SlotOrder<Node::LOG2DIM>::table().forEach(
+    SlotOrder<Node::LOG2DIM, kLeads>::table().forEach(
         [&](unsigned slot) {
           return children.isOn(slot) || active.isOn(slot) || !sameBits(table[slot].getValue(), background);
         },
@@ -131,7 +143,7 @@ void forEachInOrder(TreeT const& tree, OnLeaf const& onLeaf, OnTile const& onTil
     if (it.isValueOn() || !sameBits(*it, background))
       entries.push_back({it.getCoord(), nullptr, *it, it.isValueOn()});
   std::sort(entries.begin(), entries.end(), [](Entry const& a, Entry const& b) {
-    return TileTree3D::mortonLess(toInt3(a.corner), toInt3(b.corner));
+    return comesBefore<kLeads>(toInt3(a.corner), toInt3(b.corner));
   });
   for (Entry const& entry : entries) {
     if (!entry.node)

@@ -4,13 +4,13 @@
 
 namespace VLN::Interop {
 
-std::unique_ptr<GridSource> makeScalarSource(openvdb::GridBase::ConstPtr const& grid) {
+std::unique_ptr<GridSource> makeScalarSource(GridToRead const& from) {
   return sourceAmong<openvdb::FloatGrid, openvdb::Int32Grid, openvdb::Int64Grid, openvdb::BoolGrid
 #if VLN_HAS_ELEMENT_DOUBLE
                      ,
                      openvdb::DoubleGrid
 #endif
-                     >(grid);
+                     >(from);
 }
 
 openvdb::GridBase::Ptr makeScalarGrid(std::string const& type, GridToWrite const& from) {

@@ -53,11 +53,11 @@ GridSummary joinSummaries(GridSummary a, GridSummary const& b) {
   return a;
 }
 
-std::unique_ptr<GridSource> makeGridSource(openvdb::GridBase::ConstPtr const& grid, std::string& type) {
-  type = grid->type() == "Tree_ptdataidx32_5_4_3" ? "points" : grid->type();
+std::unique_ptr<GridSource> makeGridSource(GridToRead const& from, std::string& type) {
+  type = from.grid->type() == "Tree_ptdataidx32_5_4_3" ? "points" : from.grid->type();
   // A grid of another node configuration has the value type, but none of the nodes.
-  auto source = makeScalarSource(grid);
-  return source ? std::move(source) : makeVectorSource(grid);
+  auto source = makeScalarSource(from);
+  return source ? std::move(source) : makeVectorSource(from);
 }
 
 int rootDepth(std::vector<GridSummary> const& grids) {

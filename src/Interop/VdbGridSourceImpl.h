@@ -4,6 +4,7 @@
 #include "GeometryVolume/core/FunctionRef.h"
 #include "GeometryVolume/tiletree/Morton.h"
 #include "Interop/VdbImport.h"
+#include "Interop/VdbPackedLeavesImpl.h"
 #include "Interop/VdbRecord.h"
 #include "Interop/VdbTreeImpl.h"
 
@@ -85,7 +86,8 @@ public:
   virtual void collectBeyondRoots(RootPlaces const& roots, std::vector<Velorn::Math::int3>& out) const = 0;
   /// The rule by which values tell what is active, or kChannel.
   virtual VdbActiveRule activeRule() const = 0;
-  /// A channel with the grid's values for every sample of the tree.
+  /// A channel with the grid's values for every sample of the tree. Voxels that lie in packed leaves are gone
+  /// afterwards.
   virtual Ostil::Ptr<TileTree3D::ChannelBase> makeChannel(std::string const& name,
                                                           VdbContainer const& container,
                                                           VdbTopology const& topology,
@@ -94,12 +96,18 @@ public:
                                                     VdbTopology const& topology) const = 0;
 };
 
+/// A grid, and where its voxels lie unless its leaves have them.
+struct GridToRead {
+  openvdb::GridBase::Ptr grid; ///< whose leaves will be numbered
+  std::shared_ptr<PackedLeaves> packed;
+};
+
 /// Null for a type that is not supported; `type` then tells its name.
-std::unique_ptr<GridSource> makeGridSource(openvdb::GridBase::ConstPtr const& grid, std::string& type);
+std::unique_ptr<GridSource> makeGridSource(GridToRead const& from, std::string& type);
 
 // Its two halves, compiled apart.
-std::unique_ptr<GridSource> makeScalarSource(openvdb::GridBase::ConstPtr const& grid);
-std::unique_ptr<GridSource> makeVectorSource(openvdb::GridBase::ConstPtr const& grid);
+std::unique_ptr<GridSource> makeScalarSource(GridToRead const& from);
+std::unique_ptr<GridSource> makeVectorSource(GridToRead const& from);
 
 /// The deepest depth at which all roots for grids with these summaries may lie.
 int rootDepth(std::vector<GridSummary> const& grids);

@@ -3,7 +3,7 @@
 
 #include "GeometryVolume/core/Parallel.h"
 #include "Interop/VdbGridSourceImpl.h"
-#include "Interop/VdbLeafImpl.h"
+#include "Interop/VdbLeafPlacesImpl.h"
 
 #include <algorithm>
 
@@ -17,12 +17,17 @@ public:
   using Element = typename ElementOf<Value>::type;
   using ChannelT = TileTree3D::Channel<VdbTraits, Element, 4, 0>;
 
-  explicit TypedGrid(typename GridT::ConstPtr grid)
-      : m_grid(std::move(grid))
+  TypedGrid(typename GridT::Ptr const& grid, std::shared_ptr<PackedLeaves> packed)
+      : m_grid(grid)
+      , m_packed(std::move(packed))
       , m_background(m_grid->background()) {
     m_leaves.reserve(m_grid->tree().leafCount());
     forEachInOrder(
-        m_grid->tree(), [&](Leaf const& leaf) { m_leaves.push_back(&leaf); },
+        m_grid->tree(),
+        [&](Leaf& leaf) {
+          if (!m_packed) leaf.setTransientData(static_cast<openvdb::Index32>(m_leaves.size()));
+          m_leaves.push_back(&leaf);
+        },
         [&](Coord const& c, int width, Value const& value, bool active) {
           m_wide.push_back({c, width, value, active});
         });
@@ -60,13 +65,15 @@ public:
     std::size_t const known = at(VdbTraits::kMaxDepth).size();
     collectInParallel(
         std::int64_t(m_leaves.size()), 256,
-        [&](std::int64_t n, Accessor& grid, auto& blocks, auto& blocksBefore) {
+        [&](std::int64_t n, Search& search, auto& blocks, auto& blocksBefore) {
           Leaf const& leaf = *m_leaves[static_cast<std::size_t>(n)];
-          Places places(grid, leaf.origin());
+          auto const& digest = m_digests[leaf.transientData()];
+          Places places = placesRound(search, leaf.origin());
           unsigned const active = activeBlocks(leaf);
           for (int b = 0; b < 8; ++b) {
             int const x = b >> 2, y = b >> 1 & 1, z = b & 1;
-            bool const spare = !(active >> b & 1) && places.isUniform(x, y, z) &&
+            bool const spare = !(active >> b & 1) && (digest.uniform >> 8 * b & 1) &&
+                               places.isUniform(x, y, z) &&
                                (leavesHaveTile || sameBits(places.valueAt(x, y, z), m_background));
             if (!spare) blocks.push_back(blockOf(leaf.origin(), x, y, z));
           }
@@ -93,7 +100,7 @@ public:
 
   void collectBeyondRoots(RootPlaces const& roots, std::vector<int3>& out) const override {
     int const width = VdbTraits::width(roots.depth()), step = width / VdbTraits::kTDW;
-    auto grid = m_grid->getConstAccessor();
+    Search search(m_grid->tree());
     for (int3 const& root : roots.corners()) {
       unsigned const missing = roots.missingBeside(root);
       for (int n = 1; missing >> n != 0; ++n) {
@@ -103,7 +110,7 @@ public:
         for (int a = 0; a < 3; ++a)
           inside =
               inside && std::int64_t(root[a]) + std::int64_t(side[a]) * width <= VdbTraits::kMaxTileCoord;
-        if (inside && goesOn(grid, root, side, step))
+        if (inside && goesOn(search, root, side, step))
           out.push_back({root.x + side[0] * width, root.y + side[1] * width, root.z + side[2] * width});
       }
     }
@@ -113,54 +120,94 @@ public:
                                                   VdbTopology const& topology,
                                                   FilledTiles filled) const override {
     Element const background = toElement(m_background);
-    auto channel = makeOn<ChannelT>(name, background, topology);
-    constexpr std::int64_t kPart = 1 << 16;
-    for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth)
-      for (std::int64_t first = 0; first < container.tileCount(depth); first += kPart) {
-        std::int64_t const last = std::min(first + kPart, container.tileCount(depth));
+    auto channel = makeEmptyOn<ChannelT>(name, background, topology);
+    auto tiles = channel->tileDataAccessor();
+    constexpr std::int64_t kPart = 1 << 16, kPiece = 1 << 14;
+    // The deepest tiles come last, and read the voxels leaf by leaf.
+    std::vector<Leaf const*> const packed =
+        m_packed && tilesFollowLeaves(container) ? leavesByNumber() : std::vector<Leaf const*>();
+    for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth) {
+      std::int64_t const count = container.tileCount(depth);
+      for (std::int64_t first = 0, told = 0; first < count; first += kPiece) {
+        std::int64_t const last = std::min(first + kPiece, count);
         parallelFor(first, last,
                     [&](std::int64_t begin, std::int64_t end) {
-                      auto accessor = m_grid->getConstAccessor();
+                      Search search(m_grid->tree());
                       LastPlace place;
                       for (std::int64_t n = begin; n < end; ++n)
-                        fillTile(accessor, place, container.tile(n, depth).tijk(), depth,
-                                 &*channel->tileData(n, depth).begin());
+                        fillTile(search, place, container.tile(n, depth).tijk(), depth,
+                                 newSamples(*channel, tiles, {n, depth}));
                     },
                     {.grain = 256});
-        filled(last - first);
+        if (!packed.empty() && depth == VdbTraits::kMaxDepth && last < count)
+          m_packed->drop(leavesBefore(packed, container.tile(last, depth).tijk()) * Leaf::SIZE *
+                         sizeof(Value));
+        if (last - told < kPart && last < count) continue;
+        filled(last - told);
+        told = last;
       }
+    }
+    if (m_packed) m_packed->drop(m_leaves.size() * Leaf::SIZE * sizeof(Value));
     return channel;
   }
 
   Ostil::Ptr<StateChannel> makeStateChannel(std::string const& name, VdbContainer const& container,
                                             VdbTopology const& topology) const override {
-    auto channel = makeOn<StateChannel>(name, static_cast<unsigned char>(0), topology);
+    auto channel = makeEmptyOn<StateChannel>(name, static_cast<unsigned char>(0), topology);
+    auto tiles = channel->tileDataAccessor();
     for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth)
       parallelFor(0, container.tileCount(depth),
                   [&](std::int64_t begin, std::int64_t end) {
-                    auto accessor = m_grid->getConstAccessor();
+                    Search search(m_grid->tree());
                     for (std::int64_t n = begin; n < end; ++n)
-                      fillState(accessor, container.tile(n, depth).tijk(), depth,
-                                &*channel->tileData(n, depth).begin());
+                      fillState(search, container.tile(n, depth).tijk(), depth,
+                                newSamples(*channel, tiles, {n, depth}));
                   },
                   {.grain = 256});
     return channel;
   }
 
 private:
-  using Accessor = typename GridT::ConstAccessor;
-  using Places = LeafPlaces<GridT>;
+  using Search = PlaceSearch<TreeT>;
+  using Places = LeafPlaces<TreeT>;
 
   /// Whether one of a root's outermost samples on some high sides is not the background: without a root
   /// there, it would go on for ever.
-  bool goesOn(Accessor& grid, int3 const& root, int const (&side)[3], int step) const {
+  bool goesOn(Search& search, int3 const& root, int const (&side)[3], int step) const {
     for (int k = side[2] ? 3 : 0; k < 4; ++k)
       for (int j = side[1] ? 3 : 0; j < 4; ++j)
         for (int i = side[0] ? 3 : 0; i < 4; ++i)
-          if (!sameBits(Value(grid.getValue(toCoord(root).offsetBy(i * step, j * step, k * step))),
-                        m_background))
+          if (!sameBits(valueAt(search, toCoord(root).offsetBy(i * step, j * step, k * step)), m_background))
             return true;
     return false;
+  }
+
+  /// The voxels of a leaf, unless they are bits.
+  Value const* valuesOf(Leaf const& leaf) const {
+    if constexpr (std::is_same_v<Value, bool>)
+      return nullptr;
+    else if (m_packed)
+      return static_cast<Value const*>(m_packed->begin()) + std::size_t(leaf.transientData()) * Leaf::SIZE;
+    else
+      return leaf.buffer().data();
+  }
+  /// Has the voxels of a leaf fetched: leaves are small, and mostly over before the processor sees a pattern.
+  static void fetchAhead(Value const* values) {
+    if constexpr (!std::is_same_v<Value, bool>)
+      for (std::size_t byte = 0; byte < Leaf::SIZE * sizeof(Value); byte += 64)
+        __builtin_prefetch(reinterpret_cast<char const*>(values) + byte);
+  }
+  Value valueAt(Search& search, Coord const& c) const {
+    auto const place = search.at(c);
+    if (!place.leaf) return place.value;
+    auto const n = Leaf::coordToOffset(c);
+    if constexpr (std::is_same_v<Value, bool>)
+      return place.leaf->getValue(n);
+    else
+      return valuesOf(*place.leaf)[n];
+  }
+  Places placesRound(Search& search, Coord const& corner) const {
+    return Places(search, m_digests.data(), corner);
   }
 
   /// A tile of the file's tree that is active, or has another value than the background.
@@ -178,13 +225,17 @@ private:
     bool byBackground = true, byBand = true; ///< whether the rule holds for every voxel
   };
 
-  /// Goes through all voxels once: summary and rule.
+  /// Goes through all voxels once: summary, rule and digests.
   void lookThrough() {
+    m_digests.resize(m_leaves.size());
     Findings found = parallelReduce(
         0, std::int64_t(m_leaves.size()), 64, Findings{},
         [&](std::int64_t begin, std::int64_t end) {
           Findings part;
-          for (std::int64_t n = begin; n < end; ++n) lookAt(*m_leaves[static_cast<std::size_t>(n)], part);
+          for (std::int64_t n = begin; n < end; ++n) {
+            if (n + 1 < end) fetchAhead(valuesOf(*m_leaves[static_cast<std::size_t>(n) + 1]));
+            lookAt(static_cast<std::size_t>(n), part);
+          }
           return part;
         },
         [](Findings a, Findings const& b) {
@@ -216,8 +267,10 @@ private:
                                 : VdbActiveRule::kChannel;
   }
 
-  void lookAt(Leaf const& leaf, Findings& found) const {
-    LeafValues<Leaf> const values(leaf);
+  void lookAt(std::size_t n, Findings& found) {
+    Leaf const& leaf = *m_leaves[n];
+    LeafValues<Leaf> const values(leaf, valuesOf(leaf));
+    m_digests[leaf.transientData()] = digestOf(values.data());
     growBy(found.summary.stored, leaf.origin(), Leaf::DIM);
     found.summary.activeVoxels += std::int64_t(leaf.onVoxelCount());
     if (IndexBox const box = activeBox(leaf); !box.empty())
@@ -239,10 +292,10 @@ private:
     using Part = std::array<std::vector<int3>, sizeof...(Lists)>;
     std::vector<Part> parts(static_cast<std::size_t>(chunkCount(0, count, grain)));
     parallelChunks(0, count, grain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-      auto grid = m_grid->getConstAccessor();
+      Search search(m_grid->tree());
       Part& part = parts[static_cast<std::size_t>(chunk)];
       for (std::int64_t n = begin; n < end; ++n)
-        std::apply([&](auto&... list) { collect(n, grid, list...); }, part);
+        std::apply([&](auto&... list) { collect(n, search, list...); }, part);
     });
     std::size_t n = 0;
     auto const append = [&](std::vector<int3>& list) {
@@ -259,19 +312,12 @@ private:
   static void collectBeforeLeaf(Places& places, Coord const& origin, std::vector<int3>& out) {
     for (int n = 1; n < 8; ++n) {
       int const step[3] = {n & 1, n >> 1 & 1, n >> 2};
-      if (places.at(-step[0], -step[1], -step[2]).leaf) continue;
+      if (places.at(-step[0], -step[1], -step[2]).digest) continue;
       // On an axis with a step the one block before, on the others the leaf's two.
       for (int slot = 0; slot < 8; ++slot) {
-        int const at[3] = {slot & 1, slot >> 1 & 1, slot >> 2};
-        int block[3];
-        bool once = true;
-        for (int a = 0; a < 3; ++a) {
-          once = once && !(step[a] && at[a]);
-          block[a] = step[a] ? -1 : at[a];
-        }
-        if (once)
-          collectUnlessUniform(places, blockOf(origin, block[0], block[1], block[2]), block[0], block[1],
-                               block[2], out);
+        if (slot & n) continue;
+        int const x = (slot & 1) - step[0], y = (slot >> 1 & 1) - step[1], z = (slot >> 2) - step[2];
+        collectUnlessUniform(places, blockOf(origin, x, y, z), x, y, z, out);
       }
     }
   }
@@ -289,8 +335,8 @@ private:
       if (width == kLeafWidth) {
         collectInParallel(
             std::int64_t(exposed.size()), 96,
-            [&](std::int64_t n, Accessor& grid, auto& part) {
-              collectRound(grid, exposed[static_cast<std::size_t>(n)]->corner, part);
+            [&](std::int64_t n, Search& search, auto& part) {
+              collectRound(search, exposed[static_cast<std::size_t>(n)]->corner, part);
             },
             out);
         continue;
@@ -298,8 +344,8 @@ private:
       auto const rows = std::int64_t(across) + 1;
       collectInParallel(
           std::int64_t(exposed.size()) * rows, 1,
-          [&](std::int64_t n, Accessor& grid, auto& part) {
-            collectSlice(grid, exposed[static_cast<std::size_t>(n / rows)]->corner, across,
+          [&](std::int64_t n, Search& search, auto& part) {
+            collectSlice(search, exposed[static_cast<std::size_t>(n / rows)]->corner, across,
                          static_cast<int>(n % rows) - 1, part);
           },
           out);
@@ -314,9 +360,9 @@ private:
     std::vector<char> exposed(list.size());
     parallelFor(0, std::int64_t(list.size()),
                 [&](std::int64_t begin, std::int64_t end) {
-                  auto grid = m_grid->getConstAccessor();
+                  Search search(m_grid->tree());
                   for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n)
-                    exposed[n] = isExposed(grid, *list[n]);
+                    exposed[n] = isExposed(search, *list[n]);
                 },
                 {.grain = 64});
     std::size_t kept = 0;
@@ -326,47 +372,54 @@ private:
     return list;
   }
   /// Whether one of a tile's 26 neighbours of the same width is finer, or has another value.
-  static bool isExposed(Accessor& grid, WideTile const& tile) {
-    if (tile.width == kNodeWidths[0]) {
-      Places places(grid, tile.corner);
-      for (int n = 0; n < 27; ++n) {
-        auto const& place = places.at(n / 9 - 1, n / 3 % 3 - 1, n % 3 - 1);
-        if (place.leaf || !sameBits(place.value, tile.value)) return true;
-      }
-      return false;
-    }
-    int const level = tile.width == kNodeWidths[1] ? 1 : 0;
+  bool isExposed(Search& search, WideTile const& tile) const {
+    if (auto const* const lower = search.lower(tile.corner); lower && Search::isInside(*lower, tile.corner))
+      return isExposed(*lower, Search::Lower::coordToOffset(tile.corner), tile.value);
+    int const level = tile.width == kNodeWidths[0] ? 2 : tile.width == kNodeWidths[1] ? 1 : 0;
     for (int n = 0; n < 27; ++n) {
       Coord const c = tile.corner.offsetBy((n / 9 - 1) * tile.width, (n / 3 % 3 - 1) * tile.width,
                                            (n % 3 - 1) * tile.width);
-      if (grid.getValueDepth(c) > level) return true;
-      if (!sameBits(Value(grid.getValue(c)), tile.value)) return true;
+      auto const place = search.at(c);
+      if (place.level > level || !sameBits(place.value, tile.value)) return true;
     }
+    return false;
+  }
+
+  /// The same of a tile whose neighbours are all in one node.
+  static bool isExposed(typename Search::Lower const& lower, openvdb::Index slot, Value const& value) {
+    auto const* const table = lower.getTable();
+    for (int x = -1; x < 2; ++x)
+      for (int y = -1; y < 2; ++y)
+        for (int z = -1; z < 2; ++z) {
+          openvdb::Index const beside = slot + static_cast<openvdb::Index>(256 * x + 16 * y + z);
+          if (lower.isChildMaskOn(beside) || !sameBits(Value(table[beside].getValue()), value)) return true;
+        }
     return false;
   }
 
   /// The blocks in and before a tile that is as wide as a leaf. Those in leaves have been looked at, and
   /// those in tiles like this one come with them.
-  void collectRound(Accessor& grid, Coord const& corner, std::vector<int3>& out) const {
-    Places places(grid, corner);
+  void collectRound(Search& search, Coord const& corner, std::vector<int3>& out) const {
+    Places places = placesRound(search, corner);
     for (int x = -1; x < 2; ++x)
       for (int y = -1; y < 2; ++y)
         for (int z = -1; z < 2; ++z) {
           if (x == 0 && y == 0 && z == 0) continue;
           bool const inside = x >= 0 && y >= 0 && z >= 0;
           auto const& place = places.at(x >> 1, y >> 1, z >> 1);
-          if (place.leaf || (!inside && place.isNarrow && !sameBits(place.value, m_background))) continue;
+          if (place.digest || (!inside && place.isNarrow && !sameBits(place.value, m_background))) continue;
           collectUnlessUniform(places, blockOf(corner, x, y, z), x, y, z, out);
         }
   }
   /// The blocks of the shell of a wider tile with one z, of -1 to across - 1.
-  static void collectSlice(Accessor& grid, Coord const& corner, int across, int z, std::vector<int3>& out) {
+  void collectSlice(Search& search, Coord const& corner, int across, int z, std::vector<int3>& out) const {
     auto const outer = [&](int c) { return c == -1 || c == across - 1; };
     for (int y = -1; y < across; ++y) {
       int const step = outer(z) || outer(y) ? 1 : across;
       for (int x = -1; x < across; x += step) {
         int3 const block = blockOf(corner, x, y, z);
-        Places places(grid, Coord(block.x & -kLeafWidth, block.y & -kLeafWidth, block.z & -kLeafWidth));
+        Places places =
+            placesRound(search, Coord(block.x & -kLeafWidth, block.y & -kLeafWidth, block.z & -kLeafWidth));
         collectUnlessUniform(places, block, block.x >> 2 & 1, block.y >> 2 & 1, block.z >> 2 & 1, out);
       }
     }
@@ -377,30 +430,70 @@ private:
     if (VdbTraits::inDomain(corner) && !places.isUniform(x, y, z)) out.push_back(corner);
   }
 
+  /// Whether the deepest tiles lie in the order of the places of leaves that they are in.
+  static bool tilesFollowLeaves(VdbContainer const& container) {
+    constexpr int kDepth = VdbTraits::kMaxDepth;
+    return parallelReduce(
+        1, std::max<std::int64_t>(1, container.tileCount(kDepth)), 4096, true,
+        [&](std::int64_t begin, std::int64_t end) {
+          for (std::int64_t n = begin; n < end; ++n)
+            if (comesBefore<LeadingAxis::kZ>(placeOf(container.tile(n, kDepth).tijk()),
+                                             placeOf(container.tile(n - 1, kDepth).tijk())))
+              return false;
+          return true;
+        },
+        [](bool a, bool b) { return a && b; });
+  }
+  static int3 placeOf(int3 const& c) { return {c.x & -kLeafWidth, c.y & -kLeafWidth, c.z & -kLeafWidth}; }
+  std::vector<Leaf const*> leavesByNumber() const {
+    std::vector<Leaf const*> leaves(m_leaves.size());
+    for (Leaf const* leaf : m_leaves) leaves[leaf->transientData()] = leaf;
+    return leaves;
+  }
+  /// How many packed leaves lie before the place of a tile.
+  static std::size_t leavesBefore(std::vector<Leaf const*> const& packed, int3 const& corner) {
+    int3 const place = placeOf(corner);
+    auto const found = std::partition_point(packed.begin(), packed.end(), [&](Leaf const* leaf) {
+      return comesBefore<LeadingAxis::kZ>(toInt3(leaf->origin()), place);
+    });
+    return static_cast<std::size_t>(found - packed.begin());
+  }
+
+  /// A channel whose tiles have no samples yet: memory that is written for the first time is best written
+  /// once.
   template <class C, class T>
-  static Ostil::Ptr<C> makeOn(std::string const& name, T const& value, VdbTopology const& topology) {
+  static Ostil::Ptr<C> makeEmptyOn(std::string const& name, T const& value, VdbTopology const& topology) {
     auto channel =
         Ostil::makePtr<C>(name, &value, TileTree3D::kInitializeNone, false, true, 0, VdbTraits::kMaxDepth);
     channel->setTargetName(topology.name());
     channel->setOwner(topology.getTargetName());
+    channel->enableAllocateEmptyTileData();
     channel->update(topology);
+    channel->disableAllocateEmptyTileData();
     return channel;
+  }
+  /// Gives a tile samples of the channel's default value.
+  template <class C>
+  static auto* newSamples(C const& channel, typename C::TileDataAccessor& tiles, TreeIndex const& at) {
+    auto* const samples = tiles.tileData(at).data();
+    *samples = channel.newTile();
+    return samples->data();
   }
 
   /// The place of a leaf that was looked up last: tiles that are filled one after another share it.
   struct LastPlace {
     std::optional<Coord> corner;
     LeafPlace<TreeT> place;
+    Value const* values = nullptr; ///< of the leaf, unless they are bits
   };
 
-  static void fillTile(Accessor& grid, LastPlace& last, int3 const& corner, int depth, Element* samples) {
+  void fillTile(Search& search, LastPlace& last, int3 const& corner, int depth, Element* samples) const {
     int const step = VdbTraits::width(depth) / VdbTraits::kTDW;
     if (step >= kLeafWidth) {
       for (int k = 0; k < 4; ++k)
         for (int j = 0; j < 4; ++j)
           for (int i = 0; i < 4; ++i)
-            *samples++ =
-                toElement(Value(grid.getValue(toCoord(corner).offsetBy(i * step, j * step, k * step))));
+            *samples++ = toElement(valueAt(search, toCoord(corner).offsetBy(i * step, j * step, k * step)));
       return;
     }
     // Leaf by leaf, or what stands in its place: each holds `count` samples along an axis.
@@ -408,15 +501,16 @@ private:
     for (int k = 0; k < 4; k += count)
       for (int j = 0; j < 4; j += count)
         for (int i = 0; i < 4; i += count)
-          fillFromPlace(grid, last, toCoord(corner).offsetBy(i * step, j * step, k * step), step, count,
+          fillFromPlace(search, last, toCoord(corner).offsetBy(i * step, j * step, k * step), step, count,
                         samples + i + 4 * (j + 4 * k));
   }
-  static void fillFromPlace(Accessor& grid, LastPlace& last, Coord const& at, int step, int count,
-                            Element* samples) {
+  void fillFromPlace(Search& search, LastPlace& last, Coord const& at, int step, int count,
+                     Element* samples) const {
     Coord const corner = at & -kLeafWidth;
     if (last.corner != corner) {
-      last.place.lookUp(grid, corner);
+      last.place = search.at(corner);
       last.corner = corner;
+      if (last.place.leaf) last.values = valuesOf(*last.place.leaf);
     }
     Leaf const* const leaf = last.place.leaf;
     auto const fill = [&](auto const& valueAt) {
@@ -432,16 +526,16 @@ private:
     if constexpr (std::is_same_v<Value, bool>) { // kept as bits
       fill([&](int n) { return leaf->getValue(static_cast<openvdb::Index>(first + n)); });
     } else {
-      Value const* const values = last.place.values + first;
+      Value const* const values = last.values + first;
       if (step == 1) return copyBlock(values, samples);
       fill([&](int n) { return values[n]; });
     }
   }
 
-  static void fillState(Accessor& grid, int3 const& corner, int depth, unsigned char* states) {
+  static void fillState(Search& search, int3 const& corner, int depth, unsigned char* states) {
     Coord const origin = toCoord(corner);
     if (depth == VdbTraits::kMaxDepth) {
-      Leaf const* leaf = grid.probeConstLeaf(origin);
+      Leaf const* const leaf = search.at(origin).leaf;
       if (!leaf) return;
       writeBlockStates(*leaf, static_cast<int>(Leaf::coordToOffset(origin)), states);
       return;
@@ -457,26 +551,29 @@ private:
       for (int j = 0; j < 4; ++j)
         for (int i = 0; i < 4; ++i, ++states) {
           Coord const c = origin.offsetBy(i * step, j * step, k * step);
-          if (grid.getValueDepth(c) == level && grid.isValueOn(c)) *states = kVdbStateActive;
+          auto const place = search.at(c);
+          if (place.level == level && place.active) *states = kVdbStateActive;
         }
   }
 
   typename GridT::ConstPtr m_grid;
+  std::shared_ptr<PackedLeaves> m_packed; ///< null where leaves have buffers
   Value m_background;
-  std::vector<Leaf const*> m_leaves; ///< along the Z-shaped curve
-  std::vector<WideTile> m_wide;      ///< likewise
+  std::vector<Leaf const*> m_leaves;        ///< along the Z-shaped curve
+  std::vector<LeafDigest<Value>> m_digests; ///< by the leaves' numbers, their transient data
+  std::vector<WideTile> m_wide;             ///< likewise
   std::optional<std::string> m_whyNot;
   GridSummary m_summary;
   VdbActiveRule m_rule = VdbActiveRule::kChannel;
 };
 
 /// Source of the one type among `Grids` that fits.
-template <class... Grids> std::unique_ptr<GridSource> sourceAmong(openvdb::GridBase::ConstPtr const& grid) {
+template <class... Grids> std::unique_ptr<GridSource> sourceAmong(GridToRead const& from) {
   std::unique_ptr<GridSource> source;
   auto const attempt = [&]<class GridT>(GridT const*) {
     if (source) return;
-    if (auto typed = openvdb::gridConstPtrCast<GridT>(grid))
-      source = std::make_unique<TypedGrid<GridT>>(typed);
+    if (auto typed = openvdb::gridPtrCast<GridT>(from.grid))
+      source = std::make_unique<TypedGrid<GridT>>(typed, from.packed);
   };
   (attempt(static_cast<Grids const*>(nullptr)), ...);
   return source;

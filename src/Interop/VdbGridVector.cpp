@@ -4,13 +4,13 @@
 
 namespace VLN::Interop {
 
-std::unique_ptr<GridSource> makeVectorSource(openvdb::GridBase::ConstPtr const& grid) {
+std::unique_ptr<GridSource> makeVectorSource(GridToRead const& from) {
   return sourceAmong<openvdb::Vec3SGrid, openvdb::Vec3DGrid
 #if VLN_HAS_ELEMENT_INT3
                      ,
                      openvdb::Vec3IGrid
 #endif
-                     >(grid);
+                     >(from);
 }
 
 openvdb::GridBase::Ptr makeVectorGrid(std::string const& type, GridToWrite const& from) {

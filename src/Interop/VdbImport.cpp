@@ -55,7 +55,9 @@ std::vector<Group> groupByTransform(VdbFile const& file, std::vector<SkippedGrid
   std::vector<Group> groups;
   for (auto const& base : file.grids) {
     std::string type;
-    auto source = makeGridSource(withoutMask(base), type);
+    auto const packed = file.packed.find(base.get());
+    auto source =
+        makeGridSource({withoutMask(base), packed == file.packed.end() ? nullptr : packed->second}, type);
     if (!source) {
       if (isPointGrid(*base)) continue;
       skipped.push_back({base->getName(), "grids of type " + oneLine(type) + " are not read"});
@@ -271,8 +273,9 @@ VdbImport importGrids(VdbFile& file, VdbReadLimits const& limits, Progress const
 
 VdbImport importVdb(std::string const& path, VdbReadLimits const& limits, Progress const& progress) {
   report(progress, "reading", 0);
-  VdbFile file =
-      readVdbFile(path, limits, [&](double share) { report(progress, "reading", kReadDone * share); });
+  VdbFile file = readVdbFile(
+      path, limits, [&](double share) { report(progress, "reading", kReadDone * share); },
+      LeafMemory::kPacked);
   return importGrids(file, limits, progress);
 }
 

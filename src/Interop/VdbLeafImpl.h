@@ -25,12 +25,13 @@ template <class LeafT> class LeafValues {
 public:
   using Value = typename LeafT::ValueType;
 
-  explicit LeafValues(LeafT const& leaf) {
+  /// @param values Where they are, unless they are bits.
+  LeafValues(LeafT const& leaf, Value const* values) {
     if constexpr (std::is_same_v<Value, bool>) {
       for (openvdb::Index n = 0; n < LeafT::SIZE; ++n) m_copy[n] = leaf.getValue(n);
       m_values = m_copy;
     } else {
-      m_values = leaf.buffer().data();
+      m_values = values;
     }
   }
   LeafValues(LeafValues const&) = delete;
@@ -44,21 +45,6 @@ private:
   Value const* m_values;
   [[no_unique_address]] std::conditional_t<std::is_same_v<Value, bool>, bool[512], Nothing> m_copy;
 };
-
-/// Whether the four voxels from `row` on hold a value, bit for bit.
-template <class V> bool rowHolds(V const* row, V const& value) {
-  if constexpr (sizeof(V) == 4) {
-    std::uint32_t bits;
-    std::memcpy(&bits, &value, sizeof bits);
-    std::uint64_t const twice = bits | std::uint64_t(bits) << 32;
-    std::uint64_t pairs[2];
-    std::memcpy(pairs, row, sizeof pairs);
-    return ((pairs[0] ^ twice) | (pairs[1] ^ twice)) == 0;
-  } else {
-    return sameBits(row[0], value) && sameBits(row[1], value) && sameBits(row[2], value) &&
-           sameBits(row[3], value);
-  }
-}
 
 /// Bits of 64 values that pass a test.
 template <class V, class Test> std::uint64_t wordOf(V const* values, Test const& test) {
@@ -198,124 +184,17 @@ template <class V, class T> void copyBlock(V const* block, T* samples) {
 /// Writes the states of a block's voxels, as the samples of a tile: i fastest. The block begins with voxel
 /// `first`.
 template <class LeafT> void writeBlockStates(LeafT const& leaf, int first, unsigned char* states) {
+  std::uint32_t rows[kBlockWidth] = {}; // for each j, a byte for each i, and a bit of that for each k
   for (int i = 0; i < kBlockWidth; ++i) {
     std::uint64_t const word = maskWord(leaf, first / 64 + i) >> first % 64;
-    for (int j = 0; j < kBlockWidth; ++j)
-      for (int k = 0; k < kBlockWidth; ++k)
-        states[i + 4 * j + 16 * k] =
-            static_cast<unsigned char>(kVdbStateLeaf | (word >> (8 * j + k) & 1) * kVdbStateActive);
+    for (int j = 0; j < kBlockWidth; ++j) rows[j] |= std::uint32_t(word >> 8 * j & 0xF) << 8 * i;
   }
-}
-
-/// What lies at the place of a leaf: one, or a value of the tile there.
-template <class TreeT> struct LeafPlace {
-  using Leaf = typename TreeT::LeafNodeType;
-  using Value = typename TreeT::ValueType;
-
-  Leaf const* leaf = nullptr;
-  Value const* values = nullptr; ///< of the leaf, unless they are bits
-  Value value{};                 ///< without a leaf
-  bool isNarrow = false;         ///< whether the tile is known to be as wide as a leaf
-
-  using Lower = typename TreeT::RootNodeType::ChildNodeType::ChildNodeType;
-
-  template <class AccessorT> void lookUp(AccessorT& grid, Coord const& corner) {
-    take(grid.probeConstLeaf(corner));
-    if (!leaf) value = grid.getValue(corner);
-  }
-  /// The same where the node above is known.
-  void lookUp(Lower const& lower, Coord const& corner) {
-    auto const slot = Lower::coordToOffset(corner);
-    take(lower.isChildMaskOn(slot) ? lower.getTable()[slot].getChild() : nullptr);
-    if (!leaf) value = lower.getTable()[slot].getValue(), isNarrow = true;
-  }
-  void take(Leaf const* found) {
-    leaf = found;
-    if constexpr (!std::is_same_v<Value, bool>)
-      if (leaf) values = leaf->buffer().data();
-  }
-  Value valueAt(int n) const {
-    if (!leaf) return value;
-    if constexpr (std::is_same_v<Value, bool>)
-      return leaf->getValue(static_cast<openvdb::Index>(n));
-    else
-      return values[n];
-  }
-  /// Whether I x J x K voxels, each 1 or 4, from voxel number n on hold a value.
-  template <int I, int J, int K> bool holds(int n, Value const& wanted) const {
-    if (!leaf) return sameBits(value, wanted);
-    for (int i = 0; i < I; ++i)
-      for (int j = 0; j < J; ++j) {
-        int const row = n + 64 * i + 8 * j;
-        if constexpr (std::is_same_v<Value, bool>) {
-          for (int k = 0; k < K; ++k)
-            if (valueAt(row + k) != wanted) return false;
-        } else if (K == 1 ? !sameBits(values[row], wanted) : !rowHolds(values + row, wanted)) {
-          return false;
-        }
-      }
-    return true;
-  }
-};
-
-/// The places round the place of one leaf, each looked up when it is first asked for.
-template <class GridT> class LeafPlaces {
-public:
-  using TreeT = typename GridT::TreeType;
-  using Value = typename GridT::ValueType;
-  using Accessor = typename GridT::ConstAccessor;
-
-  LeafPlaces(Accessor& grid, Coord const& origin)
-      : m_grid(grid)
-      , m_origin(origin)
-      , m_lower(grid.template probeConstNode<Lower>(origin)) {}
-
-  /// The place x, y, z leaves away, each -1, 0 or 1.
-  LeafPlace<TreeT> const& at(int x, int y, int z) {
-    auto const n = static_cast<std::size_t>(9 * (x + 1) + 3 * (y + 1) + z + 1);
-    LeafPlace<TreeT>& place = m_lookupTable[n];
-    if (!m_known[n]) {
-      m_known[n] = true;
-      Coord const corner = m_origin.offsetBy(kLeafWidth * x, kLeafWidth * y, kLeafWidth * z);
-      auto const sameNode = [&](int a) {
-        return (static_cast<unsigned>(corner[a]) ^ static_cast<unsigned>(m_origin[a])) <
-               unsigned(kNodeWidths[1]);
-      };
-      if (m_lower && sameNode(0) && sameNode(1) && sameNode(2))
-        place.lookUp(*m_lower, corner);
-      else
-        place.lookUp(m_grid, corner);
+  constexpr std::uint32_t kEach = 0x01010101;
+  for (int k = 0; k < kBlockWidth; ++k)
+    for (int j = 0; j < kBlockWidth; ++j) {
+      std::uint32_t const four = kVdbStateLeaf * kEach | (rows[j] >> k & kEach) * kVdbStateActive;
+      std::memcpy(states + 4 * j + 16 * k, &four, sizeof four);
     }
-    return place;
-  }
-
-  /// Whether all voxels of a block, and the layer of voxels beyond its high sides, hold one value: then every
-  /// blend that begins in the block gives that value.
-  /// @param block In blocks from the leaf's origin, each -1, 0 or 1.
-  bool isUniform(int x, int y, int z) {
-    Value const first = valueAt(x, y, z);
-    // The few voxels beyond edges first: where values change, they mostly tell.
-    return holds<1, 1, 1>(x + 1, y + 1, z + 1, first) && holds<1, 1, 4>(x + 1, y + 1, z, first) &&
-           holds<1, 4, 1>(x + 1, y, z + 1, first) && holds<4, 1, 1>(x, y + 1, z + 1, first) &&
-           holds<1, 4, 4>(x + 1, y, z, first) && holds<4, 1, 4>(x, y + 1, z, first) &&
-           holds<4, 4, 1>(x, y, z + 1, first) && holds<4, 4, 4>(x, y, z, first);
-  }
-  /// The first voxel of a block.
-  Value valueAt(int x, int y, int z) { return at(x >> 1, y >> 1, z >> 1).valueAt(numberIn(x, y, z)); }
-
-private:
-  static int numberIn(int x, int y, int z) { return kBlockWidth * (64 * (x & 1) + 8 * (y & 1) + (z & 1)); }
-  template <int I, int J, int K> bool holds(int x, int y, int z, Value const& wanted) {
-    return at(x >> 1, y >> 1, z >> 1).template holds<I, J, K>(numberIn(x, y, z), wanted);
-  }
-
-  using Lower = typename LeafPlace<TreeT>::Lower;
-
-  Accessor& m_grid;
-  Coord m_origin;
-  Lower const* m_lower; ///< the node that the leaf's place is in, if it is that fine
-  LeafPlace<TreeT> m_lookupTable[27];
-  bool m_known[27] = {};
-};
+}
 
 } // namespace VLN::Interop

@@ -6,8 +6,8 @@ std::string valueTypeOf(openvdb::GridBase const& grid) {
   return grid.isType<openvdb::MaskGrid>() ? kMaskType : grid.valueType();
 }
 
-openvdb::GridBase::ConstPtr withoutMask(openvdb::GridBase::ConstPtr const& grid) {
-  auto const mask = openvdb::gridConstPtrCast<openvdb::MaskGrid>(grid);
+openvdb::GridBase::Ptr withoutMask(openvdb::GridBase::Ptr const& grid) {
+  auto const mask = openvdb::gridPtrCast<openvdb::MaskGrid>(grid);
   if (!mask) return grid;
   auto bools = openvdb::BoolGrid::create(
       std::make_shared<openvdb::BoolTree>(mask->tree(), false, true, openvdb::TopologyCopy()));

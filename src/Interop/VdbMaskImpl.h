@@ -12,7 +12,7 @@ inline constexpr char const* kMaskType = "mask";
 std::string valueTypeOf(openvdb::GridBase const& grid);
 
 /// The grid itself, or a grid of bools with name, transform and metadata of a mask grid.
-openvdb::GridBase::ConstPtr withoutMask(openvdb::GridBase::ConstPtr const& grid);
+openvdb::GridBase::Ptr withoutMask(openvdb::GridBase::Ptr const& grid);
 
 /// The way back: a mask grid of the same active voxels and tiles.
 openvdb::GridBase::Ptr maskOf(openvdb::GridBase const& bools);
