@@ -41,7 +41,9 @@ template <class V, class T> V fromElement(T const& v) {
 }
 
 /// Equal bit for bit, so that NaN and the sign of zero count.
-template <class V> bool sameBits(V const& a, V const& b) { return std::memcmp(&a, &b, sizeof(V)) == 0; }
+template <class V> bool sameBits(V const& a, V const& b) {
+  return std::memcmp(&a, &b, sizeof(V)) == 0; // NOLINT(bugprone-suspicious-memory-comparison)
+}
 
 /// Value, or length of a vector.
 template <class T> double magnitude(T const& v) {

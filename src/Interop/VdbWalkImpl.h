@@ -205,6 +205,7 @@ void spreadValues(WrittenValues const& values, char const* activeMask, Value con
       std::fill_n(out, 64, inactive[second & 1]);
     else
       for (int n = 0; n < 64; ++n) out[n] = inactive[second >> n & 1];
+    // As many were written as the mask has bits. NOLINTNEXTLINE(clang-analyzer-core.uninitialized.Assign)
     for (; active != 0; active &= active - 1) out[std::countr_zero(active)] = *written++;
   }
 }
