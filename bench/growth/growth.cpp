@@ -17,6 +17,7 @@
 #include <fstream>
 #include <random>
 #include <sstream>
+#include <stdexcept>
 
 #include <stdlib.h>
 
@@ -75,6 +76,8 @@ void run(double millions) {
     float const background = core->defaultValue();
     Wide wide("", &background, kInitializeDefaultValue, true, true, core->minDepth(), core->depth());
     wide.update(*topology);
+    // Where the one block for all tiles is not to be had, a channel stays as it was.
+    if (wide.tileCount(-1) != tree->tileCount(-1)) throw std::runtime_error("no memory for wide tiles");
     step("halos", [&] { computeHalo<Shape, float, 0, 0, 1, 0>(*core, *tree, wide, -1, -1); });
     FloatVoxelSamplerLinear<Shape> const sampler(*tree, *topology, wide);
     std::mt19937 random(1);
