@@ -561,7 +561,7 @@ private:
   Value m_background;
   std::vector<Leaf const*> m_leaves;        ///< along the Z-shaped curve
   std::vector<LeafDigest<Value>> m_digests; ///< by the leaves' numbers, their transient data
-  std::vector<WideTile> m_wide;             ///< likewise
+  std::vector<WideTile> m_wide;             ///< along the Z-shaped curve
   std::optional<std::string> m_whyNot;
   GridSummary m_summary;
   VdbActiveRule m_rule = VdbActiveRule::kChannel;
