@@ -82,6 +82,32 @@ std::vector<Order> orders() {
   for (int n = 0; n < 600; ++n)
     apart.positions.push_back({n % 7 + (n % 3) * (1 << 16), n % 5 + (n % 2) * (1 << 20), (n / 50 % 2) << 24});
   all.push_back(apart);
+  // Few to a tile, in more blocks than a chunk remembers; the second half has some that the first has not.
+  Order scattered{"scattered", {}};
+  for (int n = 0; n < 40000; ++n) {
+    int const width = n < 20000 ? 150 : 170;
+    auto const next = [&] { return static_cast<int>(random() % static_cast<unsigned>(width)) - 70; };
+    int const x = next(), y = next();
+    scattered.positions.push_back({x, y, next()});
+  }
+  all.push_back(scattered);
+  // Rows over what was scattered before, but not where that began.
+  Order over{"rows over scattered ones", {}};
+  for (int n = 0; n < 15000; ++n) {
+    auto const next = [&] { return static_cast<int>(random() % 60) + (n < 1200 ? 1000 : 0); };
+    int const x = next(), y = next();
+    over.positions.push_back({x, y, next()});
+  }
+  auto const rows = boxOf({0, 0, 0}, {60, 60, 15}, 0, 1);
+  over.positions.insert(over.positions.end(), rows.begin(), rows.end());
+  all.push_back(over);
+  // Chunks that meet within blocks, and write the same elements: each plane comes again half a plane later.
+  Order planes{"planes again and again", {}};
+  for (int n = 0; n < 12; ++n) {
+    auto const plane = boxOf({-30, -30, n / 2 - 1}, {80, 80, 1}, 0, 1);
+    planes.positions.insert(planes.positions.end(), plane.begin(), plane.end());
+  }
+  all.push_back(planes);
   Order ends{"ends of the domain", boxOf({kHigh - 9, kHigh - 2, kLow}, {10, 3, 3}, 0, 1)};
   for (int3 const& p : boxOf({kLow, kLow, kHigh - 20}, {2, 2, 21}, 2, 0)) ends.positions.push_back(p);
   all.push_back(ends);
@@ -143,6 +169,30 @@ TEST(BulkSetTest, RequirementElementsOfEverySize) {
   }
 }
 
+/// Few tiles are made one by one, many together: in the same order for any number of threads.
+TEST(BulkSetTest, RequirementTilesAreNumberedTheSameForAnyNumberOfThreads) {
+  auto all = orders();
+  Order few{"many positions in few tiles", std::vector<int3>(20000, {1, 2, 3})};
+  int3 const later[3] = {{4, 0, 4}, {12, 0, 0}, {0, 4, 0}}; // of two blocks in turns
+  for (std::size_t n = 0; n < 20000; ++n) few.positions.push_back(later[n % 3]);
+  all.push_back(few);
+  for (Order const& order : all) {
+    std::vector<float> const values(order.positions.size(), 1.0f);
+    std::vector<int3> first;
+    for (int const threads : {1, 2, 3, 8}) {
+      Volume volume;
+      auto field = volume.addField<float>("f", 0);
+      VLN::withThreads(threads, [&] { field.set(order.positions, values); });
+      std::vector<int3> corners;
+      for (int d = 0; d <= 28; ++d)
+        for (std::int64_t n = 0; n < volume.tree().tileCount(d); ++n)
+          corners.push_back(volume.tree().tile(n, d).tijk());
+      if (threads == 1) first = corners;
+      EXPECT_EQ(corners, first) << order.name << ", " << threads << " threads";
+    }
+  }
+}
+
 TEST(BulkSetTest, RequirementSomeTilesThereAndSomeNot) {
   auto const box = boxOf({-9, -9, -9}, {40, 40, 40}, 0, 1);
   Volume volume;
@@ -173,6 +223,10 @@ TEST(BulkSetTest, NegativeBeyondTheDomainAfterManyTiles) {
     EXPECT_EQ(field.get(3, 3, 3), 5.0f);
     field.set(3, 3, 3, 7);
     for (float const& element : field.channel()) ASSERT_EQ(element, 7.0f) << threads << " threads";
+    // And the field is sound.
+    std::span const inside(positions.data(), positions.size() - 1);
+    field.set(inside, std::span(values).first(inside.size()));
+    for (int3 const& p : inside) ASSERT_EQ(field.get(p), 1.0f) << threads << " threads";
   }
 }
 

@@ -1,5 +1,8 @@
 #include "GeometryVolume/volume/detail/FieldBlocks.h"
 
+#include <algorithm>
+#include <iterator>
+
 namespace VLN::TileTree3D::Internal {
 
 FieldBlock* FieldBlocks::noBlock() {
@@ -7,26 +10,32 @@ FieldBlock* FieldBlocks::noBlock() {
   return &none;
 }
 
-FieldBlock& FieldBlocks::make(int3 const& position) {
+FieldBlock& FieldBlocks::make(int3 const& position, FieldBlock* block) {
   if (2 * (m_used + 1) > m_slots.size()) resize(2 * m_slots.size());
   int3 const at{position.x >> 3, position.y >> 3, position.z >> 3};
   std::size_t n = hash(at) & m_mask;
   while (m_slots[n].block && m_slots[n].at != at) n = (n + 1) & m_mask;
   Slot& slot = m_slots[n];
-  FieldBlock& block = slot.block ? *slot.block : newBlock();
   if (!slot.block) {
-    slot = {at, &block};
+    slot = {at, block ? block : &newBlock()};
     ++m_used;
   }
-  return block;
+  return *slot.block;
 }
 
 FieldBlock& FieldBlocks::newBlock() {
   if (m_left == 0) {
-    m_chunks.emplace_back(kChunk);
-    m_left = kChunk;
+    m_left = std::clamp(m_used, kFirstChunk, kMostChunk);
+    m_chunks.emplace_back(m_left);
   }
-  return m_chunks.back()[kChunk - m_left--];
+  return m_chunks.back()[m_chunks.back().size() - m_left--];
+}
+
+void FieldBlocks::takeMemory(FieldBlocks& other) {
+  // In front: the last one is this table's own, and has blocks left.
+  m_chunks.insert(m_chunks.begin(), std::move_iterator(other.m_chunks.begin()),
+                  std::move_iterator(other.m_chunks.end()));
+  other.clear();
 }
 
 void FieldBlocks::clear() { *this = FieldBlocks(); }

@@ -1,6 +1,7 @@
 // BulkRuns: many positions, grouped so that threads may write their elements without meeting.
 #pragma once
 
+#include "GeometryVolume/core/FunctionRef.h"
 #include "GeometryVolume/volume/PartPlacesImpl.h"
 #include "GeometryVolume/volume/detail/VolumeData.h"
 
@@ -13,6 +14,9 @@
 
 namespace VLN::TileTree3D::Internal {
 
+/// How many blocks before its turn one is fetched.
+inline constexpr std::size_t kAhead = 8;
+
 /// Consecutive positions in one block. They are a row, each one sample behind the one before it along an
 /// axis, or loose.
 struct BulkRun {
@@ -24,31 +28,44 @@ struct BulkRun {
   std::uint8_t slot, element; ///< of a row's first position
 };
 
-/// Runs by chunks of `grain` positions and by shares, in the order of the positions. A block belongs to one
-/// share: whoever writes each share chunk by chunk writes what comes last last, whatever the number of
-/// shares.
+/// Tiles that a chunk of positions makes for itself and writes at once, where the field has no tiles near.
+/// @threads One at a time.
+struct ChunkTiles {
+  explicit ChunkTiles(ArrayAhead its)
+      : values(its) {}
+  virtual ~ChunkTiles();
+  /// Makes elements, with the values that are read there.
+  /// @param tiles Their block gets them.
+  virtual void make(BlockTiles& tiles) = 0;
+  /// Writes runs that begin at these places and values of the chunk.
+  virtual void write(std::span<BulkRun const> runs, BulkPlace const* places) const = 0;
+
+  ArrayAhead const values; ///< of the chunk
+};
+
+/// Blocks that a chunk of positions made because the field had none there, or lacked tiles of them.
+struct ChunkBlocks {
+  FieldBlocks own;    ///< with tiles of the chunk's ChunkTiles
+  FieldBlocks listed; ///< what lies in them is only listed: the field makes it for all chunks together
+};
+
+/// Runs that are left to be written, by chunks of positions and by shares; those of one block in the order of
+/// the positions. A block belongs to one share: whoever writes each share chunk by chunk writes what comes
+/// last last, whatever the number of shares.
 struct BulkRuns {
-  std::size_t grain = 0, chunks = 0, shares = 1;
+  std::vector<std::size_t> begins; ///< of the chunks, and the end
+  std::size_t shares = 1;
   std::unique_ptr<BulkPlace[]> places; ///< of loose positions
   std::vector<std::vector<BulkRun>> lists;
-  std::vector<FieldBlocks>
-      made; ///< for each chunk, copies of blocks that were not there when it was looked at
+  std::vector<ChunkBlocks> made; ///< for each chunk
 
-  /// For each chunk the tiles that were made for it; the first of its runs in one writes their background.
-  /// Before, they are unwritten: memory is written when it is about to be written again.
-  std::vector<std::vector<BlockTiles>> tilesMade;
-
-  /// To all tiles that are still unwritten.
-  void writeBackground(FieldSlot const& slot) {
-    for (auto& chunk : tilesMade)
-      for (BlockTiles& tiles : chunk) slot.writeBackground(tiles);
-  }
+  std::size_t chunks() const { return begins.size() - 1; }
   /// Which share writes a block. Shares are made of cubes of 32 samples: small enough to balance, and wide
   /// enough that positions in order are read in order.
   std::size_t shareOf(int3 const& at) const {
     auto const x = static_cast<std::uint32_t>(at.x) >> 5, y = static_cast<std::uint32_t>(at.y) >> 5,
                z = static_cast<std::uint32_t>(at.z) >> 5;
-    return (x + 3 * y + 5 * z) % shares;
+    return (x + 3 * y + 5 * z) % static_cast<std::uint32_t>(shares);
   }
   std::vector<BulkRun>& list(std::size_t chunk, std::size_t share) { return lists[chunk * shares + share]; }
   std::vector<BulkRun> const& list(std::size_t chunk, std::size_t share) const {
@@ -56,9 +73,14 @@ struct BulkRuns {
   }
 };
 
-/// Makes the tiles that are missing, and groups the positions.
-/// @error std::out_of_range beyond the domain. Tiles may have been made then, which changes no value.
-VLN_API BulkRuns planBulk(VolumeData& volume, FieldSlot& slot, std::span<int3 const> positions);
+/// Begins the own tiles of a chunk whose first position has this number. Any thread may call it.
+using ChunkTilesBegin = FunctionRef<std::unique_ptr<ChunkTiles>(std::size_t)>;
+
+/// Makes the tiles that are missing, writes those that one chunk alone writes, and groups the positions that
+/// are left to be written.
+/// @error std::out_of_range beyond the domain. What is thrown leaves all values as they were.
+VLN_API BulkRuns planBulk(VolumeData& volume, FieldSlot& slot, std::span<int3 const> positions,
+                          ChunkTilesBegin chunkTiles);
 
 template <int kAxis, class T>
 [[gnu::always_inline]] inline void writeRow(BulkRun const& row, T const* values) {

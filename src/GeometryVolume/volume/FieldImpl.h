@@ -27,8 +27,33 @@ inline constexpr int kFinest = VolumeShape::kMaxDepth;
 inline constexpr std::size_t kTileElements = 64;
 /// Blocks whose missing tiles a thread makes at a time.
 inline constexpr std::int64_t kGroupBlocks = 64;
-/// How many blocks before its turn one is fetched.
-inline constexpr std::size_t kAhead = 8;
+
+template <class T> struct TypedSlot;
+
+template <class T> struct TypedChunkTiles final : ChunkTiles {
+  TypedChunkTiles(TypedSlot<T> const& slot, VolumeTree const& tree, T const* first)
+      : ChunkTiles({reinterpret_cast<std::uintptr_t>(first), sizeof(T)})
+      , m_slot(slot)
+      , m_tree(tree)
+      , m_accessor(tree.tileAccessor())
+      , m_values(first) {}
+  void make(BlockTiles& wanted) override {
+    tiles.appendFew(std::size_t(std::popcount(wanted.slots)), [&](auto& group) {
+      m_slot.makeElements(m_tree, m_accessor, {&wanted, 1}, group);
+    });
+  }
+  void write(std::span<BulkRun const> runs, BulkPlace const* places) const override {
+    for (BulkRun const& run : runs) writeRun(run, places + run.begin, m_values + run.begin);
+  }
+
+  PendingTiles<T> tiles;
+
+private:
+  TypedSlot<T> const& m_slot;
+  VolumeTree const& m_tree;
+  VolumeTree::ConstTileAccessor m_accessor;
+  T const* m_values;
+};
 
 template <class T> struct TypedSlot final : FieldSlot {
   using ChannelType = Channel<VolumeShape, T, 4, 0>;
@@ -90,13 +115,12 @@ template <class T> struct TypedSlot final : FieldSlot {
       for (PendingTile<T> const& tile : m_pending.group(n)) corners.append(tile.corner);
   }
 
-  void makePending(VolumeData& volume, std::span<BlockTiles> tiles, bool later) override {
+  void makePending(VolumeData& volume, std::span<BlockTiles> tiles) override {
     std::size_t entered = 0;
     VLN::Internal::Rollback entries([&] {
       for (BlockTiles& made : tiles.first(entered)) {
         for (std::uint32_t left = made.slots; left; left &= left - 1)
           made.block->tiles[static_cast<std::size_t>(std::countr_zero(left))].storeRelaxed(nullptr);
-        made.unwritten = 0;
       }
     });
     if (tiles.size() > 1) blocks.reserve(tiles.size());
@@ -114,26 +138,45 @@ template <class T> struct TypedSlot final : FieldSlot {
       ++entered;
     }
     if (tiles.size() == 1)
-      m_pending.appendOne(
-          [&](auto& group) { makeElements(*volume.tree, volume.reader(), tiles, later, group); });
+      m_pending.appendFew(std::size_t(std::popcount(tiles[0].slots)),
+                          [&](auto& group) { makeElements(*volume.tree, volume.reader(), tiles, group); });
     else
       m_pending.append(
           static_cast<std::size_t>(chunkCount(0, std::ssize(tiles), kGroupBlocks)), [&](auto* groups) {
             parallelChunks(0, std::ssize(tiles), kGroupBlocks, [&](auto n, auto begin, auto end) {
-              makeGroup(*volume.tree, tiles.subspan(std::size_t(begin), std::size_t(end - begin)), later,
-                        groups[n]);
+              makeGroup(*volume.tree, tiles.subspan(std::size_t(begin), std::size_t(end - begin)), groups[n]);
             });
           });
     entries.dismiss();
     volume.pending.store(true, std::memory_order_release);
   }
 
-  void writeBackground(BlockTiles& tiles) const override {
-    for (; tiles.unwritten; tiles.unwritten &= tiles.unwritten - 1) {
-      auto const slot = static_cast<std::size_t>(std::countr_zero(tiles.unwritten));
-      std::fill_n(static_cast<T*>(tiles.block->tiles[slot].loadAcquire()), kTileElements,
-                  m_channel->defaultValue());
-    }
+  void adopt(VolumeData& volume, std::span<std::unique_ptr<ChunkTiles>> chunks) override {
+    std::vector<PendingTiles<T>*> tiles;
+    for (auto const& chunk : chunks) tiles.push_back(&static_cast<TypedChunkTiles<T>&>(*chunk).tiles);
+    m_pending.take(tiles);
+    volume.pending.store(true, std::memory_order_release);
+  }
+  std::size_t pendingGroups() const override { return m_pending.groupCount(); }
+  void dropUnentered(std::size_t first) override {
+    parallelFor(static_cast<std::int64_t>(first), static_cast<std::int64_t>(m_pending.groupCount()),
+                [&](std::int64_t begin, std::int64_t end) {
+                  for (auto n = begin; n < end; ++n)
+                    std::erase_if(m_pending.group(static_cast<std::size_t>(n)),
+                                  [&](PendingTile<T> const& tile) {
+                                    int3 const& p = tile.corner;
+                                    return blocks.tile(p.x, p.y, p.z) != tile.elements.data();
+                                  });
+                });
+  }
+  void dropGroups(std::size_t first) noexcept override {
+    for (std::size_t n = first; n < m_pending.groupCount(); ++n)
+      for (PendingTile<T> const& tile : m_pending.group(n)) {
+        int3 const& p = tile.corner;
+        if (FieldBlock* const block = blocks.find(p.x, p.y, p.z); block != FieldBlocks::noBlock())
+          block->tiles[FieldBlock::place(p.x, p.y, p.z).slot()].storeRelease(nullptr);
+      }
+    m_pending.cutBack(first);
   }
 
   void tilesRemoved(VolumeData& volume, TileRemovalList const& moves) override {
@@ -163,6 +206,30 @@ template <class T> struct TypedSlot final : FieldSlot {
     volume.rest.putComponent(std::move(halo));
   }
 
+  /// Makes elements and enters them.
+  void makeElements(VolumeTree const& tree, VolumeTree::ConstTileAccessor const& accessor,
+                    std::span<BlockTiles> tiles, typename PendingTiles<T>::Group& out) const {
+    bool const grown = tree.tileCount(-1) > 0;
+    for (std::size_t n = 0; n < tiles.size(); ++n) {
+      if (n + kAhead < tiles.size())
+        __builtin_prefetch(tiles[n + kAhead].block, 1); // another thread's so far
+      BlockTiles& block = tiles[n];
+      TreeIndex above; // the deepest tile of the tree there
+      bool ofAll = !grown;
+      for (std::uint32_t left = block.slots; left; left &= left - 1) {
+        auto const slot = static_cast<std::size_t>(std::countr_zero(left));
+        int3 const p = FieldBlock::tileCorner(block.position, slot);
+        if (!ofAll) above = accessor.treeIndex(p.x, p.y, p.z, kFinest, false);
+        ofAll = ofAll || above.depth < kFinest - 1; // the block is a tile of that depth
+        TileVector<T> elements = m_channel->newTile();
+        if (above.depth == kFinest || elements.size() < kTileElements)
+          throw std::logic_error("field \"" + name + "\": a tile holds no elements");
+        if (above.valid()) fillFromCoarse(tree, above, p, elements);
+        out.emplace_back(p, std::move(elements));
+        block.block->tiles[slot].storeRelease(out.back().elements.data());
+      }
+    }
+  }
   TileArrays<T> const& tiles() const { return *std::as_const(*m_channel).tileArrays(); }
   TileVector<T> const& tile(TreeIndex const& at) const {
     return tiles()[static_cast<std::size_t>(at.depth)][static_cast<std::size_t>(at.index)];
@@ -203,7 +270,7 @@ private:
       to[at] = p[(at & 3) / 2 + (at >> 2 & 3) / 2 * 4 + (at >> 4) / 2 * 16];
   }
   /// The same for a tile with missing ones above it: from the tile `at`, the deepest there is.
-  void fillFromCoarse(VolumeTree const& tree, TreeIndex at, int3 const& corner, TileVector<T>& to) {
+  void fillFromCoarse(VolumeTree const& tree, TreeIndex at, int3 const& corner, TileVector<T>& to) const {
     while (at.valid() && tile(at).size() < kTileElements) at = tree.tile(at).parentTreeIndex();
     if (!at.valid()) return;
     TileVector<T> const& from = tile(at);
@@ -215,39 +282,11 @@ private:
           ConstTileData<T, 4, 0>::index(p[n >> 1 & 1].x, p[n >> 3 & 1].y, p[n >> 5].z))];
   }
 
-  void makeGroup(VolumeTree const& tree, std::span<BlockTiles> tiles, bool later,
-                 typename PendingTiles<T>::Group& out) {
+  void makeGroup(VolumeTree const& tree, std::span<BlockTiles> tiles, typename PendingTiles<T>::Group& out) {
     std::size_t count = 0;
     for (BlockTiles const& block : tiles) count += static_cast<std::size_t>(std::popcount(block.slots));
     out.reserve(count);
-    makeElements(tree, tree.tileAccessor(), tiles, later, out);
-  }
-  /// Makes elements and enters them.
-  /// @param out Has room for the tiles.
-  void makeElements(VolumeTree const& tree, VolumeTree::ConstTileAccessor const& accessor,
-                    std::span<BlockTiles> tiles, bool later, typename PendingTiles<T>::Group& out) {
-    bool const grown = tree.tileCount(-1) > 0;
-    for (std::size_t n = 0; n < tiles.size(); ++n) {
-      if (n + kAhead < tiles.size())
-        __builtin_prefetch(tiles[n + kAhead].block, 1); // another thread's so far
-      BlockTiles& block = tiles[n];
-      TreeIndex above; // the deepest tile of the tree there
-      bool ofAll = !grown;
-      for (std::uint32_t left = block.slots; left; left &= left - 1) {
-        auto const slot = static_cast<std::size_t>(std::countr_zero(left));
-        int3 const p = FieldBlock::tileCorner(block.position, slot);
-        if (!ofAll) above = accessor.treeIndex(p.x, p.y, p.z, kFinest, false);
-        ofAll = ofAll || above.depth < kFinest - 1; // the block is a tile of that depth
-        bool const unwritten = later && !above.valid();
-        PendingTile<T> made{p, unwritten ? m_channel->unwrittenTile() : m_channel->newTile()};
-        if (above.depth == kFinest || made.elements.size() < kTileElements)
-          throw std::logic_error("field \"" + name + "\": a tile holds no elements");
-        if (above.valid()) fillFromCoarse(tree, above, p, made.elements);
-        out.push_back(std::move(made));
-        block.block->tiles[slot].storeRelease(out.back().elements.data());
-        if (unwritten) block.unwritten |= left & -left;
-      }
-    }
+    makeElements(tree, tree.tileAccessor(), tiles, out);
   }
   /// Makes the finest tiles of the tree that the channel lacks, pending ones by handing over their elements.
   /// What is thrown leaves all as it was.
@@ -367,7 +406,7 @@ template <class T> T* Field<T>::make(int i, int j, int k) {
     int3 const p{i, j, k};
     if (!Internal::VolumeShape::inDomain(p)) Internal::throwOutside(p);
     Internal::BlockTiles tile{p, 1u << Internal::FieldBlock::place(i, j, k).slot()};
-    Internal::typed<T>(*m_slot).makePending(*m_volume, {&tile, 1}, false);
+    Internal::typed<T>(*m_slot).makePending(*m_volume, {&tile, 1});
     findBlock(i, j, k);
   }
   return static_cast<T*>(m_block->tile(i, j, k));
@@ -398,24 +437,19 @@ template <class T> void Field<T>::set(std::span<int3 const> positions, std::span
   if (positions.size() != values.size())
     throw std::invalid_argument("field \"" + m_slot->name + "\": " + std::to_string(positions.size()) +
                                 " positions with " + std::to_string(values.size()) + " values");
-  BulkRuns plan = planBulk(*m_volume, *m_slot, positions);
-  m_volume->valuesChanged(*m_slot);
   auto const& slot = typed<T>(*m_slot);
-  VLN::Internal::Rollback unwritten([&] { plan.writeBackground(slot); });
+  BulkRuns const plan = planBulk(*m_volume, *m_slot, positions, [&](std::size_t first) {
+    return std::make_unique<TypedChunkTiles<T>>(slot, *m_volume->tree, values.data() + first);
+  });
+  m_volume->valuesChanged(*m_slot);
   parallelFor(0, static_cast<std::int64_t>(plan.shares), [&](std::int64_t begin, std::int64_t end) {
     for (auto share = static_cast<std::size_t>(begin); share < static_cast<std::size_t>(end); ++share)
-      for (std::size_t chunk = 0; chunk < plan.chunks; ++chunk) {
-        std::size_t const first = chunk * plan.grain;
-        auto made = plan.tilesMade[chunk].begin();
-        auto const madeEnd = plan.tilesMade[chunk].end();
-        for (BulkRun const& run : plan.list(chunk, share)) {
-          for (; made != madeEnd && made->number <= run.begin; ++made)
-            if (plan.shareOf(made->position) == share) slot.writeBackground(*made);
+      for (std::size_t chunk = 0; chunk < plan.chunks(); ++chunk) {
+        std::size_t const first = plan.begins[chunk];
+        for (BulkRun const& run : plan.list(chunk, share))
           writeRun(run, &plan.places[first + run.begin], values.data() + first + run.begin);
-        }
       }
   });
-  unwritten.dismiss();
 }
 
 template <class T> void Field<T>::fill(T const& value) {

@@ -5,13 +5,21 @@
 #include "GeometryVolume/pools/TileDataAllocator.h"
 #include "GeometryVolume/volume/detail/FieldBlocks.h"
 
+#include <algorithm>
 #include <cstddef>
 #include <cstdint>
+#include <iterator>
+#include <span>
+#include <utility>
 #include <vector>
 
 namespace VLN::TileTree3D::Internal {
 
 template <class T> struct PendingTile {
+  PendingTile(int3 const& at, TileVector<T>&& its)
+      : corner(at)
+      , elements(std::move(its)) {}
+
   int3 corner;
   TileVector<T> elements;
   std::int64_t arrival = -1; ///< place among the tiles that are being adopted
@@ -28,18 +36,31 @@ public:
   Group& group(std::size_t n) { return m_groups[n]; }
   Group const& group(std::size_t n) const { return m_groups[n]; }
 
+  /// Takes all groups over.
+  /// @error std::bad_alloc; nothing has changed then.
+  void take(std::span<PendingTiles* const> others) {
+    std::size_t count = m_groups.size();
+    for (PendingTiles const* other : others) count += other->m_groups.size();
+    m_groups.reserve(count);
+    for (PendingTiles* other : others) {
+      std::move(other->m_groups.begin(), other->m_groups.end(), std::back_inserter(m_groups));
+      other->clear();
+    }
+  }
+  /// Drops the groups from `first` on.
+  void cutBack(std::size_t first) { m_groups.resize(std::min(first, m_groups.size())); }
   /// Calls `fill` for `count` groups to be filled.
   /// @error What it throws leaves all as it was.
   template <class Fill> void append(std::size_t count, Fill const& fill) {
     std::size_t const first = m_groups.size();
-    VLN::Internal::Rollback added([&] { m_groups.resize(first); });
+    VLN::Internal::Rollback added([&] { cutBack(first); });
     m_groups.resize(first + count);
     fill(m_groups.data() + first);
     added.dismiss();
   }
-  /// The same for a tile alone: `fill` gets a group that has room for it.
-  template <class Fill> void appendOne(Fill const& fill) {
-    if (!m_groups.empty() && m_groups.back().size() < m_groups.back().capacity())
+  /// The same for few tiles: `fill` gets a group that has room for them.
+  template <class Fill> void appendFew(std::size_t count, Fill const& fill) {
+    if (!m_groups.empty() && m_groups.back().capacity() - m_groups.back().size() >= count)
       return fill(m_groups.back());
     append(1, [&](Group* group) {
       group->reserve(kTogether);

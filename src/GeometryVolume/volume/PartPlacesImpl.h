@@ -36,17 +36,35 @@ struct SlotBytes {
   void drop(std::uint32_t slots) { bytes &= ~(slots * 0x0101010101010101u); }
 };
 
+/// An array that is read in order, and fetched ahead: no processor does that beyond a page of memory. It may
+/// be fetched beyond its end.
+struct ArrayAhead {
+  std::uintptr_t begin;
+  std::size_t elementSize;
+
+  void fetch(std::size_t first, std::size_t count) const {
+    for (std::size_t byte = 0; byte < count * elementSize; byte += 64)
+      __builtin_prefetch(reinterpret_cast<void const*>(begin + first * elementSize + byte));
+  }
+};
+
 /// What is found of a part of the positions.
 class PartPlaces {
 public:
   static constexpr std::uint32_t kMost = 1024, kAtOnce = 8;
 
   /// @param places Gets `count` of them.
-  void find(int3 const* positions, std::size_t count, BulkPlace* places) {
+  /// @param values What is fetched meanwhile, from the part's own on; empty for nothing.
+  void find(int3 const* positions, std::size_t count, BulkPlace* places, ArrayAhead values) {
+    ArrayAhead const ahead{reinterpret_cast<std::uintptr_t>(positions), sizeof(int3)};
     m_first.fill(0);
     Four last{};
     std::size_t n = 0;
-    for (; n + kAtOnce <= count; n += kAtOnce) findEight(positions + n, n, last, places + n);
+    for (; n + kAtOnce <= count; n += kAtOnce) {
+      ahead.fetch(kMost + n, kAtOnce);
+      values.fetch(n, kAtOnce);
+      findEight(positions + n, n, last, places + n);
+    }
     if (n < count) {
       int3 rest[kAtOnce] = {};
       BulkPlace placesOfRest[kAtOnce];

@@ -2,7 +2,9 @@
 
 #include "GeometryVolume/channels/UpdateDispatch.h"
 #include "GeometryVolume/channels/UpdateTopologies.h"
+#include "GeometryVolume/tiletree/Morton.h"
 
+#include <algorithm>
 #include <stdexcept>
 #include <string>
 #include <utility>
@@ -107,6 +109,8 @@ void VolumeData::flushLocked() {
   ++version;
   auto const count = static_cast<std::int64_t>(finest.size());
   if (count <= kFewTiles || count * kBulkShare <= edited.tileCount(-1)) {
+    // Which of them bulk writes made first depends on the number of threads.
+    std::sort(finest.begin(), finest.end(), MortonOrder());
     for (int3 const& p : finest) {
       if (m_accessor.addTileBelow(p.x, p.y, p.z, kFinest) >= 0) continue;
       m_accessor.addTile(p, rootDepth());

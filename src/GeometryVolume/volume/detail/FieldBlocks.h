@@ -50,8 +50,6 @@ struct BlockTiles {
   int3 position;
   std::uint32_t slots;
   FieldBlock* block = nullptr; ///< of the table that they are looked for in
-  std::uint32_t number = 0;    ///< of the position, where it is one of many
-  std::uint32_t unwritten = 0; ///< those of the slots whose elements are as the memory held them
 };
 
 /// @threads As a container of the standard library.
@@ -68,7 +66,11 @@ public:
   /// The elements of the tile at a position, or null.
   void* tile(int i, int j, int k) const { return find(i, j, k)->tile(i, j, k); }
   /// The block that holds the position, made where there is none.
-  FieldBlock& make(int3 const& position);
+  FieldBlock& make(int3 const& position) { return make(position, nullptr); }
+  /// The same where the table has none, or `block`, which it has taken over, instead of a new one.
+  FieldBlock& make(int3 const& position, FieldBlock* block);
+  /// Takes over the memory of another table's blocks, which is empty then.
+  void takeMemory(FieldBlocks& other);
   /// The tile at a position, to be entered. It stays where it is.
   FieldBlock::Entry& entry(int3 const& position) {
     return make(position).tiles[FieldBlock::place(position.x, position.y, position.z).slot()];
@@ -88,7 +90,7 @@ private:
     int3 at;
     FieldBlock* block;
   };
-  static constexpr std::size_t kChunk = 256;
+  static constexpr std::size_t kFirstChunk = 8, kMostChunk = 256;
 
   static std::size_t hash(int3 const& at) {
     std::uint64_t h = static_cast<std::uint32_t>(at.x) * 0x9e3779b97f4a7c15ull;
@@ -101,7 +103,7 @@ private:
 
   std::vector<Slot> m_slots = std::vector<Slot>(16, Slot{{0, 0, 0}, nullptr});
   std::size_t m_mask = 15, m_used = 0;
-  std::vector<std::vector<FieldBlock>> m_chunks; ///< of fixed sizes, so that blocks stay where they are
+  std::vector<std::vector<FieldBlock>> m_chunks; ///< none grows: blocks stay where they are
   std::size_t m_left = 0;                        ///< blocks of the last chunk that are not in use
 };
 

@@ -32,6 +32,7 @@ using VolumeTree = Container<VolumeShape>;
 using VolumeTopology = VoxelTopology<VolumeShape>;
 
 struct VolumeData;
+struct ChunkTiles;
 
 /// Fewer tiles are made one by one; more are worth a pass over lists, in parallel.
 inline constexpr std::int64_t kFewTiles = 256;
@@ -51,12 +52,18 @@ struct VLN_API FieldSlot {
   /// read there. In parallel.
   /// @param tiles In the domain; some may come more than once, or have elements. Gets the blocks, and which
   /// tiles were made.
-  /// @param later Leaves those unwritten that writeBackground() is to write: where no coarser tile is.
   /// @pre The slot is in step and exclusive.
   /// @error What is thrown leaves all as it was.
-  virtual void makePending(VolumeData& volume, std::span<BlockTiles> tiles, bool later) = 0;
-  /// Writes the background to all elements that are unwritten. Any thread may, each to other tiles.
-  virtual void writeBackground(BlockTiles& tiles) const = 0;
+  virtual void makePending(VolumeData& volume, std::span<BlockTiles> tiles) = 0;
+  /// Takes tiles over from chunks. They are pending as soon as the caller has entered them in `blocks`.
+  /// @error What is thrown leaves all as it was.
+  virtual void adopt(VolumeData& volume, std::span<std::unique_ptr<ChunkTiles>> chunks) = 0;
+  /// How many groups of pending tiles there are, to go back to.
+  virtual std::size_t pendingGroups() const = 0;
+  /// Of the groups from `first` on, drops tiles that `blocks` does not lead to.
+  virtual void dropUnentered(std::size_t first) = 0;
+  /// Drops the groups from `first` on, and takes their tiles out of `blocks`.
+  virtual void dropGroups(std::size_t first) noexcept = 0;
   /// Appends the corners of tiles that have elements, but are not in the tree yet.
   virtual void listPending(Ostil::Array<int3>& corners) const = 0;
   /// Makes the channel and its elements the volume's alone.
