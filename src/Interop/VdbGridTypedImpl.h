@@ -4,6 +4,7 @@
 #include "GeometryVolume/core/Parallel.h"
 #include "Interop/VdbGridSourceImpl.h"
 #include "Interop/VdbLeafPlacesImpl.h"
+#include "Interop/VdbZeroTilesImpl.h"
 
 #include <algorithm>
 
@@ -122,6 +123,7 @@ public:
     Element const background = toElement(m_background);
     auto channel = makeEmptyOn<ChannelT>(name, background, topology);
     auto tiles = channel->tileDataAccessor();
+    ZeroTiles<Element> zeros(ChannelT::kSize);
     constexpr std::int64_t kPart = 1 << 16, kPiece = 1 << 14;
     // The deepest tiles come last, and read the voxels leaf by leaf.
     std::vector<Leaf const*> const packed =
@@ -132,11 +134,9 @@ public:
         std::int64_t const last = std::min(first + kPiece, count);
         parallelFor(first, last,
                     [&](std::int64_t begin, std::int64_t end) {
-                      Search search(m_grid->tree());
-                      LastPlace place;
+                      TileMaker make(*this, *channel, zeros);
                       for (std::int64_t n = begin; n < end; ++n)
-                        fillTile(search, place, container.tile(n, depth).tijk(), depth,
-                                 newSamples(*channel, tiles, {n, depth}));
+                        *tiles.tileData({n, depth}).data() = make(container.tile(n, depth).tijk(), depth);
                     },
                     {.grain = 256});
         if (!packed.empty() && depth == VdbTraits::kMaxDepth && last < count)
@@ -148,6 +148,7 @@ public:
       }
     }
     if (m_packed) m_packed->drop(m_leaves.size() * Leaf::SIZE * sizeof(Value));
+    zeros.leaveTo(*channel->cloneData());
     return channel;
   }
 
@@ -487,6 +488,54 @@ private:
     Value const* values = nullptr; ///< of the leaf, unless they are bits
   };
 
+  /// Makes the tiles of a channel, each thread with one of its own.
+  class TileMaker {
+  public:
+    TileMaker(TypedGrid const& grid, ChannelT const& channel, ZeroTiles<Element>& zeros)
+        : m_grid(grid)
+        , m_channel(channel)
+        , m_zeros(zeros)
+        , m_search(grid.m_grid->tree()) {}
+
+    TileVector<Element> operator()(int3 const& corner, int depth) {
+      if (depth == VdbTraits::kMaxDepth) {
+        if (m_grid.isZeroBlock(m_search, m_last, corner)) return m_zeros.take(m_run);
+        auto tile = m_channel.unwrittenTile();
+        m_grid.fillTile(m_search, m_last, corner, depth, tile.data());
+        return tile;
+      }
+      Element samples[ChannelT::kSize];
+      m_grid.fillTile(m_search, m_last, corner, depth, samples);
+      if (areZeros(samples, ChannelT::kSize)) return m_zeros.take(m_run);
+      auto tile = m_channel.unwrittenTile();
+      std::copy(std::begin(samples), std::end(samples), tile.data());
+      return tile;
+    }
+
+  private:
+    TypedGrid const& m_grid;
+    ChannelT const& m_channel;
+    ZeroTiles<Element>& m_zeros;
+    typename ZeroTiles<Element>::Run m_run;
+    Search m_search;
+    LastPlace m_last;
+  };
+
+  /// Whether all bits of the voxels in a block are zero.
+  bool isZeroBlock(Search& search, LastPlace& last, int3 const& corner) const {
+    lookUp(search, last, toCoord(placeOf(corner)));
+    if (!last.place.leaf) return areZeros(&last.place.value, 1);
+    auto const& digest = m_digests[last.place.leaf->transientData()];
+    auto const block = static_cast<unsigned>((corner.x & 4) | (corner.y & 4) >> 1 | (corner.z & 4) >> 2);
+    return (digest.uniform >> 8 * block & 1) && areZeros(&digest.first[block], 1);
+  }
+  void lookUp(Search& search, LastPlace& last, Coord const& corner) const {
+    if (last.corner == corner) return;
+    last.place = search.at(corner);
+    last.corner = corner;
+    if (last.place.leaf) last.values = valuesOf(*last.place.leaf);
+  }
+
   void fillTile(Search& search, LastPlace& last, int3 const& corner, int depth, Element* samples) const {
     int const step = VdbTraits::width(depth) / VdbTraits::kTDW;
     if (step >= kLeafWidth) {
@@ -506,12 +555,7 @@ private:
   }
   void fillFromPlace(Search& search, LastPlace& last, Coord const& at, int step, int count,
                      Element* samples) const {
-    Coord const corner = at & -kLeafWidth;
-    if (last.corner != corner) {
-      last.place = search.at(corner);
-      last.corner = corner;
-      if (last.place.leaf) last.values = valuesOf(*last.place.leaf);
-    }
+    lookUp(search, last, at & -kLeafWidth);
     Leaf const* const leaf = last.place.leaf;
     auto const fill = [&](auto const& valueAt) {
       for (int k = 0; k < count; ++k)
