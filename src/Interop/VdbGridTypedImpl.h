@@ -117,17 +117,17 @@ public:
     }
   }
 
-  Ostil::Ptr<TileTree3D::ChannelBase> makeChannel(std::string const& name, VdbContainer const& container,
-                                                  VdbTopology const& topology,
+  Ostil::Ptr<TileTree3D::ChannelBase> makeChannel(std::string const& name, TreeToFill const& tree,
                                                   FilledTiles filled) const override {
+    VdbContainer const& container = tree.container;
     Element const background = toElement(m_background);
-    auto channel = makeEmptyOn<ChannelT>(name, background, topology);
+    auto channel = makeEmptyOn<ChannelT>(name, background, tree.topology);
     auto tiles = channel->tileDataAccessor();
     ZeroTiles<Element> zeros(ChannelT::kSize);
     constexpr std::int64_t kPart = 1 << 16, kPiece = 1 << 14;
     // The deepest tiles come last, and read the voxels leaf by leaf.
     std::vector<Leaf const*> const packed =
-        m_packed && tilesFollowLeaves(container) ? leavesByNumber() : std::vector<Leaf const*>();
+        m_packed && tree.followsLeaves ? leavesByNumber() : std::vector<Leaf const*>();
     for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth) {
       std::int64_t const count = container.tileCount(depth);
       for (std::int64_t first = 0, told = 0; first < count; first += kPiece) {
@@ -152,9 +152,9 @@ public:
     return channel;
   }
 
-  Ostil::Ptr<StateChannel> makeStateChannel(std::string const& name, VdbContainer const& container,
-                                            VdbTopology const& topology) const override {
-    auto channel = makeEmptyOn<StateChannel>(name, static_cast<unsigned char>(0), topology);
+  Ostil::Ptr<StateChannel> makeStateChannel(std::string const& name, TreeToFill const& tree) const override {
+    VdbContainer const& container = tree.container;
+    auto channel = makeEmptyOn<StateChannel>(name, static_cast<unsigned char>(0), tree.topology);
     auto tiles = channel->tileDataAccessor();
     for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth)
       parallelFor(0, container.tileCount(depth),
@@ -431,21 +431,6 @@ private:
     if (VdbTraits::inDomain(corner) && !places.isUniform(x, y, z)) out.push_back(corner);
   }
 
-  /// Whether the deepest tiles lie in the order of the places of leaves that they are in.
-  static bool tilesFollowLeaves(VdbContainer const& container) {
-    constexpr int kDepth = VdbTraits::kMaxDepth;
-    return parallelReduce(
-        1, std::max<std::int64_t>(1, container.tileCount(kDepth)), 4096, true,
-        [&](std::int64_t begin, std::int64_t end) {
-          for (std::int64_t n = begin; n < end; ++n)
-            if (comesBefore<LeadingAxis::kZ>(placeOf(container.tile(n, kDepth).tijk()),
-                                             placeOf(container.tile(n - 1, kDepth).tijk())))
-              return false;
-          return true;
-        },
-        [](bool a, bool b) { return a && b; });
-  }
-  static int3 placeOf(int3 const& c) { return {c.x & -kLeafWidth, c.y & -kLeafWidth, c.z & -kLeafWidth}; }
   std::vector<Leaf const*> leavesByNumber() const {
     std::vector<Leaf const*> leaves(m_leaves.size());
     for (Leaf const* leaf : m_leaves) leaves[leaf->transientData()] = leaf;
@@ -453,7 +438,7 @@ private:
   }
   /// How many packed leaves lie before the place of a tile.
   static std::size_t leavesBefore(std::vector<Leaf const*> const& packed, int3 const& corner) {
-    int3 const place = placeOf(corner);
+    int3 const place = leafPlaceOf(corner);
     auto const found = std::partition_point(packed.begin(), packed.end(), [&](Leaf const* leaf) {
       return comesBefore<LeadingAxis::kZ>(toInt3(leaf->origin()), place);
     });
@@ -504,6 +489,8 @@ private:
         m_grid.fillTile(m_search, m_last, corner, depth, tile.data());
         return tile;
       }
+      if (depth == VdbTraits::kMaxDepth - 1 && m_grid.isZeroTile(m_search, m_last, corner))
+        return m_zeros.take(m_run);
       Element samples[ChannelT::kSize];
       m_grid.fillTile(m_search, m_last, corner, depth, samples);
       if (areZeros(samples, ChannelT::kSize)) return m_zeros.take(m_run);
@@ -521,9 +508,14 @@ private:
     LastPlace m_last;
   };
 
+  /// Whether the place of a leaf has none, and all bits of its value are zero.
+  bool isZeroTile(Search& search, LastPlace& last, int3 const& corner) const {
+    lookUp(search, last, toCoord(corner));
+    return !last.place.leaf && areZeros(&last.place.value, 1);
+  }
   /// Whether all bits of the voxels in a block are zero.
   bool isZeroBlock(Search& search, LastPlace& last, int3 const& corner) const {
-    lookUp(search, last, toCoord(placeOf(corner)));
+    lookUp(search, last, toCoord(leafPlaceOf(corner)));
     if (!last.place.leaf) return areZeros(&last.place.value, 1);
     auto const& digest = m_digests[last.place.leaf->transientData()];
     auto const block = static_cast<unsigned>((corner.x & 4) | (corner.y & 4) >> 1 | (corner.z & 4) >> 2);

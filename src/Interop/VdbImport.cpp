@@ -140,20 +140,21 @@ Ostil::Array<VdbGridRecord> addChannels(Group const& group, VLN::Object& object,
   // Grids come first to their names, channels of states after them.
   std::vector<std::string> names;
   for (auto const& source : group.grids) names.push_back(freeName(source->grid().getName(), taken));
+  TreeToFill const tree{container, topology, tilesFollowLeaves(container)};
   Ostil::Array<VdbGridRecord> records;
   for (std::size_t n = 0; n < group.grids.size(); ++n) {
     GridSource const& source = *group.grids[n];
     openvdb::GridBase const& grid = source.grid();
     GridSummary const& summary = group.summaries[n];
     std::string const& name = names[n];
-    object.addComponent(source.makeChannel(name, container, topology, [&](std::int64_t tiles) {
+    object.addComponent(source.makeChannel(name, tree, [&](std::int64_t tiles) {
       filled += double(tiles);
       filledShare(filled / tilesToFill);
     }));
     VdbGridRecord record{name, group.types[n], source.activeRule(), "", metadataBytes(grid)};
     if (record.rule == VdbActiveRule::kChannel) {
       record.stateChannel = freeName(name + "_active", taken);
-      object.addComponent(source.makeStateChannel(record.stateChannel, container, topology));
+      object.addComponent(source.makeStateChannel(record.stateChannel, tree));
     }
     records.append(record);
     volume.channels.push_back({name, grid.getName(), group.types[n], 4, 0, summary.activeVoxels,
