@@ -95,10 +95,10 @@ public:
   virtual VdbActiveRule activeRule() const = 0;
   /// A channel with the grid's values for every sample of the tree. Voxels that lie in packed leaves are gone
   /// afterwards.
-  virtual Ostil::Ptr<TileTree3D::ChannelBase> makeChannel(std::string const& name,
-                                                          TreeToFill const& tree,
+  virtual Ostil::Ptr<TileTree3D::ChannelBase> makeChannel(std::string const& name, TreeToFill const& tree,
                                                           FilledTiles filled) const = 0;
-  virtual Ostil::Ptr<StateChannel> makeStateChannel(std::string const& name, TreeToFill const& tree) const = 0;
+  virtual Ostil::Ptr<StateChannel> makeStateChannel(std::string const& name,
+                                                    TreeToFill const& tree) const = 0;
 };
 
 /// A grid, and where its voxels lie unless its leaves have them.

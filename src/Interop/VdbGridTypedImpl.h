@@ -156,15 +156,25 @@ public:
     VdbContainer const& container = tree.container;
     auto channel = makeEmptyOn<StateChannel>(name, static_cast<unsigned char>(0), tree.topology);
     auto tiles = channel->tileDataAccessor();
+    ZeroTiles<unsigned char> zeros(StateChannel::kSize);
     for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth)
       parallelFor(0, container.tileCount(depth),
                   [&](std::int64_t begin, std::int64_t end) {
                     Search search(m_grid->tree());
-                    for (std::int64_t n = begin; n < end; ++n)
-                      fillState(search, container.tile(n, depth).tijk(), depth,
-                                newSamples(*channel, tiles, {n, depth}));
+                    LastPlace place;
+                    ZeroTiles<unsigned char>::Run run;
+                    for (std::int64_t n = begin; n < end; ++n) {
+                      auto& tile = *tiles.tileData({n, depth}).data();
+                      if (!hasStates(search, place, container.tile(n, depth).tijk(), depth)) {
+                        tile = zeros.take(run);
+                        continue;
+                      }
+                      tile = channel->newTile();
+                      fillState(search, place, container.tile(n, depth).tijk(), depth, tile.data());
+                    }
                   },
                   {.grain = 256});
+    zeros.leaveTo(*channel->cloneData());
     return channel;
   }
 
@@ -458,14 +468,6 @@ private:
     channel->disableAllocateEmptyTileData();
     return channel;
   }
-  /// Gives a tile samples of the channel's default value.
-  template <class C>
-  static auto* newSamples(C const& channel, typename C::TileDataAccessor& tiles, TreeIndex const& at) {
-    auto* const samples = tiles.tileData(at).data();
-    *samples = channel.newTile();
-    return samples->data();
-  }
-
   /// The place of a leaf that was looked up last: tiles that are filled one after another share it.
   struct LastPlace {
     std::optional<Coord> corner;
@@ -483,14 +485,21 @@ private:
         , m_search(grid.m_grid->tree()) {}
 
     TileVector<Element> operator()(int3 const& corner, int depth) {
-      if (depth == VdbTraits::kMaxDepth) {
-        if (m_grid.isZeroBlock(m_search, m_last, corner)) return m_zeros.take(m_run);
-        auto tile = m_channel.unwrittenTile();
-        m_grid.fillTile(m_search, m_last, corner, depth, tile.data());
-        return tile;
+      if (VdbTraits::width(depth) <= kLeafWidth) {
+        m_grid.lookUp(m_search, m_last, toCoord(leafPlaceOf(corner)));
+        auto const& place = m_last.place;
+        bool const deepest = depth == VdbTraits::kMaxDepth;
+        if (place.leaf ? deepest && m_grid.isZeroBlock(*place.leaf, corner) : areZeros(&place.value, 1))
+          return m_zeros.take(m_run);
+        if (deepest || !place.leaf) {
+          auto tile = m_channel.unwrittenTile();
+          if (place.leaf)
+            m_grid.fillTile(m_search, m_last, corner, depth, tile.data());
+          else
+            TileTree3D::Internal::fillRun(tile.data(), ChannelT::kSize, toElement(place.value));
+          return tile;
+        }
       }
-      if (depth == VdbTraits::kMaxDepth - 1 && m_grid.isZeroTile(m_search, m_last, corner))
-        return m_zeros.take(m_run);
       Element samples[ChannelT::kSize];
       m_grid.fillTile(m_search, m_last, corner, depth, samples);
       if (areZeros(samples, ChannelT::kSize)) return m_zeros.take(m_run);
@@ -508,16 +517,9 @@ private:
     LastPlace m_last;
   };
 
-  /// Whether the place of a leaf has none, and all bits of its value are zero.
-  bool isZeroTile(Search& search, LastPlace& last, int3 const& corner) const {
-    lookUp(search, last, toCoord(corner));
-    return !last.place.leaf && areZeros(&last.place.value, 1);
-  }
   /// Whether all bits of the voxels in a block are zero.
-  bool isZeroBlock(Search& search, LastPlace& last, int3 const& corner) const {
-    lookUp(search, last, toCoord(leafPlaceOf(corner)));
-    if (!last.place.leaf) return areZeros(&last.place.value, 1);
-    auto const& digest = m_digests[last.place.leaf->transientData()];
+  bool isZeroBlock(Leaf const& leaf, int3 const& corner) const {
+    auto const& digest = m_digests[leaf.transientData()];
     auto const block = static_cast<unsigned>((corner.x & 4) | (corner.y & 4) >> 1 | (corner.z & 4) >> 2);
     return (digest.uniform >> 8 * block & 1) && areZeros(&digest.first[block], 1);
   }
@@ -568,21 +570,25 @@ private:
     }
   }
 
-  static void fillState(Search& search, int3 const& corner, int depth, unsigned char* states) {
-    Coord const origin = toCoord(corner);
-    if (depth == VdbTraits::kMaxDepth) {
-      Leaf const* const leaf = search.at(origin).leaf;
-      if (!leaf) return;
-      writeBlockStates(*leaf, static_cast<int>(Leaf::coordToOffset(origin)), states);
-      return;
-    }
+  /// Depth of the file's tree whose tiles are as wide as a sample: 2, 1 or 0 for 8, 128 or 4096 voxels, else
+  /// one that no tile has.
+  static int levelOf(int depth) {
     int const step = VdbTraits::width(depth) / VdbTraits::kTDW;
-    // Depth of the file's tree whose tiles are as wide as a sample: 2, 1 or 0 for 8, 128 or 4096.
-    int const level = step == kNodeWidths[0]   ? 2
-                      : step == kNodeWidths[1] ? 1
-                      : step == kNodeWidths[2] ? 0
-                                               : -2;
-    if (level == -2) return;
+    return step == kNodeWidths[0] ? 2 : step == kNodeWidths[1] ? 1 : step == kNodeWidths[2] ? 0 : -2;
+  }
+  /// Whether a tile of states may hold one.
+  bool hasStates(Search& search, LastPlace& last, int3 const& corner, int depth) const {
+    if (depth < VdbTraits::kMaxDepth) return levelOf(depth) != -2;
+    lookUp(search, last, toCoord(leafPlaceOf(corner)));
+    return last.place.leaf;
+  }
+  /// @pre hasStates(); the states are none yet.
+  static void fillState(Search& search, LastPlace const& last, int3 const& corner, int depth,
+                        unsigned char* states) {
+    Coord const origin = toCoord(corner);
+    if (depth == VdbTraits::kMaxDepth)
+      return writeBlockStates(*last.place.leaf, static_cast<int>(Leaf::coordToOffset(origin)), states);
+    int const step = VdbTraits::width(depth) / VdbTraits::kTDW, level = levelOf(depth);
     for (int k = 0; k < 4; ++k)
       for (int j = 0; j < 4; ++j)
         for (int i = 0; i < 4; ++i, ++states) {
