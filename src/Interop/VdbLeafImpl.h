@@ -123,10 +123,31 @@ struct ValueRange {
   bool empty() const { return minimum > maximum; }
 };
 
+/// The same of all voxels of a leaf, four at a time.
+/// @edges Does not tell which zero came first.
+inline ValueRange rangeOfAll(float const* values) {
+  using Lanes = float __attribute__((vector_size(16)));
+  constexpr float kFar = std::numeric_limits<float>::infinity();
+  Lanes low = {kFar, kFar, kFar, kFar}, high = -low;
+  for (int n = 0; n < 512; n += 4) {
+    Lanes v;
+    std::memcpy(&v, values + n, sizeof v);
+    low = v < low ? v : low;
+    high = v > high ? v : high;
+  }
+  ValueRange range;
+  for (int lane = 0; lane < 4; ++lane) range.join({low[lane], high[lane]});
+  return range;
+}
+
 template <class LeafT> ValueRange activeRange(LeafT const& leaf, LeafValues<LeafT> const& values) {
   using Value = typename LeafT::ValueType;
   ValueRange range;
   if constexpr (std::is_same_v<Value, float>) {
+    if (leaf.getValueMask().isOn()) {
+      range = rangeOfAll(values.data());
+      if (range.minimum != 0 && range.maximum != 0) return range;
+    }
     float low = std::numeric_limits<float>::infinity(), high = -low;
     for (int i = 0; i < kLeafWidth; ++i) {
       float const* const slice = values.data() + 64 * i;
