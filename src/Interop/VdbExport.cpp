@@ -48,30 +48,51 @@ openvdb::GridBase::Ptr toGrid(Object const& object, VdbGridRecord const& record)
   return grid;
 }
 
-// `metadata` takes that of the volumes.
-openvdb::GridPtrVec makeGrids(std::vector<VdbVolume> const& volumes, openvdb::MetaMap& metadata,
-                              Progress const& progress) {
-  openvdb::GridPtrVec grids;
-  std::size_t count = 0, done = 0;
-  Ostil::Any holder, bytesHolder;
-  for (auto const& volume : volumes) count += volume.channels.size();
-  for (auto const& volume : volumes) {
-    auto const* records = property<Ostil::Array<VdbGridRecord>>(*volume.object, kVdbGridsProperty, holder);
-    if (!records) continue;
-    auto const* transform = property<Ostil::String>(*volume.object, kVdbTransformProperty, bytesHolder);
-    IndexToWorld const indexToWorld = transform ? IndexToWorld(*transform) : IndexToWorld();
-    for (auto const& record : *records) {
-      if (progress)
-        progress("building the grids", 0.8 * double(done++) / double(std::max<std::size_t>(1, count)));
-      auto grid = toGrid(*volume.object, record);
-      grid->setTransform(indexToWorld.impl().transform->copy());
-      grids.push_back(grid);
+// The grids of volumes, which must stay, in the order of their records.
+class ExportedGrids {
+public:
+  /// @param metadata Takes that of the volumes.
+  ExportedGrids(std::vector<VdbVolume> const& volumes, openvdb::MetaMap& metadata, Progress const& progress)
+      : m_progress(progress) {
+    for (auto const& volume : volumes) {
+      m_count += volume.channels.size();
+      Ostil::Any holder;
+      auto const* records = property<Ostil::Array<VdbGridRecord>>(*volume.object, kVdbGridsProperty, holder);
+      if (!records) continue;
+      for (auto const& record : *records) m_grids.push_back({volume.object, record});
+      if (auto const* bytes = property<Ostil::String>(*volume.object, kVdbMetadataProperty, holder))
+        readMetadata(*bytes, metadata);
     }
-    if (auto const* bytes = property<Ostil::String>(*volume.object, kVdbMetadataProperty, bytesHolder))
-      readMetadata(*bytes, metadata);
   }
-  return grids;
-}
+
+  std::size_t size() const { return m_grids.size(); }
+  std::string nameOf(std::size_t n) const {
+    openvdb::MetaMap metadata;
+    readMetadata(m_grids[n].record.metadata, metadata);
+    auto const name = metadata[openvdb::GridBase::META_GRID_NAME];
+    return name ? name->str() : std::string();
+  }
+  openvdb::GridBase::Ptr make(std::size_t n) const {
+    if (m_progress)
+      m_progress("building the grids", 0.8 * double(n) / double(std::max<std::size_t>(1, m_count)));
+    auto const& [object, record] = m_grids[n];
+    auto grid = toGrid(*object, record);
+    Ostil::Any holder;
+    auto const* transform = property<Ostil::String>(*object, kVdbTransformProperty, holder);
+    IndexToWorld const indexToWorld = transform ? IndexToWorld(*transform) : IndexToWorld();
+    grid->setTransform(indexToWorld.impl().transform->copy());
+    return grid;
+  }
+
+private:
+  struct Grid {
+    Ostil::Ptr<Object> object;
+    VdbGridRecord record;
+  };
+  Progress const& m_progress;
+  std::size_t m_count = 0;
+  std::vector<Grid> m_grids;
+};
 
 void write(std::vector<VdbVolume> const& volumes, std::vector<PointVolume> const& points,
            std::string const& fileMetadata, std::string const& path, Progress const& progress) {
@@ -79,11 +100,17 @@ void write(std::vector<VdbVolume> const& volumes, std::vector<PointVolume> const
   OutputFile out(path);
   openvdb::MetaMap metadata;
   if (!fileMetadata.empty()) readMetadata(fileMetadata, metadata);
-  openvdb::GridPtrVec grids = makeGrids(volumes, metadata, progress);
-  for (auto const& volume : points)
-    grids.push_back(makePointsGrid(pointSetOf(volume), volume.name.empty() ? "points" : volume.name));
-  if (progress) progress("writing", 0.8);
-  writeVdbFile(out, grids, metadata);
+  ExportedGrids const exported(volumes, metadata, progress);
+  std::vector<GridInTurn> grids;
+  for (std::size_t n = 0; n < exported.size(); ++n)
+    grids.push_back({exported.nameOf(n), [&exported, n] { return exported.make(n); }});
+  for (auto const& volume : points) {
+    std::string const name = volume.name.empty() ? "points" : volume.name;
+    grids.push_back({name, [&volume, name] { return makePointsGrid(pointSetOf(volume), name); }});
+  }
+  writeVdbFile(out, grids, metadata, [&] {
+    if (progress) progress("writing", 0.8);
+  });
   if (progress) progress("done", 1);
 }
 
@@ -92,7 +119,10 @@ void write(std::vector<VdbVolume> const& volumes, std::vector<PointVolume> const
 openvdb::GridPtrVec exportedGrids(VdbImport const& content, Progress const& progress) {
   openvdb::initialize();
   openvdb::MetaMap metadata;
-  return makeGrids(content.volumes, metadata, progress);
+  ExportedGrids const exported(content.volumes, metadata, progress);
+  openvdb::GridPtrVec grids;
+  for (std::size_t n = 0; n < exported.size(); ++n) grids.push_back(exported.make(n));
+  return grids;
 }
 
 void exportVdb(std::vector<VdbVolume> const& volumes, std::string const& path, Progress const& progress) {

@@ -94,13 +94,14 @@ public:
     return made;
   }
 
-  /// Calls `f(slot)` for the slots that `wanted` holds for.
+  /// Calls `f(slot)` for the slots whose bits `wanted(word)` gives, 64 at a time.
   template <class Wanted, class F> void forEach(Wanted const& wanted, F const& f) const {
     std::uint64_t ranks[kSlots / 64] = {};
-    for (unsigned slot = 0; slot < kSlots; ++slot) {
-      unsigned const rank = m_rank[slot];
-      ranks[rank / 64] |= std::uint64_t(wanted(slot)) << rank % 64;
-    }
+    for (unsigned n = 0; n < kSlots / 64; ++n)
+      for (std::uint64_t word = wanted(n); word != 0; word &= word - 1) {
+        unsigned const rank = m_rank[64 * n + static_cast<unsigned>(std::countr_zero(word))];
+        ranks[rank / 64] |= std::uint64_t(1) << rank % 64;
+      }
     for (unsigned n = 0; n < kSlots / 64; ++n)
       for (std::uint64_t word = ranks[n]; word != 0; word &= word - 1)
         f(unsigned(m_slot[64 * n + static_cast<unsigned>(std::countr_zero(word))]));
@@ -108,6 +109,62 @@ public:
 
 private:
   std::uint16_t m_rank[kSlots], m_slot[kSlots];
+};
+
+/// Bits of 64 values that pass a test.
+template <class V, class Test> std::uint64_t wordOf(V const* values, Test const& test) {
+  // A byte for each, and from every eight of them the low bits side by side: the compiler does the first in
+  // wide lanes.
+  std::uint8_t passed[64];
+  for (int n = 0; n < 64; ++n) passed[n] = test(values[n]);
+  std::uint64_t word = 0;
+  for (int n = 0; n < 8; ++n) {
+    std::uint64_t bytes;
+    std::memcpy(&bytes, passed + 8 * n, sizeof bytes);
+    word |= (bytes * 0x0102040810204080ull >> 56) << 8 * n;
+  }
+  return word;
+}
+
+/// The entries of a node's table that hold another value than the background. Those of children are anything.
+template <class Entry, class Value> class OtherValues {
+public:
+  explicit OtherValues(Value const& background)
+      : m_background(background) {
+    std::memset(m_value, 0, sizeof m_value);
+    std::memset(m_mask, 0, sizeof m_mask);
+    for (std::size_t at = 0; kInLanes && at < sizeof m_value; at += sizeof(Entry)) {
+      std::memcpy(m_value + at, &background, sizeof(Value));
+      std::memset(m_mask + at, 0xFF, sizeof(Value));
+    }
+  }
+  /// Of 64 entries.
+  std::uint64_t among(Entry const* entries) const {
+    if (kInLanes && areBackground(entries)) return 0; // as most are
+    return wordOf(entries, [&](Entry const& entry) { return !sameBits(entry.getValue(), m_background); });
+  }
+
+private:
+  // Values begin where their entries do.
+  static constexpr bool kInLanes =
+      std::is_trivially_copyable_v<Entry> && (sizeof(Entry) == 8 || sizeof(Entry) == 16);
+
+  bool areBackground(Entry const* entries) const {
+    using Lanes = std::uint64_t __attribute__((vector_size(16)));
+    Lanes value, mask, any = {};
+    std::memcpy(&value, m_value, sizeof value);
+    std::memcpy(&mask, m_mask, sizeof mask);
+    auto const* const bytes = reinterpret_cast<char const*>(entries);
+    for (std::size_t at = 0; at < 64 * sizeof(Entry); at += sizeof(Lanes)) {
+      Lanes some;
+      std::memcpy(&some, bytes + at, sizeof some);
+      any |= (some ^ value) & mask;
+    }
+    return (any[0] | any[1]) == 0;
+  }
+
+  Value m_background;
+  unsigned char m_value[16], m_mask[16];
 };
 
 /// Goes through a file's tree along the Z-shaped curve: calls `onLeaf(leaf)`, and `onTile(corner, width,
@@ -121,9 +178,11 @@ void forEachInOrder(TreeT const& tree, OnLeaf const& onLeaf, OnTile const& onTil
     auto const* const table = node.getTable();
     auto const& children = node.getChildMask();
     auto const& active = node.getValueMask();
+    OtherValues<std::remove_cvref_t<decltype(*table)>, Value> const other(background);
     SlotOrder<Node::LOG2DIM, kLeads>::table().forEach(
-        [&](unsigned slot) {
-          return children.isOn(slot) || active.isOn(slot) || !sameBits(table[slot].getValue(), background);
+        [&](unsigned n) {
+          auto const wordIn = [n](auto const& mask) { return mask.template getWord<std::uint64_t>(n); };
+          return wordIn(children) | wordIn(active) | other.among(table + 64 * n);
         },
         [&](unsigned slot) {
           if (children.isOn(slot)) return onChild(*table[slot].getChild());

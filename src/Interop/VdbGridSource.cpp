@@ -1,5 +1,8 @@
 #include "Interop/VdbGridSourceImpl.h"
 
+#include "GeometryVolume/core/Parallel.h"
+#include "Interop/VdbLeafImpl.h"
+
 #include <algorithm>
 #include <bit>
 #include <iterator>
@@ -111,6 +114,19 @@ int cheapestRootDepth(std::vector<int3> leaves, std::vector<int3> tiles, int dee
 }
 
 void joinSorted(std::vector<int3>& corners, std::size_t known, std::vector<int3> others) {
+  if (known > 0) {
+    // What another grid brought mostly comes again.
+    sortCorners(others);
+    auto const middle = corners.begin() + static_cast<std::ptrdiff_t>(known);
+    std::vector<int3> added, all;
+    added.reserve(corners.size() - known + others.size());
+    std::set_union(middle, corners.end(), others.begin(), others.end(), std::back_inserter(added),
+                   TileTree3D::MortonOrder());
+    all.reserve(known + added.size());
+    std::set_union(corners.begin(), middle, added.begin(), added.end(), std::back_inserter(all),
+                   TileTree3D::MortonOrder());
+    return corners.swap(all);
+  }
   auto const begin = corners.begin(), middle = begin + static_cast<std::ptrdiff_t>(known);
   std::inplace_merge(begin, middle, corners.end(), TileTree3D::MortonOrder());
   if (others.empty()) return;
@@ -118,6 +134,19 @@ void joinSorted(std::vector<int3>& corners, std::size_t known, std::vector<int3>
   auto const count = static_cast<std::ptrdiff_t>(corners.size());
   corners.insert(corners.end(), others.begin(), others.end());
   std::inplace_merge(corners.begin(), corners.begin() + count, corners.end(), TileTree3D::MortonOrder());
+}
+
+bool tilesFollowLeaves(VdbContainer const& container) {
+  return parallelReduce(
+      1, std::max<std::int64_t>(1, container.tileCount(kMaxDepth)), 4096, true,
+      [&](std::int64_t begin, std::int64_t end) {
+        for (std::int64_t n = begin; n < end; ++n)
+          if (comesBefore<LeadingAxis::kZ>(leafPlaceOf(container.tile(n, kMaxDepth).tijk()),
+                                           leafPlaceOf(container.tile(n - 1, kMaxDepth).tijk())))
+            return false;
+        return true;
+      },
+      [](bool a, bool b) { return a && b; });
 }
 
 void completeCorners(TileCorners& corners, int rootDepth) {

@@ -64,6 +64,13 @@ using TileCorners = VLN::PerDepth<std::vector<Velorn::Math::int3>, VdbTraits::kD
 /// Reports tiles as they are filled.
 using FilledTiles = FunctionRef<void(std::int64_t tiles)>;
 
+/// The tree that channels are made on.
+struct TreeToFill {
+  VdbContainer const& container;
+  VdbTopology const& topology;
+  bool followsLeaves; ///< see tilesFollowLeaves()
+};
+
 class GridSource {
 public:
   virtual ~GridSource() = default;
@@ -88,12 +95,10 @@ public:
   virtual VdbActiveRule activeRule() const = 0;
   /// A channel with the grid's values for every sample of the tree. Voxels that lie in packed leaves are gone
   /// afterwards.
-  virtual Ostil::Ptr<TileTree3D::ChannelBase> makeChannel(std::string const& name,
-                                                          VdbContainer const& container,
-                                                          VdbTopology const& topology,
+  virtual Ostil::Ptr<TileTree3D::ChannelBase> makeChannel(std::string const& name, TreeToFill const& tree,
                                                           FilledTiles filled) const = 0;
-  virtual Ostil::Ptr<StateChannel> makeStateChannel(std::string const& name, VdbContainer const& container,
-                                                    VdbTopology const& topology) const = 0;
+  virtual Ostil::Ptr<StateChannel> makeStateChannel(std::string const& name,
+                                                    TreeToFill const& tree) const = 0;
 };
 
 /// A grid, and where its voxels lie unless its leaves have them.
@@ -115,9 +120,12 @@ int rootDepth(std::vector<GridSummary> const& grids);
 /// wide tiles, shallow ones stand above more ancestors.
 int cheapestRootDepth(std::vector<Velorn::Math::int3> leaves, std::vector<Velorn::Math::int3> tiles,
                       int deepest);
-/// Brings into Morton order: corners whose first `known` and whose others are each so, and more.
+/// Brings into Morton order: corners whose first `known` and whose others are each so, and more. Corners that
+/// were known do not come again.
 void joinSorted(std::vector<Velorn::Math::int3>& corners, std::size_t known,
                 std::vector<Velorn::Math::int3> others);
+/// Whether the deepest tiles lie in the order of the places of leaves that they are in.
+bool tilesFollowLeaves(VdbContainer const& container);
 /// Joins extents and counts; neither has a range yet.
 GridSummary joinSummaries(GridSummary a, GridSummary const& b);
 /// Adds each tile's parents down from `rootDepth`, sorts each depth along the Z-shaped curve and drops

@@ -4,6 +4,7 @@
 #include "GeometryVolume/core/Parallel.h"
 #include "Interop/VdbGridSourceImpl.h"
 #include "Interop/VdbLeafPlacesImpl.h"
+#include "Interop/VdbZeroTilesImpl.h"
 
 #include <algorithm>
 
@@ -116,27 +117,26 @@ public:
     }
   }
 
-  Ostil::Ptr<TileTree3D::ChannelBase> makeChannel(std::string const& name, VdbContainer const& container,
-                                                  VdbTopology const& topology,
+  Ostil::Ptr<TileTree3D::ChannelBase> makeChannel(std::string const& name, TreeToFill const& tree,
                                                   FilledTiles filled) const override {
+    VdbContainer const& container = tree.container;
     Element const background = toElement(m_background);
-    auto channel = makeEmptyOn<ChannelT>(name, background, topology);
+    auto channel = makeEmptyOn<ChannelT>(name, background, tree.topology);
     auto tiles = channel->tileDataAccessor();
+    ZeroTiles<Element> zeros(ChannelT::kSize);
     constexpr std::int64_t kPart = 1 << 16, kPiece = 1 << 14;
     // The deepest tiles come last, and read the voxels leaf by leaf.
     std::vector<Leaf const*> const packed =
-        m_packed && tilesFollowLeaves(container) ? leavesByNumber() : std::vector<Leaf const*>();
+        m_packed && tree.followsLeaves ? leavesByNumber() : std::vector<Leaf const*>();
     for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth) {
       std::int64_t const count = container.tileCount(depth);
       for (std::int64_t first = 0, told = 0; first < count; first += kPiece) {
         std::int64_t const last = std::min(first + kPiece, count);
         parallelFor(first, last,
                     [&](std::int64_t begin, std::int64_t end) {
-                      Search search(m_grid->tree());
-                      LastPlace place;
+                      TileMaker make(*this, *channel, zeros);
                       for (std::int64_t n = begin; n < end; ++n)
-                        fillTile(search, place, container.tile(n, depth).tijk(), depth,
-                                 newSamples(*channel, tiles, {n, depth}));
+                        *tiles.tileData({n, depth}).data() = make(container.tile(n, depth).tijk(), depth);
                     },
                     {.grain = 256});
         if (!packed.empty() && depth == VdbTraits::kMaxDepth && last < count)
@@ -148,22 +148,33 @@ public:
       }
     }
     if (m_packed) m_packed->drop(m_leaves.size() * Leaf::SIZE * sizeof(Value));
+    zeros.leaveTo(*channel->cloneData());
     return channel;
   }
 
-  Ostil::Ptr<StateChannel> makeStateChannel(std::string const& name, VdbContainer const& container,
-                                            VdbTopology const& topology) const override {
-    auto channel = makeEmptyOn<StateChannel>(name, static_cast<unsigned char>(0), topology);
+  Ostil::Ptr<StateChannel> makeStateChannel(std::string const& name, TreeToFill const& tree) const override {
+    VdbContainer const& container = tree.container;
+    auto channel = makeEmptyOn<StateChannel>(name, static_cast<unsigned char>(0), tree.topology);
     auto tiles = channel->tileDataAccessor();
+    ZeroTiles<unsigned char> zeros(StateChannel::kSize);
     for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth)
       parallelFor(0, container.tileCount(depth),
                   [&](std::int64_t begin, std::int64_t end) {
                     Search search(m_grid->tree());
-                    for (std::int64_t n = begin; n < end; ++n)
-                      fillState(search, container.tile(n, depth).tijk(), depth,
-                                newSamples(*channel, tiles, {n, depth}));
+                    LastPlace place;
+                    ZeroTiles<unsigned char>::Run run;
+                    for (std::int64_t n = begin; n < end; ++n) {
+                      auto& tile = *tiles.tileData({n, depth}).data();
+                      if (!hasStates(search, place, container.tile(n, depth).tijk(), depth)) {
+                        tile = zeros.take(run);
+                        continue;
+                      }
+                      tile = channel->newTile();
+                      fillState(search, place, container.tile(n, depth).tijk(), depth, tile.data());
+                    }
                   },
                   {.grain = 256});
+    zeros.leaveTo(*channel->cloneData());
     return channel;
   }
 
@@ -430,21 +441,6 @@ private:
     if (VdbTraits::inDomain(corner) && !places.isUniform(x, y, z)) out.push_back(corner);
   }
 
-  /// Whether the deepest tiles lie in the order of the places of leaves that they are in.
-  static bool tilesFollowLeaves(VdbContainer const& container) {
-    constexpr int kDepth = VdbTraits::kMaxDepth;
-    return parallelReduce(
-        1, std::max<std::int64_t>(1, container.tileCount(kDepth)), 4096, true,
-        [&](std::int64_t begin, std::int64_t end) {
-          for (std::int64_t n = begin; n < end; ++n)
-            if (comesBefore<LeadingAxis::kZ>(placeOf(container.tile(n, kDepth).tijk()),
-                                             placeOf(container.tile(n - 1, kDepth).tijk())))
-              return false;
-          return true;
-        },
-        [](bool a, bool b) { return a && b; });
-  }
-  static int3 placeOf(int3 const& c) { return {c.x & -kLeafWidth, c.y & -kLeafWidth, c.z & -kLeafWidth}; }
   std::vector<Leaf const*> leavesByNumber() const {
     std::vector<Leaf const*> leaves(m_leaves.size());
     for (Leaf const* leaf : m_leaves) leaves[leaf->transientData()] = leaf;
@@ -452,7 +448,7 @@ private:
   }
   /// How many packed leaves lie before the place of a tile.
   static std::size_t leavesBefore(std::vector<Leaf const*> const& packed, int3 const& corner) {
-    int3 const place = placeOf(corner);
+    int3 const place = leafPlaceOf(corner);
     auto const found = std::partition_point(packed.begin(), packed.end(), [&](Leaf const* leaf) {
       return comesBefore<LeadingAxis::kZ>(toInt3(leaf->origin()), place);
     });
@@ -472,20 +468,67 @@ private:
     channel->disableAllocateEmptyTileData();
     return channel;
   }
-  /// Gives a tile samples of the channel's default value.
-  template <class C>
-  static auto* newSamples(C const& channel, typename C::TileDataAccessor& tiles, TreeIndex const& at) {
-    auto* const samples = tiles.tileData(at).data();
-    *samples = channel.newTile();
-    return samples->data();
-  }
-
   /// The place of a leaf that was looked up last: tiles that are filled one after another share it.
   struct LastPlace {
     std::optional<Coord> corner;
     LeafPlace<TreeT> place;
     Value const* values = nullptr; ///< of the leaf, unless they are bits
   };
+
+  /// Makes the tiles of a channel, each thread with one of its own.
+  class TileMaker {
+  public:
+    TileMaker(TypedGrid const& grid, ChannelT const& channel, ZeroTiles<Element>& zeros)
+        : m_grid(grid)
+        , m_channel(channel)
+        , m_zeros(zeros)
+        , m_search(grid.m_grid->tree()) {}
+
+    TileVector<Element> operator()(int3 const& corner, int depth) {
+      if (VdbTraits::width(depth) <= kLeafWidth) {
+        m_grid.lookUp(m_search, m_last, toCoord(leafPlaceOf(corner)));
+        auto const& place = m_last.place;
+        bool const deepest = depth == VdbTraits::kMaxDepth;
+        if (place.leaf ? deepest && m_grid.isZeroBlock(*place.leaf, corner) : areZeros(&place.value, 1))
+          return m_zeros.take(m_run);
+        if (deepest || !place.leaf) {
+          auto tile = m_channel.unwrittenTile();
+          if (place.leaf)
+            m_grid.fillTile(m_search, m_last, corner, depth, tile.data());
+          else
+            TileTree3D::Internal::fillRun(tile.data(), ChannelT::kSize, toElement(place.value));
+          return tile;
+        }
+      }
+      Element samples[ChannelT::kSize];
+      m_grid.fillTile(m_search, m_last, corner, depth, samples);
+      if (areZeros(samples, ChannelT::kSize)) return m_zeros.take(m_run);
+      auto tile = m_channel.unwrittenTile();
+      std::copy(std::begin(samples), std::end(samples), tile.data());
+      return tile;
+    }
+
+  private:
+    TypedGrid const& m_grid;
+    ChannelT const& m_channel;
+    ZeroTiles<Element>& m_zeros;
+    typename ZeroTiles<Element>::Run m_run;
+    Search m_search;
+    LastPlace m_last;
+  };
+
+  /// Whether all bits of the voxels in a block are zero.
+  bool isZeroBlock(Leaf const& leaf, int3 const& corner) const {
+    auto const& digest = m_digests[leaf.transientData()];
+    auto const block = static_cast<unsigned>((corner.x & 4) | (corner.y & 4) >> 1 | (corner.z & 4) >> 2);
+    return (digest.uniform >> 8 * block & 1) && areZeros(&digest.first[block], 1);
+  }
+  void lookUp(Search& search, LastPlace& last, Coord const& corner) const {
+    if (last.corner == corner) return;
+    last.place = search.at(corner);
+    last.corner = corner;
+    if (last.place.leaf) last.values = valuesOf(*last.place.leaf);
+  }
 
   void fillTile(Search& search, LastPlace& last, int3 const& corner, int depth, Element* samples) const {
     int const step = VdbTraits::width(depth) / VdbTraits::kTDW;
@@ -506,12 +549,7 @@ private:
   }
   void fillFromPlace(Search& search, LastPlace& last, Coord const& at, int step, int count,
                      Element* samples) const {
-    Coord const corner = at & -kLeafWidth;
-    if (last.corner != corner) {
-      last.place = search.at(corner);
-      last.corner = corner;
-      if (last.place.leaf) last.values = valuesOf(*last.place.leaf);
-    }
+    lookUp(search, last, at & -kLeafWidth);
     Leaf const* const leaf = last.place.leaf;
     auto const fill = [&](auto const& valueAt) {
       for (int k = 0; k < count; ++k)
@@ -532,21 +570,25 @@ private:
     }
   }
 
-  static void fillState(Search& search, int3 const& corner, int depth, unsigned char* states) {
-    Coord const origin = toCoord(corner);
-    if (depth == VdbTraits::kMaxDepth) {
-      Leaf const* const leaf = search.at(origin).leaf;
-      if (!leaf) return;
-      writeBlockStates(*leaf, static_cast<int>(Leaf::coordToOffset(origin)), states);
-      return;
-    }
+  /// Depth of the file's tree whose tiles are as wide as a sample: 2, 1 or 0 for 8, 128 or 4096 voxels, else
+  /// one that no tile has.
+  static int levelOf(int depth) {
     int const step = VdbTraits::width(depth) / VdbTraits::kTDW;
-    // Depth of the file's tree whose tiles are as wide as a sample: 2, 1 or 0 for 8, 128 or 4096.
-    int const level = step == kNodeWidths[0]   ? 2
-                      : step == kNodeWidths[1] ? 1
-                      : step == kNodeWidths[2] ? 0
-                                               : -2;
-    if (level == -2) return;
+    return step == kNodeWidths[0] ? 2 : step == kNodeWidths[1] ? 1 : step == kNodeWidths[2] ? 0 : -2;
+  }
+  /// Whether a tile of states may hold one.
+  bool hasStates(Search& search, LastPlace& last, int3 const& corner, int depth) const {
+    if (depth < VdbTraits::kMaxDepth) return levelOf(depth) != -2;
+    lookUp(search, last, toCoord(leafPlaceOf(corner)));
+    return last.place.leaf;
+  }
+  /// @pre hasStates(); the states are none yet.
+  static void fillState(Search& search, LastPlace const& last, int3 const& corner, int depth,
+                        unsigned char* states) {
+    Coord const origin = toCoord(corner);
+    if (depth == VdbTraits::kMaxDepth)
+      return writeBlockStates(*last.place.leaf, static_cast<int>(Leaf::coordToOffset(origin)), states);
+    int const step = VdbTraits::width(depth) / VdbTraits::kTDW, level = levelOf(depth);
     for (int k = 0; k < 4; ++k)
       for (int j = 0; j < 4; ++j)
         for (int i = 0; i < 4; ++i, ++states) {

@@ -51,7 +51,8 @@ std::string whyNotKept(openvdb::math::Transform const& transform) {
   } catch (std::exception const& error) { return "its transform cannot be used: " + oneLine(error.what()); }
 }
 
-std::vector<Group> groupByTransform(VdbFile const& file, std::vector<SkippedGrid>& skipped) {
+/// Takes the grids out of the file, apart from those of points.
+std::vector<Group> groupByTransform(VdbFile& file, std::vector<SkippedGrid>& skipped) {
   std::vector<Group> groups;
   for (auto const& base : file.grids) {
     std::string type;
@@ -82,6 +83,8 @@ std::vector<Group> groupByTransform(VdbFile const& file, std::vector<SkippedGrid
     group->types.push_back(valueTypeOf(*base));
     group->grids.push_back(std::move(source));
   }
+  std::erase_if(file.grids, [](auto const& grid) { return !isPointGrid(*grid); });
+  file.packed.clear();
   return groups;
 }
 
@@ -128,8 +131,9 @@ std::string metadataBytes(openvdb::MetaMap const& metadata) {
   return out.str();
 }
 
-// Makes and fills the channels of a volume, and tells of each in it; returns what the way back needs.
-Ostil::Array<VdbGridRecord> addChannels(Group const& group, VLN::Object& object, Container const& container,
+// Makes and fills the channels of a volume, and tells of each in it; returns what the way back needs. Each
+// grid goes when its channels are there: what it took is at hand for the next ones.
+Ostil::Array<VdbGridRecord> addChannels(Group& group, VLN::Object& object, Container const& container,
                                         Topology const& topology, VdbVolume& volume,
                                         VLN::FunctionRef<void(double share)> filledShare) {
   // Components and plain properties share one set of names.
@@ -140,33 +144,35 @@ Ostil::Array<VdbGridRecord> addChannels(Group const& group, VLN::Object& object,
   // Grids come first to their names, channels of states after them.
   std::vector<std::string> names;
   for (auto const& source : group.grids) names.push_back(freeName(source->grid().getName(), taken));
+  TreeToFill const tree{container, topology, tilesFollowLeaves(container)};
   Ostil::Array<VdbGridRecord> records;
   for (std::size_t n = 0; n < group.grids.size(); ++n) {
     GridSource const& source = *group.grids[n];
     openvdb::GridBase const& grid = source.grid();
     GridSummary const& summary = group.summaries[n];
     std::string const& name = names[n];
-    object.addComponent(source.makeChannel(name, container, topology, [&](std::int64_t tiles) {
+    object.addComponent(source.makeChannel(name, tree, [&](std::int64_t tiles) {
       filled += double(tiles);
       filledShare(filled / tilesToFill);
     }));
     VdbGridRecord record{name, group.types[n], source.activeRule(), "", metadataBytes(grid)};
     if (record.rule == VdbActiveRule::kChannel) {
       record.stateChannel = freeName(name + "_active", taken);
-      object.addComponent(source.makeStateChannel(record.stateChannel, container, topology));
+      object.addComponent(source.makeStateChannel(record.stateChannel, tree));
     }
     records.append(record);
     volume.channels.push_back({name, grid.getName(), group.types[n], 4, 0, summary.activeVoxels,
                                summary.minimum, summary.maximum, summary.hasRange, summary.active});
     if (!summary.active.empty())
       volume.activeBox.grow(summary.active.min), volume.activeBox.grow(summary.active.max);
+    group.grids[n].reset();
   }
   return records;
 }
 
 // `memoryLeft` falls by what the volume takes.
-VdbVolume buildVolume(VdbFile const& file, Group const& group, std::uint64_t& memoryLeft,
-                      Progress const& progress, double from, double to) {
+VdbVolume buildVolume(VdbFile const& file, Group& group, std::uint64_t& memoryLeft, Progress const& progress,
+                      double from, double to) {
   report(progress, "building the tree", from);
   std::vector<int3> leaves, wideTiles;
   for (auto const& grid : group.grids) grid->collectStored(leaves, wideTiles);
@@ -238,7 +244,9 @@ std::string transformBesidesScale(openvdb::math::Transform const& transform) {
   return translated ? "a uniform scale with a translation" : "";
 }
 
-VdbImport importGrids(VdbFile const& file, Progress const& progress) {
+namespace {
+
+VdbImport importAndDrop(VdbFile& file, Progress const& progress) {
   VdbImport result;
   result.file = file.path;
   result.skipped = file.skipped;
@@ -258,6 +266,13 @@ VdbImport importGrids(VdbFile const& file, Progress const& progress) {
   return result;
 }
 
+} // namespace
+
+VdbImport importGrids(VdbFile const& file, Progress const& progress) {
+  VdbFile shared = file;
+  return importAndDrop(shared, progress);
+}
+
 VdbImport importGrids(VdbFile& file, VdbReadLimits const& limits, Progress const& progress) {
   if (!limits.channels.empty()) {
     Utils::ChannelParser filter;
@@ -268,7 +283,7 @@ VdbImport importGrids(VdbFile& file, VdbReadLimits const& limits, Progress const
       return !filter.accepts(grid->getName().empty() ? "unnamed" : grid->getName());
     });
   }
-  return importGrids(file, progress);
+  return importAndDrop(file, progress);
 }
 
 VdbImport importVdb(std::string const& path, VdbReadLimits const& limits, Progress const& progress) {

@@ -10,7 +10,8 @@ namespace VLN::Interop {
 /// Builds the volumes of a file that is in memory. Grids that cannot come in are named as skipped.
 VLN_API VdbImport importGrids(VdbFile const& file, Progress const& progress = {});
 
-/// The same of the grids that the limits' filter lets through.
+/// The same of the grids that the limits' filter lets through. Grids go out of the file as their channels are
+/// made.
 /// @error FileError for a filter that is none.
 VdbImport importGrids(VdbFile& file, VdbReadLimits const& limits, Progress const& progress);
 

@@ -216,7 +216,7 @@ openvdb::GridBase::Ptr makePointsGrid(PointSet const& points, std::string const&
 
 void writeVdbPoints(std::string const& path, PointSet const& points, std::string const& name) {
   OutputFile file(path);
-  writeVdbFile(file, {makePointsGrid(points, name)});
+  writeVdbFile(file, makePointsGrid(points, name));
 }
 
 } // namespace VLN::Interop

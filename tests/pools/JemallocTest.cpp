@@ -35,6 +35,19 @@ TEST(BulkAllocation, RequirementIsAlignedAndWritable) {
   }
 }
 
+TEST(BulkAllocation, RequirementZerosAreAlignedAndZeroAgain) {
+  for (int round = 0; round < 2; ++round)
+    for (std::uint64_t count : {1u, 17u, 1000u, 100000u, 2000000u}) {
+      auto* const block = static_cast<unsigned char*>(allocateZeros_jemalloc(count, 12));
+      ASSERT_NE(block, nullptr);
+      EXPECT_EQ(reinterpret_cast<std::uintptr_t>(block) % 64, 0u) << count;
+      std::uint64_t const bytes = bulkBytes(count, 12);
+      EXPECT_TRUE(std::all_of(block, block + bytes, [](unsigned char b) { return b == 0; })) << count;
+      std::fill_n(block, bytes, 0xab); // the next round may meet this memory
+      deallocate_jemalloc(block);
+    }
+}
+
 /// Whether the mapping of an address is to be made of huge pages.
 bool asksForHugePages(void const* address) {
   std::ifstream maps("/proc/self/smaps");

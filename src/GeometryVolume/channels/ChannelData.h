@@ -132,6 +132,9 @@ public:
   void appendTiles(int depth, std::int64_t count);
   /// A tile as appendTiles() makes it, of nobody yet.
   Vector newTile() const { return m_allocateEmptyTileData ? Vector() : newTile(m_layout.size, nullptr); }
+  Vector unwrittenTile() const {
+    return m_allocateEmptyTileData ? Vector() : unwrittenTile(m_layout.size, nullptr);
+  }
   /// Appends such tiles, moving them out of `arriving`: all, or none when something is thrown.
   void appendTiles(int depth, std::vector<Vector>& arriving);
   /// Grows tiles that hold fewer elements than `source` says.

@@ -17,17 +17,27 @@ std::int64_t tileSlotStride(std::int64_t elements, std::size_t elementSize) {
   return static_cast<std::int64_t>(padded / elementSize + (divides ? 0 : 1));
 }
 
-void* BlockList::allocate(std::int64_t elements, std::size_t elementSize) {
+void* BlockList::add(std::int64_t elements, std::size_t elementSize, Source source) {
   auto const count = static_cast<std::uint64_t>(elements);
   if (count > static_cast<std::uint64_t>(INT64_MAX) / elementSize) return nullptr;
   m_blocks.push_back(nullptr); // first: a block without a place would be lost
-  void* const block = ChannelMemoryPool::enabled() ? ChannelMemoryPool::allocate(count * elementSize)
-                                                   : allocate_jemalloc(count, elementSize);
+  void* const block = source(count, elementSize);
   if (block)
     m_blocks.back() = block;
   else
     m_blocks.pop_back();
   return block;
+}
+
+void* BlockList::allocate(std::int64_t elements, std::size_t elementSize) {
+  return add(elements, elementSize, [](std::uint64_t count, std::uint64_t size) {
+    return ChannelMemoryPool::enabled() ? ChannelMemoryPool::allocate(count * size)
+                                        : allocate_jemalloc(count, size);
+  });
+}
+
+void* BlockList::allocateZeros(std::int64_t elements, std::size_t elementSize) {
+  return add(elements, elementSize, &allocateZeros_jemalloc);
 }
 
 void BlockList::clear() {

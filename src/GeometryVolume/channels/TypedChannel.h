@@ -91,6 +91,8 @@ public:
   void appendTiles(int depth, std::int64_t count);
   /// A tile as appendTiles() makes it, of no channel yet.
   TileVector<T> newTile() const;
+  /// The same with elements as the memory held them.
+  TileVector<T> unwrittenTile() const;
   /// Appends such tiles, moving them out of `arriving`.
   /// @error std::bad_alloc; nothing has changed then.
   void appendTiles(int depth, std::vector<TileVector<T>>& arriving);

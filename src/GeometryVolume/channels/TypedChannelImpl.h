@@ -281,6 +281,7 @@ template <class T> void TypedChannel<T>::appendTiles(int depth, std::int64_t cou
   write([&](ChannelData<T>& data) { data.appendTiles(depth, count); });
 }
 template <class T> TileVector<T> TypedChannel<T>::newTile() const { return m_data->newTile(); }
+template <class T> TileVector<T> TypedChannel<T>::unwrittenTile() const { return m_data->unwrittenTile(); }
 template <class T> void TypedChannel<T>::appendTiles(int depth, std::vector<TileVector<T>>& arriving) {
   write([&](ChannelData<T>& data) { data.appendTiles(depth, arriving); });
 }

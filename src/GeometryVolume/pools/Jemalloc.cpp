@@ -36,6 +36,11 @@ void* allocate_jemalloc(std::uint64_t count, std::uint64_t elementSize) {
   return block;
 }
 
+void* allocateZeros_jemalloc(std::uint64_t count, std::uint64_t elementSize) {
+  static_assert(kBulkAlignment == 1u << 6);
+  return vlje_mallocx(bulkBytes(count, elementSize), VLJE_LG_ALIGN(6) | VLJE_ZERO);
+}
+
 void deallocate_jemalloc(void* block) { vlje_free(block); }
 
 void jemalloc_flushCache() {

@@ -21,6 +21,9 @@ constexpr std::uint64_t bulkBytes(std::uint64_t count, std::uint64_t elementSize
 /// @error Null when there is no memory.
 /// @threads Any thread.
 VLN_API void* allocate_jemalloc(std::uint64_t count, std::uint64_t elementSize);
+/// The same, all bytes zero. Large blocks take memory page by page as they are written.
+/// @edges Written at once where the system back end lies behind the bulk allocator.
+VLN_API void* allocateZeros_jemalloc(std::uint64_t count, std::uint64_t elementSize);
 VLN_API void deallocate_jemalloc(void* block);
 
 /// Gives memory that threads keep cached back to the system, as far as it can be reached: the caches of the

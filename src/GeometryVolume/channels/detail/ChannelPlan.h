@@ -32,6 +32,8 @@ public:
   /// A further block, 64-byte aligned.
   /// @error Null when there is no memory for it.
   void* allocate(std::int64_t elements, std::size_t elementSize);
+  /// The same of zeros, from the allocator alone: what the pool has was written before.
+  void* allocateZeros(std::int64_t elements, std::size_t elementSize);
   /// Takes all blocks of another list. Needs no memory.
   void take(BlockList& from) noexcept { m_blocks.splice(m_blocks.end(), from.m_blocks); }
   void clear();
@@ -39,6 +41,9 @@ public:
   std::size_t size() const { return m_blocks.size(); }
 
 private:
+  using Source = FunctionRef<void*(std::uint64_t elements, std::uint64_t elementSize)>;
+  void* add(std::int64_t elements, std::size_t elementSize, Source source);
+
   std::list<void*> m_blocks;
 };
 /// Appends `from` to `into` and empties it.
