@@ -51,7 +51,7 @@ void fillLeaves(openvdb::FloatGrid& grid, Coord const& low, Coord const& high, E
   }
 }
 
-void writeGrid(std::string const& path, openvdb::FloatGrid::Ptr grid, Progress const& progress) {
+void writeGrid(std::string const& path, openvdb::FloatGrid::Ptr const& grid, Progress const& progress) {
   if (progress) progress("writing", 0);
   OutputFile file(path);
   writeVdbFile(file, grid);

@@ -16,11 +16,11 @@ FieldBlock& FieldBlocks::make(int3 const& position, FieldBlock* block) {
   std::size_t n = hash(at) & m_mask;
   while (m_slots[n].block && m_slots[n].at != at) n = (n + 1) & m_mask;
   Slot& slot = m_slots[n];
-  if (!slot.block) {
-    slot = {at, block ? block : &newBlock()};
-    ++m_used;
-  }
-  return *slot.block;
+  if (slot.block) return *slot.block;
+  FieldBlock& made = block ? *block : newBlock();
+  slot = {at, &made};
+  ++m_used;
+  return made;
 }
 
 FieldBlock& FieldBlocks::newBlock() {
