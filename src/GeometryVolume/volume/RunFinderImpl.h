@@ -27,7 +27,7 @@ namespace VLN::TileTree3D::Internal {
 inline constexpr std::uint64_t kScattered = 3;
 /// Positions far apart are in no block that was seen lately: one part of so many tells, the others do not
 /// look.
-inline constexpr std::uint32_t kFarParts = 8;
+inline constexpr std::uint32_t kFarParts = 32;
 
 /// Four positions as they lie in memory: x y z x, y z x y, z x y z.
 struct FourPositions {
@@ -150,7 +150,8 @@ public:
   /// @param isScattered Whether the chunk is to make no blocks for itself.
   Chunk find(std::span<int3 const> positions, BulkPlace* places, bool isScattered) {
     m_out.isScattered = isScattered;
-    auto const count = static_cast<std::uint32_t>(positions.size());
+    m_count = positions.size();
+    auto const count = static_cast<std::uint32_t>(m_count);
     for (std::uint32_t n = 0; n < count && !m_out.outside;) {
       int3 const* const p = positions.data() + n;
       int const axis = rowAxis(p, count - n);
@@ -204,9 +205,15 @@ private:
     } else {
       m_lookUps = 0;
       std::uint32_t const runs = addRuns<false>(p, begin, count);
-      if (2 * m_lookUps > runs) m_farParts = kFarParts;
+      if (2 * m_lookUps > runs) expectFarApart();
     }
     return count;
+  }
+  void expectFarApart() {
+    m_farParts = kFarParts;
+    // A run for each position, in shares that are not quite equal.
+    for (std::size_t n = 0; n < m_plan.shares; ++n)
+      m_lists[n].reserve(m_count / m_plan.shares + m_count / 16);
   }
   /// @tparam kFarApart Whether the field's own blocks are looked up first, not those that were seen lately.
   /// @return How many runs the part has.
@@ -315,6 +322,7 @@ private:
   BulkRuns const& m_plan;
   ChunkTiles& m_tiles;
   std::vector<BulkRun>* m_lists;
+  std::size_t m_count = 0; ///< of positions
   std::uint64_t m_ownTiles = 0;
   std::uint32_t m_lookUps = 0;  ///< of whole blocks of the field, in the part
   std::uint32_t m_farParts = 0; ///< to come
