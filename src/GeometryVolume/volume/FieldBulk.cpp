@@ -1,9 +1,9 @@
 // Writing many elements: chunks of positions find their runs, and the field gets the tiles that they need.
 //
 // A round of chunks, one for each thread or all that are left:
-//   each chunk:  RunFinder --> runs for the shares, own blocks that are written already, tiles that are
-//   missing the field:   takes the own blocks; what several chunks have written is listed to be written
-//   again, in order
+//
+//   each chunk   finds runs for the shares, writes own blocks, lists missing tiles (RunFinder)
+//   the field    takes the own blocks; what several chunks wrote is listed to be written again, in order
 //                makes the missing tiles
 #include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/core/RollbackImpl.h"
@@ -68,6 +68,7 @@ std::vector<std::size_t> chunkBegins(std::span<int3 const> positions, std::size_
   return out;
 }
 
+/// Lets chunks find their runs, round by round, and gives the field what they need.
 class Planner {
 public:
   Planner(VolumeData& volume, FieldSlot& slot, std::span<int3 const> positions, BulkRuns& out)

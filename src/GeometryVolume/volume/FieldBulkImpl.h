@@ -36,7 +36,7 @@ struct ChunkTiles {
   virtual ~ChunkTiles();
   /// Makes elements, with the values that are read there.
   /// @param tiles Their block gets them.
-  virtual void make(BlockTiles& tiles) = 0;
+  virtual void make(BlockTiles const& tiles) = 0;
   /// Writes runs that begin at these places and values of the chunk.
   virtual void write(std::span<BulkRun const> runs, BulkPlace const* places) const = 0;
 

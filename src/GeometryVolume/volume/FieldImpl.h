@@ -37,7 +37,7 @@ template <class T> struct TypedChunkTiles final : ChunkTiles {
       , m_tree(tree)
       , m_accessor(tree.tileAccessor())
       , m_values(first) {}
-  void make(BlockTiles& wanted) override {
+  void make(BlockTiles const& wanted) override {
     tiles.appendFew(std::size_t(std::popcount(wanted.slots)), [&](auto& group) {
       m_slot.makeElements(m_tree, m_accessor, {&wanted, 1}, group);
     });
@@ -208,12 +208,12 @@ template <class T> struct TypedSlot final : FieldSlot {
 
   /// Makes elements and enters them.
   void makeElements(VolumeTree const& tree, VolumeTree::ConstTileAccessor const& accessor,
-                    std::span<BlockTiles> tiles, typename PendingTiles<T>::Group& out) const {
+                    std::span<BlockTiles const> tiles, typename PendingTiles<T>::Group& out) const {
     bool const grown = tree.tileCount(-1) > 0;
     for (std::size_t n = 0; n < tiles.size(); ++n) {
       if (n + kAhead < tiles.size())
         __builtin_prefetch(tiles[n + kAhead].block, 1); // another thread's so far
-      BlockTiles& block = tiles[n];
+      BlockTiles const& block = tiles[n];
       TreeIndex above; // the deepest tile of the tree there
       bool ofAll = !grown;
       for (std::uint32_t left = block.slots; left; left &= left - 1) {
@@ -282,7 +282,8 @@ private:
           ConstTileData<T, 4, 0>::index(p[n >> 1 & 1].x, p[n >> 3 & 1].y, p[n >> 5].z))];
   }
 
-  void makeGroup(VolumeTree const& tree, std::span<BlockTiles> tiles, typename PendingTiles<T>::Group& out) {
+  void makeGroup(VolumeTree const& tree, std::span<BlockTiles const> tiles,
+                 typename PendingTiles<T>::Group& out) {
     std::size_t count = 0;
     for (BlockTiles const& block : tiles) count += static_cast<std::size_t>(std::popcount(block.slots));
     out.reserve(count);

@@ -1,9 +1,8 @@
 // RunFinder: which positions of a chunk lie in which block.
 //
-//   positions in order --> runs in blocks that the field has ------> lists of the shares, written later
-//                      --> runs in blocks that the field lacks ----> the chunk's own blocks, written at once
-//   positions scattered -> runs in blocks that the field lacks ----> lists, and the tiles are listed as
-//   missing
+//   block in the field           --> list of a share, written later; tiles that it lacks are listed
+//   no block, positions in order --> block of the chunk's own, written at once
+//   no block, scattered          --> list of a share, and the tiles are listed as missing
 #pragma once
 
 #include "GeometryVolume/core/detail/SimdLanes.h"
@@ -266,8 +265,7 @@ private:
       return true;
     }
     if (seen.kind == SeenBlock::kOwn) {
-      BlockTiles wanted{p, missing, seen.block};
-      m_tiles.make(wanted);
+      m_tiles.make({p, missing, seen.block});
       m_ownTiles += static_cast<std::uint64_t>(std::popcount(missing));
     } else {
       FieldBlock& listed = seen.kind == SeenBlock::kListed ? *seen.block : list(p);
