@@ -4,6 +4,7 @@
 #include "GeometryVolume/core/Parallel.h"
 #include "Interop/VdbGridSourceImpl.h"
 #include "Interop/VdbLeafPlacesImpl.h"
+#include "Interop/VdbStateTilesImpl.h"
 #include "Interop/VdbZeroTilesImpl.h"
 
 #include <algorithm>
@@ -160,18 +161,9 @@ public:
     for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth)
       parallelFor(0, container.tileCount(depth),
                   [&](std::int64_t begin, std::int64_t end) {
-                    Search search(m_grid->tree());
-                    LastPlace place;
-                    ZeroTiles<unsigned char>::Run run;
-                    for (std::int64_t n = begin; n < end; ++n) {
-                      auto& tile = *tiles.tileData({n, depth}).data();
-                      if (!hasStates(search, place, container.tile(n, depth).tijk(), depth)) {
-                        tile = zeros.take(run);
-                        continue;
-                      }
-                      tile = channel->newTile();
-                      fillState(search, place, container.tile(n, depth).tijk(), depth, tile.data());
-                    }
+                    StateMaker<TreeT> make(m_grid->tree(), *channel, zeros);
+                    for (std::int64_t n = begin; n < end; ++n)
+                      *tiles.tileData({n, depth}).data() = make(container.tile(n, depth).tijk(), depth);
                   },
                   {.grain = 256});
     zeros.leaveTo(*channel->cloneData());
@@ -568,34 +560,6 @@ private:
       if (step == 1) return copyBlock(values, samples);
       fill([&](int n) { return values[n]; });
     }
-  }
-
-  /// Depth of the file's tree whose tiles are as wide as a sample: 2, 1 or 0 for 8, 128 or 4096 voxels, else
-  /// one that no tile has.
-  static int levelOf(int depth) {
-    int const step = VdbTraits::width(depth) / VdbTraits::kTDW;
-    return step == kNodeWidths[0] ? 2 : step == kNodeWidths[1] ? 1 : step == kNodeWidths[2] ? 0 : -2;
-  }
-  /// Whether a tile of states may hold one.
-  bool hasStates(Search& search, LastPlace& last, int3 const& corner, int depth) const {
-    if (depth < VdbTraits::kMaxDepth) return levelOf(depth) != -2;
-    lookUp(search, last, toCoord(leafPlaceOf(corner)));
-    return last.place.leaf;
-  }
-  /// @pre hasStates(); the states are none yet.
-  static void fillState(Search& search, LastPlace const& last, int3 const& corner, int depth,
-                        unsigned char* states) {
-    Coord const origin = toCoord(corner);
-    if (depth == VdbTraits::kMaxDepth)
-      return writeBlockStates(*last.place.leaf, static_cast<int>(Leaf::coordToOffset(origin)), states);
-    int const step = VdbTraits::width(depth) / VdbTraits::kTDW, level = levelOf(depth);
-    for (int k = 0; k < 4; ++k)
-      for (int j = 0; j < 4; ++j)
-        for (int i = 0; i < 4; ++i, ++states) {
-          Coord const c = origin.offsetBy(i * step, j * step, k * step);
-          auto const place = search.at(c);
-          if (place.level == level && place.active) *states = kVdbStateActive;
-        }
   }
 
   typename GridT::ConstPtr m_grid;
