@@ -92,7 +92,7 @@ std::vector<Order> orders() {
   }
   all.push_back(scattered);
   // Rows over what was scattered before, but not where that began.
-  Order over{"rows over scattered ones", {}};
+  Order over{"rows over scattered ones", boxOf({2000, 0, 0}, {300, 1, 1}, 0, 1)}; // which begin in order
   for (int n = 0; n < 15000; ++n) {
     auto const next = [&] { return static_cast<int>(random() % 60) + (n < 1200 ? 1000 : 0); };
     int const x = next(), y = next();
