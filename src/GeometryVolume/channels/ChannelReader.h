@@ -5,6 +5,7 @@
 #include "GeometryVolume/channels/Channel.h"
 #include "GeometryVolume/channels/detail/BlockCursor.h"
 
+#include <new>
 #include <utility>
 
 namespace VLN::TileTree3D {
@@ -52,8 +53,7 @@ public:
   /// @cost In the block of the read before: one test, and two loads. In another with a tile of the deepest
   /// depth: one load more, and where blocks are read one after another, their samples are fetched ahead.
   /// Elsewhere a lookup in the tree.
-  /// @error std::bad_alloc from the first lookup in the tree.
-  value_type const& value(int i, int j, int k) const {
+  value_type const& value(int i, int j, int k) const noexcept {
     using Tile = typename ChannelT::ConstTile;
     value_type const* const sample =
         m_blocks.template element<value_type, Tile::kWidth, Tile::index(0, 0, 0)>(i, j, k);
@@ -64,7 +64,7 @@ public:
     }
     return *sample;
   }
-  value_type const& value(int3 const& p) const { return value(p.x, p.y, p.z); }
+  value_type const& value(int3 const& p) const noexcept { return value(p.x, p.y, p.z); }
 
   /// Bytes of the tables.
   std::uint64_t memUsage() const { return m_tables->memUsage(); }
@@ -83,20 +83,28 @@ private:
     value_type const* sample;
   };
   /// From the tile that a search in the tree finds, or from one above it.
-  /// @param tiles The accessor of earlier searches, null for the first one.
+  /// @param tiles The accessor of earlier searches, null for the first one, and where there is no memory for
+  /// one.
+  // What could throw would keep the caller's sums out of registers: none of x86's survives a call, and around
+  // one with a way for exceptions the compiler does not save them.
   [[gnu::cold, gnu::noinline]] static Coarse coarse(Tiles* tiles, Container<TraitsT> const& tree,
-                                                    ChannelT const& channel, int i, int j, int k) {
-    if (!tiles) tiles = new Tiles(tree.tileAccessor());
-    TreeIndex at = tiles->treeIndex(i, j, k, TraitsT::kMaxDepth, false);
+                                                    ChannelT const& channel, int i, int j, int k) noexcept {
+    if (!tiles) tiles = new (std::nothrow) Tiles(tree.tileAccessor());
+    if (!tiles) [[unlikely]]
+      return {nullptr, &coarse(tree.tileAccessor(), channel, i, j, k)};
+    return {tiles, &coarse(*tiles, channel, i, j, k)};
+  }
+  static value_type const& coarse(Tiles const& tiles, ChannelT const& channel, int i, int j, int k) {
+    TreeIndex at = tiles.treeIndex(i, j, k, TraitsT::kMaxDepth, false);
     while (at.valid()) {
-      auto const& tile = tiles->tile(at);
+      auto const& tile = tiles.tile(at);
       if (value_type const* const samples = elements(channel, at))
-        return {tiles, samples + ChannelT::ConstTile::index(tile.childDataIJK(i, j, k))};
+        return samples[ChannelT::ConstTile::index(tile.childDataIJK(i, j, k))];
       at = tile.parentTreeIndex();
     }
-    return {tiles, &channel.defaultValue()};
+    return channel.defaultValue();
   }
-  [[gnu::cold, gnu::noinline]] static void drop(Tiles* tiles) { delete tiles; }
+  [[gnu::cold, gnu::noinline]] static void drop(Tiles* tiles) noexcept { delete tiles; }
 
   Ostil::Ptr<Tables> m_tables;
   Container<TraitsT> const* m_tree;

@@ -35,7 +35,8 @@ template <class TraitsT> void ReadTables<TraitsT>::chooseCells(Container<TraitsT
   }
 }
 
-template <class TraitsT> auto ReadTables<TraitsT>::blockInNodes(int i, int j, int k) const -> Block const* {
+template <class TraitsT>
+auto ReadTables<TraitsT>::blockInNodes(int i, int j, int k) const noexcept -> Block const* {
   std::uint32_t const u[3] = {TraitsT::offset(i), TraitsT::offset(j), TraitsT::offset(k)};
   std::size_t cell = 0;
   bool inside = true;
@@ -52,7 +53,7 @@ template <class TraitsT> auto ReadTables<TraitsT>::blockInNodes(int i, int j, in
 
 template <class TraitsT>
 auto ReadTables<TraitsT>::fetch(Block const& here, Block const* fetched, int i, int j, int k,
-                                std::size_t tileBytes) const -> Block const* {
+                                std::size_t tileBytes) const noexcept -> Block const* {
   constexpr std::size_t kLine = 64;
   Block const* const ahead = block(i, j, k);
   // Not a function for one block: the compiler takes one that does nothing but fetch ahead for one without

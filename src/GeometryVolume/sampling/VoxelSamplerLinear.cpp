@@ -70,7 +70,7 @@ VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::operator=(VoxelSamplerLinear const& other
   m_minDepth = other.m_minDepth;
   m_maxDepth = other.m_maxDepth;
   m_shared = other.m_shared;
-  m_tablesArrays = other.m_tablesArrays;
+  m_arrays = other.m_arrays;
   forgetTiles();
   return *this;
 }
@@ -88,10 +88,8 @@ VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::bind(CoreChannel const* core, WideChannel
     take(*core);
   else
     take(*wide);
-  if (m_maxDepth == TraitsT::kMaxDepth) {
-    m_shared = Ostil::makePtr<Internal::SharedReadTables<TraitsT>>();
-    m_tablesArrays = tileArrays();
-  }
+  if (m_maxDepth == TraitsT::kMaxDepth) m_shared = Ostil::makePtr<Internal::SharedReadTables<TraitsT>>();
+  m_arrays = tileArrays();
   forgetTiles();
 }
 
@@ -102,6 +100,108 @@ VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::forgetTiles() {
   m_highSides.fill({});
   m_blocks = m_blocksBeside = {};
   m_tileBefore = -1, m_tileChanges = 0;
+  m_region = {};
+  m_edge = {};
+  m_finestBefore = nullptr;
+}
+
+// Calls f with the corners of a position's cell and 1 / width of its tile's voxels.
+// @return The default value where there is no tile.
+VLN_SAMPLER_TEMPLATE template <class F>
+[[gnu::always_inline]] inline float VLN_SAMPLER::withCorners(Position const& position, int depth,
+                                                             SamplerSpace space, F const& f) const {
+  using namespace Internal;
+  if (depth > m_maxDepth) depth = m_maxDepth;
+  auto const p = this->toTileSpace(position, space);
+  SampleCell cell;
+  CellCorners corners;
+  TileSamples samples;
+  bool isKnown = tileArrays() == m_arrays;
+  if (m_region.holds(p, depth) && isKnown)
+    samples = m_region.samples();
+  else
+    isKnown = isKnown && depth == TraitsT::kMaxDepth && m_blocks.isOpen() && findFinest(p, samples);
+  if (isKnown) [[likely]] {
+    placeInCell<D>(p, __builtin_convertvector(samples.corner, FloatLanes), samples.scale.samples,
+                   lanesOf(this->m_offset), cell);
+    if (m_channelWide) return f(wideCorners(samples.data, cell), samples.scale.invVoxelWidth);
+    if (isInside(cell)) {
+      ++m_accessCount;
+      return f(insideCorners(samples.data, cell), samples.scale.invVoxelWidth);
+    }
+    if (m_edge.is(samples.data, cell.ijk) || finestEdge(samples, cell)) {
+      ++m_accessCount;
+      return f({m_edge.low, m_edge.width, cell.weights}, samples.scale.invVoxelWidth);
+    }
+  }
+  return findCorners(p, depth, cell, corners) ? f(corners, cell.invVoxelWidth) : m_defaultValue;
+}
+
+VLN_SAMPLER_TEMPLATE float VLN_SAMPLER::sample(Position const& position, int depth,
+                                               SamplerSpace space) const {
+  return withCorners(position, depth, space,
+                     [](CellCorners const& corners, float) { return corners.value(); });
+}
+VLN_SAMPLER_TEMPLATE float VLN_SAMPLER::sampleGradient(Position const& position, int depth,
+                                                       SamplerSpace space, Position* gradient) const {
+  Position slope{0.0f, 0.0f, 0.0f}; // apart: the position may be where the gradient is to be
+  float const value = withCorners(position, depth, space, [&](CellCorners const& corners, float inverse) {
+    slope = corners.slope() * (inverse * 2.0f * m_invVoxelSize);
+    return corners.value();
+  });
+  *gradient = slope;
+  return value;
+}
+
+// The corners of a position's cell by a search.
+// @return false where the position takes the default value.
+VLN_SAMPLER_TEMPLATE [[gnu::noinline]] bool
+VLN_SAMPLER::findCorners(Internal::FloatLanes p, int depth, SampleCell& cell, CellCorners& corners) const {
+  if (!this->locate(p, Internal::floorLanesAnywhere(p), depth, cell) || !covers(cell.tile)) return false;
+  bool const isOther = cell.tile.index != m_tileBefore;
+  if (isOther) countTile(cell.tile.index);
+  // Of the smallest tiles the second time: what is read at random needs no region.
+  if (!(isOther && cell.tile.depth == TraitsT::kMaxDepth) && tileArrays() == m_arrays) {
+    auto const& last = this->m_last;
+    m_region.set(last.regionCorner(), last.regionWidth(), depth,
+                 {dataOf(cell.tile), last.corner(), Internal::kSampleScales<TraitsT>[cell.tile.depth]});
+  }
+  corners = cornersOf(cell);
+  return true;
+}
+
+VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::cornersOf(SampleCell const& cell) const -> CellCorners {
+  float const* const data = dataOf(cell.tile);
+  if (m_channelWide) return wideCorners(data, cell);
+  ++m_accessCount;
+  if (isInside(cell)) return insideCorners(data, cell);
+  m_edge.tile = nullptr; // memory may end while what it refers to is overwritten
+  auto const corners = cachedCorners(cell.tile, Internal::toInt3(cell.ijk), Internal::toFloat3(cell.weights));
+  m_edge = {data, cell.ijk, corners.low, corners.width};
+  return corners;
+}
+VLN_SAMPLER_TEMPLATE float VLN_SAMPLER::sample(TreeIndex const& tile, int3 const& ijk,
+                                               Position const& weights) const {
+  if (tile.depth > m_maxDepth) return sampleAbove(tile, ijk, weights);
+  if (!covers(tile)) return m_defaultValue;
+  return cornersOf({tile, 0.0f, Internal::lanesOf(ijk), Internal::lanesOf(weights)}).value();
+}
+
+// The tile of the deepest depth that holds the position, by the tables.
+// @return false where there is none.
+VLN_SAMPLER_TEMPLATE [[gnu::always_inline]] inline bool
+VLN_SAMPLER::findFinest(Internal::FloatLanes p, Internal::TileSamples& samples) const {
+  using namespace Internal;
+  constexpr int kDepth = TraitsT::kMaxDepth;
+  auto const c = floorLanesAnywhere(p);
+  FinestSample const at = m_blocks.find(c[0], c[1], c[2]);
+  if (!at.elements) return false;
+  IntLanes const corner = c - IntLanes{int(at.i), int(at.j), int(at.k), 0};
+  samples = {static_cast<float const*>(at.elements), corner, kSampleScales<TraitsT>[kDepth]};
+  // The second position in a tile: it may well be a walk.
+  if (samples.data == m_finestBefore) m_region.set(corner, TraitsT::width(kDepth), kDepth, samples);
+  m_finestBefore = samples.data;
+  return true;
 }
 
 VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::findTile(int i, int j, int k, int depth) const -> CoreTile {
@@ -175,22 +275,27 @@ VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::openTables(std::int64_t tileChanges) cons
   m_blocks = m_blocksBeside = Internal::BlockCursor<TraitsT>(*tables);
 }
 
-// A cell of corner samples on the edge of a tile of the deepest depth.
-VLN_SAMPLER_TEMPLATE bool VLN_SAMPLER::finestEdge(float const* data, int3 const& corner,
-                                                  SampleCell const& cell, CellCorners& corners) const {
+// A cell of corner samples on the edge of a tile of the deepest depth, by the tables.
+// @return false of another tile, and where a tile beside it is needed and not there.
+VLN_SAMPLER_TEMPLATE [[gnu::noinline]] bool VLN_SAMPLER::finestEdge(Internal::TileSamples const& samples,
+                                                                    SampleCell const& cell) const {
+  using namespace Internal;
+  bool const isFinest =
+      samples.scale.invVoxelWidth == kSampleScales<TraitsT>[TraitsT::kMaxDepth].invVoxelWidth;
+  if (this->m_offsetType != kVoxelOffsetCorner || !isFinest || !m_blocks.isOpen()) return false;
   unsigned edge = 0;
   for (int a = 0; a < 3; ++a) edge |= unsigned(cell.ijk[a] == D - 1) << a;
   std::array<float const*, 8> tiles;
-  tiles[0] = data;
+  tiles[0] = samples.data;
   for (unsigned direction = edge; direction; direction = (direction - 1) & edge) {
     auto const on = [&](unsigned bit) { return direction & bit ? D : 0; };
-    auto const at = m_blocksBeside.find(corner.x + on(1), corner.y + on(2), corner.z + on(4));
+    auto const at =
+        m_blocksBeside.find(samples.corner[0] + on(1), samples.corner[1] + on(2), samples.corner[2] + on(4));
     if (!at.elements) return false;
     tiles[direction] = static_cast<float const*>(at.elements);
   }
-  readEdge(Internal::toInt3(cell.ijk), edge, tiles, m_corners.data());
-  ++m_accessCount;
-  corners = {m_corners.data(), 2, cell.weights};
+  readEdge(toInt3(cell.ijk), edge, tiles, m_corners.data());
+  m_edge = {samples.data, cell.ijk, m_corners.data(), 2};
   return true;
 }
 
@@ -251,7 +356,7 @@ VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::findHighSide(TreeIndex const& tile, HighS
   auto const on = [&](unsigned bit) { return direction & bit ? w : 0; };
   TreeIndex const at =
       m_tileAccessor.treeIndex(corner.x + on(1), corner.y + on(2), corner.z + on(4), tile.depth, true);
-  sides.set(direction, at.valid() ? dataOf(*m_channelCore, at) : nullptr);
+  sides.set(direction, at.valid() ? dataOf(at) : nullptr);
 }
 
 // The eight samples of a cell of corner samples, x fastest.
@@ -276,7 +381,7 @@ VLN_SAMPLER_TEMPLATE bool VLN_SAMPLER::edgeCorners(TreeIndex const& tile, int3 c
   auto& sides = m_highSides[tile.depth];
   if (sides.tile != tile.index) {
     sides.tile = tile.index, sides.known = sides.missing = sides.gaps = 0;
-    sides.set(0, dataOf(*m_channelCore, tile));
+    sides.set(0, dataOf(tile));
   }
   unsigned const edge =
       unsigned(low.x == D - 1) | unsigned(low.y == D - 1) << 1 | unsigned(low.z == D - 1) << 2;

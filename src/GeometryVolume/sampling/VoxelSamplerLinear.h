@@ -15,6 +15,7 @@
 #include "GeometryVolume/channels/detail/BlockCursor.h"
 #include "GeometryVolume/sampling/VoxelSampler.h"
 #include "GeometryVolume/sampling/detail/CellCorners.h"
+#include "GeometryVolume/sampling/detail/SampleRegion.h"
 #include "GeometryVolume/tiletree/Voxel.h"
 
 #include <cstdint>
@@ -87,11 +88,7 @@ public:
   float sample(Position const& position, SamplerSpace space) const {
     return sample(position, TraitsT::kMaxDepth, space);
   }
-  float sample(Position const& position, int depth, SamplerSpace space) const {
-    SampleCell cell;
-    CellCorners corners;
-    return cornersAt(position, depth, space, cell, corners) ? corners.value() : m_defaultValue;
-  }
+  float sample(Position const& position, int depth, SamplerSpace space) const;
   /// Many positions: values[n] = sample(positions[n], depth, space).
   /// @shape `count` positions and values.
   /// @cost At random places about half of as many single calls: what the next ones need is fetched
@@ -100,11 +97,7 @@ public:
               SamplerSpace space = kSamplerWorldSpace) const;
   /// The interpolation proper, of a cell as prepareToSample() gives it. A tile deeper than the channel stands
   /// for the same place at the channel's deepest depth.
-  float sample(TreeIndex const& tile, int3 const& ijk, Position const& weights) const {
-    if (tile.depth > m_maxDepth) return sampleAbove(tile, ijk, weights);
-    if (!covers(tile)) return m_defaultValue;
-    return cornersOf({tile, 0.0f, Internal::lanesOf(ijk), Internal::lanesOf(weights)}).value();
-  }
+  float sample(TreeIndex const& tile, int3 const& ijk, Position const& weights) const;
 
   // Values with gradients
   /// @formula The derivative of the trilinear cell in world space, times 2 kTW / D: exact for the
@@ -119,17 +112,7 @@ public:
   float sampleGradient(Position const& position, SamplerSpace space, Position* gradient) const {
     return sampleGradient(position, TraitsT::kMaxDepth, space, gradient);
   }
-  float sampleGradient(Position const& position, int depth, SamplerSpace space, Position* gradient) const {
-    SampleCell cell;
-    CellCorners corners;
-    if (!cornersAt(position, depth, space, cell, corners)) {
-      *gradient = {0.0f, 0.0f, 0.0f};
-      return m_defaultValue;
-    }
-    float const g = cell.invVoxelWidth * 2.0f * m_invVoxelSize;
-    *gradient = corners.slope() * g;
-    return corners.value();
-  }
+  float sampleGradient(Position const& position, int depth, SamplerSpace space, Position* gradient) const;
 
   /// Many positions, as sample() takes them.
   /// @shape `count` positions, values and gradients.
@@ -162,50 +145,25 @@ protected:
 private:
   using HighSides = Internal::HighSides;
   template <class Tile> using Cache = std::vector<CacheEntry<Tile>>;
+  // The cell that was last put together from several tiles.
+  struct EdgeCell {
+    float const* tile = nullptr;
+    Internal::IntLanes ijk{};
+    float const* low = nullptr;
+    int width = 0;
+    bool is(float const* samples, Internal::IntLanes cell) const {
+      return samples == tile && cell[0] == ijk[0] && cell[1] == ijk[1] && cell[2] == ijk[2];
+    }
+  };
 
   bool covers(TreeIndex const& tile) const {
     return tile.index >= 0 && tile.depth >= (m_minDepth > 0 ? m_minDepth : 0);
   }
-  // The cell of a position and its corners.
-  // @return false where it takes the default value.
-  bool cornersAt(Position const& position, int depth, SamplerSpace space, SampleCell& cell,
-                 CellCorners& corners) const {
-    if (depth > m_maxDepth) depth = m_maxDepth;
-    auto const p = this->toTileSpace(position, space);
-    auto const c = Internal::floorLanesAnywhere(p);
-    if (depth == TraitsT::kMaxDepth && m_blocks.isOpen() && !this->m_last.holds(c, depth) &&
-        finestCorners(p, c, cell, corners))
-      return true;
-    if (!this->locate(p, c, depth, cell) || !covers(cell.tile)) return false;
-    if (cell.tile.index != m_tileBefore) countTile(cell.tile.index);
-    corners = cornersOf(cell);
-    return true;
-  }
-  // The same by the tables.
-  // @return false where there is no tile of the deepest depth, or one of its neighbours is needed and not
-  // there.
-  bool finestCorners(Internal::FloatLanes p, Internal::IntLanes c, SampleCell& cell,
-                     CellCorners& corners) const {
-    using namespace Internal;
-    if (tileArrays() != m_tablesArrays) [[unlikely]]
-      return false;
-    FinestSample const at = m_blocks.find(c[0], c[1], c[2]);
-    if (!at.elements) return false;
-    auto const* const data = static_cast<float const*>(at.elements);
-    cell.tile = {-1, TraitsT::kMaxDepth};
-    IntLanes const corner = c - IntLanes{int(at.i), int(at.j), int(at.k), 0};
-    placeInCell<TraitsT>(p, corner, this->m_offset, cell);
-    if (m_channelWide) {
-      corners = wideCorners(data, cell);
-      return true;
-    }
-    if (isInside(cell)) {
-      ++m_accessCount;
-      corners = {data + cell.ijk[0] + D * (cell.ijk[1] + D * cell.ijk[2]), D, cell.weights};
-      return true;
-    }
-    return this->m_offsetType == kVoxelOffsetCorner && finestEdge(data, toInt3(corner), cell, corners);
-  }
+  template <class F>
+  float withCorners(Position const& position, int depth, SamplerSpace space, F const& f) const;
+  bool findCorners(Internal::FloatLanes p, int depth, SampleCell& cell, CellCorners& corners) const;
+  CellCorners cornersOf(SampleCell const& cell) const;
+  bool findFinest(Internal::FloatLanes p, Internal::TileSamples& samples) const;
   void countTile(std::int64_t index) const {
     m_tileBefore = index;
     if (++m_tileChanges == kTileChangesTold) openTables(std::exchange(m_tileChanges, 0));
@@ -219,13 +177,8 @@ private:
     auto const inside = [low](int i) { return i >= low && i + 1 < D; };
     return inside(cell.ijk[0]) && inside(cell.ijk[1]) && inside(cell.ijk[2]);
   }
-  CellCorners cornersOf(SampleCell const& cell) const {
-    if (m_channelWide) return wideCorners(dataOf(*m_channelWide, cell.tile), cell);
-    ++m_accessCount;
-    if (isInside(cell))
-      return {dataOf(*m_channelCore, cell.tile) + cell.ijk[0] + D * (cell.ijk[1] + D * cell.ijk[2]), D,
-              cell.weights};
-    return cachedCorners(cell.tile, Internal::toInt3(cell.ijk), Internal::toFloat3(cell.weights));
+  static CellCorners insideCorners(float const* data, SampleCell const& cell) {
+    return {data + cell.ijk[0] + D * (cell.ijk[1] + D * cell.ijk[2]), D, cell.weights};
   }
   CellCorners wideCorners(float const* data, SampleCell const& cell) const {
     constexpr int w = D + 1;
@@ -235,13 +188,12 @@ private:
     auto const weights = cell.weights + __builtin_convertvector(below, Internal::FloatLanes);
     return {data + at[0] + w * (at[1] + w * at[2]), w, weights};
   }
-  template <class ChannelT> static float const* dataOf(ChannelT const& channel, TreeIndex const& tile) {
-    auto const& tiles = (*channel.tileArrays())[tile.depth];
-    return tiles[static_cast<std::size_t>(tile.index)].data();
+  float const* dataOf(TreeIndex const& tile) const {
+    return (*tileArrays())[tile.depth][static_cast<std::size_t>(tile.index)].data();
   }
   float sampleAbove(TreeIndex const& tile, int3 const& ijk, Position const& weights) const;
   CellCorners cachedCorners(TreeIndex const& tile, int3 const& ijk, Position const& weights) const;
-  bool finestEdge(float const* data, int3 const& corner, SampleCell const& cell, CellCorners& corners) const;
+  bool finestEdge(Internal::TileSamples const& samples, SampleCell const& cell) const;
   void openTables(std::int64_t tileChanges) const;
   template <class F>
   void forBatches(Position const* positions, std::int64_t count, int depth, SamplerSpace space,
@@ -271,12 +223,15 @@ private:
   mutable PerDepth<std::int32_t, TraitsT::kDepths> m_lastSlot;
   mutable PerDepth<HighSides, TraitsT::kDepths> m_highSides;
   mutable std::array<float, 8> m_corners;
+  mutable Internal::SampleRegion m_region;
+  mutable EdgeCell m_edge; ///< in the region
   // What leads from positions straight to samples of the deepest depth: made by the first copy of the sampler
   // for which it pays.
   static constexpr int kTileChangesTold = 64;
   Ostil::Ptr<Internal::SharedReadTables<TraitsT>> m_shared;
   mutable Internal::BlockCursor<TraitsT> m_blocks, m_blocksBeside;
-  mutable TileArrays<float> const* m_tablesArrays = nullptr; ///< of the channel when they were made
+  TileArrays<float> const* m_arrays = nullptr; ///< of the channel, when the sampler was made
+  mutable float const* m_finestBefore = nullptr;
   mutable std::int64_t m_tileBefore = -1;
   mutable int m_tileChanges = 0;
   ContainerT const* m_container = nullptr;

@@ -32,7 +32,7 @@ public:
 
   /// The block that holds the point; noBlock() where no tile of the deepest depth is near, and out of the
   /// domain.
-  Block const* block(int i, int j, int k) const {
+  Block const* block(int i, int j, int k) const noexcept {
     if (m_cellDepth != kBlockDepth) return blockInNodes(i, j, k);
     // A cell for each block: depth and so the divisions are known here.
     std::uint32_t const x = cellOf(i, 0), y = cellOf(j, 1), z = cellOf(k, 2);
@@ -44,7 +44,7 @@ public:
   /// point.
   /// @return The latter.
   Block const* fetch(Block const& here, Block const* fetched, int i, int j, int k,
-                     std::size_t tileBytes) const;
+                     std::size_t tileBytes) const noexcept;
   /// A block without tiles.
   Block const& noBlock() const { return m_blocks.front(); }
   std::uint64_t memUsage() const;
@@ -71,7 +71,7 @@ private:
     else
       return TraitsT::quotient(TraitsT::offset(c), kBlockDepth) - m_origin[axis];
   }
-  Block const* blockInNodes(int i, int j, int k) const;
+  Block const* blockInNodes(int i, int j, int k) const noexcept;
   void chooseCells(Container<TraitsT> const& tree);
   /// The block of a tile's corner, made when there is none.
   Block& makeBlock(int3 const& corner);

@@ -5,6 +5,7 @@
 
 #include <array>
 #include <cstdint>
+#include <cstring>
 
 namespace VLN::TileTree3D::Internal {
 
@@ -14,26 +15,42 @@ struct CellCorners {
   int width;
   FloatLanes weights;
 
-  static float lerp(float a, float b, float t) { return (b - a) * t + a; }
-  /// The four samples of an edge of the cell along x, in the order (0,0) (1,0) (0,1) (1,1) of y and z.
-  FloatLanes samples(int x) const {
-    float const* const p = low + x;
-    int const w = width;
-    return FloatLanes{p[0], p[w], p[w * w], p[w * w + w]};
+  /// Two samples in a row from each of two places.
+  static FloatLanes rows(float const* p, float const* q) {
+    using Pair = float __attribute__((vector_size(8)));
+    Pair a, b;
+    std::memcpy(&a, p, sizeof a);
+    std::memcpy(&b, q, sizeof b);
+    return __builtin_shufflevector(a, b, 0, 1, 2, 3);
   }
-  float value() const { return value(samples(0), samples(1)); }
+  static float lerp(float a, float b, float t) { return (b - a) * t + a; }
+  /// The four samples at either end of the cell along x, in the order (0,0) (0,1) (1,0) (1,1) of y and z.
+  struct Ends {
+    FloatLanes low, high;
+  };
+  Ends ends() const {
+    int const w = width;
+    auto const a = rows(low, low + w * w), b = rows(low + w, low + (w * w + w));
+    return {__builtin_shufflevector(a, b, 0, 2, 4, 6), __builtin_shufflevector(a, b, 1, 3, 5, 7)};
+  }
+  float value() const {
+    auto const [a, b] = ends();
+    return value(a, b);
+  }
   float value(FloatLanes low4, FloatLanes high4) const {
     auto const v = lerpLanes(low4, high4, lanesOf(weights[0]));
-    float const y = weights[1];
-    return lerp(lerp(v[0], v[1], y), lerp(v[2], v[3], y), weights[2]);
+    // By y, for both z at once.
+    auto const u = lerpLanes(v, __builtin_shufflevector(v, v, 2, 3, 2, 3), lanesOf(weights[1]));
+    return lerp(u[0], u[1], weights[2]);
   }
   /// Derivatives by the weights.
   Velorn::Math::float3 slope() const {
-    auto const a = samples(0), b = samples(1), d = b - a;
+    auto const [a, b] = ends();
+    auto const d = b - a;
     float const x = weights[0], y = weights[1], z = weights[2];
-    return {lerp(lerp(d[0], d[1], y), lerp(d[2], d[3], y), z),
-            lerp(lerp(a[1] - a[0], b[1] - b[0], x), lerp(a[3] - a[2], b[3] - b[2], x), z),
-            lerp(lerp(a[2] - a[0], b[2] - b[0], x), lerp(a[3] - a[1], b[3] - b[1], x), y)};
+    return {lerp(lerp(d[0], d[2], y), lerp(d[1], d[3], y), z),
+            lerp(lerp(a[2] - a[0], b[2] - b[0], x), lerp(a[3] - a[1], b[3] - b[1], x), z),
+            lerp(lerp(a[1] - a[0], b[1] - b[0], x), lerp(a[3] - a[2], b[3] - b[2], x), y)};
   }
 };
 

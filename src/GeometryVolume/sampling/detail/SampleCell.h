@@ -18,35 +18,45 @@ struct SampleCell {
   FloatLanes weights;
 };
 
-/// Puts a position of tile space into the cell of a tile, by the tile's depth and corner.
-/// @pre The tile holds the position.
+/// Of a tile of each depth.
+struct SampleScale {
+  float invVoxelWidth; // kTW / W
+  float samples;       // D / W
+};
 template <class TraitsT>
-[[gnu::always_inline]] inline void placeInCell(FloatLanes p, IntLanes tileCorner,
-                                               Velorn::Math::float3 const& offset, SampleCell& cell) {
-  constexpr int D = TraitsT::kTDW;
-  struct Scale {
-    float invVoxelWidth; // kTW / W
-    float samples;       // D / W
-  };
-  static constexpr auto kScales = [] {
-    PerDepth<Scale, TraitsT::kDepths> scales{};
-    for (int d = 0; d < TraitsT::kDepths; ++d) {
-      auto const r = static_cast<float>(double(TraitsT::kTW) / TraitsT::width(d));
-      scales[d] = {r, D == 2 * TraitsT::kTW ? r + r : static_cast<float>(double(D) / TraitsT::width(d))};
-    }
-    return scales;
-  }();
-  Scale const& scale = kScales[cell.tile.depth];
-  cell.invVoxelWidth = scale.invVoxelWidth;
-  auto const corner = __builtin_convertvector(tileCorner, FloatLanes);
-  FloatLanes l = (p - corner) * scale.samples - lanesOf(offset);
+inline constexpr auto kSampleScales = [] {
+  PerDepth<SampleScale, TraitsT::kDepths> scales{};
+  for (int d = 0; d < TraitsT::kDepths; ++d) {
+    auto const r = static_cast<float>(double(TraitsT::kTW) / TraitsT::width(d));
+    constexpr int D = TraitsT::kTDW;
+    scales[d] = {r, D == 2 * TraitsT::kTW ? r + r : static_cast<float>(double(D) / TraitsT::width(d))};
+  }
+  return scales;
+}();
+
+/// Puts a position of tile space into a cell of the tile of `kWidth` samples with this corner.
+/// @param samples To a unit of tile space.
+/// @pre The tile holds the position.
+template <int kWidth>
+[[gnu::always_inline]] inline void placeInCell(FloatLanes p, FloatLanes corner, float samples,
+                                               FloatLanes offset, SampleCell& cell) {
+  FloatLanes l = (p - corner) * samples - offset;
   FloatLanes const zero = {};
   // Up to 1e-5 below the first sample counts as on it.
   l = (l > zero) | (l <= lanesOf(-1e-5f)) ? l : zero;
   // In reach of int: the tile holds p.
-  IntLanes const i = floorLanes(l), last = IntLanes{} + (D - 1);
+  IntLanes const i = floorLanes(l), last = IntLanes{} + (kWidth - 1);
   cell.ijk = i < last ? i : last;
   cell.weights = l - __builtin_convertvector(cell.ijk, FloatLanes);
+}
+/// The same by the cell's tile, with the tile's corner.
+template <class TraitsT>
+[[gnu::always_inline]] inline void placeInCell(FloatLanes p, IntLanes tileCorner,
+                                               Velorn::Math::float3 const& offset, SampleCell& cell) {
+  SampleScale const& scale = kSampleScales<TraitsT>[cell.tile.depth];
+  cell.invVoxelWidth = scale.invVoxelWidth;
+  placeInCell<TraitsT::kTDW>(p, __builtin_convertvector(tileCorner, FloatLanes), scale.samples,
+                             lanesOf(offset), cell);
 }
 
 /// The tile found last. Where it is coarser than was asked for, the voxel without a child that held the
@@ -55,6 +65,10 @@ template <class TraitsT> class LastTile {
 public:
   TreeIndex const& tile() const { return m_tile; }
   IntLanes corner() const { return m_corner; }
+  /// Where positions are known to have the same tile when the same depth is asked for: a voxel, or the whole
+  /// tile.
+  IntLanes regionCorner() const { return m_depth == INT_MIN ? m_corner : m_leafCorner; }
+  int regionWidth() const { return TraitsT::width(m_depth == INT_MIN ? m_tile.depth : m_tile.depth + 1); }
 
   bool holds(IntLanes c, int depth) const {
     auto const from = reinterpret_cast<UnsignedLanes>(c) - reinterpret_cast<UnsignedLanes>(m_leafCorner);
