@@ -39,6 +39,18 @@ TEST_F(PooledBlocks, RequirementBlocksComeFromAndReturnToThePool) {
   EXPECT_GE(ChannelMemoryPool::freeStoreSize(), 1u);
 }
 
+// What the pool keeps was written before, by another channel.
+TEST_F(PooledBlocks, RequirementLargeBlocksHoldTheDefaultValueOfTheirNextChannel) {
+  FakeTree const tree = FakeTree().set(3, 12000);
+  for (float const value : {7.0f, 0.0f, 3.0f, 0.0f}) {
+    C channel(Flags{true}, value);
+    channel.update(tree);
+    for (std::int64_t n = 0; n < channel.tileCount(3); ++n)
+      for (float v : std::as_const(channel).tileData(n, 3)) ASSERT_EQ(v, value);
+  }
+  EXPECT_EQ(ChannelMemoryPool::freeStoreSize(), 1u);
+}
+
 TEST_F(PooledBlocks, RequirementHandedOverBlocksReturnWithTheStorage) {
   std::uint64_t const before = ChannelMemoryPool::usedStoreSize();
   auto original = std::make_unique<C>(Flags{true}, 4.0f);

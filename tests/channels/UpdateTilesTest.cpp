@@ -2,6 +2,8 @@
 #include "FakeTree.h"
 #include "ProbeChannel.h"
 
+#include <bit>
+#include <cstdint>
 #include <gtest/gtest.h>
 #include <utility>
 
@@ -139,6 +141,52 @@ TEST(UpdateTiles, RequirementStaticPointTilesLieOneBehindTheOther) {
   EXPECT_EQ(channel.tileData(0, 9).data()->data(), first + 12);
   EXPECT_EQ(channel.elementCount(TreeIndex{1, 3}), 0);
   EXPECT_FALSE(channel.isStatic({1, 3}));
+}
+
+TEST(UpdateTiles, RequirementStaticPointTilesOfOneSizeLieBehindThoseThatDiffer) {
+  Points channel(Flags{true}, 1.0f);
+  FakeTree tree;
+  tree.elements[3] = {5, 7};
+  tree.elements[9] = {2, 2, 2};
+  channel.update(tree);
+  float const* const first = channel.tileData(0, 3).data()->data();
+  for (std::int64_t n = 0; n < 3; ++n) EXPECT_EQ(channel.tileData(n, 9).data()->data(), first + 12 + 2 * n);
+  EXPECT_EQ(channel.tileData(2, 9)[1], 1.0f);
+  tree.elements[9] = {2, 2, 2, 6, 6, 1};
+  channel.update(tree);
+  EXPECT_EQ(channel.elementCount(TreeIndex{4, 9}), 6);
+  EXPECT_EQ(channel.elementCount(TreeIndex{5, 9}), 1);
+  EXPECT_EQ(channel.tileData(4, 9).data()->data(), channel.tileData(3, 9).data()->data() + 6);
+  for (std::int64_t n = 0; n < 6; ++n)
+    for (float v : std::as_const(channel).tileData(n, 9)) EXPECT_EQ(v, 1.0f);
+}
+
+// Blocks of many megabytes are made in other ways than small ones.
+template <class C> void expectLargeGrowth(int elements) {
+  constexpr std::size_t kTiles = 40000;
+  for (float const value : {0.0f, -0.0f, 2.5f}) {
+    auto const bits = std::bit_cast<std::uint32_t>(value);
+    C channel(Flags{true}, value);
+    for (std::size_t n : {kTiles, kTiles + 1, 2 * kTiles}) {
+      auto const before = channel.tileCount(20);
+      channel.update(FakeTree().set(20, n, elements).set(28, 3, elements));
+      expectSize(channel, 28, 3, elements);
+      ASSERT_EQ(channel.tileCount(20), static_cast<std::int64_t>(n));
+      for (auto i = before; i < channel.tileCount(20); ++i) {
+        ASSERT_EQ(channel.elementCount(TreeIndex{i, 20}), elements);
+        ASSERT_TRUE(channel.isStatic({i, 20}));
+        for (float v : std::as_const(channel).tileData(i, 20))
+          ASSERT_EQ(std::bit_cast<std::uint32_t>(v), bits);
+        channel.tileData(i, 20).set(static_cast<float>(i));
+      }
+    }
+    for (std::int64_t i = 0; i < channel.tileCount(20); ++i)
+      for (float v : std::as_const(channel).tileData(i, 20)) ASSERT_EQ(v, static_cast<float>(i));
+  }
+}
+TEST(UpdateTiles, RequirementLargeStaticGrowthHoldsTheDefaultValue) {
+  expectLargeGrowth<Points>(64);
+  expectLargeGrowth<Haloed>(216);
 }
 
 TEST(UpdateTiles, BoundaryStaticGrowthByEmptyTilesNeedsNoBlock) {

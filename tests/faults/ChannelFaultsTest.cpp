@@ -80,6 +80,17 @@ TEST(ChannelFaults, RequirementGrowing) {
   tryEach<Points>("points grow", [&](Points& c) { c.update(more); });
   tryEach<Field>("a field grows", [&](Field& c) { c.updateTilesAdded(more); });
 }
+TEST(ChannelFaults, RequirementGrowingByManyMegabytes) {
+  FakeTree const more = tiles(8, 12000);
+  auto const counts = [](Held<Field> const& h) {
+    Field const& c = *h.channel;
+    auto const last = c.tileData(c.tileCount(20) - 1, 20);
+    return std::to_string(c.tileCount(-1)) + ' ' + std::to_string(c.size()) + ' ' + std::to_string(last[0]);
+  };
+  everyAllocation<Held<Field>>(
+      "a large field grows",
+      {[] { return held<Field>(true); }, [&](Held<Field>& h) { h.channel->update(more); }, counts});
+}
 TEST(ChannelFaults, RequirementShrinking) {
   FakeTree const fewer = tiles(1, 2), both = tiles(1, 30);
   tryEach<Points>("points shrink", [&](Points& c) { c.update(fewer); });

@@ -11,6 +11,7 @@
 
 #include <algorithm>
 #include <limits>
+#include <random>
 #include <utility>
 #include <vector>
 
@@ -243,6 +244,80 @@ TYPED_TEST(Accessor, RequirementManyTilesInAnyOrderMakeOneTree) {
       VLN::withThreads(threads, [&] { tree.tileAccessor().addTiles(*lists); });
       EXPECT_EQ(Support::treeContents(tree), Support::treeContents(first)) << threads;
     }
+  }
+}
+
+// requirement: what is there already, and roots that come to lie below new tiles, are found by all threads
+TYPED_TEST(Accessor, ManyTilesAtOnceOnATreeMakeThoseOfSingleAdditions) {
+  using T = TypeParam;
+  for (unsigned const seed : {1u, 2u, 3u}) {
+    Support::TilePlaces<T> places(seed);
+    Container<T> start;
+    for (VoxelCoord const& at : places.some(400)) start.tileAccessor().addTile(at);
+    auto wanted = places.some(4000);
+    typename Container<T>::TileLists lists;
+    for (VoxelCoord const& at : wanted) lists[at.depth].append(at.ijk());
+    Container<T> single = start;
+    std::stable_sort(wanted.begin(), wanted.end(),
+                     [](auto const& a, auto const& b) { return a.depth < b.depth; });
+    for (VoxelCoord const& at : wanted) single.tileAccessor().addTile(at);
+    std::vector<std::int64_t> first;
+    for (int const threads : {1, 2, 8}) {
+      Container<T> tree = start;
+      typename Container<T>::TileLists made;
+      VLN::withThreads(threads, [&] { tree.tileAccessor().addTiles(lists, &made); });
+      EXPECT_TRUE(tree.checkConsistency(true)) << seed;
+      EXPECT_TRUE(tree.checkBranchSizes(true)) << seed;
+      auto const reader = std::as_const(tree).tileAccessor();
+      for (int d = 0; d <= T::kMaxDepth; ++d) {
+        ASSERT_EQ(tree.tileCount(d), single.tileCount(d)) << seed << " depth " << d;
+        ASSERT_EQ(static_cast<std::int64_t>(made[d].size()), tree.tileCount(d) - start.tileCount(d));
+        for (std::int64_t n = 0; n < single.tileCount(d); ++n)
+          ASSERT_TRUE(reader.tile(single.tile(n, d).voxelCoord(), true).valid()) << seed << " depth " << d;
+      }
+      auto const contents = Support::treeContents(tree);
+      if (first.empty()) first = contents;
+      EXPECT_EQ(contents, first) << seed << ", threads " << threads;
+    }
+  }
+}
+
+// requirement: where the cursor stands, and where it was, only shortens the way
+TYPED_TEST(Accessor, AdditionsThroughOneCursorAreThoseOfFreshOnes) {
+  using T = TypeParam;
+  constexpr int kDeep = T::kMaxDepth;
+  for (unsigned const seed : {1u, 2u, 3u, 4u}) {
+    std::mt19937 random(seed);
+    auto const pick = [&](int low, int high) {
+      return std::uniform_int_distribution<int>(low, high)(random);
+    };
+    Container<T> tree, fresh;
+    auto accessor = tree.tileAccessor();
+    int const wide = T::width(kDeep - 5);
+    int3 place{0, 0, 0};
+    for (int n = 0; n < 3000; ++n) {
+      // Mostly close to the place before, so that paths are shared; at times in another tree.
+      int const reach = pick(0, 9) == 0 ? 3 * wide : T::width(kDeep - pick(0, 4));
+      for (int a = 0; a < 3; ++a) place[a] = std::clamp(place[a] + pick(-reach, reach), -4 * wide, 4 * wide);
+      int const what = pick(0, 99), depth = kDeep - (what < 60 ? 0 : pick(0, 5));
+      if (what == 99) {
+        TreeIndex const at = fresh.tileAccessor().treeIndex(place.x, place.y, place.z, depth, false);
+        if (!at.valid()) continue;
+        accessor.removeTile(at, true);
+        fresh.tileAccessor().removeTile(at, true);
+      } else if (what >= 90) {
+        EXPECT_EQ(accessor.tile(place, depth, true).treeIndex(),
+                  fresh.tileAccessor().tile(place, depth, true).treeIndex());
+      } else {
+        TreeIndex const added = accessor.addTile(place, depth).treeIndex();
+        ASSERT_EQ(added, fresh.tileAccessor().addTile(place, depth).treeIndex())
+            << "seed " << seed << ", " << n;
+        ASSERT_EQ(accessor.current().treeIndex(), added);
+        ASSERT_TRUE(tree.tile(added).contains(place));
+      }
+    }
+    EXPECT_EQ(Support::treeContents(tree), Support::treeContents(fresh)) << seed;
+    EXPECT_TRUE(tree.checkConsistency(true)) << seed;
   }
 }
 

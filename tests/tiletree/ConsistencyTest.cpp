@@ -192,6 +192,19 @@ TYPED_TEST(Consistency, BranchSizesDoNotDependOnThreads) {
   }
 }
 
+// requirement: sizes that somebody has changed as well
+TYPED_TEST(Consistency, ManyTilesAtOnceMakeAllBranchSizesRight) {
+  using T = TypeParam;
+  Container<T> tree;
+  auto accessor = tree.tileAccessor();
+  accessor.addTiles({0, 0, 0}, {20, 20, 20}, T::kMaxDepth);
+  for (auto t = tree.beginTiles(); t != tree.endTiles(); ++t) t->setBranchSize(-1);
+  typename Container<T>::TileLists lists;
+  for (int n = 0; n < 50; ++n) lists[T::kMaxDepth].append({n, n, 0});
+  accessor.addTiles(lists);
+  EXPECT_TRUE(tree.checkBranchSizes(true));
+}
+
 // requirement
 TYPED_TEST(Consistency, DumpListsCountsRootsAndTiles) {
   using T = TypeParam;

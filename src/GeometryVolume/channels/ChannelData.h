@@ -179,9 +179,12 @@ private:
   std::size_t tileBytes() const { return static_cast<std::size_t>(m_layout.size) * sizeof(T); }
   void sumCounts();
   Spans allTiles() const;
+  /// Makes the added tiles of a depth: in their slots of `block` where all are of one size, and not written
+  /// then; else empty.
+  void makeAdded(Internal::GrowthPlan const& plan, int depth, T* block);
   /// Gives the added tiles of a plan their elements, in `block` if there is one.
-  void fillAdded(Internal::GrowthPlan const& plan, Internal::TileCounts const& source, void* block,
-                 std::int64_t stride);
+  /// @param zeros Whether that holds zeros for new elements.
+  void fillAdded(Internal::GrowthPlan const& plan, Internal::TileCounts const& source, T* block, bool zeros);
 
   /// A vector of `n` unwritten elements, in `slot` when that is not null.
   Vector unwrittenTile(std::int64_t n, T* slot) const;

@@ -1,5 +1,6 @@
 #include "GeometryVolume/channels/detail/ChannelPlan.h"
 
+#include "GeometryVolume/core/HugePagesImpl.h"
 #include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/pools/ChannelMemoryPool.h"
 #include "GeometryVolume/pools/Jemalloc.h"
@@ -38,6 +39,17 @@ void* BlockList::allocate(std::int64_t elements, std::size_t elementSize) {
 
 void* BlockList::allocateZeros(std::int64_t elements, std::size_t elementSize) {
   return add(elements, elementSize, &allocateZeros_jemalloc);
+}
+
+void* BlockList::allocate(std::int64_t elements, std::size_t elementSize, bool& zeros) {
+  // Smaller blocks are mostly memory that was in use before, and still in the caches when it is written.
+  constexpr std::int64_t kFreshBytes = std::int64_t(8) << 20;
+  zeros = zeros && !ChannelMemoryPool::enabled() &&
+          elements >= kFreshBytes / static_cast<std::int64_t>(elementSize);
+  if (!zeros) return allocate(elements, elementSize);
+  void* const block = allocateZeros(elements, elementSize);
+  if (block) VLN::Internal::preferHugePages(block, static_cast<std::size_t>(elements) * elementSize);
+  return block;
 }
 
 void BlockList::clear() {
@@ -106,25 +118,37 @@ TileSlots planSlots(int first, int last, DepthCounts const& counts,
   return slots;
 }
 
-GrowthPlan planGrowth(int first, int last, DepthCounts const& own, TileCounts const& source, bool fixedSize,
-                      std::int64_t stride) {
+GrowthPlan planGrowth(int first, int last, DepthCounts const& own, TileCounts const& source,
+                      std::int64_t fixedElements, std::int64_t stride) {
   GrowthPlan plan;
   for (int d = first; d <= last; ++d) {
     auto const depth = static_cast<std::size_t>(d);
-    std::int64_t const n = std::max<std::int64_t>(0, source.tileCount(d));
+    std::int64_t const n = std::max<std::int64_t>(0, source.tileCount(d)), begin = own[depth];
     plan.wanted[depth] = n;
-    plan.changes = plan.changes || n != own[depth];
-    plan.added.add(d, own[depth], n);
-    if (stride == 0) continue;
-    plan.base[depth] = plan.blockElements;
-    if (fixedSize) {
-      plan.blockElements += std::max<std::int64_t>(0, n - own[depth]) * stride;
-      continue;
+    plan.changes = plan.changes || n != begin;
+    plan.added.add(d, begin, n);
+    auto& tiles = plan.tiles[depth];
+    if (fixedElements > 0)
+      tiles = {fixedElements, plan.blockElements, stride};
+    else if (stride > 0 && n > begin) {
+      auto const elements = [&](std::int64_t i) {
+        return std::max<std::int64_t>(0, source.elementCount(TreeIndex{i, d}));
+      };
+      std::int64_t const size = elements(begin);
+      auto differs = begin + 1;
+      while (differs < n && elements(differs) == size) ++differs;
+      if (differs == n) {
+        tiles = {size, plan.blockElements, size};
+      } else {
+        auto& offsets = plan.slots.offsets[depth];
+        offsets.reserve(static_cast<std::size_t>(n - begin));
+        for (auto i = begin; i < n; ++i) {
+          offsets.push_back(plan.blockElements);
+          plan.blockElements += i < differs ? size : elements(i);
+        }
+      }
     }
-    for (auto i = own[depth]; i < n; ++i) {
-      plan.slots.offsets[depth].push_back(plan.blockElements);
-      plan.blockElements += std::max<std::int64_t>(0, source.elementCount(TreeIndex{i, d}));
-    }
+    plan.blockElements += std::max<std::int64_t>(0, n - begin) * tiles.stride;
   }
   return plan;
 }

@@ -3,13 +3,16 @@
 
 #include "GeometryVolume/channels/ChannelData.h"
 #include "GeometryVolume/channels/detail/TileVectorOps.h"
+#include "GeometryVolume/core/HugePagesImpl.h"
 #include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/core/RollbackImpl.h"
 
 #include <algorithm>
 #include <atomic>
+#include <cstddef>
 #include <cstring>
 #include <iterator>
+#include <span>
 #include <utility>
 
 namespace VLN::TileTree3D {
@@ -19,7 +22,15 @@ namespace Internal {
 /// Room for `n` tiles, growing as vectors do.
 template <class T> void reserveDepthTiles(std::vector<TileVector<T>>& tiles, std::int64_t n) {
   auto const wanted = static_cast<std::size_t>(n);
-  if (wanted > tiles.capacity()) tiles.reserve(std::max(wanted, 2 * tiles.size()));
+  if (wanted <= tiles.capacity()) return;
+  tiles.reserve(std::max(wanted, 2 * tiles.size()));
+  VLN::Internal::preferHugePages(tiles.data(), tiles.capacity() * sizeof(TileVector<T>));
+}
+
+/// Whether all bytes of a value are 0, which is more than to compare as 0 does.
+template <class T> bool isZeroBytes(T const& value) {
+  auto const bytes = std::as_bytes(std::span(&value, 1));
+  return std::all_of(bytes.begin(), bytes.end(), [](std::byte b) { return b == std::byte(0); });
 }
 
 /// Drops capacity beyond twice the size, where there is memory for the move.
@@ -48,16 +59,20 @@ template <class T> void assignTile(TileVector<T>& to, TileVector<T> const& from)
 template <class T> bool ChannelData<T>::resizeTiles(Internal::TileCounts const& source) {
   if (!m_data) return true;
   bool const fill = !m_allocateEmptyTileData;
-  bool const fixed = m_layout.fixedSize();
   std::int64_t const stride = m_useStaticAllocation && fill ? slotElements(0) : 0;
-  auto const plan = Internal::planGrowth(firstDepth(), lastDepth(), m_tileCounts, source, fixed, stride);
+  auto const plan = Internal::planGrowth(firstDepth(), lastDepth(), m_tileCounts, source,
+                                         m_layout.fixedSize() ? m_layout.size : 0, stride);
   if (!plan.changes) {
     sumCounts();
     return true;
   }
   Internal::BlockList blocks;
-  void* block = nullptr;
-  if (plan.blockElements > 0 && !(block = blocks.allocate(plan.blockElements, sizeof(T)))) return false;
+  T* block = nullptr;
+  bool zeros = m_callElementConstructor && Internal::isZeroBytes(m_defaultValue);
+  if (plan.blockElements > 0) {
+    block = static_cast<T*>(blocks.allocate(plan.blockElements, sizeof(T), zeros));
+    if (!block) return false;
+  }
 
   Counts const before = m_tileCounts;
   cloneData();
@@ -76,12 +91,9 @@ template <class T> bool ChannelData<T>::resizeTiles(Internal::TileCounts const& 
     }
   });
   Internal::forEachDepth(firstDepth(), lastDepth(), [&](int d) {
-    auto& tiles = depthTiles(d);
-    if (wanted(d) <= tiles.size()) return;
-    Internal::reserveDepthTiles(tiles, plan.wanted[static_cast<std::size_t>(d)]);
-    tiles.resize(wanted(d));
+    if (wanted(d) > depthTiles(d).size()) makeAdded(plan, d, block);
   });
-  if (fill) fillAdded(plan, source, block, stride);
+  if (fill) fillAdded(plan, source, block, zeros);
   added.dismiss();
 
   m_allocations.take(blocks);
@@ -97,22 +109,45 @@ template <class T> bool ChannelData<T>::resizeTiles(Internal::TileCounts const& 
   return true;
 }
 
+template <class T> void ChannelData<T>::makeAdded(Internal::GrowthPlan const& plan, int depth, T* block) {
+  auto& tiles = depthTiles(depth);
+  auto const wanted = static_cast<std::size_t>(plan.wanted[static_cast<std::size_t>(depth)]);
+  Internal::reserveDepthTiles(tiles, static_cast<std::int64_t>(wanted));
+  auto const& added = plan.tiles[static_cast<std::size_t>(depth)];
+  if (!block || added.elements <= 0) return tiles.resize(wanted);
+  // Where they belong at once: a table of tiles is long enough to be written only once.
+  using Elements = Internal::UnwrittenElements;
+  Elements const begin(0), end(added.elements);
+  T* slot = block + added.base;
+  for (auto n = wanted - tiles.size(); n > 0; --n, slot += added.stride)
+    tiles.emplace_back(begin, end, TileDataAllocator<T>(slot, added.elements, m_callElementConstructor));
+}
+
 template <class T>
-void ChannelData<T>::fillAdded(Internal::GrowthPlan const& plan, Internal::TileCounts const& source,
-                               void* block, std::int64_t stride) {
-  bool const fixed = m_layout.fixedSize();
+void ChannelData<T>::fillAdded(Internal::GrowthPlan const& plan, Internal::TileCounts const& source, T* block,
+                               bool zeros) {
+  bool const write = m_callElementConstructor && !zeros;
+  auto const made = [&](int d) { return block && plan.tiles[static_cast<std::size_t>(d)].elements >= 0; };
+  bool allMade = true;
+  for (int d = firstDepth(); d <= lastDepth(); ++d)
+    allMade = allMade && (plan.wanted[static_cast<std::size_t>(d)] <= count(d) || made(d));
+  if (allMade && !write) return;
   plan.added.forEach(Internal::tileGrain(tileBytes()), [&](int d, std::int64_t begin, std::int64_t end) {
     auto const depth = static_cast<std::size_t>(d);
+    if (made(d)) {
+      auto const& added = plan.tiles[depth];
+      T* slot = block + added.base + (begin - count(d)) * added.stride;
+      for (auto i = begin; write && i < end; ++i, slot += added.stride)
+        Internal::fillRun(slot, added.elements, m_defaultValue);
+      return;
+    }
     auto& tiles = depthTiles(d);
     for (auto i = begin; i < end; ++i) {
-      std::int64_t const n =
-          fixed ? m_layout.size : std::max<std::int64_t>(0, source.elementCount(TreeIndex{i, d}));
+      std::int64_t const n = m_layout.fixedSize()
+                                 ? m_layout.size
+                                 : std::max<std::int64_t>(0, source.elementCount(TreeIndex{i, d}));
       if (n == 0) continue;
-      T* slot = nullptr;
-      if (block) {
-        std::int64_t const nth = i - m_tileCounts[depth];
-        slot = static_cast<T*>(block) + (fixed ? plan.base[depth] + nth * stride : plan.slots.at(d, nth));
-      }
+      T* const slot = block ? block + plan.slots.at(d, i - count(d)) : nullptr;
       tiles[static_cast<std::size_t>(i)] = newTile(n, slot);
     }
   });

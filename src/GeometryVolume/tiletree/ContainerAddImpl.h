@@ -2,30 +2,13 @@
 #pragma once
 
 #include "GeometryVolume/core/Canceller.h"
-#include "GeometryVolume/tiletree/ContainerBuilderImpl.h"
+#include "GeometryVolume/tiletree/ContainerAppendImpl.h"
 
+#include <algorithm>
 #include <utility>
 #include <vector>
 
 namespace VLN::TileTree3D {
-
-template <class TraitsT>
-TreeIndex ContainerBuilder<TraitsT>::addTileBelow(TreeIndex above, int i, int j, int k, int depth) {
-  if (depth == kMaxDepth && above.depth + 1 == depth) {
-    // The common case: a record alone, after whose allocation nothing fails.
-    TreeIndex const made = makeTile(i, j, k, depth);
-    editTile(made).setParentIndex(above.index);
-    TileType& parent = editTile(above);
-    parent.childIndex(tile(made)) = made.index;
-    parent.setBranchSize(parent.branchSize() + kTileSize);
-    return made;
-  }
-  Growth growth(data());
-  TreeIndex const made = makeTile(i, j, k, depth);
-  insertChild(above, made);
-  growth.keep();
-  return made;
-}
 
 template <class TraitsT> TreeIndex ContainerBuilder<TraitsT>::makeTile(int i, int j, int k, int depth) {
   TileType* made = nullptr;
@@ -89,10 +72,10 @@ void ContainerBuilder<TraitsT>::listNewTiles(Counts const& before, TileLists* ne
   }
 }
 
-template <class TraitsT> void ContainerBuilder<TraitsT>::adoptDeeperRoots(int depth, Growth& growth) {
+template <class TraitsT> bool ContainerBuilder<TraitsT>::adoptDeeperRoots(int depth, Growth& growth) {
   bool deeper = false;
   for (int d = depth + 1; d <= kMaxDepth; ++d) deeper |= m_tree.rootCount(d) > 0;
-  if (!deeper) return;
+  if (!deeper) return false;
   // Roots never overlap, so a root of this depth that holds a deeper one is new.
   auto& roots = data().m_roots;
   std::vector<std::pair<TreeIndex, RootTable::iterator>> adoptions;
@@ -106,9 +89,11 @@ template <class TraitsT> void ContainerBuilder<TraitsT>::adoptDeeperRoots(int de
   growth.reserve(adoptions.size());
   for (auto const& [parent, root] : adoptions) insertChild(parent, root->second);
   for (auto const& adoption : adoptions) growth.adopt(adoption.second);
+  return !adoptions.empty();
 }
 
-template <class TraitsT> void ContainerBuilder<TraitsT>::setBranchSizes(Cancellation cancellation) {
+template <class TraitsT>
+void ContainerBuilder<TraitsT>::setBranchSizes(Cancellation cancellation, std::int64_t deepest) {
   // What a bottom-up traversal would do, as one loop over each array: nothing but sums of children.
   Canceller::cancelID(Canceller::kTraverse);
   data().detachTiles();
@@ -116,7 +101,10 @@ template <class TraitsT> void ContainerBuilder<TraitsT>::setBranchSizes(Cancella
     auto& tiles = data().editTiles(d);
     auto const* const below = d < kMaxDepth ? data().tiles(d + 1).begin() : nullptr;
     bool const belowIsDeepest = d + 1 == kMaxDepth; // whose sizes are known
-    parallelFor(0, tiles.size(),
+    // The host is asked whether to go on wherever there are tiles.
+    std::int64_t const count =
+        d < kMaxDepth ? tiles.size() : std::max(deepest, std::min<std::int64_t>(1, tiles.size()));
+    parallelFor(0, count,
                 [&](std::int64_t begin, std::int64_t end) {
                   for (std::int64_t n = begin; n < end; ++n) {
                     TileType& t = tiles[n];

@@ -9,7 +9,20 @@ namespace VLN::TileTree3D {
 
 namespace Internal {
 template <class TraitsT> struct Siblings;
+template <class TraitsT> struct MadeAbove;
+
+/// Slot of the child of `above` whose corner is p.
+/// @pre p is such a corner. Then no division is needed where a tile has two voxels along an axis.
+template <class TileType> int slotOfCorner(TileType const& above, int3 const& p) {
+  if constexpr (TileType::kTileWidth == 2)
+    return int(p.x > above.ti()) | int(p.y > above.tj()) << 1 | int(p.z > above.tk()) << 2;
+  else {
+    int3 const at = above.childIJK(p);
+    return TileType::slotOf(at.x, at.y, at.z);
+  }
 }
+
+} // namespace Internal
 
 /// @threads As the container's own changes: one thread.
 template <class TraitsT> class ContainerBuilder {
@@ -28,8 +41,10 @@ public:
       : m_tree(tree) {}
 
   TreeIndex addTile(int i, int j, int k, int depth);
-  /// A tile below an existing one, with those between.
+  /// A tile below the deepest one that holds its place, with those between.
   TreeIndex addTileBelow(TreeIndex above, int i, int j, int k, int depth);
+  /// The same for a tile of the deepest depth, in a free slot of its parent.
+  TreeIndex addDeepestTile(std::int64_t above, int slot, int3 const& corner);
   void addTilesInBulk(TileLists const& corners, TileLists* newTiles);
   void refine(Tree const& source, TileLists* newTiles);
   /// @param lists Becomes what went, sorted.
@@ -40,10 +55,15 @@ public:
   void truncate(int depth);
   /// Takes all scratch containers back, truncated from a depth on; for -1, from where each gained tiles.
   void returnThreadLocal(int fromDepth);
-  void setBranchSizes(Cancellation cancellation);
+  /// @param deepest How many tiles of the deepest depth are looked at, from the first on. Those behind them
+  /// are new, with the size that they were made with.
+  void setBranchSizes(Cancellation cancellation, std::int64_t deepest);
+  void setBranchSizes(Cancellation cancellation) { setBranchSizes(cancellation, tileCount(kMaxDepth)); }
 
 private:
   using Siblings = Internal::Siblings<TraitsT>;
+  using MadeAbove = Internal::MadeAbove<TraitsT>;
+  class MadeParents;
   /// In place of the index of a source tile's counterpart.
   static constexpr std::int64_t kDeadSource = -1, kNotThere = -2;
 
@@ -52,6 +72,8 @@ private:
     std::int64_t index;
     TreeIndex above;
   };
+  /// A record more, not live, of which nothing but the array knows.
+  TileType& appendRecord(int depth);
   /// A new live tile without parent at the aligned corner.
   TreeIndex makeTile(int i, int j, int k, int depth);
   /// Hangs `child` below `parent`, making the tiles between; returns the size of the branch that the parent
@@ -78,14 +100,16 @@ private:
                                              std::vector<std::int64_t>& here) const;
   /// Takes the tiles that are there out of groups, and finds the groups' parents; -1 for none.
   /// @return How many tiles are left, for each chunk of groups.
-  std::vector<std::int64_t> dropExisting(std::vector<Siblings>& groups, int depth,
+  std::vector<std::int64_t> dropExisting(std::vector<Siblings>& groups, int depth, MadeAbove const& above,
                                          std::vector<std::int64_t>& parents) const;
   /// Makes the tiles of groups, those of a chunk from its start on; returns those without a parent, by chunk.
+  /// @param firsts Gets the index of the first tile of each group.
   TileIndexLists makeSiblings(std::vector<Siblings> const& groups, int depth,
                               std::vector<std::int64_t> const& parents,
-                              std::vector<std::int64_t> const& starts);
+                              std::vector<std::int64_t> const& starts, std::vector<std::int64_t>& firsts);
   /// Hangs roots deeper than `depth` below roots of `depth` that hold them.
-  void adoptDeeperRoots(int depth, Growth& growth);
+  /// @return Whether there were any.
+  bool adoptDeeperRoots(int depth, Growth& growth);
   /// Whether all listed tiles are alive, not roots, without children, and listed once by rising index: then
   /// they can go in any order.
   bool areRisingLeaves(TileIndexLists const& lists) const;

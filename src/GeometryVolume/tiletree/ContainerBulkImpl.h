@@ -9,6 +9,7 @@
 #include "GeometryVolume/tiletree/Morton.h"
 
 #include <algorithm>
+#include <bit>
 #include <bitset>
 #include <new>
 #include <utility>
@@ -35,6 +36,49 @@ template <class TraitsT> struct Siblings {
     return {static_cast<int>(parent.x + w * at.x), static_cast<int>(parent.y + w * at.y),
             static_cast<int>(parent.z + w * at.z)};
   }
+  /// Calls `f(slot)` for each slot, rising.
+  template <class F> void forEachSlot(F const& f) const {
+    if constexpr (TraitsT::kTW == 2) {
+      for (auto bits = slots.to_ulong(); bits != 0; bits &= bits - 1)
+        f(static_cast<std::size_t>(std::countr_zero(bits)));
+    } else {
+      for (std::size_t slot = 0; slot < slots.size(); ++slot)
+        if (slots[slot]) f(slot);
+    }
+  }
+  /// How many slots lie before one.
+  std::int64_t countBefore(std::size_t slot) const {
+    return static_cast<std::int64_t>((slots << (slots.size() - slot)).count());
+  }
+};
+template <class TraitsT> bool comesBefore(Siblings<TraitsT> const& a, Siblings<TraitsT> const& b) {
+  return a.key.high != b.key.high ? a.key.high < b.key.high : a.key.low < b.key.low;
+}
+
+/// The slot of the child of a tile of depth - 1 in which a point lies, if it lies in the tile; else beyond
+/// all slots.
+template <class TraitsT>
+[[gnu::always_inline]] inline std::size_t slotIn(int3 const& corner, int3 const& p, int depth) {
+  constexpr std::uint32_t kTW = TraitsT::kTW;
+  auto const w = static_cast<std::uint32_t>(TraitsT::width(depth));
+  auto const x = static_cast<std::uint32_t>(p.x) - static_cast<std::uint32_t>(corner.x),
+             y = static_cast<std::uint32_t>(p.y) - static_cast<std::uint32_t>(corner.y),
+             z = static_cast<std::uint32_t>(p.z) - static_cast<std::uint32_t>(corner.z);
+  if constexpr (kTW == 2) {
+    if ((x | y | z) >= 2 * w) return TraitsT::kTileSize;
+    return std::size_t(x >= w) | std::size_t(y >= w) << 1 | std::size_t(z >= w) << 2;
+  } else {
+    if (x >= kTW * w || y >= kTW * w || z >= kTW * w) return TraitsT::kTileSize;
+    return x / w + kTW * (y / w + kTW * (z / w));
+  }
+}
+
+/// The depth above while a depth is made: its groups, without those that were there, and the index of the
+/// first tile made for each.
+template <class TraitsT> struct MadeAbove {
+  std::vector<Siblings<TraitsT>> const* groups = nullptr;
+  std::vector<std::int64_t> firsts;
+  bool childless = true; ///< no tile was there that hangs below one of them now
 };
 
 template <class TraitsT> class WantedTiles {
@@ -50,8 +94,7 @@ public:
       auto const* const list = points[d].data();
       join(d, listed(static_cast<std::int64_t>(points[d].size()), kPointGrain,
                      [&](std::int64_t begin, std::int64_t end, Groups& to) {
-                       for (std::int64_t n = begin; n < end; ++n)
-                         if (TraitsT::inDomain(list[n])) add(list[n], d, to);
+                       for (std::int64_t n = begin; n < end; ++n) add(list[n], d, to);
                      }));
     }
   }
@@ -88,19 +131,21 @@ public:
   }
 
 private:
-  static bool less(Group const& a, Group const& b) {
-    return a.key.high != b.key.high ? a.key.high < b.key.high : a.key.low < b.key.low;
-  }
-  static std::size_t slotOf(int3 const& p, int3 const& parent, int d) {
-    std::int64_t const w = TraitsT::width(d);
-    auto const digit = [&](int a) { return (std::int64_t(p[a]) - parent[a]) / w; };
-    return static_cast<std::size_t>(digit(0) + TraitsT::kTW * (digit(1) + TraitsT::kTW * digit(2)));
-  }
-
   static void add(int3 const& p, int depth, Groups& to) {
+    if (!to.empty()) {
+      Group& last = to.back();
+      std::size_t const slot = slotIn<TraitsT>(last.parent, p, depth);
+      if (slot < last.slots.size()) {
+        last.slots[slot] = true;
+        return;
+      }
+    }
+    if (TraitsT::inDomain(p)) addGroup(p, depth, to);
+  }
+  static void addGroup(int3 const& p, int depth, Groups& to) {
     int3 const parent = TraitsT::align(p, depth - 1);
-    if (to.empty() || to.back().parent != parent) to.push_back({{}, parent, {}});
-    to.back().slots.set(slotOf(p, parent, depth));
+    to.push_back({{}, parent, {}});
+    to.back().slots[slotIn<TraitsT>(parent, p, depth)] = true;
   }
   /// Groups that chunks of a range make, in the range's order.
   template <class Make>
@@ -188,8 +233,9 @@ private:
       m_asked = true, m_corner = corner;
       int3 const parent = TraitsT::align(p, m_depth - 1);
       Group const wanted{mortonRecord<TraitsT>(parent, 0), parent, {}};
-      auto const at = std::lower_bound(m_list->begin(), m_list->end(), wanted, less);
-      m_answer = at != m_list->end() && at->parent == parent && at->slots[slotOf(corner, parent, m_depth)];
+      auto const at = std::lower_bound(m_list->begin(), m_list->end(), wanted, comesBefore<TraitsT>);
+      m_answer =
+          at != m_list->end() && at->parent == parent && at->slots[slotIn<TraitsT>(parent, corner, m_depth)];
       return m_answer;
     }
 
@@ -224,28 +270,33 @@ void ContainerBuilder<TraitsT>::addTilesInBulk(TileLists const& corners, TileLis
     addRootTile(kLow, kLow, kLow, 0, growth);
     listNewTiles(growth.before(), newTiles);
   }
+  Internal::MadeAbove<TraitsT> above;
   for (int d = 1; d <= kMaxDepth; ++d) {
-    if (wanted.groups(d).empty()) continue;
+    auto& groups = wanted.groups(d);
     std::vector<std::int64_t> parents;
-    std::vector<std::int64_t> starts = dropExisting(wanted.groups(d), d, parents);
+    std::vector<std::int64_t> starts = dropExisting(groups, d, above, parents);
+    above.groups = &groups;
+    above.firsts.clear();
     Counts const before = data().m_tileCounts;
     std::int64_t next = tileCount(d);
     for (std::int64_t& start : starts) next += std::exchange(start, next);
     if (next == tileCount(d)) continue;
+    above.firsts.resize(groups.size());
     allocateUninitialised(d, next - tileCount(d));
     bool anyRoot = false;
-    for (auto const& part : makeSiblings(wanted.groups(d), d, parents, starts)) {
+    for (auto const& part : makeSiblings(groups, d, parents, starts, above.firsts)) {
       for (std::int64_t const index : part) m_tree.addRoot(tile({index, d})), anyRoot = true;
     }
-    if (anyRoot) adoptDeeperRoots(d, growth);
+    if (anyRoot && adoptDeeperRoots(d, growth)) above.childless = false;
     listNewTiles(before, newTiles);
   }
   growth.keep();
-  setBranchSizes(Cancellation::kPoll);
+  setBranchSizes(Cancellation::kPoll, growth.before()[kMaxDepth]);
 }
 
 template <class TraitsT>
 std::vector<std::int64_t> ContainerBuilder<TraitsT>::dropExisting(std::vector<Siblings>& groups, int depth,
+                                                                  MadeAbove const& above,
                                                                   std::vector<std::int64_t>& parents) const {
   auto const count = static_cast<std::int64_t>(groups.size());
   parents.resize(groups.size());
@@ -253,23 +304,26 @@ std::vector<std::int64_t> ContainerBuilder<TraitsT>::dropExisting(std::vector<Si
   parallelChunks(
       0, count, Internal::kGroupGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
         auto const accessor = m_tree.growthAccessor();
+        MadeParents made(above, groups[static_cast<std::size_t>(begin)], depth);
         std::size_t missing = 0;
         for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
           Siblings& group = groups[n];
           int3 const& p = group.parent;
-          TreeIndex const above = accessor.treeIndex(p.x, p.y, p.z, depth - 1, false);
-          bool const hasParent = above.depth == depth - 1;
-          parents[n] = hasParent ? above.index : -1;
-          for (std::size_t slot = 0; slot < group.slots.size(); ++slot) {
-            if (!group.slots[slot]) continue;
-            bool there;
-            if (hasParent) {
-              there = !tile(above).isLeaf(static_cast<int>(slot));
-            } else {
-              int3 const corner = group.corner(slot, depth);
-              there = accessor.treeIndex(corner.x, corner.y, corner.z, depth, false).depth == depth;
-            }
-            if (there) group.slots.reset(slot);
+          parents[n] = made.index(group);
+          if (parents[n] < 0 || !above.childless) {
+            TreeIndex const found = accessor.treeIndex(p.x, p.y, p.z, depth - 1, false);
+            bool const hasParent = found.depth == depth - 1;
+            parents[n] = hasParent ? found.index : -1;
+            group.forEachSlot([&](std::size_t slot) {
+              bool there;
+              if (hasParent) {
+                there = !tile(found).isLeaf(static_cast<int>(slot));
+              } else {
+                int3 const corner = group.corner(slot, depth);
+                there = accessor.treeIndex(corner.x, corner.y, corner.z, depth, false).depth == depth;
+              }
+              if (there) group.slots.reset(slot);
+            });
           }
           missing += group.slots.count();
         }
@@ -278,10 +332,44 @@ std::vector<std::int64_t> ContainerBuilder<TraitsT>::dropExisting(std::vector<Si
   return left;
 }
 
+/// Finds parents among the tiles just made, for groups in their order, without a search.
+template <class TraitsT> class ContainerBuilder<TraitsT>::MadeParents {
+public:
+  /// @param depth Of the groups.
+  MadeParents(MadeAbove const& above, Siblings const& first, int depth)
+      : m_above(above)
+      , m_depth(depth) {
+    // Only where widths are powers of two do parents lie in the order of their own parents.
+    if (TraitsT::kTW != 2 || above.firsts.empty()) return;
+    auto const& groups = *above.groups;
+    m_end = groups.size();
+    m_at = static_cast<std::size_t>(
+        std::upper_bound(groups.begin(), groups.end(), first, Internal::comesBefore<TraitsT>) -
+        groups.begin());
+    if (m_at > 0) --m_at;
+  }
+  /// Index of a group's parent; -1 where that was not made.
+  std::int64_t index(Siblings const& group) {
+    if (m_end == 0) return -1;
+    auto const* const groups = m_above.groups->data();
+    while (m_at + 1 < m_end && !Internal::comesBefore(group, groups[m_at + 1])) ++m_at;
+    Siblings const& found = groups[m_at];
+    std::size_t const slot = Internal::slotIn<TraitsT>(found.parent, group.parent, m_depth - 1);
+    if (slot >= found.slots.size() || !found.slots[slot]) return -1;
+    return m_above.firsts[m_at] + found.countBefore(slot);
+  }
+
+private:
+  MadeAbove const& m_above;
+  int m_depth;
+  std::size_t m_at = 0, m_end = 0;
+};
+
 template <class TraitsT>
 TileIndexLists ContainerBuilder<TraitsT>::makeSiblings(std::vector<Siblings> const& groups, int depth,
                                                        std::vector<std::int64_t> const& parents,
-                                                       std::vector<std::int64_t> const& starts) {
+                                                       std::vector<std::int64_t> const& starts,
+                                                       std::vector<std::int64_t>& firsts) {
   auto& tiles = data().editTiles(depth);
   auto& above = data().editTiles(depth - 1);
   TileIndexLists roots(starts.size());
@@ -290,19 +378,21 @@ TileIndexLists ContainerBuilder<TraitsT>::makeSiblings(std::vector<Siblings> con
                    std::int64_t index = starts[static_cast<std::size_t>(chunk)];
                    for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
                      Siblings const& group = groups[n];
-                     for (std::size_t slot = 0; slot < group.slots.size(); ++slot) {
-                       if (!group.slots[slot]) continue;
+                     std::int64_t const parent = parents[n];
+                     // Each group has its parent to itself.
+                     auto* const children = parent >= 0 ? above[parent].children() : nullptr;
+                     firsts[n] = index;
+                     group.forEachSlot([&](std::size_t slot) {
                        int3 const corner = group.corner(slot, depth);
                        auto* const tile = &tiles[index];
                        if (depth == kMaxDepth) new (static_cast<void*>(tile)) TileType;
-                       tile->init(parents[n], corner.x, corner.y, corner.z, depth, index);
-                       // Each group has its parent to itself.
-                       if (parents[n] >= 0)
-                         above[parents[n]].childIndex(static_cast<int>(slot)) = index;
+                       tile->init(parent, corner.x, corner.y, corner.z, depth, index);
+                       if (children)
+                         children[slot] = index;
                        else
                          roots[static_cast<std::size_t>(chunk)].push_back(index);
                        ++index;
-                     }
+                     });
                    }
                  });
   return roots;

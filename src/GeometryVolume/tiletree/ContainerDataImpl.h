@@ -49,6 +49,12 @@ template <class TraitsT> struct VLN_API ContainerData : ContainerTiles<TraitsT> 
   }
   void cloneTiles();
 
+  /// Whether there is anything that a change of the tree drops.
+  bool hasDerived() const {
+    return m_neighbors || m_halos || m_compressedHalos || m_gridDepth >= 0 || this->m_lookup.loadRelaxed() ||
+           m_longSearches.load(std::memory_order_relaxed) != 0;
+  }
+
   void memUse(std::uint64_t& used, std::uint64_t& allocated) const;
 
   void setLookupTable(std::shared_ptr<TileLookupTable<TraitsT> const> table);

@@ -33,17 +33,6 @@ inline void refinePass(std::int64_t count,
   }
 }
 
-/// Slot of the child of `above` whose corner is p.
-/// @pre p is such a corner. Then no division is needed where a tile has two voxels along an axis.
-template <class TileType> int slotOfCorner(TileType const& above, int3 const& p) {
-  if constexpr (TileType::kTileWidth == 2)
-    return int(p.x > above.ti()) | int(p.y > above.tj()) << 1 | int(p.z > above.tk()) << 2;
-  else {
-    int3 const at = above.childIJK(p);
-    return TileType::slotOf(at.x, at.y, at.z);
-  }
-}
-
 /// Throws when the host has cancelled the job. Called between the passes, never while tiles lack their links.
 inline void refineCheckpoint() {
   Canceller::cancelID(Canceller::kRefine);

@@ -82,7 +82,7 @@ template <class TraitsT> TreeIndex Container<TraitsT>::entry(int i, int j, int k
       if (index >= 0) return {index, d};
     }
   }
-  if (!TraitsT::inDomain(i, j, k)) return {};
+  if (data.m_roots.empty() || !TraitsT::inDomain(i, j, k)) return {};
   for (int d = 0; d <= std::min(depth, kMaxDepth); ++d) {
     if (data.m_rootCounts[d] == 0) continue;
     auto const found =

@@ -1,17 +1,12 @@
 #include "GeometryVolume/tiletree/TileAccessor.h"
 
+#include "GeometryVolume/tiletree/ContainerAppendImpl.h"
 #include "GeometryVolume/tiletree/NeighborSearchImpl.h"
 
 #include <algorithm>
 #include <bit>
 
 namespace VLN::TileTree3D {
-
-namespace {
-/// Bits of an offset in the power-of-two shape's domain.
-constexpr int kDomainBits = 30;
-static_assert(PowerOfTwoTraits::kDomainWidth == 1 << kDomainBits);
-} // namespace
 
 template <class TraitsT> auto ConstTileAccessorOf<TraitsT>::invalidTile() const -> TileType const& {
   static TileType const none;
@@ -35,10 +30,7 @@ TreeIndex ConstTileAccessorOf<TraitsT>::findNear(int i, int j, int k, int depth)
   // The deepest depth at which the cursor's corner and the point lie in one tile.
   int common = std::min(m_depth, depth);
   if constexpr (TraitsT::kTW == 2) {
-    std::uint32_t const bits = (TraitsT::offset(i) ^ TraitsT::offset(m_corner.x)) |
-                               (TraitsT::offset(j) ^ TraitsT::offset(m_corner.y)) |
-                               (TraitsT::offset(k) ^ TraitsT::offset(m_corner.z));
-    common = std::min(common, kDomainBits - static_cast<int>(std::bit_width(bits)));
+    common = std::min(common, commonDepth({i, j, k}, m_corner));
   } else {
     auto const shares = [&](int d) {
       return TraitsT::quotient(TraitsT::offset(i), d) == TraitsT::quotient(TraitsT::offset(m_corner.x), d) &&
@@ -149,12 +141,55 @@ void ConstTileAccessorOf<TraitsT>::tiles(std::vector<TreeIndex>& list, int minDe
 }
 
 template <class TraitsT>
+[[gnu::always_inline]] inline bool TileAccessorOf<TraitsT>::addNextTo(int i, int j, int k) {
+  if constexpr (TraitsT::kTW == 2) {
+    if (this->m_depth != kDeepest || this->m_pathTop == kDeepest) return false;
+    constexpr std::uint32_t w = TraitsT::width(kDeepest);
+    int3 const& last = this->m_corner;
+    auto const bits = static_cast<std::uint32_t>((i ^ last.x) | (j ^ last.y) | (k ^ last.z));
+    if (bits >= 2 * w) return false;
+    constexpr auto kMask = static_cast<int>(~(w - 1));
+    int3 const corner{i & kMask, j & kMask, k & kMask};
+    int const slot = int((i & w) != 0) | int((j & w) != 0) << 1 | int((k & w) != 0) << 2;
+    std::int64_t const parent = this->m_path[kDeepest - 1];
+    std::int64_t index = this->m_container->tile(parent, kDeepest - 1).childIndex(slot);
+    if (index < 0)
+      index = ContainerBuilder<TraitsT>(*m_mutableContainer).addDeepestTile(parent, slot, corner).index;
+    this->m_index = this->m_path[kDeepest] = index;
+    this->m_corner = corner;
+    return true;
+  }
+  return false;
+}
+
+template <class TraitsT>
 auto TileAccessorOf<TraitsT>::addTile(int i, int j, int k, int depth) -> TileType const& {
+  if (depth == kDeepest && addNextTo(i, j, k)) return this->m_container->tile(this->m_index, kDeepest);
+  return addFar(i, j, k, depth);
+}
+
+template <class TraitsT>
+auto TileAccessorOf<TraitsT>::addFar(int i, int j, int k, int depth) -> TileType const& {
   ContainerT& tree = *m_mutableContainer;
   if (!TraitsT::isDepth(depth) || !TraitsT::inDomain(i, j, k)) return tree.invalidTile();
   if (depth == this->m_depth && this->holds(i, j, k, depth)) return this->current();
   TreeIndex at = this->findNear(i, j, k, depth);
   if (!at.valid()) return this->setCursor(tree.tile(tree.addTile(i, j, k, depth)));
+  if constexpr (TraitsT::kTW == 2) {
+    auto& way = m_wayDown;
+    auto& path = this->m_path;
+    if (depth == at.depth && depth < this->m_depth) {
+      way.point = this->m_corner, way.from = depth, way.to = this->m_depth;
+      std::copy(path.begin() + way.from + 1, path.begin() + way.to + 1, way.path.begin() + way.from + 1);
+    } else if (at.depth == this->m_depth && at.depth >= way.from && at.depth < way.to) {
+      int const common = std::min({way.to, depth, this->commonDepth({i, j, k}, way.point)});
+      if (common > at.depth) {
+        std::copy(way.path.begin() + at.depth + 1, way.path.begin() + common + 1,
+                  path.begin() + at.depth + 1);
+        at = {path[common], common};
+      }
+    }
+  }
   at = this->descend(at, i, j, k, depth);
   if (at.depth != depth) growBelow(at, i, j, k, depth);
   return this->current();
@@ -162,13 +197,10 @@ auto TileAccessorOf<TraitsT>::addTile(int i, int j, int k, int depth) -> TileTyp
 
 template <class TraitsT>
 void TileAccessorOf<TraitsT>::growBelow(TreeIndex at, int i, int j, int k, int depth) {
-  TreeIndex const made = m_mutableContainer->addTileBelow(at, i, j, k, depth);
-  if (at.depth + 1 < depth) {
-    this->descend(at, i, j, k, depth);
-    return;
-  }
-  this->m_path[depth] = made.index;
-  this->m_depth = depth, this->m_index = made.index;
+  ContainerT& tree = *m_mutableContainer;
+  this->m_index = ContainerBuilder<TraitsT>(tree).addTileBelow(at, i, j, k, depth).index;
+  for (int d = at.depth + 1; d <= depth; ++d) this->m_path[d] = tree.tileCount(d) - 1;
+  this->m_depth = depth;
   this->m_corner = TraitsT::align(int3{i, j, k}, depth);
 }
 
@@ -208,6 +240,7 @@ template <class TraitsT> void TileAccessorOf<TraitsT>::addTiles(int3 const& min,
 
 template <class TraitsT> void TileAccessorOf<TraitsT>::rereadCursor() {
   ContainerT const& tree = *m_mutableContainer;
+  m_wayDown.to = -1;
   if (this->m_depth >= 0 && this->m_index < tree.tileCount(this->m_depth) &&
       tree.tile(this->m_index, this->m_depth).valid())
     this->setCursor(tree.tile(this->m_index, this->m_depth));

@@ -3,6 +3,7 @@
 
 #include "GeometryVolume/tiletree/Container.h"
 
+#include <bit>
 #include <vector>
 
 namespace VLN::TileTree3D {
@@ -141,6 +142,15 @@ protected:
   /// A tile at or above `depth` that holds the point, from the cursor's neighbours or its path; invalid when
   /// the way leads over the tree's entry. What the path keeps is then still right for the tile returned.
   TreeIndex findNear(int i, int j, int k, int depth) const;
+  /// The deepest depth at which two points of the domain lie in one tile; above kMaxDepth for points close
+  /// by.
+  static int commonDepth(int3 const& a, int3 const& b) requires(TraitsT::kTW == 2) {
+    constexpr int kDomainBits = std::bit_width(static_cast<std::uint32_t>(TraitsT::kDomainWidth)) - 1;
+    std::uint32_t const bits = (TraitsT::offset(a.x) ^ TraitsT::offset(b.x)) |
+                               (TraitsT::offset(a.y) ^ TraitsT::offset(b.y)) |
+                               (TraitsT::offset(a.z) ^ TraitsT::offset(b.z));
+    return kDomainBits - static_cast<int>(std::bit_width(bits));
+  }
   /// Follows child slots from a tile, keeps the path, and puts the cursor on the last tile.
   TreeIndex descend(TreeIndex at, int i, int j, int k, int depth) const;
 
@@ -215,6 +225,20 @@ public:
                    TileMoves* moves = nullptr);
 
 private:
+  static constexpr int kDeepest = TraitsT::kMaxDepth;
+  /// What the cursor's path was below the tile to which it has gone up: the way back down, without a search.
+  struct WayDown {
+    int3 point{0, 0, 0};
+    std::int32_t from = -1, to = -1; ///< depths; known are the indices below the first one
+    PerDepth<std::int64_t, TraitsT::kDepths> path{};
+  };
+
+  /// The tile of the deepest depth at a point, made where it is not there, if the cursor's is a tile of the
+  /// same parent. Moves the cursor.
+  /// @return false, and nothing done, else.
+  bool addNextTo(int i, int j, int k);
+  /// addTile() of any other tile.
+  TileType const& addFar(int i, int j, int k, int depth);
   /// Makes the tile of `depth` below the cursor's tile `at`, and moves the cursor there.
   void growBelow(TreeIndex at, int i, int j, int k, int depth);
   /// Reads the cursor's tile again at its index, or resets the cursor when there is none.
@@ -227,6 +251,7 @@ private:
       , m_mutableContainer(&container) {}
 
   ContainerT* m_mutableContainer = nullptr;
+  WayDown m_wayDown;
 };
 
 template <class TraitsT> ConstTileAccessorOf<TraitsT> Container<TraitsT>::tileAccessor() const {

@@ -34,6 +34,9 @@ public:
   void* allocate(std::int64_t elements, std::size_t elementSize);
   /// The same of zeros, from the allocator alone: what the pool has was written before.
   void* allocateZeros(std::int64_t elements, std::size_t elementSize);
+  /// A block as allocate() makes it; of zeros where `zeros` asks for that and it takes no writing.
+  /// @param zeros Tells afterwards whether it is.
+  void* allocate(std::int64_t elements, std::size_t elementSize, bool& zeros);
   /// Takes all blocks of another list. Needs no memory.
   void take(BlockList& from) noexcept { m_blocks.splice(m_blocks.end(), from.m_blocks); }
   void clear();
@@ -106,18 +109,25 @@ VLN_API TileSlots planSlots(int first, int last, DepthCounts const& counts,
 
 /// How a channel comes into step with other tile counts.
 struct GrowthPlan {
+  /// The added tiles of a depth: those of one size lie in the block from `base` on, a stride apart; others at
+  /// offsets of their own.
+  struct Tiles {
+    static constexpr std::int64_t kDiffer = -1;
+    std::int64_t elements = kDiffer; ///< of each; not asked for without a block
+    std::int64_t base = 0, stride = 0;
+  };
   bool changes = false;
   DepthCounts wanted{};
   TileSpans added;
-  /// Slots of the added tiles: at a fixed stride from `base[d]`, or at their own offsets.
-  DepthCounts base{};
+  PerDepth<Tiles, kChannelDepths> tiles;
   TileSlots slots;
   std::int64_t blockElements = 0;
 };
-/// `stride` is 0 without a block, else the slot of a tile of fixed size. Tiles of a size of their own lie one
-/// behind the other.
+/// @param fixedElements Of tiles of fixed size; 0 where each has what `source` says.
+/// @param stride 0 without a block, else the slot of a tile of fixed size. Other tiles lie one behind the
+/// other.
 VLN_API GrowthPlan planGrowth(int first, int last, DepthCounts const& own, TileCounts const& source,
-                              bool fixedSize, std::int64_t stride);
+                              std::int64_t fixedElements, std::int64_t stride);
 
 /// Whether each list of the depths [first, last] is empty or names every tile once.
 VLN_API bool isPermutation(std::vector<std::vector<std::int64_t>> const& lists, int first, int last,
