@@ -51,14 +51,38 @@ std::string whyNotKept(openvdb::math::Transform const& transform) {
   } catch (std::exception const& error) { return "its transform cannot be used: " + oneLine(error.what()); }
 }
 
+struct TypedSource {
+  std::unique_ptr<GridSource> source; ///< null for a type that is not supported
+  std::string type;
+};
+
+/// A source for each grid of a file.
+std::vector<TypedSource> makeSources(VdbFile const& file) {
+  std::vector<TypedSource> sources(file.grids.size());
+  // Sources number the leaves of trees, which grids may share unless their voxels are packed.
+  bool const apart = file.packed.size() == file.grids.size();
+  auto const count = std::int64_t(sources.size());
+  parallelFor(0, count,
+              [&](std::int64_t first, std::int64_t last) {
+                for (auto n = static_cast<std::size_t>(first); n < static_cast<std::size_t>(last); ++n) {
+                  auto const& base = file.grids[n];
+                  auto const packed = file.packed.find(base.get());
+                  sources[n].source = makeGridSource(
+                      {withoutMask(base), packed == file.packed.end() ? nullptr : packed->second},
+                      sources[n].type);
+                }
+              },
+              {.grain = apart ? 1 : std::max<std::int64_t>(1, count)});
+  return sources;
+}
+
 /// Takes the grids out of the file, apart from those of points.
 std::vector<Group> groupByTransform(VdbFile& file, std::vector<SkippedGrid>& skipped) {
   std::vector<Group> groups;
-  for (auto const& base : file.grids) {
-    std::string type;
-    auto const packed = file.packed.find(base.get());
-    auto source =
-        makeGridSource({withoutMask(base), packed == file.packed.end() ? nullptr : packed->second}, type);
+  std::vector<TypedSource> sources = makeSources(file);
+  for (std::size_t n = 0; n < sources.size(); ++n) {
+    auto const& base = file.grids[n];
+    auto& [source, type] = sources[n];
     if (!source) {
       if (isPointGrid(*base)) continue;
       skipped.push_back({base->getName(), "grids of type " + oneLine(type) + " are not read"});
@@ -95,6 +119,12 @@ void addTiles(Container& container, TileCorners const& corners) {
   container.tileAccessor().addTiles(lists);
 }
 
+template <class F> void forEachGrid(Group const& group, F const& f) {
+  parallelFor(0, std::int64_t(group.grids.size()), [&](std::int64_t first, std::int64_t last) {
+    for (std::int64_t n = first; n < last; ++n) f(static_cast<std::size_t>(n));
+  });
+}
+
 std::size_t countOf(TileCorners const& corners) {
   std::size_t count = 0;
   for (auto const& list : corners) count += list.size();
@@ -102,12 +132,43 @@ std::size_t countOf(TileCorners const& corners) {
 }
 
 void addRootsBeyond(std::vector<int3>& roots, Group const& group, int depth) {
-  std::vector<int3> beyond;
   RootPlaces const known(roots, depth);
-  for (auto const& grid : group.grids) grid->collectBeyondRoots(known, beyond);
-  if (beyond.empty()) return;
-  joinSorted(roots, roots.size(), std::move(beyond));
-  roots.erase(std::unique(roots.begin(), roots.end()), roots.end());
+  std::vector<std::vector<int3>> beyond(group.grids.size());
+  forEachGrid(group, [&](std::size_t n) { group.grids[n]->collectBeyondRoots(known, beyond[n]); });
+  std::vector<int3> all;
+  for (auto const& part : beyond) all.insert(all.end(), part.begin(), part.end());
+  if (!all.empty()) addSorted(roots, std::move(all));
+}
+
+/// The tiles that the grids need in all, without ancestors.
+TileCorners collectTiles(Group const& group, int rootDepth, std::uint64_t mostTiles) {
+  std::vector<NeededTiles> needed(group.grids.size());
+  forEachGrid(group, [&](std::size_t n) { needed[n] = group.grids[n]->collectTiles(rootDepth, mostTiles); });
+  std::uint64_t count = 0;
+  for (NeededTiles const& tiles : needed) count += tiles.count;
+  BlockList blocks;
+  if (count > mostTiles) {
+    // Where memory is short, those come first that the grids before have.
+    for (std::size_t n = 0; n < needed.size(); ++n) {
+      std::uint64_t const known = countBlocks(blocks);
+      needed[n] = group.grids[n]->collectTiles(rootDepth, mostTiles - std::min(mostTiles, known));
+      blocks = unionOf(blocks, std::exchange(needed[n].blocks, {}));
+    }
+  } else {
+    // By pairs: grids are much the same.
+    for (std::size_t step = 1; step < needed.size(); step *= 2)
+      for (std::size_t n = 0; n + step < needed.size(); n += 2 * step)
+        needed[n].blocks = unionOf(needed[n].blocks, std::exchange(needed[n + step].blocks, {}));
+    if (!needed.empty()) blocks.swap(needed[0].blocks);
+  }
+  TileCorners corners;
+  for (NeededTiles const& tiles : needed)
+    for (int depth = 0; depth < VdbTraits::kDepths; ++depth)
+      corners[depth].insert(corners[depth].end(), tiles.wider[depth].begin(), tiles.wider[depth].end());
+  corners[VdbTraits::kMaxDepth] = cornersOf(blocks);
+  if (rootDepth < VdbTraits::kMaxDepth)
+    for (PlaceBlocks const& b : blocks) corners[VdbTraits::kMaxDepth - 1].push_back(b.place);
+  return corners;
 }
 
 // About what a volume takes: records of tiles and of their vectors, child tables and samples. Many grids that
@@ -177,10 +238,9 @@ VdbVolume buildVolume(VdbFile const& file, Group& group, std::uint64_t& memoryLe
   std::vector<int3> leaves, wideTiles;
   for (auto const& grid : group.grids) grid->collectStored(leaves, wideTiles);
   int const root = cheapestRootDepth(std::move(leaves), std::move(wideTiles), rootDepth(group.summaries));
-  TileCorners corners;
   // A half for the shells of wide tiles: ancestors take an eighth or more, and lists of corners their part.
   std::uint64_t const mostTiles = memoryLeft / 2 / bytesFor(1, group);
-  for (auto const& grid : group.grids) grid->collectTiles(root, mostTiles, corners);
+  TileCorners corners = collectTiles(group, root, mostTiles);
   completeCorners(corners, root);
   addRootsBeyond(corners[root], group, root);
   std::uint64_t const bytes = bytesFor(countOf(corners), group);
