@@ -5,6 +5,7 @@
 #include "Interop/VdbGridSourceImpl.h"
 #include "Interop/VdbLeafPlacesImpl.h"
 #include "Interop/VdbStateTilesImpl.h"
+#include "Interop/VdbTilesRoundImpl.h"
 #include "Interop/VdbZeroTilesImpl.h"
 
 #include <algorithm>
@@ -141,8 +142,9 @@ public:
         parallelFor(first, last,
                     [&](std::int64_t begin, std::int64_t end) {
                       TileMaker make(*this, *channel, zeros);
+                      TileVector<Element>* const made = tiles.tileData({0, depth}).data();
                       for (std::int64_t n = begin; n < end; ++n)
-                        *tiles.tileData({n, depth}).data() = make(container.tile(n, depth).tijk(), depth);
+                        make(container.tile(n, depth).tijk(), depth, made[n]);
                     },
                     {.grain = 256});
         if (!packed.empty() && depth == VdbTraits::kMaxDepth && last < count)
@@ -167,8 +169,9 @@ public:
       parallelFor(0, container.tileCount(depth),
                   [&](std::int64_t begin, std::int64_t end) {
                     StateMaker<TreeT> make(m_grid->tree(), *channel, zeros);
+                    TileVector<unsigned char>* const made = tiles.tileData({0, depth}).data();
                     for (std::int64_t n = begin; n < end; ++n)
-                      *tiles.tileData({n, depth}).data() = make(container.tile(n, depth).tijk(), depth);
+                      make(container.tile(n, depth).tijk(), depth, made[n]);
                   },
                   {.grain = 256});
     zeros.leaveTo(*channel->cloneData());
@@ -410,18 +413,46 @@ private:
     for (WideTile const& tile : m_wide)
       if (tile.width == width && !sameBits(tile.value, m_background)) list.push_back(&tile);
     std::vector<char> exposed(list.size());
-    parallelFor(0, std::int64_t(list.size()),
+    std::vector<std::size_t> const runs = runsInNodes(list);
+    // The narrow tiles of most grids all have one value: where a node has many, it is looked at whole.
+    bool const alike = width == kLeafWidth && list.size() > 8 * runs.size() &&
+                       std::all_of(list.begin(), list.end(), [&](WideTile const* tile) {
+                         return sameBits(tile->value, list[0]->value);
+                       });
+    std::optional<TilesRound<TreeT>> round;
+    if (alike) round.emplace(m_grid->tree(), list[0]->value);
+    parallelFor(0, std::int64_t(runs.size()),
                 [&](std::int64_t begin, std::int64_t end) {
                   Search search(m_grid->tree());
-                  for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n)
-                    exposed[n] = isExposed(search, *list[n]);
+                  for (auto run = static_cast<std::size_t>(begin); run < static_cast<std::size_t>(end);
+                       ++run) {
+                    std::size_t const last = run + 1 < runs.size() ? runs[run + 1] : list.size();
+                    if (!alike) {
+                      for (std::size_t n = runs[run]; n < last; ++n) exposed[n] = isExposed(search, *list[n]);
+                      continue;
+                    }
+                    auto const inside = round->inside(search, *search.lower(list[runs[run]]->corner));
+                    for (std::size_t n = runs[run]; n < last; ++n) {
+                      auto const slot = Search::Lower::coordToOffset(list[n]->corner);
+                      exposed[n] = !(inside[slot / 64] >> slot % 64 & 1);
+                    }
+                  }
                 },
-                {.grain = 64});
+                {});
     std::size_t kept = 0;
     for (std::size_t n = 0; n < list.size(); ++n)
       if (exposed[n]) list[kept++] = list[n];
     list.resize(kept);
     return list;
+  }
+  /// Where the tiles of another node begin: those of one lie side by side.
+  static std::vector<std::size_t> runsInNodes(std::vector<WideTile const*> const& tiles) {
+    std::vector<std::size_t> runs;
+    for (std::size_t n = 0; n < tiles.size(); ++n) {
+      auto const nodeOf = [](WideTile const* tile) { return tile->corner & -kNodeWidths[1]; };
+      if (n == 0 || nodeOf(tiles[n]) != nodeOf(tiles[n - 1])) runs.push_back(n);
+    }
+    return runs;
   }
   /// Whether one of a tile's 26 neighbours of the same width is finer, or has another value.
   bool isExposed(Search& search, WideTile const& tile) const {
@@ -508,8 +539,9 @@ private:
   }
   /// The place of a leaf that was looked up last: tiles that are filled one after another share it.
   struct LastPlace {
-    std::optional<Coord> corner;
+    int3 corner{1, 1, 1}; ///< at first none that a place has
     LeafPlace<TreeT> place;
+    bool isZero = false;           ///< where there is no leaf
     Value const* values = nullptr; ///< of the leaf, unless they are bits
   };
 
@@ -522,28 +554,28 @@ private:
         , m_zeros(zeros)
         , m_search(grid.m_grid->tree()) {}
 
-    TileVector<Element> operator()(int3 const& corner, int depth) {
+    /// @param made Empty.
+    void operator()(int3 const& corner, int depth, TileVector<Element>& made) {
       if (VdbTraits::width(depth) <= kLeafWidth) {
-        m_grid.lookUp(m_search, m_last, toCoord(leafPlaceOf(corner)));
+        m_grid.lookUp(m_search, m_last, leafPlaceOf(corner));
         auto const& place = m_last.place;
         bool const deepest = depth == VdbTraits::kMaxDepth;
-        if (place.leaf ? deepest && m_grid.isZeroBlock(*place.leaf, corner) : areZeros(&place.value, 1))
-          return m_zeros.take(m_run);
+        if (place.leaf ? deepest && m_grid.isZeroBlock(*place.leaf, corner) : m_last.isZero)
+          return m_zeros.make(m_run, made);
         if (deepest || !place.leaf) {
-          auto tile = m_channel.unwrittenTile();
+          made = m_channel.unwrittenTile();
           if (place.leaf)
-            m_grid.fillTile(m_search, m_last, corner, depth, tile.data());
+            m_grid.fillTile(m_search, m_last, corner, depth, made.data());
           else
-            TileTree3D::Internal::fillRun(tile.data(), ChannelT::kSize, toElement(place.value));
-          return tile;
+            TileTree3D::Internal::fillRun(made.data(), ChannelT::kSize, toElement(place.value));
+          return;
         }
       }
       Element samples[ChannelT::kSize];
       m_grid.fillTile(m_search, m_last, corner, depth, samples);
-      if (areZeros(samples, ChannelT::kSize)) return m_zeros.take(m_run);
-      auto tile = m_channel.unwrittenTile();
-      std::copy(std::begin(samples), std::end(samples), tile.data());
-      return tile;
+      if (areZeros(samples, ChannelT::kSize)) return m_zeros.make(m_run, made);
+      made = m_channel.unwrittenTile();
+      std::copy(std::begin(samples), std::end(samples), made.data());
     }
 
   private:
@@ -561,11 +593,16 @@ private:
     int const block = blockNumber(corner);
     return (digest.uniform >> 8 * block & 1) && areZeros(&digest.first[block], 1);
   }
-  void lookUp(Search& search, LastPlace& last, Coord const& corner) const {
-    if (last.corner == corner) return;
-    last.place = search.at(corner);
+  void lookUp(Search& search, LastPlace& last, int3 const& corner) const {
+    if (last.corner != corner) lookUpAnew(search, last, corner);
+  }
+  [[gnu::noinline]] void lookUpAnew(Search& search, LastPlace& last, int3 const& corner) const {
+    last.place = search.at(toCoord(corner));
     last.corner = corner;
-    if (last.place.leaf) last.values = valuesOf(*last.place.leaf);
+    if (last.place.leaf)
+      last.values = valuesOf(*last.place.leaf);
+    else
+      last.isZero = areZeros(&last.place.value, 1);
   }
 
   void fillTile(Search& search, LastPlace& last, int3 const& corner, int depth, Element* samples) const {
@@ -587,7 +624,7 @@ private:
   }
   void fillFromPlace(Search& search, LastPlace& last, Coord const& at, int step, int count,
                      Element* samples) const {
-    lookUp(search, last, at & -kLeafWidth);
+    lookUp(search, last, leafPlaceOf(toInt3(at)));
     Leaf const* const leaf = last.place.leaf;
     auto const fill = [&](auto const& valueAt) {
       for (int k = 0; k < count; ++k)

@@ -192,43 +192,75 @@ std::string metadataBytes(openvdb::MetaMap const& metadata) {
   return out.str();
 }
 
-// Makes and fills the channels of a volume, and tells of each in it; returns what the way back needs. Each
-// grid goes when its channels are there: what it took is at hand for the next ones.
-Ostil::Array<VdbGridRecord> addChannels(Group& group, VLN::Object& object, Container const& container,
-                                        Topology const& topology, VdbVolume& volume,
-                                        VLN::FunctionRef<void(double share)> filledShare) {
-  // Components and plain properties share one set of names.
+// Tells of each grid in the volume.
+// @return What the way back needs.
+Ostil::Array<VdbGridRecord> tellOfGrids(Group const& group, VdbVolume& volume) {
+  // Components and plain properties share one set of names. Grids come first to their names, channels of
+  // states after them.
   std::set<std::string> taken{kVdbContainerName, kVdbTopologyName, kVdbGridsProperty, kVdbTransformProperty,
                               kVdbMetadataProperty};
-  double const tilesToFill = double(container.tileCount(-1)) * double(group.grids.size());
-  double filled = 0;
-  // Grids come first to their names, channels of states after them.
   std::vector<std::string> names;
   for (auto const& source : group.grids) names.push_back(freeName(source->grid().getName(), taken));
-  TreeToFill const tree{container, topology, tilesFollowLeaves(container)};
   Ostil::Array<VdbGridRecord> records;
   for (std::size_t n = 0; n < group.grids.size(); ++n) {
     GridSource const& source = *group.grids[n];
-    openvdb::GridBase const& grid = source.grid();
     GridSummary const& summary = group.summaries[n];
-    std::string const& name = names[n];
-    object.addComponent(source.makeChannel(name, tree, [&](std::int64_t tiles) {
-      filled += double(tiles);
-      filledShare(filled / tilesToFill);
-    }));
-    VdbGridRecord record{name, group.types[n], source.activeRule(), "", metadataBytes(grid)};
-    if (record.rule == VdbActiveRule::kChannel) {
-      record.stateChannel = freeName(name + "_active", taken);
-      object.addComponent(source.makeStateChannel(record.stateChannel, tree));
-    }
+    VdbGridRecord record{names[n], group.types[n], source.activeRule(), "", metadataBytes(source.grid())};
+    if (record.rule == VdbActiveRule::kChannel) record.stateChannel = freeName(names[n] + "_active", taken);
     records.append(record);
-    volume.channels.push_back({name, grid.getName(), group.types[n], 4, 0, summary.activeVoxels,
+    volume.channels.push_back({names[n], source.grid().getName(), group.types[n], 4, 0, summary.activeVoxels,
                                summary.minimum, summary.maximum, summary.hasRange, summary.active});
     if (!summary.active.empty())
       volume.activeBox.grow(summary.active.min), volume.activeBox.grow(summary.active.max);
-    group.grids[n].reset();
   }
   return records;
+}
+
+struct GridChannels {
+  Ostil::Ptr<TileTree3D::ChannelBase> values;
+  Ostil::Ptr<StateChannel> states; ///< null unless the rule is kChannel
+};
+
+// Makes and fills the channels of a volume. Each grid goes when its channels are there: what it took is at
+// hand for the next ones.
+void addChannels(Group& group, Ostil::Array<VdbGridRecord> const& records, VLN::Object& object,
+                 TreeToFill const& tree, VLN::FunctionRef<void(double share)> filledShare) {
+  auto const count = std::int64_t(group.grids.size()), tiles = tree.container.tileCount(-1);
+  auto const make = [&](std::int64_t n, FilledTiles filled) {
+    auto& source = group.grids[static_cast<std::size_t>(n)];
+    VdbGridRecord const& record = records[n];
+    GridChannels made{source->makeChannel(record.channel, tree, filled), nullptr};
+    if (record.rule == VdbActiveRule::kChannel)
+      made.states = source->makeStateChannel(record.stateChannel, tree);
+    source.reset();
+    return made;
+  };
+  double filled = 0;
+  auto const tell = [&](std::int64_t more) {
+    filled += double(more);
+    filledShare(filled / (double(tiles) * double(count)));
+  };
+  // Of a small tree several at once, so that no core waits for others at the end of each depth. Of a large
+  // one there is something to tell before a grid ends.
+  constexpr std::int64_t kSmall = 1 << 16, kAtOnce = 8;
+  std::int64_t const atOnce = tiles < kSmall ? kAtOnce : 1;
+  for (std::int64_t first = 0; first < count; first += atOnce) {
+    std::int64_t const last = std::min(first + atOnce, count);
+    std::vector<GridChannels> made(static_cast<std::size_t>(last - first));
+    if (made.size() == 1) {
+      made[0] = make(first, tell);
+    } else {
+      parallelFor(first, last, [&](std::int64_t begin, std::int64_t end) {
+        for (std::int64_t n = begin; n < end; ++n)
+          made[static_cast<std::size_t>(n - first)] = make(n, [](std::int64_t) {});
+      });
+      tell(tiles * (last - first));
+    }
+    for (GridChannels& channels : made) {
+      object.addComponent(std::move(channels.values));
+      if (channels.states) object.addComponent(std::move(channels.states));
+    }
+  }
 }
 
 // `memoryLeft` falls by what the volume takes.
@@ -261,11 +293,10 @@ VdbVolume buildVolume(VdbFile const& file, Group& group, std::uint64_t& memoryLe
   auto topology = object->extractComponent<Topology>(kVdbTopologyName);
   topology->update(*container);
 
-  object->setProperty(
-      kVdbGridsProperty,
-      Ostil::Any(addChannels(group, *object, *container, *topology, volume, [&](double share) {
-        report(progress, "filling the channels", from + (to - from) * share);
-      })));
+  Ostil::Array<VdbGridRecord> const records = tellOfGrids(group, volume);
+  addChannels(group, records, *object, {*container, *topology, tilesFollowLeaves(*container)},
+              [&](double share) { report(progress, "filling the channels", from + (to - from) * share); });
+  object->setProperty(kVdbGridsProperty, Ostil::Any(records));
   object->setProperty(kVdbTransformProperty, Ostil::Any(Ostil::String(volume.indexToWorld.bytes())));
   if (file.metadata)
     object->setProperty(kVdbMetadataProperty, Ostil::Any(Ostil::String(metadataBytes(*file.metadata))));
