@@ -112,12 +112,90 @@ struct ReadingStopped {
   std::exception_ptr reason;
 };
 
+/// A tree that has been walked through, to be made of its bytes.
+class TreeToRead {
+public:
+  virtual ~TreeToRead() = default;
+  /// Where the buffers of its leaves begin.
+  std::vector<std::size_t> const& places() const { return m_places; }
+  /// @param in With the versions of the file set.
+  virtual void makeNodes(MemoryStream& in) = 0;
+  virtual void readLeaves(std::int64_t first, std::int64_t last) const = 0;
+  /// Null for leaves with buffers.
+  std::shared_ptr<PackedLeaves> const& packed() const { return m_packed; }
+
+protected:
+  std::vector<std::size_t> m_places;
+  std::shared_ptr<PackedLeaves> m_packed;
+};
+
+template <class TreeT> class TypedTreeToRead final : public TreeToRead {
+public:
+  /// @param bytes At the tree; afterwards behind it.
+  /// @error WalkEnds, also where the tree would take more than `memoryLeft`, which falls by what it takes.
+  TypedTreeToRead(TreeT& tree, WalkedBytes& bytes, ValueCoding const& coding, LeafMemory leafMemory,
+                  std::uint64_t& memoryLeft)
+      : m_tree(tree)
+      , m_bytes(bytes.data(), bytes.size())
+      , m_coding(coding)
+      , m_leafMemory(leafMemory)
+      , m_begin(bytes.place()) {
+    WalkedTree const walked = walkTopology<TreeT>(bytes, coding);
+    walkOnlyIf(walked.memory <= memoryLeft);
+    memoryLeft -= walked.memory;
+    m_end = bytes.place();
+    m_places.reserve(static_cast<std::size_t>(walked.leaves));
+    for (std::uint64_t n = 0; n < walked.leaves; ++n) {
+      m_places.push_back(bytes.place());
+      walkBuffers<Leaf>(bytes, coding);
+    }
+  }
+
+  void makeNodes(MemoryStream& in) override {
+    openvdb::io::setDataCompression(in, m_coding.compression);
+    in.goTo(m_begin);
+    m_tree.readTopology(in, m_coding.half);
+    walkOnlyIf(in.place() == m_end);
+    m_leaves.reserve(m_places.size());
+    m_tree.getNodes(m_leaves);
+    walkOnlyIf(m_leaves.size() == m_places.size());
+    if (m_leafMemory != LeafMemory::kPacked) return;
+    openvdb::Index32 next = 0;
+    forEachInOrder<LeadingAxis::kZ>(
+        m_tree, [&](Leaf& leaf) { leaf.setTransientData(next++); }, [](auto const&...) {});
+    m_packed = std::make_shared<PackedLeaves>(m_leaves.size() * Leaf::SIZE * sizeof(Value));
+  }
+
+  void readLeaves(std::int64_t first, std::int64_t last) const override {
+    MemoryStream in(m_bytes);
+    for (auto n = static_cast<std::size_t>(first); n < static_cast<std::size_t>(last); ++n)
+      readLeaf(*m_leaves[n], m_bytes, m_places[n], in, m_coding, m_tree.background(), valuesOf(*m_leaves[n]));
+  }
+
+private:
+  using Leaf = typename TreeT::LeafNodeType;
+  using Value = typename TreeT::ValueType;
+
+  Value* valuesOf(Leaf& leaf) const {
+    return m_packed ? static_cast<Value*>(m_packed->begin()) + std::size_t(leaf.transientData()) * Leaf::SIZE
+                    : leaf.buffer().data();
+  }
+
+  TreeT& m_tree;
+  WalkedBytes m_bytes; ///< all of the file
+  ValueCoding m_coding;
+  LeafMemory m_leafMemory;
+  std::size_t m_begin, m_end = 0;
+  std::vector<Leaf*> m_leaves;
+};
+
 class CheckedReader : public openvdb::io::Archive {
 public:
   CheckedReader(WalkedBytes bytes, std::uint64_t memoryBytes, std::function<void(double)> const& told,
                 LeafMemory leafMemory)
       : m_leafMemory(leafMemory)
       , m_bytes(bytes)
+      , m_all(bytes)
       , m_in(bytes)
       , m_memoryLeft(memoryBytes)
       , m_told(told) {}
@@ -133,7 +211,8 @@ public:
     openvdb::io::setVersion(m_in, libraryVersion(), fileVersion());
     file.metadata = std::make_shared<openvdb::MetaMap>();
     readMetadata(*file.metadata);
-    for (auto count = m_bytes.number<std::int32_t>(); count > 0; --count) readGrid(file);
+    for (auto count = m_bytes.number<std::int32_t>(); count > 0; --count) walkGrid(file);
+    readTrees(file);
   }
 
 private:
@@ -174,7 +253,8 @@ private:
     m_bytes.take(m_in.place() - m_bytes.place());
   }
 
-  void readGrid(VdbFile& file) {
+  // Its tree is still to be made.
+  void walkGrid(VdbFile& file) {
     // What a grid takes by itself: many small ones are more in memory than in a file.
     constexpr std::uint64_t kGrid = 8192;
     walkOnlyIf(m_memoryLeft >= kGrid);
@@ -189,73 +269,60 @@ private:
     GridBase::Ptr grid = descriptor.read(m_in);
     walkOnlyIf(m_in.place() == m_bytes.place());
     ValueCoding coding{m_bytes.number<std::uint32_t>(), false};
-    openvdb::io::setDataCompression(m_in, coding.compression);
     readMetadata(*grid);
     readTransform(*grid);
     coding.half = grid->saveFloatAsHalf();
-    bool done = false;
+    std::size_t const known = m_trees.size();
     auto const attempt = [&]<class GridT>(GridT const*) {
-      if (!done && grid->isType<GridT>()) {
-        if (auto packed = readTree(static_cast<GridT&>(*grid).tree(), coding))
-          file.packed.emplace(grid.get(), std::move(packed));
-        done = true;
-      }
+      if (m_trees.size() > known || !grid->isType<GridT>()) return;
+      m_trees.push_back(std::make_unique<TypedTreeToRead<typename GridT::TreeType>>(
+          static_cast<GridT&>(*grid).tree(), m_bytes, coding, m_leafMemory, m_memoryLeft));
     };
 #define VLN_ATTEMPT(GridT) attempt(static_cast<openvdb::GridT const*>(nullptr));
     VLN_FOR_EACH_VDB_REAL_GRID(VLN_ATTEMPT)
     VLN_FOR_EACH_VDB_VECTOR_GRID(VLN_ATTEMPT)
     VLN_ATTEMPT(Int64Grid) // bytes of a file may be no bools
 #undef VLN_ATTEMPT
-    walkOnlyIf(done);
+    walkOnlyIf(m_trees.size() > known);
     file.grids.push_back(std::move(grid));
   }
 
-  template <class TreeT> std::shared_ptr<PackedLeaves> readTree(TreeT& tree, ValueCoding const& coding) {
-    using Leaf = typename TreeT::LeafNodeType;
-    using Value = typename TreeT::ValueType;
-    std::size_t const begin = m_bytes.place();
-    std::uint64_t const memory = walkTopology<TreeT>(m_bytes, coding);
-    walkOnlyIf(memory <= m_memoryLeft);
-    m_memoryLeft -= memory;
-    m_in.goTo(begin);
-    tree.readTopology(m_in, coding.half);
-    walkOnlyIf(m_in.place() == m_bytes.place());
+  /// Makes all trees at once, and then all leaves: those of many small grids keep all cores busy.
+  void readTrees(VdbFile& file) {
+    parallelFor(0, std::int64_t(m_trees.size()), [&](std::int64_t first, std::int64_t last) {
+      MemoryStream in(m_all);
+      openvdb::io::setVersion(in, libraryVersion(), fileVersion());
+      for (auto n = static_cast<std::size_t>(first); n < static_cast<std::size_t>(last); ++n)
+        m_trees[n]->makeNodes(in);
+    });
+    for (std::size_t n = 0; n < m_trees.size(); ++n)
+      if (auto const& packed = m_trees[n]->packed()) file.packed.emplace(file.grids[n].get(), packed);
 
-    std::vector<Leaf*> leaves;
-    leaves.reserve(tree.leafCount());
-    tree.getNodes(leaves);
-    std::vector<std::size_t> places;
-    places.reserve(leaves.size());
-    for (std::size_t n = 0; n < leaves.size(); ++n) {
-      places.push_back(m_bytes.place());
-      walkBuffers<Leaf>(m_bytes, coding);
-    }
-    std::shared_ptr<PackedLeaves> packed;
-    if (m_leafMemory == LeafMemory::kPacked) {
-      openvdb::Index32 next = 0;
-      forEachInOrder<LeadingAxis::kZ>(
-          tree, [&](Leaf& leaf) { leaf.setTransientData(next++); }, [](auto const&...) {});
-      packed = std::make_shared<PackedLeaves>(leaves.size() * Leaf::SIZE * sizeof(Value));
-    }
-    auto const valuesOf = [&](Leaf& leaf) {
-      return packed ? static_cast<Value*>(packed->begin()) + std::size_t(leaf.transientData()) * Leaf::SIZE
-                    : leaf.buffer().data();
+    struct Part {
+      TreeToRead const* tree;
+      std::int64_t first, last; ///< leaves
     };
-    WalkedBytes const all(m_bytes.data(), m_bytes.size());
-    auto const count = std::int64_t(leaves.size());
-    for (std::int64_t done = 0, next = 0; done < count; done = next) {
-      tell(places[static_cast<std::size_t>(done)]);
-      next = std::min(done + kLeavesAtOnce, count);
-      parallelFor(done, next,
-                  [&](std::int64_t first, std::int64_t last) {
-                    MemoryStream in(all);
-                    for (auto n = static_cast<std::size_t>(first); n < static_cast<std::size_t>(last); ++n)
-                      readLeaf(*leaves[n], all, places[n], in, coding, tree.background(),
-                               valuesOf(*leaves[n]));
-                  },
-                  {.grain = 64});
+    std::vector<Part> parts;
+    std::int64_t leaves = 0;
+    auto const read = [&] {
+      if (parts.empty()) return;
+      tell(parts[0].tree->places()[static_cast<std::size_t>(parts[0].first)]);
+      parallelFor(0, std::int64_t(parts.size()), [&](std::int64_t first, std::int64_t last) {
+        for (auto n = static_cast<std::size_t>(first); n < static_cast<std::size_t>(last); ++n)
+          parts[n].tree->readLeaves(parts[n].first, parts[n].last);
+      });
+      parts.clear();
+      leaves = 0;
+    };
+    for (auto const& tree : m_trees) {
+      auto const count = std::int64_t(tree->places().size());
+      for (std::int64_t first = 0; first < count; first += kLeavesInPart) {
+        parts.push_back({tree.get(), first, std::min(first + kLeavesInPart, count)});
+        leaves += kLeavesInPart;
+        if (leaves >= kLeavesAtOnce) read();
+      }
     }
-    return packed;
+    read();
   }
 
   void tell(std::size_t place) const {
@@ -265,13 +332,14 @@ private:
     } catch (...) { throw ReadingStopped{std::current_exception()}; }
   }
 
-  static constexpr std::int64_t kLeavesAtOnce = 16384; ///< some hundredths of a second
+  static constexpr std::int64_t kLeavesInPart = 64, kLeavesAtOnce = 16384; ///< some hundredths of a second
 
   LeafMemory m_leafMemory;
-  WalkedBytes m_bytes;
+  WalkedBytes m_bytes, m_all; ///< what is to come, and all of the file
   MemoryStream m_in;
   std::uint64_t m_memoryLeft;
   std::function<void(double)> const& m_told;
+  std::vector<std::unique_ptr<TreeToRead>> m_trees; ///< of the file's grids
 };
 
 } // namespace

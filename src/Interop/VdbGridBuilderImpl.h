@@ -143,7 +143,9 @@ private:
                 [&](std::int64_t begin, std::int64_t end) {
                   for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
                     if (!hasLeaf(blocks[n])) continue;
-                    leaves[n] = std::make_unique<Leaf>(blocks[n].origin, m_background, false);
+                    // Its values come with the first look at them, and all are written.
+                    leaves[n] = std::make_unique<Leaf>(openvdb::PartialCreate(), blocks[n].origin,
+                                                       m_background, false);
                     fillLeaf(*leaves[n], blocks[n]);
                   }
                 },

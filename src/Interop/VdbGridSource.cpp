@@ -26,6 +26,12 @@ void sortCorners(std::vector<int3>& corners) {
     std::sort(corners.begin(), corners.end(), TileTree3D::MortonOrder());
 }
 
+struct PlaceOrder {
+  bool operator()(PlaceBlocks const& a, PlaceBlocks const& b) const {
+    return TileTree3D::mortonLess(a.place, b.place);
+  }
+};
+
 } // namespace
 
 RootPlaces::RootPlaces(std::vector<int3> const& corners, int depth)
@@ -113,27 +119,57 @@ int cheapestRootDepth(std::vector<int3> leaves, std::vector<int3> tiles, int dee
   return best;
 }
 
-void joinSorted(std::vector<int3>& corners, std::size_t known, std::vector<int3> others) {
-  if (known > 0) {
-    // What another grid brought mostly comes again.
-    sortCorners(others);
-    auto const middle = corners.begin() + static_cast<std::ptrdiff_t>(known);
-    std::vector<int3> added, all;
-    added.reserve(corners.size() - known + others.size());
-    std::set_union(middle, corners.end(), others.begin(), others.end(), std::back_inserter(added),
-                   TileTree3D::MortonOrder());
-    all.reserve(known + added.size());
-    std::set_union(corners.begin(), middle, added.begin(), added.end(), std::back_inserter(all),
-                   TileTree3D::MortonOrder());
-    return corners.swap(all);
+void sortPlaces(BlockList& list) {
+  std::sort(list.begin(), list.end(), PlaceOrder());
+  std::size_t kept = 0;
+  for (PlaceBlocks const& b : list)
+    if (kept > 0 && list[kept - 1].place == b.place)
+      list[kept - 1].blocks |= b.blocks;
+    else
+      list[kept++] = b;
+  list.resize(kept);
+}
+
+BlockList unionOf(BlockList const& a, BlockList const& b) {
+  BlockList both;
+  both.reserve(std::max(a.size(), b.size()));
+  auto i = a.begin(), j = b.begin();
+  while (i != a.end() && j != b.end()) {
+    if (i->place == j->place)
+      both.push_back({i->place, i->blocks | j->blocks}), ++i, ++j;
+    else
+      both.push_back(PlaceOrder()(*i, *j) ? *i++ : *j++);
   }
-  auto const begin = corners.begin(), middle = begin + static_cast<std::ptrdiff_t>(known);
-  std::inplace_merge(begin, middle, corners.end(), TileTree3D::MortonOrder());
-  if (others.empty()) return;
+  both.insert(both.end(), i, a.end());
+  both.insert(both.end(), j, b.end());
+  return both;
+}
+
+std::uint64_t countBlocks(BlockList const& list) {
+  std::uint64_t count = 0;
+  for (PlaceBlocks const& b : list) count += static_cast<std::uint64_t>(std::popcount(b.blocks));
+  return count;
+}
+
+std::vector<int3> cornersOf(BlockList const& list) {
+  std::vector<int3> corners;
+  corners.reserve(static_cast<std::size_t>(countBlocks(list)));
+  for (auto const& [place, blocks] : list)
+    for (unsigned rest = blocks; rest != 0; rest &= rest - 1) {
+      int const n = std::countr_zero(rest);
+      corners.push_back({place.x + (n & 4), place.y + 2 * (n & 2), place.z + 4 * (n & 1)});
+    }
+  return corners;
+}
+
+void addSorted(std::vector<int3>& corners, std::vector<int3> others) {
   sortCorners(others);
-  auto const count = static_cast<std::ptrdiff_t>(corners.size());
-  corners.insert(corners.end(), others.begin(), others.end());
-  std::inplace_merge(corners.begin(), corners.begin() + count, corners.end(), TileTree3D::MortonOrder());
+  std::vector<int3> all;
+  all.reserve(corners.size() + others.size());
+  std::set_union(corners.begin(), corners.end(), others.begin(), others.end(), std::back_inserter(all),
+                 TileTree3D::MortonOrder());
+  all.erase(std::unique(all.begin(), all.end()), all.end());
+  corners.swap(all);
 }
 
 bool tilesFollowLeaves(VdbContainer const& container) {

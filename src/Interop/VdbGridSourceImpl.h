@@ -3,6 +3,7 @@
 
 #include "GeometryVolume/core/FunctionRef.h"
 #include "GeometryVolume/tiletree/Morton.h"
+#include "Interop/VdbBlocksImpl.h"
 #include "Interop/VdbImport.h"
 #include "Interop/VdbPackedLeavesImpl.h"
 #include "Interop/VdbRecord.h"
@@ -61,6 +62,13 @@ private:
 /// Corners of tiles by depth.
 using TileCorners = VLN::PerDepth<std::vector<Velorn::Math::int3>, VdbTraits::kDepths>;
 
+/// What a grid needs of a tree.
+struct NeededTiles {
+  BlockList blocks;    ///< narrow tiles, and the places of leaves
+  TileCorners wider;   ///< without the tiles that are as wide as leaves
+  std::uint64_t count; ///< of narrow tiles, with some counted twice: of those that were asked for
+};
+
 /// Reports tiles as they are filled.
 using FilledTiles = FunctionRef<void(std::int64_t tiles)>;
 
@@ -85,9 +93,9 @@ public:
   /// Appends the corners of all leaves, and of the file's tiles with another value than the background.
   virtual void collectStored(std::vector<Velorn::Math::int3>& leaves,
                              std::vector<Velorn::Math::int3>& tiles) const = 0;
-  /// Appends the corners of the tiles that the grid needs, without their ancestors: see VdbImport.h.
+  /// Collects the tiles that the grid needs, without their ancestors: see VdbImport.h.
   /// @param mostTiles The shells of the widest tiles are left out where they would take more.
-  virtual void collectTiles(int rootDepth, std::uint64_t mostTiles, TileCorners& corners) const = 0;
+  virtual NeededTiles collectTiles(int rootDepth, std::uint64_t mostTiles) const = 0;
   /// Appends the corners of further roots: those on the high sides of the others where a blend would
   /// otherwise not meet the background.
   virtual void collectBeyondRoots(RootPlaces const& roots, std::vector<Velorn::Math::int3>& out) const = 0;
@@ -120,10 +128,8 @@ int rootDepth(std::vector<GridSummary> const& grids);
 /// wide tiles, shallow ones stand above more ancestors.
 int cheapestRootDepth(std::vector<Velorn::Math::int3> leaves, std::vector<Velorn::Math::int3> tiles,
                       int deepest);
-/// Brings into Morton order: corners whose first `known` and whose others are each so, and more. Corners that
-/// were known do not come again.
-void joinSorted(std::vector<Velorn::Math::int3>& corners, std::size_t known,
-                std::vector<Velorn::Math::int3> others);
+/// Adds corners to others that are along the Z-shaped curve, and drops duplicates.
+void addSorted(std::vector<Velorn::Math::int3>& corners, std::vector<Velorn::Math::int3> others);
 /// Whether the deepest tiles lie in the order of the places of leaves that they are in.
 bool tilesFollowLeaves(VdbContainer const& container);
 /// Joins extents and counts; neither has a range yet.

@@ -5,6 +5,7 @@
 #include "Interop/VdbGridSourceImpl.h"
 #include "Interop/VdbLeafPlacesImpl.h"
 #include "Interop/VdbStateTilesImpl.h"
+#include "Interop/VdbTilesRoundImpl.h"
 #include "Interop/VdbZeroTilesImpl.h"
 
 #include <algorithm>
@@ -57,47 +58,51 @@ public:
       if (!sameBits(tile.value, m_background)) tiles.push_back(toInt3(tile.corner));
   }
 
-  void collectTiles(int rootDepth, std::uint64_t mostTiles, TileCorners& corners) const override {
-    auto at = [&](int depth) -> std::vector<int3>& { return corners[depth]; };
+  NeededTiles collectTiles(int rootDepth, std::uint64_t mostTiles) const override {
+    NeededTiles needed;
+    auto add = [&](int depth, int3 const& corner) {
+      auto& list = needed.wider[depth];
+      if (list.empty() || list.back() != corner) list.push_back(corner);
+    };
     constexpr int kWidestDepth = depthOfSamples(kNodeWidths[2]);
     bool const leavesHaveTile = rootDepth < VdbTraits::kMaxDepth;
 
     // In the leaves, which are in order, and before them: only what lies before is out of order.
-    std::vector<int3> before;
-    std::size_t const known = at(VdbTraits::kMaxDepth).size();
+    BlockList before;
     collectInParallel(
         std::int64_t(m_leaves.size()), 256,
-        [&](std::int64_t n, Search& search, auto& blocks, auto& blocksBefore) {
+        [&](std::int64_t n, Search& search, BlockList& own, BlockList& places) {
           Leaf const& leaf = *m_leaves[static_cast<std::size_t>(n)];
           auto const& digest = m_digests[leaf.transientData()];
-          Places places = placesRound(search, leaf.origin());
-          unsigned const active = activeBlocks(leaf);
+          Places round = placesRound(search, leaf.origin());
+          unsigned blocks = activeBlocks(leaf);
           for (int b = 0; b < 8; ++b) {
+            if (blocks >> b & 1) continue;
             int const x = b >> 2, y = b >> 1 & 1, z = b & 1;
-            bool const spare = !(active >> b & 1) && (digest.uniform >> 8 * b & 1) &&
-                               places.isUniform(x, y, z) &&
-                               (leavesHaveTile || sameBits(places.valueAt(x, y, z), m_background));
-            if (!spare) blocks.push_back(blockOf(leaf.origin(), x, y, z));
+            bool const spare = (digest.uniform >> 8 * b & 1) && round.isUniform(x, y, z) &&
+                               (leavesHaveTile || sameBits(round.valueAt(x, y, z), m_background));
+            if (!spare) blocks |= 1u << b;
           }
-          collectBeforeLeaf(places, leaf.origin(), blocksBefore);
+          if (blocks != 0 || leavesHaveTile) own.push_back({toInt3(leaf.origin()), blocks});
+          collectBeforeLeaf(round, leaf.origin(), places);
         },
-        at(VdbTraits::kMaxDepth), before);
-    if (leavesHaveTile)
-      for (Leaf const* leaf : m_leaves) at(VdbTraits::kMaxDepth - 1).push_back(toInt3(leaf->origin()));
+        needed.blocks, before);
 
     for (WideTile const& tile : m_wide) {
       int const depth = depthOfSamples(tile.width);
       int3 const c = toInt3(tile.corner);
-      if (tile.active) at(depth).push_back(alignTo(c, depth));
+      if (tile.active) add(depth, alignTo(c, depth));
       if (sameBits(tile.value, m_background)) continue;
       // A root over the tile: what has no finer tile is read there.
-      at(rootDepth).push_back(alignTo(c, rootDepth));
+      add(rootDepth, alignTo(c, rootDepth));
       // And no sample that is wider than any tile of the file: the way back has no place for it.
-      if (rootDepth < kWidestDepth) at(kWidestDepth).push_back(alignTo(c, kWidestDepth));
+      if (rootDepth < kWidestDepth) add(kWidestDepth, alignTo(c, kWidestDepth));
     }
-    std::uint64_t const planned = at(VdbTraits::kMaxDepth).size() + before.size();
-    collectShells(planned, mostTiles, before);
-    joinSorted(at(VdbTraits::kMaxDepth), known, std::move(before));
+    needed.count = countBlocks(needed.blocks) + countBlocks(before);
+    collectShells(mostTiles, needed.count, before);
+    sortPlaces(before);
+    needed.blocks = unionOf(needed.blocks, before);
+    return needed;
   }
 
   void collectBeyondRoots(RootPlaces const& roots, std::vector<int3>& out) const override {
@@ -105,6 +110,7 @@ public:
     Search search(m_grid->tree());
     for (int3 const& root : roots.corners()) {
       unsigned const missing = roots.missingBeside(root);
+      if (missing == 0 || isBackground(search, root, width)) continue;
       for (int n = 1; missing >> n != 0; ++n) {
         if (!(missing >> n & 1)) continue;
         int const side[3] = {n & 1, n >> 1 & 1, n >> 2};
@@ -136,8 +142,9 @@ public:
         parallelFor(first, last,
                     [&](std::int64_t begin, std::int64_t end) {
                       TileMaker make(*this, *channel, zeros);
+                      TileVector<Element>* const made = tiles.tileData({0, depth}).data();
                       for (std::int64_t n = begin; n < end; ++n)
-                        *tiles.tileData({n, depth}).data() = make(container.tile(n, depth).tijk(), depth);
+                        make(container.tile(n, depth).tijk(), depth, made[n]);
                     },
                     {.grain = 256});
         if (!packed.empty() && depth == VdbTraits::kMaxDepth && last < count)
@@ -162,8 +169,9 @@ public:
       parallelFor(0, container.tileCount(depth),
                   [&](std::int64_t begin, std::int64_t end) {
                     StateMaker<TreeT> make(m_grid->tree(), *channel, zeros);
+                    TileVector<unsigned char>* const made = tiles.tileData({0, depth}).data();
                     for (std::int64_t n = begin; n < end; ++n)
-                      *tiles.tileData({n, depth}).data() = make(container.tile(n, depth).tijk(), depth);
+                      make(container.tile(n, depth).tijk(), depth, made[n]);
                   },
                   {.grain = 256});
     zeros.leaveTo(*channel->cloneData());
@@ -173,6 +181,22 @@ public:
 private:
   using Search = PlaceSearch<TreeT>;
   using Places = LeafPlaces<TreeT>;
+
+  /// Whether a tile is known to hold nothing but the background, without its samples.
+  bool isBackground(Search& search, int3 const& corner, int width) const {
+    IndexBox const& stored = m_summary.stored;
+    for (int a = 0; a < 3; ++a)
+      if (corner[a] >= stored.max[a] || std::int64_t(corner[a]) + width <= stored.min[a]) return true;
+    if (width > kLeafWidth) return false;
+    auto const place = search.at(toCoord(leafPlaceOf(corner)));
+    if (!place.leaf) return sameBits(place.value, m_background);
+    auto const& digest = m_digests[place.leaf->transientData()];
+    return width == kBlockWidth && digest.holds(blockNumber(corner), 0, m_background);
+  }
+  /// Of the block in its leaf.
+  static int blockNumber(int3 const& corner) {
+    return (corner.x & 4) | (corner.y & 4) >> 1 | (corner.z & 4) >> 2;
+  }
 
   /// Whether one of a root's outermost samples on some high sides is not the background: without a root
   /// there, it would go on for ever.
@@ -292,7 +316,7 @@ private:
   template <class Collect, class... Lists>
   void collectInParallel(std::int64_t count, std::int64_t grain, Collect const& collect,
                          Lists&... lists) const {
-    using Part = std::array<std::vector<int3>, sizeof...(Lists)>;
+    using Part = std::array<BlockList, sizeof...(Lists)>;
     std::vector<Part> parts(static_cast<std::size_t>(chunkCount(0, count, grain)));
     parallelChunks(0, count, grain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
       Search search(m_grid->tree());
@@ -301,34 +325,62 @@ private:
         std::apply([&](auto&... list) { collect(n, search, list...); }, part);
     });
     std::size_t n = 0;
-    auto const append = [&](std::vector<int3>& list) {
+    auto const append = [&](BlockList& list) {
+      std::size_t size = list.size();
+      for (Part const& part : parts) size += part[n].size();
+      list.reserve(size);
       for (Part const& part : parts) list.insert(list.end(), part[n].begin(), part[n].end());
       ++n;
     };
     (append(lists), ...);
   }
-  static int3 blockOf(Coord const& leaf, int x, int y, int z) {
-    return {leaf.x() + kBlockWidth * x, leaf.y() + kBlockWidth * y, leaf.z() + kBlockWidth * z};
+  /// A block of the place that lies x, y, z blocks from another one's first.
+  static int3 blockOf(int3 const& place, int x, int y, int z) {
+    return {place.x + kBlockWidth * x, place.y + kBlockWidth * y, place.z + kBlockWidth * z};
+  }
+  /// The first of all blocks of a place.
+  static int3 placeOf(Coord const& leaf, int x, int y, int z) {
+    return {leaf.x() + kLeafWidth * x, leaf.y() + kLeafWidth * y, leaf.z() + kLeafWidth * z};
+  }
+
+  /// Appends those of a place's blocks whose blends give more than one value.
+  /// @param blocks Bits, numbered as in PlaceBlocks.
+  /// @param x, y, z The place, counted from that which `places` lie round.
+  static void collectUnlessUniform(Places& places, Coord const& origin, int x, int y, int z, unsigned blocks,
+                                   BlockList& out) {
+    int3 const place = placeOf(origin, x, y, z);
+    unsigned found = 0;
+    for (int n = 0; n < 8; ++n) {
+      if (!(blocks >> n & 1)) continue;
+      int const bx = n >> 2, by = n >> 1 & 1, bz = n & 1;
+      if (VdbTraits::inDomain(blockOf(place, bx, by, bz)) &&
+          !places.isUniform(2 * x + bx, 2 * y + by, 2 * z + bz))
+        found |= 1u << n;
+    }
+    if (found == 0) return;
+    if (!out.empty() && out.back().place == place)
+      out.back().blocks |= found;
+    else
+      out.push_back({place, found});
   }
 
   /// The blocks before a leaf's low sides, as far as no leaf holds them.
-  static void collectBeforeLeaf(Places& places, Coord const& origin, std::vector<int3>& out) {
+  static void collectBeforeLeaf(Places& places, Coord const& origin, BlockList& out) {
+    // Of a place before on some axes those that touch the leaf: on these axes the second ones.
+    constexpr unsigned kSecond[3] = {0xF0, 0xCC, 0xAA};
     for (int n = 1; n < 8; ++n) {
-      int const step[3] = {n & 1, n >> 1 & 1, n >> 2};
-      if (places.at(-step[0], -step[1], -step[2]).digest) continue;
-      // On an axis with a step the one block before, on the others the leaf's two.
-      for (int slot = 0; slot < 8; ++slot) {
-        if (slot & n) continue;
-        int const x = (slot & 1) - step[0], y = (slot >> 1 & 1) - step[1], z = (slot >> 2) - step[2];
-        collectUnlessUniform(places, blockOf(origin, x, y, z), x, y, z, out);
-      }
+      int const x = n & 1, y = n >> 1 & 1, z = n >> 2;
+      if (places.at(-x, -y, -z).digest) continue;
+      unsigned const touching =
+          (x ? kSecond[0] : 0xFFu) & (y ? kSecond[1] : 0xFFu) & (z ? kSecond[2] : 0xFFu);
+      collectUnlessUniform(places, origin, -x, -y, -z, touching, out);
     }
   }
 
   /// The blocks at the surfaces of wide tiles: those inside at the high sides, and those before the low ones.
   /// Inside such a block a value goes over to another one within one voxel.
-  /// @param planned Tiles that there are already.
-  void collectShells(std::uint64_t planned, std::uint64_t mostTiles, std::vector<int3>& out) const {
+  /// @param planned Tiles that there are already. Grows by those that are looked at.
+  void collectShells(std::uint64_t mostTiles, std::uint64_t& planned, BlockList& out) const {
     for (int const width : kNodeWidths) {
       std::vector<WideTile const*> exposed = exposedTiles(width);
       // A shell grows with the square of the width: where memory ends, the widest tiles stay coarse.
@@ -338,7 +390,7 @@ private:
       if (width == kLeafWidth) {
         collectInParallel(
             std::int64_t(exposed.size()), 96,
-            [&](std::int64_t n, Search& search, auto& part) {
+            [&](std::int64_t n, Search& search, BlockList& part) {
               collectRound(search, exposed[static_cast<std::size_t>(n)]->corner, part);
             },
             out);
@@ -347,7 +399,7 @@ private:
       auto const rows = std::int64_t(across) + 1;
       collectInParallel(
           std::int64_t(exposed.size()) * rows, 1,
-          [&](std::int64_t n, Search& search, auto& part) {
+          [&](std::int64_t n, Search& search, BlockList& part) {
             collectSlice(search, exposed[static_cast<std::size_t>(n / rows)]->corner, across,
                          static_cast<int>(n % rows) - 1, part);
           },
@@ -361,18 +413,46 @@ private:
     for (WideTile const& tile : m_wide)
       if (tile.width == width && !sameBits(tile.value, m_background)) list.push_back(&tile);
     std::vector<char> exposed(list.size());
-    parallelFor(0, std::int64_t(list.size()),
+    std::vector<std::size_t> const runs = runsInNodes(list);
+    // The narrow tiles of most grids all have one value: where a node has many, it is looked at whole.
+    bool const alike = width == kLeafWidth && list.size() > 8 * runs.size() &&
+                       std::all_of(list.begin(), list.end(), [&](WideTile const* tile) {
+                         return sameBits(tile->value, list[0]->value);
+                       });
+    std::optional<TilesRound<TreeT>> round;
+    if (alike) round.emplace(m_grid->tree(), list[0]->value);
+    parallelFor(0, std::int64_t(runs.size()),
                 [&](std::int64_t begin, std::int64_t end) {
                   Search search(m_grid->tree());
-                  for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n)
-                    exposed[n] = isExposed(search, *list[n]);
+                  for (auto run = static_cast<std::size_t>(begin); run < static_cast<std::size_t>(end);
+                       ++run) {
+                    std::size_t const last = run + 1 < runs.size() ? runs[run + 1] : list.size();
+                    if (!alike) {
+                      for (std::size_t n = runs[run]; n < last; ++n) exposed[n] = isExposed(search, *list[n]);
+                      continue;
+                    }
+                    auto const inside = round->inside(search, *search.lower(list[runs[run]]->corner));
+                    for (std::size_t n = runs[run]; n < last; ++n) {
+                      auto const slot = Search::Lower::coordToOffset(list[n]->corner);
+                      exposed[n] = !(inside[slot / 64] >> slot % 64 & 1);
+                    }
+                  }
                 },
-                {.grain = 64});
+                {});
     std::size_t kept = 0;
     for (std::size_t n = 0; n < list.size(); ++n)
       if (exposed[n]) list[kept++] = list[n];
     list.resize(kept);
     return list;
+  }
+  /// Where the tiles of another node begin: those of one lie side by side.
+  static std::vector<std::size_t> runsInNodes(std::vector<WideTile const*> const& tiles) {
+    std::vector<std::size_t> runs;
+    for (std::size_t n = 0; n < tiles.size(); ++n) {
+      auto const nodeOf = [](WideTile const* tile) { return tile->corner & -kNodeWidths[1]; };
+      if (n == 0 || nodeOf(tiles[n]) != nodeOf(tiles[n - 1])) runs.push_back(n);
+    }
+    return runs;
   }
   /// Whether one of a tile's 26 neighbours of the same width is finer, or has another value.
   bool isExposed(Search& search, WideTile const& tile) const {
@@ -402,35 +482,32 @@ private:
 
   /// The blocks in and before a tile that is as wide as a leaf. Those in leaves have been looked at, and
   /// those in tiles like this one come with them.
-  void collectRound(Search& search, Coord const& corner, std::vector<int3>& out) const {
+  void collectRound(Search& search, Coord const& corner, BlockList& out) const {
     Places places = placesRound(search, corner);
-    for (int x = -1; x < 2; ++x)
-      for (int y = -1; y < 2; ++y)
-        for (int z = -1; z < 2; ++z) {
-          if (x == 0 && y == 0 && z == 0) continue;
-          bool const inside = x >= 0 && y >= 0 && z >= 0;
-          auto const& place = places.at(x >> 1, y >> 1, z >> 1);
-          if (place.digest || (!inside && place.isNarrow && !sameBits(place.value, m_background))) continue;
-          collectUnlessUniform(places, blockOf(corner, x, y, z), x, y, z, out);
-        }
+    // The first block of the tile blends with nothing else.
+    collectUnlessUniform(places, corner, 0, 0, 0, 0xFE, out);
+    constexpr unsigned kSecond[3] = {0xF0, 0xCC, 0xAA};
+    for (int n = 1; n < 8; ++n) {
+      int const x = n & 1, y = n >> 1 & 1, z = n >> 2;
+      auto const& place = places.at(-x, -y, -z);
+      if (place.digest || (place.isNarrow && !sameBits(place.value, m_background))) continue;
+      unsigned const touching =
+          (x ? kSecond[0] : 0xFFu) & (y ? kSecond[1] : 0xFFu) & (z ? kSecond[2] : 0xFFu);
+      collectUnlessUniform(places, corner, -x, -y, -z, touching, out);
+    }
   }
   /// The blocks of the shell of a wider tile with one z, of -1 to across - 1.
-  void collectSlice(Search& search, Coord const& corner, int across, int z, std::vector<int3>& out) const {
+  void collectSlice(Search& search, Coord const& corner, int across, int z, BlockList& out) const {
     auto const outer = [&](int c) { return c == -1 || c == across - 1; };
     for (int y = -1; y < across; ++y) {
       int const step = outer(z) || outer(y) ? 1 : across;
       for (int x = -1; x < across; x += step) {
-        int3 const block = blockOf(corner, x, y, z);
-        Places places =
-            placesRound(search, Coord(block.x & -kLeafWidth, block.y & -kLeafWidth, block.z & -kLeafWidth));
-        collectUnlessUniform(places, block, block.x >> 2 & 1, block.y >> 2 & 1, block.z >> 2 & 1, out);
+        int3 const place = leafPlaceOf(blockOf(toInt3(corner), x, y, z));
+        Places places = placesRound(search, toCoord(place));
+        collectUnlessUniform(places, toCoord(place), 0, 0, 0, 1u << (4 * (x & 1) + 2 * (y & 1) + (z & 1)),
+                             out);
       }
     }
-  }
-  /// @param x, y, z The block, counted from the first of the place that `places` lie round.
-  static void collectUnlessUniform(Places& places, int3 const& corner, int x, int y, int z,
-                                   std::vector<int3>& out) {
-    if (VdbTraits::inDomain(corner) && !places.isUniform(x, y, z)) out.push_back(corner);
   }
 
   std::vector<Leaf const*> leavesByNumber() const {
@@ -462,8 +539,9 @@ private:
   }
   /// The place of a leaf that was looked up last: tiles that are filled one after another share it.
   struct LastPlace {
-    std::optional<Coord> corner;
+    int3 corner{1, 1, 1}; ///< at first none that a place has
     LeafPlace<TreeT> place;
+    bool isZero = false;           ///< where there is no leaf
     Value const* values = nullptr; ///< of the leaf, unless they are bits
   };
 
@@ -476,28 +554,28 @@ private:
         , m_zeros(zeros)
         , m_search(grid.m_grid->tree()) {}
 
-    TileVector<Element> operator()(int3 const& corner, int depth) {
+    /// @param made Empty.
+    void operator()(int3 const& corner, int depth, TileVector<Element>& made) {
       if (VdbTraits::width(depth) <= kLeafWidth) {
-        m_grid.lookUp(m_search, m_last, toCoord(leafPlaceOf(corner)));
+        m_grid.lookUp(m_search, m_last, leafPlaceOf(corner));
         auto const& place = m_last.place;
         bool const deepest = depth == VdbTraits::kMaxDepth;
-        if (place.leaf ? deepest && m_grid.isZeroBlock(*place.leaf, corner) : areZeros(&place.value, 1))
-          return m_zeros.take(m_run);
+        if (place.leaf ? deepest && m_grid.isZeroBlock(*place.leaf, corner) : m_last.isZero)
+          return m_zeros.make(m_run, made);
         if (deepest || !place.leaf) {
-          auto tile = m_channel.unwrittenTile();
+          made = m_channel.unwrittenTile();
           if (place.leaf)
-            m_grid.fillTile(m_search, m_last, corner, depth, tile.data());
+            m_grid.fillTile(m_search, m_last, corner, depth, made.data());
           else
-            TileTree3D::Internal::fillRun(tile.data(), ChannelT::kSize, toElement(place.value));
-          return tile;
+            TileTree3D::Internal::fillRun(made.data(), ChannelT::kSize, toElement(place.value));
+          return;
         }
       }
       Element samples[ChannelT::kSize];
       m_grid.fillTile(m_search, m_last, corner, depth, samples);
-      if (areZeros(samples, ChannelT::kSize)) return m_zeros.take(m_run);
-      auto tile = m_channel.unwrittenTile();
-      std::copy(std::begin(samples), std::end(samples), tile.data());
-      return tile;
+      if (areZeros(samples, ChannelT::kSize)) return m_zeros.make(m_run, made);
+      made = m_channel.unwrittenTile();
+      std::copy(std::begin(samples), std::end(samples), made.data());
     }
 
   private:
@@ -512,14 +590,19 @@ private:
   /// Whether all bits of the voxels in a block are zero.
   bool isZeroBlock(Leaf const& leaf, int3 const& corner) const {
     auto const& digest = m_digests[leaf.transientData()];
-    auto const block = static_cast<unsigned>((corner.x & 4) | (corner.y & 4) >> 1 | (corner.z & 4) >> 2);
+    int const block = blockNumber(corner);
     return (digest.uniform >> 8 * block & 1) && areZeros(&digest.first[block], 1);
   }
-  void lookUp(Search& search, LastPlace& last, Coord const& corner) const {
-    if (last.corner == corner) return;
-    last.place = search.at(corner);
+  void lookUp(Search& search, LastPlace& last, int3 const& corner) const {
+    if (last.corner != corner) lookUpAnew(search, last, corner);
+  }
+  [[gnu::noinline]] void lookUpAnew(Search& search, LastPlace& last, int3 const& corner) const {
+    last.place = search.at(toCoord(corner));
     last.corner = corner;
-    if (last.place.leaf) last.values = valuesOf(*last.place.leaf);
+    if (last.place.leaf)
+      last.values = valuesOf(*last.place.leaf);
+    else
+      last.isZero = areZeros(&last.place.value, 1);
   }
 
   void fillTile(Search& search, LastPlace& last, int3 const& corner, int depth, Element* samples) const {
@@ -541,7 +624,7 @@ private:
   }
   void fillFromPlace(Search& search, LastPlace& last, Coord const& at, int step, int count,
                      Element* samples) const {
-    lookUp(search, last, at & -kLeafWidth);
+    lookUp(search, last, leafPlaceOf(toInt3(at)));
     Leaf const* const leaf = last.place.leaf;
     auto const fill = [&](auto const& valueAt) {
       for (int k = 0; k < count; ++k)

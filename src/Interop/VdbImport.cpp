@@ -51,14 +51,38 @@ std::string whyNotKept(openvdb::math::Transform const& transform) {
   } catch (std::exception const& error) { return "its transform cannot be used: " + oneLine(error.what()); }
 }
 
+struct TypedSource {
+  std::unique_ptr<GridSource> source; ///< null for a type that is not supported
+  std::string type;
+};
+
+/// A source for each grid of a file.
+std::vector<TypedSource> makeSources(VdbFile const& file) {
+  std::vector<TypedSource> sources(file.grids.size());
+  // Sources number the leaves of trees, which grids may share unless their voxels are packed.
+  bool const apart = file.packed.size() == file.grids.size();
+  auto const count = std::int64_t(sources.size());
+  parallelFor(0, count,
+              [&](std::int64_t first, std::int64_t last) {
+                for (auto n = static_cast<std::size_t>(first); n < static_cast<std::size_t>(last); ++n) {
+                  auto const& base = file.grids[n];
+                  auto const packed = file.packed.find(base.get());
+                  sources[n].source = makeGridSource(
+                      {withoutMask(base), packed == file.packed.end() ? nullptr : packed->second},
+                      sources[n].type);
+                }
+              },
+              {.grain = apart ? 1 : std::max<std::int64_t>(1, count)});
+  return sources;
+}
+
 /// Takes the grids out of the file, apart from those of points.
 std::vector<Group> groupByTransform(VdbFile& file, std::vector<SkippedGrid>& skipped) {
   std::vector<Group> groups;
-  for (auto const& base : file.grids) {
-    std::string type;
-    auto const packed = file.packed.find(base.get());
-    auto source =
-        makeGridSource({withoutMask(base), packed == file.packed.end() ? nullptr : packed->second}, type);
+  std::vector<TypedSource> sources = makeSources(file);
+  for (std::size_t n = 0; n < sources.size(); ++n) {
+    auto const& base = file.grids[n];
+    auto& [source, type] = sources[n];
     if (!source) {
       if (isPointGrid(*base)) continue;
       skipped.push_back({base->getName(), "grids of type " + oneLine(type) + " are not read"});
@@ -95,6 +119,12 @@ void addTiles(Container& container, TileCorners const& corners) {
   container.tileAccessor().addTiles(lists);
 }
 
+template <class F> void forEachGrid(Group const& group, F const& f) {
+  parallelFor(0, std::int64_t(group.grids.size()), [&](std::int64_t first, std::int64_t last) {
+    for (std::int64_t n = first; n < last; ++n) f(static_cast<std::size_t>(n));
+  });
+}
+
 std::size_t countOf(TileCorners const& corners) {
   std::size_t count = 0;
   for (auto const& list : corners) count += list.size();
@@ -102,12 +132,43 @@ std::size_t countOf(TileCorners const& corners) {
 }
 
 void addRootsBeyond(std::vector<int3>& roots, Group const& group, int depth) {
-  std::vector<int3> beyond;
   RootPlaces const known(roots, depth);
-  for (auto const& grid : group.grids) grid->collectBeyondRoots(known, beyond);
-  if (beyond.empty()) return;
-  joinSorted(roots, roots.size(), std::move(beyond));
-  roots.erase(std::unique(roots.begin(), roots.end()), roots.end());
+  std::vector<std::vector<int3>> beyond(group.grids.size());
+  forEachGrid(group, [&](std::size_t n) { group.grids[n]->collectBeyondRoots(known, beyond[n]); });
+  std::vector<int3> all;
+  for (auto const& part : beyond) all.insert(all.end(), part.begin(), part.end());
+  if (!all.empty()) addSorted(roots, std::move(all));
+}
+
+/// The tiles that the grids need in all, without ancestors.
+TileCorners collectTiles(Group const& group, int rootDepth, std::uint64_t mostTiles) {
+  std::vector<NeededTiles> needed(group.grids.size());
+  forEachGrid(group, [&](std::size_t n) { needed[n] = group.grids[n]->collectTiles(rootDepth, mostTiles); });
+  std::uint64_t count = 0;
+  for (NeededTiles const& tiles : needed) count += tiles.count;
+  BlockList blocks;
+  if (count > mostTiles) {
+    // Where memory is short, those come first that the grids before have.
+    for (std::size_t n = 0; n < needed.size(); ++n) {
+      std::uint64_t const known = countBlocks(blocks);
+      needed[n] = group.grids[n]->collectTiles(rootDepth, mostTiles - std::min(mostTiles, known));
+      blocks = unionOf(blocks, std::exchange(needed[n].blocks, {}));
+    }
+  } else {
+    // By pairs: grids are much the same.
+    for (std::size_t step = 1; step < needed.size(); step *= 2)
+      for (std::size_t n = 0; n + step < needed.size(); n += 2 * step)
+        needed[n].blocks = unionOf(needed[n].blocks, std::exchange(needed[n + step].blocks, {}));
+    if (!needed.empty()) blocks.swap(needed[0].blocks);
+  }
+  TileCorners corners;
+  for (NeededTiles const& tiles : needed)
+    for (int depth = 0; depth < VdbTraits::kDepths; ++depth)
+      corners[depth].insert(corners[depth].end(), tiles.wider[depth].begin(), tiles.wider[depth].end());
+  corners[VdbTraits::kMaxDepth] = cornersOf(blocks);
+  if (rootDepth < VdbTraits::kMaxDepth)
+    for (PlaceBlocks const& b : blocks) corners[VdbTraits::kMaxDepth - 1].push_back(b.place);
+  return corners;
 }
 
 // About what a volume takes: records of tiles and of their vectors, child tables and samples. Many grids that
@@ -131,43 +192,75 @@ std::string metadataBytes(openvdb::MetaMap const& metadata) {
   return out.str();
 }
 
-// Makes and fills the channels of a volume, and tells of each in it; returns what the way back needs. Each
-// grid goes when its channels are there: what it took is at hand for the next ones.
-Ostil::Array<VdbGridRecord> addChannels(Group& group, VLN::Object& object, Container const& container,
-                                        Topology const& topology, VdbVolume& volume,
-                                        VLN::FunctionRef<void(double share)> filledShare) {
-  // Components and plain properties share one set of names.
+// Tells of each grid in the volume.
+// @return What the way back needs.
+Ostil::Array<VdbGridRecord> tellOfGrids(Group const& group, VdbVolume& volume) {
+  // Components and plain properties share one set of names. Grids come first to their names, channels of
+  // states after them.
   std::set<std::string> taken{kVdbContainerName, kVdbTopologyName, kVdbGridsProperty, kVdbTransformProperty,
                               kVdbMetadataProperty};
-  double const tilesToFill = double(container.tileCount(-1)) * double(group.grids.size());
-  double filled = 0;
-  // Grids come first to their names, channels of states after them.
   std::vector<std::string> names;
   for (auto const& source : group.grids) names.push_back(freeName(source->grid().getName(), taken));
-  TreeToFill const tree{container, topology, tilesFollowLeaves(container)};
   Ostil::Array<VdbGridRecord> records;
   for (std::size_t n = 0; n < group.grids.size(); ++n) {
     GridSource const& source = *group.grids[n];
-    openvdb::GridBase const& grid = source.grid();
     GridSummary const& summary = group.summaries[n];
-    std::string const& name = names[n];
-    object.addComponent(source.makeChannel(name, tree, [&](std::int64_t tiles) {
-      filled += double(tiles);
-      filledShare(filled / tilesToFill);
-    }));
-    VdbGridRecord record{name, group.types[n], source.activeRule(), "", metadataBytes(grid)};
-    if (record.rule == VdbActiveRule::kChannel) {
-      record.stateChannel = freeName(name + "_active", taken);
-      object.addComponent(source.makeStateChannel(record.stateChannel, tree));
-    }
+    VdbGridRecord record{names[n], group.types[n], source.activeRule(), "", metadataBytes(source.grid())};
+    if (record.rule == VdbActiveRule::kChannel) record.stateChannel = freeName(names[n] + "_active", taken);
     records.append(record);
-    volume.channels.push_back({name, grid.getName(), group.types[n], 4, 0, summary.activeVoxels,
+    volume.channels.push_back({names[n], source.grid().getName(), group.types[n], 4, 0, summary.activeVoxels,
                                summary.minimum, summary.maximum, summary.hasRange, summary.active});
     if (!summary.active.empty())
       volume.activeBox.grow(summary.active.min), volume.activeBox.grow(summary.active.max);
-    group.grids[n].reset();
   }
   return records;
+}
+
+struct GridChannels {
+  Ostil::Ptr<TileTree3D::ChannelBase> values;
+  Ostil::Ptr<StateChannel> states; ///< null unless the rule is kChannel
+};
+
+// Makes and fills the channels of a volume. Each grid goes when its channels are there: what it took is at
+// hand for the next ones.
+void addChannels(Group& group, Ostil::Array<VdbGridRecord> const& records, VLN::Object& object,
+                 TreeToFill const& tree, VLN::FunctionRef<void(double share)> filledShare) {
+  auto const count = std::int64_t(group.grids.size()), tiles = tree.container.tileCount(-1);
+  auto const make = [&](std::int64_t n, FilledTiles filled) {
+    auto& source = group.grids[static_cast<std::size_t>(n)];
+    VdbGridRecord const& record = records[n];
+    GridChannels made{source->makeChannel(record.channel, tree, filled), nullptr};
+    if (record.rule == VdbActiveRule::kChannel)
+      made.states = source->makeStateChannel(record.stateChannel, tree);
+    source.reset();
+    return made;
+  };
+  double filled = 0;
+  auto const tell = [&](std::int64_t more) {
+    filled += double(more);
+    filledShare(filled / (double(tiles) * double(count)));
+  };
+  // Of a small tree several at once, so that no core waits for others at the end of each depth. Of a large
+  // one there is something to tell before a grid ends.
+  constexpr std::int64_t kSmall = 1 << 16, kAtOnce = 8;
+  std::int64_t const atOnce = tiles < kSmall ? kAtOnce : 1;
+  for (std::int64_t first = 0; first < count; first += atOnce) {
+    std::int64_t const last = std::min(first + atOnce, count);
+    std::vector<GridChannels> made(static_cast<std::size_t>(last - first));
+    if (made.size() == 1) {
+      made[0] = make(first, tell);
+    } else {
+      parallelFor(first, last, [&](std::int64_t begin, std::int64_t end) {
+        for (std::int64_t n = begin; n < end; ++n)
+          made[static_cast<std::size_t>(n - first)] = make(n, [](std::int64_t) {});
+      });
+      tell(tiles * (last - first));
+    }
+    for (GridChannels& channels : made) {
+      object.addComponent(std::move(channels.values));
+      if (channels.states) object.addComponent(std::move(channels.states));
+    }
+  }
 }
 
 // `memoryLeft` falls by what the volume takes.
@@ -177,10 +270,9 @@ VdbVolume buildVolume(VdbFile const& file, Group& group, std::uint64_t& memoryLe
   std::vector<int3> leaves, wideTiles;
   for (auto const& grid : group.grids) grid->collectStored(leaves, wideTiles);
   int const root = cheapestRootDepth(std::move(leaves), std::move(wideTiles), rootDepth(group.summaries));
-  TileCorners corners;
   // A half for the shells of wide tiles: ancestors take an eighth or more, and lists of corners their part.
   std::uint64_t const mostTiles = memoryLeft / 2 / bytesFor(1, group);
-  for (auto const& grid : group.grids) grid->collectTiles(root, mostTiles, corners);
+  TileCorners corners = collectTiles(group, root, mostTiles);
   completeCorners(corners, root);
   addRootsBeyond(corners[root], group, root);
   std::uint64_t const bytes = bytesFor(countOf(corners), group);
@@ -201,11 +293,10 @@ VdbVolume buildVolume(VdbFile const& file, Group& group, std::uint64_t& memoryLe
   auto topology = object->extractComponent<Topology>(kVdbTopologyName);
   topology->update(*container);
 
-  object->setProperty(
-      kVdbGridsProperty,
-      Ostil::Any(addChannels(group, *object, *container, *topology, volume, [&](double share) {
-        report(progress, "filling the channels", from + (to - from) * share);
-      })));
+  Ostil::Array<VdbGridRecord> const records = tellOfGrids(group, volume);
+  addChannels(group, records, *object, {*container, *topology, tilesFollowLeaves(*container)},
+              [&](double share) { report(progress, "filling the channels", from + (to - from) * share); });
+  object->setProperty(kVdbGridsProperty, Ostil::Any(records));
   object->setProperty(kVdbTransformProperty, Ostil::Any(Ostil::String(volume.indexToWorld.bytes())));
   if (file.metadata)
     object->setProperty(kVdbMetadataProperty, Ostil::Any(Ostil::String(metadataBytes(*file.metadata))));

@@ -17,14 +17,14 @@ public:
       , m_channel(channel)
       , m_zeros(zeros) {}
 
-  TileVector<unsigned char> operator()(int3 const& corner, int depth) {
+  /// @param made Empty.
+  void operator()(int3 const& corner, int depth, TileVector<unsigned char>& made) {
     Coord const origin = toCoord(corner);
     if (depth == VdbTraits::kMaxDepth) {
       auto const* const leaf = leafAt(toCoord(leafPlaceOf(corner)));
-      if (!leaf) return m_zeros.take(m_run);
-      auto tile = m_channel.newTile();
-      writeBlockStates(*leaf, static_cast<int>(Leaf::coordToOffset(origin)), tile.data());
-      return tile;
+      if (!leaf) return m_zeros.make(m_run, made);
+      made = m_channel.unwrittenTile();
+      return writeBlockStates(*leaf, static_cast<int>(Leaf::coordToOffset(origin)), made.data());
     }
     // Depth of the file's tree whose tiles are as wide as a sample: 2, 1 or 0 for 8, 128 or 4096 voxels.
     int const step = VdbTraits::width(depth) / VdbTraits::kTDW;
@@ -32,16 +32,15 @@ public:
                       : step == kNodeWidths[1] ? 1
                       : step == kNodeWidths[2] ? 0
                                                : -2;
-    if (level == -2) return m_zeros.take(m_run);
-    auto tile = m_channel.newTile();
-    unsigned char* states = tile.data();
+    if (level == -2) return m_zeros.make(m_run, made);
+    made = m_channel.newTile();
+    unsigned char* states = made.data();
     for (int k = 0; k < 4; ++k)
       for (int j = 0; j < 4; ++j)
         for (int i = 0; i < 4; ++i, ++states) {
           auto const place = m_search.at(origin.offsetBy(i * step, j * step, k * step));
           if (place.level == level && place.active) *states = kVdbStateActive;
         }
-    return tile;
   }
 
 private:

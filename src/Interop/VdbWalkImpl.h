@@ -136,15 +136,19 @@ template <class Value> bool hasNegative(Value const& background) {
     return true;
 }
 
+struct WalkedTree {
+  std::uint64_t memory = 0; ///< bytes that the tree takes with the buffers of its leaves
+  std::uint64_t leaves = 0;
+};
+
 /// Takes the tree without the buffers of its leaves.
-/// @return Bytes of memory that the tree takes with them.
-template <class TreeT> std::uint64_t walkTopology(WalkedBytes& bytes, ValueCoding const& coding) {
+template <class TreeT> WalkedTree walkTopology(WalkedBytes& bytes, ValueCoding const& coding) {
   using Value = typename TreeT::ValueType;
   using Leaf = typename TreeT::LeafNodeType;
   using Upper = typename TreeT::RootNodeType::ChildNodeType;
   using Lower = typename Upper::ChildNodeType;
   constexpr std::uint64_t kEntry = 128; // of the root's map
-  std::uint64_t memory = 0;
+  WalkedTree tree;
   walkOnlyIf(bytes.number<std::int32_t>() == 1 && hasNegative(bytes.number<Value>()));
   auto const tiles = bytes.number<std::uint32_t>(), nodes = bytes.number<std::uint32_t>();
   auto const corner = [&] {
@@ -152,7 +156,7 @@ template <class TreeT> std::uint64_t walkTopology(WalkedBytes& bytes, ValueCodin
   };
   // @return The number of nodes below.
   auto const node = [&]<class Node>(Node const*) {
-    memory += sizeof(Node);
+    tree.memory += sizeof(Node);
     constexpr std::uint32_t kSlots = Node::NUM_VALUES;
     char const* const below = bytes.take(kSlots / 8);
     char const* const active = bytes.take(kSlots / 8);
@@ -163,18 +167,19 @@ template <class TreeT> std::uint64_t walkTopology(WalkedBytes& bytes, ValueCodin
     corner();
     bytes.take(sizeof(Value));
     walkOnlyIf(bytes.number<std::uint8_t>() <= 1); // whether it is active
-    memory += kEntry;
+    tree.memory += kEntry;
   }
   for (std::uint32_t n = 0; n < nodes; ++n) {
     corner();
-    memory += kEntry;
+    tree.memory += kEntry;
     for (unsigned lower = node(static_cast<Upper const*>(nullptr)); lower > 0; --lower) {
       unsigned const leaves = node(static_cast<Lower const*>(nullptr));
       bytes.take(std::uint64_t(leaves) * (Leaf::SIZE / 8));
-      memory += std::uint64_t(leaves) * (sizeof(Leaf) + Leaf::SIZE * sizeof(Value));
+      tree.leaves += leaves;
+      tree.memory += std::uint64_t(leaves) * (sizeof(Leaf) + Leaf::SIZE * sizeof(Value));
     }
   }
-  return memory;
+  return tree;
 }
 
 /// Takes the buffers of one leaf.

@@ -6,22 +6,84 @@
 #include <openvdb/io/GridDescriptor.h>
 #include <openvdb/io/io.h>
 
+#include <algorithm>
 #include <cstdio>
+#include <cstring>
 #include <map>
+#include <memory>
+#include <ostream>
 #include <set>
-#include <sstream>
+#include <streambuf>
 
 namespace VLN::Interop {
 
 namespace {
 
+// Bytes of a file in pieces: one that grows as a whole would be copied, and be there twice meanwhile.
+class FileBytes : public std::streambuf {
+public:
+  std::size_t size() const { return m_size; }
+  /// Calls `f(bytes, count)` for each piece from a place on.
+  template <class F> void forEachPiece(std::size_t from, F const& f) const {
+    for (std::size_t at = from; at < m_size;) {
+      std::size_t const count = std::min(kPiece - at % kPiece, m_size - at);
+      f(m_pieces[at / kPiece].get() + at % kPiece, count);
+      at += count;
+    }
+  }
+  void replace(std::size_t place, char const* bytes, std::size_t count) {
+    m_at = place;
+    append(bytes, count);
+  }
+
+protected:
+  std::streamsize xsputn(char const* bytes, std::streamsize count) override {
+    append(bytes, static_cast<std::size_t>(count));
+    return count;
+  }
+  int_type overflow(int_type c) override {
+    if (traits_type::eq_int_type(c, traits_type::eof())) return traits_type::not_eof(c);
+    char const byte = traits_type::to_char_type(c);
+    append(&byte, 1);
+    return c;
+  }
+  pos_type seekoff(off_type by, std::ios_base::seekdir from, std::ios_base::openmode) override {
+    off_type const base = from == std::ios_base::beg   ? 0
+                          : from == std::ios_base::cur ? static_cast<off_type>(m_at)
+                                                       : static_cast<off_type>(m_size);
+    return seekpos(base + by, std::ios_base::out);
+  }
+  pos_type seekpos(pos_type to, std::ios_base::openmode) override {
+    auto const place = static_cast<off_type>(to);
+    if (place < 0 || place > static_cast<off_type>(m_size)) return pos_type(off_type(-1));
+    m_at = static_cast<std::size_t>(place);
+    return to;
+  }
+
+private:
+  void append(char const* bytes, std::size_t count) {
+    while (count > 0) {
+      if (m_at / kPiece == m_pieces.size()) m_pieces.emplace_back(new char[kPiece]);
+      std::size_t const part = std::min(kPiece - m_at % kPiece, count);
+      std::memcpy(m_pieces[m_at / kPiece].get() + m_at % kPiece, bytes, part);
+      m_at += part, bytes += part, count -= part;
+      m_size = std::max(m_size, m_at);
+    }
+  }
+
+  static constexpr std::size_t kPiece = std::size_t(1) << 20;
+  std::vector<std::unique_ptr<char[]>> m_pieces;
+  std::size_t m_at = 0, m_size = 0;
+};
+
 // OpenVDB's own writer of files does not ask whether its writes succeed. So the bytes are made in memory, and
 // written with every step checked. It also wants all grids at once; here each is there for its turn alone.
 class MemoryArchive : public openvdb::io::Archive {
 public:
-  std::string write(std::string const& path, std::vector<GridInTurn> const& grids,
-                    openvdb::MetaMap const& metadata) const {
-    std::ostringstream out(std::ios::binary);
+  void write(std::string const& path, std::vector<GridInTurn> const& grids, openvdb::MetaMap const& metadata,
+             FileBytes& bytes) const {
+    std::ostream out(&bytes);
+    out.exceptions(std::ios::badbit); // there was no memory
     auto const toldAs = [&](auto const& step) {
       try {
         step();
@@ -49,7 +111,6 @@ public:
         writeGrid(descriptor, grid, out, /*seekable=*/true);
       });
     }
-    return std::move(out).str();
   }
 
 private:
@@ -64,27 +125,35 @@ private:
 
 // The library gives each file an arbitrary identity; one computed from the content makes equal volumes
 // equal files. It stands behind the magic number, the versions and a flag.
-void setIdentity(std::string& bytes) {
+void setIdentity(FileBytes& bytes) {
   constexpr std::size_t kBegin = 8 + 4 + 4 + 4 + 1, kLength = 36;
   if (bytes.size() < kBegin + kLength) return;
   std::uint64_t hash[2] = {0xcbf29ce484222325u, 0x84222325cbf29ce4u};
-  for (std::size_t n = kBegin + kLength; n < bytes.size(); ++n)
-    for (auto& h : hash) h = (h ^ static_cast<unsigned char>(bytes[n])) * 0x100000001b3u;
+  bytes.forEachPiece(kBegin + kLength, [&](char const* piece, std::size_t count) {
+    std::uint64_t first = hash[0], second = hash[1];
+    for (std::size_t n = 0; n < count; ++n) {
+      auto const byte = static_cast<unsigned char>(piece[n]);
+      first = (first ^ byte) * 0x100000001b3u;
+      second = (second ^ byte) * 0x100000001b3u;
+    }
+    hash[0] = first, hash[1] = second;
+  });
   char text[kLength + 1];
   std::snprintf(text, sizeof text, "%08x-%04x-5%03x-8%03x-%012llx", unsigned(hash[0] >> 32),
                 unsigned(hash[0] >> 16 & 0xffff), unsigned(hash[0] & 0xfff), unsigned(hash[1] >> 48 & 0xfff),
                 static_cast<unsigned long long>(hash[1] & 0xffffffffffffu));
-  bytes.replace(kBegin, kLength, text, kLength);
+  bytes.replace(kBegin, text, kLength);
 }
 
 } // namespace
 
 void writeVdbFile(OutputFile& file, std::vector<GridInTurn> const& grids, openvdb::MetaMap const& metadata,
                   std::function<void()> const& onWriting) {
-  std::string bytes = MemoryArchive().write(file.path(), grids, metadata);
+  FileBytes bytes;
+  MemoryArchive().write(file.path(), grids, metadata, bytes);
   if (onWriting) onWriting();
   setIdentity(bytes);
-  file.write(bytes.data(), bytes.size());
+  bytes.forEachPiece(0, [&](char const* piece, std::size_t count) { file.write(piece, count); });
   file.commit();
 }
 

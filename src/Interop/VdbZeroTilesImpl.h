@@ -11,6 +11,7 @@
 #include <algorithm>
 #include <cstdint>
 #include <cstring>
+#include <memory>
 #include <mutex>
 #include <new>
 
@@ -45,14 +46,18 @@ public:
       : m_elements(elements)
       , m_stride(TileTree3D::Internal::tileSlotStride(elements, sizeof(T))) {}
 
-  /// @error std::bad_alloc.
+  /// Makes a tile in place of an empty one.
+  /// @error std::bad_alloc; the tile stays empty.
   /// @threads Each with a run of its own.
-  TileVector<T> take(Run& run) {
+  void make(Run& run, TileVector<T>& tile) {
     if (run.m_left == 0) refill(run);
     T* const slot = run.m_next;
     run.m_next += m_stride;
     --run.m_left;
-    return TileTree3D::Internal::unwrittenVector(m_elements, TileDataAllocator<T>(slot, m_elements, true));
+    // Nothing is thrown from here on. To move a vector costs more than to make it.
+    std::destroy_at(&tile);
+    ::new (static_cast<void*>(&tile)) TileVector<T>(
+        TileTree3D::Internal::unwrittenVector(m_elements, TileDataAllocator<T>(slot, m_elements, true)));
   }
   /// Leaves the blocks to the storage that the tiles are in.
   void leaveTo(TileTree3D::TileStorage<T>& storage) { storage.adopt(m_blocks); }

@@ -49,7 +49,7 @@ TEST(ZeroTiles, AreApartAlignedAndZero) {
     parallelFor(0, kCount,
                 [&](std::int64_t begin, std::int64_t end) {
                   ZeroTiles<float>::Run run;
-                  for (auto n = begin; n < end; ++n) tiles[std::size_t(n)] = zeros.take(run);
+                  for (auto n = begin; n < end; ++n) zeros.make(run, tiles[std::size_t(n)]);
                 },
                 {.grain = 37});
   });
@@ -215,39 +215,6 @@ TEST(VdbLeaves, RangeOfFullLeavesIsThatOfTheirVoxels) {
       EXPECT_EQ(std::signbit(range.minimum), std::signbit(low));
       EXPECT_EQ(std::signbit(range.maximum), std::signbit(high));
     }
-}
-
-// requirement
-TEST(VdbCorners, JoinWithoutTheOnesThatWereKnown) {
-  using Velorn::Math::int3;
-  std::mt19937 random(8);
-  auto const some = [&](std::size_t count) {
-    std::vector<int3> list;
-    for (std::size_t n = 0; n < count; ++n) list.push_back({int(random() % 5), int(random() % 5) - 2, 0});
-    return list;
-  };
-  auto const inOrder = [](std::vector<int3> list) {
-    std::sort(list.begin(), list.end(), TileTree3D::MortonOrder());
-    return list;
-  };
-  auto const distinct = [&](std::vector<int3> list) {
-    list = inOrder(std::move(list));
-    list.erase(std::unique(list.begin(), list.end()), list.end());
-    return list;
-  };
-  for (int round = 0; round < 50; ++round) {
-    auto const known = distinct(some(random() % 9)), more = distinct(some(random() % 9)),
-               others = some(random() % 9);
-    auto corners = known;
-    corners.insert(corners.end(), more.begin(), more.end());
-    auto all = corners;
-    all.insert(all.end(), others.begin(), others.end());
-    joinSorted(corners, known.size(), others);
-    EXPECT_TRUE(corners == inOrder(corners));
-    EXPECT_TRUE(distinct(corners) == distinct(all));
-    // Others may name one twice; what was known is there once.
-    EXPECT_TRUE(!others.empty() || known.empty() || corners == distinct(all));
-  }
 }
 
 // requirement: who hands a file over gets it back without the grids, and who shows it keeps them
