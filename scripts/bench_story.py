@@ -47,6 +47,8 @@ ROWS = [
               "topology/ordered/OpenVDB touchLeaf/real_time"),
     *of_grids("tiles in bulk with values, 1 thread", "topology/ordered/bulk with values/threads:1/real_time",
               "topology/ordered/OpenVDB touchLeaf/real_time"),
+    *of_grids("tiles in bulk with zeros, 1 thread", "topology/ordered/bulk with zeros/threads:1/real_time",
+              "topology/ordered/OpenVDB touchLeaf/real_time"),
     *of_positions("trilinear, wide channel", "wide channel", "OpenVDB BoxSampler", "NanoVDB trilinear"),
     *of_positions("trilinear, wide channel, many at once", "wide channel, many at once",
                   "OpenVDB BoxSampler", "NanoVDB trilinear"),
