@@ -15,6 +15,7 @@ import statistics
 import sys
 
 from bench_table import TO_NS
+from bench_table import date_and_commit
 from bench_table import time as shown
 
 GRIDS = ["bunny_ls_512_half", "smoke", "sphere_200"]
@@ -151,7 +152,7 @@ def table(arguments):
                 cells.insert(2, f"{before:.2f}, now x {ratio / before:.2f}" if before else "")
             print("| " + " | ".join(cells) + " |")
     print("Time of the best peer by ours, both in this run: above 1 we are ahead. Medians of interleaved "
-          "repetitions; the spread is the largest distance from the median.\n")
+          f"repetitions; the spread is the largest distance from the median. {date_and_commit()}.\n")
     print("The worst rows:\n")
     show(rows[:8])
     print("\nThe best rows:\n")

@@ -41,6 +41,13 @@ def first_match(path, pattern):
     return "unknown"
 
 
+def date_and_commit():
+    stamp = os.environ.get("SOURCE_DATE_EPOCH")
+    now = datetime.datetime.fromtimestamp(
+        int(stamp), datetime.timezone.utc) if stamp else datetime.datetime.now(datetime.timezone.utc)
+    return f"{now:%Y-%m-%d}, commit {output('git', 'rev-parse', '--short=12', 'HEAD') or 'unknown'}"
+
+
 def cache(build, name):
     return first_match(os.path.join(build, "CMakeCache.txt"), re.escape(name) + r":[^=]*=(.*)")
 
@@ -104,13 +111,10 @@ def main():
     compiler = output(cache(build, "CMAKE_CXX_COMPILER"), "--version").split("\n")[0]
     versions = ", ".join(
         f"{p} {output('dpkg-query', '-W', '-f=${Version}', p) or 'unknown'}" for p in PACKAGES)
-    stamp = os.environ.get("SOURCE_DATE_EPOCH")
-    now = datetime.datetime.fromtimestamp(
-        int(stamp), datetime.timezone.utc) if stamp else datetime.datetime.now(datetime.timezone.utc)
     memory = int(first_match("/proc/meminfo", r"MemTotal:\s*(\d+)").replace("unknown", "0")) / 2**20
 
     print("# Benchmarks\n\nWritten by `scripts/bench.sh`; do not edit.\n")
-    print(f"- date: {now:%Y-%m-%d}, commit {output('git', 'rev-parse', '--short=12', 'HEAD') or 'unknown'}")
+    print(f"- date: {date_and_commit()}")
     processor = first_match("/proc/cpuinfo", r"model name\s*:\s*(.*)")
     print(f"- machine: {processor}, "
           f"{context.get('num_cpus', '?')} cores, {memory:.0f} GiB, {platform.system()} {platform.release()}")
