@@ -118,7 +118,7 @@ private:
       std::size_t const begin = m_out.begins[c];
       auto const positions = m_positions.subspan(begin, m_out.begins[c + 1] - begin);
       // The thread's own until they are full: lists of neighbours share lines of the cache.
-      std::vector<std::vector<BulkRun>> lists(m_out.shares + 1);
+      std::vector<BulkRunList> lists(m_out.shares + 1);
       // Enough for short rows.
       for (auto& list : lists) list.reserve(positions.size() / (2 * m_out.shares));
       auto& tiles = m_tiles[c - m_first] = chunkTiles(begin);
@@ -219,7 +219,7 @@ BulkRuns planBulk(VolumeData& volume, FieldSlot& slot, std::span<int3 const> pos
       chunkBegins(positions, std::clamp(positions.size() / (kChunks * out.shares), kLeastGrain, kMostGrain));
   out.lists.resize(out.chunks() * out.shares);
   out.made.resize(out.chunks());
-  out.places.reset(new BulkPlace[positions.size()]);
+  out.places.resize(positions.size());
   VLN::Internal::Rollback made([&, groups = slot.pendingGroups()] { slot.dropGroups(groups); });
   Planner(volume, slot, positions, out).plan(chunkTiles);
   made.dismiss();

@@ -2,6 +2,7 @@
 #pragma once
 
 #include "GeometryVolume/core/FunctionRef.h"
+#include "GeometryVolume/pools/Jemalloc.h"
 #include "GeometryVolume/volume/PartPlacesImpl.h"
 #include "GeometryVolume/volume/detail/VolumeData.h"
 
@@ -9,6 +10,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <memory>
+#include <new>
 #include <span>
 #include <vector>
 
@@ -27,6 +29,36 @@ struct BulkRun {
   std::uint8_t count, axis;
   std::uint8_t slot, element; ///< of a row's first position
 };
+
+/// Of lists as long as the positions. What is long comes from the bulk allocator, which keeps its pages from
+/// call to call: the heap gives them back to the system, which has to clear them anew each time.
+template <class T> struct BulkListAllocator {
+  using value_type = T;
+
+  BulkListAllocator() = default;
+  template <class U> explicit BulkListAllocator(BulkListAllocator<U> const&) {}
+  /// @error std::bad_alloc.
+  T* allocate(std::size_t n) {
+    if (!isLong(n)) return std::allocator<T>().allocate(n);
+    void* const block = allocate_jemalloc(n, sizeof(T));
+    if (!block) throw std::bad_alloc();
+    return static_cast<T*>(block);
+  }
+  void deallocate(T* block, std::size_t n) noexcept {
+    if (isLong(n))
+      deallocate_jemalloc(block);
+    else
+      std::allocator<T>().deallocate(block, n);
+  }
+  /// Elements without a value stay unwritten.
+  void construct(T*) const {}
+  bool operator==(BulkListAllocator const&) const { return true; }
+
+private:
+  static constexpr bool isLong(std::size_t n) { return n * sizeof(T) >= 128 << 10; }
+};
+template <class T> using BulkList = std::vector<T, BulkListAllocator<T>>;
+using BulkRunList = BulkList<BulkRun>;
 
 /// Tiles that a chunk of positions makes for itself and writes at once, where the field has no tiles near.
 /// @threads One at a time.
@@ -55,8 +87,8 @@ struct ChunkBlocks {
 struct BulkRuns {
   std::vector<std::size_t> begins; ///< of the chunks, and the end
   std::size_t shares = 1;
-  std::unique_ptr<BulkPlace[]> places; ///< of loose positions
-  std::vector<std::vector<BulkRun>> lists;
+  BulkList<BulkPlace> places; ///< of loose positions
+  std::vector<BulkRunList> lists;
   std::vector<ChunkBlocks> made; ///< for each chunk
 
   std::size_t chunks() const { return begins.size() - 1; }
@@ -67,8 +99,8 @@ struct BulkRuns {
                z = static_cast<std::uint32_t>(at.z) >> 5;
     return (x + 3 * y + 5 * z) % static_cast<std::uint32_t>(shares);
   }
-  std::vector<BulkRun>& list(std::size_t chunk, std::size_t share) { return lists[chunk * shares + share]; }
-  std::vector<BulkRun> const& list(std::size_t chunk, std::size_t share) const {
+  BulkRunList& list(std::size_t chunk, std::size_t share) { return lists[chunk * shares + share]; }
+  BulkRunList const& list(std::size_t chunk, std::size_t share) const {
     return lists[chunk * shares + share];
   }
 };

@@ -126,7 +126,7 @@ struct SeenBlock {
 /// What a chunk of positions was found to be.
 struct Chunk {
   std::vector<BlockTiles> own;     ///< blocks that it made and wrote, because the field has none there
-  std::vector<BulkRun> ownRuns;    ///< what was written there
+  BulkRunList ownRuns;             ///< what was written there
   std::vector<BlockTiles> missing; ///< tiles that are listed, each once, with blocks of the chunk's
   int3 const* outside = nullptr;
   bool isScattered = false; ///< whether few positions came to each new tile
@@ -138,7 +138,7 @@ public:
   /// @param made Gets the chunk's blocks.
   /// @param lists One for each share, and one for what is written at once.
   RunFinder(FieldBlocks const& blocks, ChunkBlocks& made, BulkRuns const& plan, ChunkTiles& tiles,
-            std::vector<BulkRun>* lists)
+            BulkRunList* lists)
       : m_blocks(blocks)
       , m_made(made)
       , m_plan(plan)
@@ -319,7 +319,7 @@ private:
   ChunkBlocks& m_made;
   BulkRuns const& m_plan;
   ChunkTiles& m_tiles;
-  std::vector<BulkRun>* m_lists;
+  BulkRunList* m_lists;
   std::size_t m_count = 0; ///< of positions
   std::uint64_t m_ownTiles = 0;
   std::uint32_t m_lookUps = 0;  ///< of whole blocks of the field, in the part
