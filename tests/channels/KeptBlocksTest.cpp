@@ -91,4 +91,14 @@ TEST_F(KeptBlocks, BoundaryLittleWaitsAndNothingAfterAFlush) {
   EXPECT_LT(residentBytes(), before + 8 * kMegabyte);
 }
 
+// A large block of zeros is fresh; it does not stand beside one that waits.
+TEST_F(KeptBlocks, BoundaryWhatFitsDoesNotLieIdleBesideZeros) {
+  std::int64_t const before = residentBytes();
+  channelOf(40 * kMegabyte, 1.0f);
+  EXPECT_GT(residentBytes(), before + 30 * kMegabyte);
+  auto const zeros = channelOf(40 * kMegabyte, 0.0f);
+  EXPECT_LT(residentBytes(), before + 30 * kMegabyte);
+  EXPECT_TRUE(holdsOnly(*zeros, 0.0f));
+}
+
 } // namespace

@@ -39,7 +39,9 @@ void* BlockList::allocate(std::int64_t elements, std::size_t elementSize) {
 }
 
 void* BlockList::allocateZeros(std::int64_t elements, std::size_t elementSize) {
-  return add(elements, elementSize, &allocateZeros_jemalloc);
+  return add(elements, elementSize, [](std::uint64_t count, std::uint64_t size) {
+    return VLN::Internal::allocateZerosKept(count * size);
+  });
 }
 
 void* BlockList::allocate(std::int64_t elements, std::size_t elementSize, bool& zeros) {

@@ -68,6 +68,11 @@ private:
 
 constinit KeptBlocks g_kept;
 
+void* takeKept(std::uint64_t bytes) {
+  // None of those that wait fits a smaller request.
+  return bytes >= kSmallestKept - kSmallestKept / 4 ? g_kept.take(bytes) : nullptr;
+}
+
 /// Whether jemalloc lies behind the bulk allocator.
 bool hasJemalloc() {
   static bool const found = [] {
@@ -84,9 +89,13 @@ std::uint64_t sizeOf(void* block) { return vlje_xallocx(block, SIZE_MAX, 0, VLJE
 } // namespace
 
 void* allocateKept(std::uint64_t bytes) noexcept {
-  if (bytes >= kSmallestKept - kSmallestKept / 4)
-    if (void* const block = g_kept.take(bytes)) return block;
-  return allocate_jemalloc(bytes, 1);
+  void* const kept = takeKept(bytes);
+  return kept ? kept : allocate_jemalloc(bytes, 1);
+}
+
+void* allocateZerosKept(std::uint64_t bytes) noexcept {
+  vlje_free(takeKept(bytes));
+  return allocateZeros_jemalloc(bytes, 1);
 }
 
 void deallocateKept(void* block) noexcept {

@@ -14,6 +14,9 @@ inline constexpr std::uint64_t kMostKept = std::uint64_t(64) << 20;
 
 /// As allocate_jemalloc(bytes, 1), from the blocks that wait if one fits without much waste.
 void* allocateKept(std::uint64_t bytes) noexcept;
+/// As allocateZeros_jemalloc(bytes, 1), which takes fresh memory. A block that waits and would fit goes, so
+/// that it does not lie idle beside the new one.
+void* allocateZerosKept(std::uint64_t bytes) noexcept;
 /// Frees a block of the bulk allocator, or lets it wait; then the oldest go to make room for it.
 /// @edges Frees it with the system back end: there the C library decides, or a sanitizer that looks for uses
 /// of what is freed.
