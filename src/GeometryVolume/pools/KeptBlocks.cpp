@@ -6,6 +6,7 @@
 #include <array>
 #include <cstddef>
 #include <mutex>
+#include <type_traits>
 #include <utility>
 
 namespace VLN::Internal {
@@ -67,6 +68,7 @@ private:
 };
 
 constinit KeptBlocks g_kept;
+static_assert(std::is_trivially_destructible_v<KeptBlocks>);
 
 void* takeKept(std::uint64_t bytes) {
   // None of those that wait fits a smaller request.
