@@ -6,7 +6,10 @@
 #include "support/Shapes.h"
 #include "support/TreeModel.h"
 
+#include <algorithm>
+#include <random>
 #include <stdexcept>
+#include <utility>
 
 using namespace Support;
 using namespace VLN;
@@ -122,6 +125,90 @@ TYPED_TEST(Refine, SerialAndParallelSizesGiveTheSameTree) {
       }
     }
   }
+}
+
+/// How the tiles of a source lie, beside their parents.
+enum class Lie { kByParents, kGrown, kSwapped, kShuffled, kWithHoles, kWithRoots };
+
+/// A cluster of some hundred tiles, with what lies between them and a few coarse ones.
+template <class T> Container<T> cluster(std::uint32_t seed, Lie lie) {
+  using Tree = Container<T>;
+  constexpr int kTop = T::kMaxDepth - 5, kDeepest = T::kMaxDepth;
+  std::mt19937 random(seed);
+  auto const place = [&] {
+    auto const along = [&] { return static_cast<int>(random() % 24) * T::width(kDeepest); };
+    return int3{along(), along(), along()};
+  };
+  typename Tree::TileLists lists;
+  for (int n = 0; n < 400; ++n) {
+    int3 const p = place();
+    lists[kDeepest].append(T::align(p, kDeepest));
+    lists[kTop].append(T::align(p, kTop));
+  }
+  Tree tree;
+  tree.tileAccessor().addTiles(lists);
+  auto accessor = tree.tileAccessor();
+  if (lie == Lie::kGrown)
+    for (int n = 0; n < 20; ++n) accessor.addTile(place(), kDeepest);
+  if (lie == Lie::kWithHoles)
+    for (int d : {kDeepest - 1, kDeepest}) accessor.removeTiles({1, tree.tileCount(d) / 2}, d, true);
+  if (lie == Lie::kWithRoots)
+    for (int n = 1; n < 20; ++n) accessor.addTile(int3{0, 0, T::width(kTop) * (n + 40)}, kTop + n % 6);
+  if (lie == Lie::kSwapped || lie == Lie::kShuffled) {
+    std::vector<std::vector<std::int64_t>> orders(T::kDepths);
+    for (int d = 0; d <= kDeepest; ++d) {
+      auto& order = orders[static_cast<std::size_t>(d)];
+      for (std::int64_t n = 0; n < tree.tileCount(d); ++n) order.push_back(n);
+      if (lie == Lie::kShuffled)
+        std::shuffle(order.begin(), order.end(), random);
+      else if (order.size() > 1)
+        std::swap(order.front(), order.back());
+    }
+    tree.permute(orders.data());
+  }
+  return tree;
+}
+
+// A source's tiles are found by parents or by themselves, as they lie.
+TYPED_TEST(Refine, NewTilesLieInTheOrderOfTheSourceHoweverItsTilesLie) {
+  for (Lie const lie :
+       {Lie::kByParents, Lie::kGrown, Lie::kSwapped, Lie::kShuffled, Lie::kWithHoles, Lie::kWithRoots}) {
+    for (std::uint32_t seed = 1; seed < 4; ++seed) {
+      SCOPED_TRACE(std::to_string(static_cast<int>(lie)) + ", " + std::to_string(seed));
+      Container<TypeParam> const source = cluster<TypeParam>(seed, lie);
+      Container<TypeParam> tree = cluster<TypeParam>(seed + 10, Lie::kGrown), before = tree;
+      auto const find = std::as_const(before).tileAccessor();
+      typename Container<TypeParam>::TileLists made;
+      withThreads(static_cast<int>(1 + seed % 2), [&] { tree.refine({&source}, &made, true); });
+      for (int d = 0; d <= TypeParam::kMaxDepth; ++d) {
+        std::vector<int3> missing;
+        for (std::int64_t n = 0; n < source.tileCount(d); ++n) {
+          auto const& t = source.tile(n, d);
+          if (t.valid() && find.treeIndex(t.ti(), t.tj(), t.tk(), d, false).depth != d)
+            missing.push_back(t.tijk());
+        }
+        auto const& list = made[static_cast<std::size_t>(d)];
+        ASSERT_EQ(static_cast<std::size_t>(list.size()), missing.size());
+        ASSERT_TRUE(std::equal(missing.begin(), missing.end(), list.begin()));
+        std::int64_t const first = before.tileCount(d);
+        for (std::size_t n = 0; n < missing.size(); ++n)
+          ASSERT_EQ(tree.tile(first + static_cast<std::int64_t>(n), d).tijk(), missing[n]);
+      }
+      EXPECT_TRUE(tree.checkConsistency(false));
+      EXPECT_TRUE(tree.checkBranchSizes(false));
+    }
+  }
+}
+
+TYPED_TEST(Refine, BranchSizesOfOldTilesAreSetToo) {
+  Container<TypeParam> tree;
+  this->addRow(tree, 20);
+  for (auto t = tree.beginTiles(); t != tree.endTiles(); ++t) t->setBranchSize(-1);
+  Container<TypeParam> source;
+  this->addRow(source, 20, 10);
+  tree.refine({&source}, nullptr, true);
+  EXPECT_TRUE(tree.checkBranchSizes(false));
+  for (auto t = tree.cbeginTiles(); t != tree.cendTiles(); ++t) EXPECT_GT((*t).branchSize(), 0);
 }
 
 TYPED_TEST(Refine, BranchSizesAreSetOnceAtTheEnd) {

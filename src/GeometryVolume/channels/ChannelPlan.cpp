@@ -4,6 +4,7 @@
 #include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/pools/ChannelMemoryPool.h"
 #include "GeometryVolume/pools/Jemalloc.h"
+#include "GeometryVolume/pools/KeptBlocksImpl.h"
 
 #include <algorithm>
 #include <mutex>
@@ -33,12 +34,14 @@ void* BlockList::add(std::int64_t elements, std::size_t elementSize, Source sour
 void* BlockList::allocate(std::int64_t elements, std::size_t elementSize) {
   return add(elements, elementSize, [](std::uint64_t count, std::uint64_t size) {
     return ChannelMemoryPool::enabled() ? ChannelMemoryPool::allocate(count * size)
-                                        : allocate_jemalloc(count, size);
+                                        : VLN::Internal::allocateKept(count * size);
   });
 }
 
 void* BlockList::allocateZeros(std::int64_t elements, std::size_t elementSize) {
-  return add(elements, elementSize, &allocateZeros_jemalloc);
+  return add(elements, elementSize, [](std::uint64_t count, std::uint64_t size) {
+    return VLN::Internal::allocateZerosKept(count * size);
+  });
 }
 
 void* BlockList::allocate(std::int64_t elements, std::size_t elementSize, bool& zeros) {
@@ -58,7 +61,7 @@ void BlockList::clear() {
     if (ChannelMemoryPool::enabled())
       ChannelMemoryPool::deallocate(block);
     else
-      deallocate_jemalloc(block);
+      VLN::Internal::deallocateKept(block);
   }
   m_blocks.clear();
 }

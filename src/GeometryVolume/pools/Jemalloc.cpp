@@ -2,6 +2,7 @@
 
 #include "GeometryVolume/core/HugePagesImpl.h"
 #include "GeometryVolume/core/WorkersImpl.h"
+#include "GeometryVolume/pools/KeptBlocksImpl.h"
 #include "vljemalloc/vljemalloc.h"
 
 #include <atomic>
@@ -27,18 +28,25 @@ void flushWorkers() noexcept {
   } catch (...) {}
 }
 
+/// What `allocate` gives, for which blocks that wait go where there is no other memory.
+template <class Allocate> void* orFromKept(Allocate const& allocate) {
+  void* const block = allocate();
+  return block || !Internal::freeKept() ? block : allocate();
+}
+
 } // namespace
 
 void* allocate_jemalloc(std::uint64_t count, std::uint64_t elementSize) {
   std::uint64_t const bytes = bulkBytes(count, elementSize);
-  void* const block = vlje_aligned_alloc(kBulkAlignment, bytes);
+  void* const block = orFromKept([&] { return vlje_aligned_alloc(kBulkAlignment, bytes); });
   Internal::preferHugePages(block, bytes);
   return block;
 }
 
 void* allocateZeros_jemalloc(std::uint64_t count, std::uint64_t elementSize) {
   static_assert(kBulkAlignment == 1u << 6);
-  return vlje_mallocx(bulkBytes(count, elementSize), VLJE_LG_ALIGN(6) | VLJE_ZERO);
+  std::uint64_t const bytes = bulkBytes(count, elementSize);
+  return orFromKept([&] { return vlje_mallocx(bytes, VLJE_LG_ALIGN(6) | VLJE_ZERO); });
 }
 
 void deallocate_jemalloc(void* block) { vlje_free(block); }
@@ -50,6 +58,7 @@ void jemalloc_flushCache() {
   struct Reset {
     ~Reset() { g_flushing.store(false, std::memory_order_release); }
   } const reset;
+  Internal::freeKept();
   flushOwnCache();
   try {
     std::thread(flushWorkers).join();

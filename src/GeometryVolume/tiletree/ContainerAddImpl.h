@@ -5,6 +5,7 @@
 #include "GeometryVolume/tiletree/ContainerAppendImpl.h"
 
 #include <algorithm>
+#include <cstdint>
 #include <utility>
 #include <vector>
 
@@ -92,6 +93,18 @@ template <class TraitsT> bool ContainerBuilder<TraitsT>::adoptDeeperRoots(int de
   return !adoptions.empty();
 }
 
+namespace Internal {
+
+/// By their signs, without a jump for each slot.
+template <class TileType> std::int64_t countChildren(TileType const& t) {
+  std::int64_t none = 0;
+  for (int slot = 0; slot < TileType::kTileSize; ++slot)
+    none += static_cast<std::int64_t>(static_cast<std::uint64_t>(t.childIndex(slot)) >> 63);
+  return TileType::kTileSize - none;
+}
+
+} // namespace Internal
+
 template <class TraitsT>
 void ContainerBuilder<TraitsT>::setBranchSizes(Cancellation cancellation, std::int64_t deepest) {
   // What a bottom-up traversal would do, as one loop over each array: nothing but sums of children.
@@ -109,14 +122,14 @@ void ContainerBuilder<TraitsT>::setBranchSizes(Cancellation cancellation, std::i
                   for (std::int64_t n = begin; n < end; ++n) {
                     TileType& t = tiles[n];
                     if (!t.valid()) continue;
-                    std::int64_t size = TraitsT::kTileSize;
-                    if (below) {
-                      for (int slot = 0; slot < TraitsT::kTileSize; ++slot) {
+                    std::int64_t size = kTileSize;
+                    if (belowIsDeepest)
+                      size += kTileSize * Internal::countChildren(t);
+                    else if (below)
+                      for (int slot = 0; slot < kTileSize; ++slot) {
                         std::int64_t const child = t.childIndex(slot);
-                        if (child >= 0)
-                          size += belowIsDeepest ? TraitsT::kTileSize : below[child].branchSize();
+                        if (child >= 0) size += below[child].branchSize();
                       }
-                    }
                     if (t.branchSize() != size) t.setBranchSize(size);
                   }
                 },

@@ -3,6 +3,11 @@
 
 #include "GeometryVolume/tiletree/ContainerGrowthImpl.h"
 
+#include <array>
+#include <bit>
+#include <bitset>
+#include <cstddef>
+#include <cstdint>
 #include <vector>
 
 namespace VLN::TileTree3D {
@@ -19,6 +24,40 @@ template <class TileType> int slotOfCorner(TileType const& above, int3 const& p)
   else {
     int3 const at = above.childIJK(p);
     return TileType::slotOf(at.x, at.y, at.z);
+  }
+}
+
+/// From the corner of a tile of depth - 1 to those of its children.
+template <class TraitsT> class ChildCorners {
+public:
+  explicit ChildCorners(int depth) {
+    for (int slot = 0; slot < TraitsT::kTileSize; ++slot) {
+      int3 const at = Tile<TraitsT, TraitsT::kTileSize>::childIJK(slot);
+      auto const w = static_cast<std::uint32_t>(TraitsT::width(depth));
+      auto& offset = m_offsets[static_cast<std::size_t>(slot)];
+      for (int a = 0; a < 3; ++a) offset[static_cast<std::size_t>(a)] = w * static_cast<std::uint32_t>(at[a]);
+    }
+  }
+  int3 operator()(int3 const& above, std::size_t slot) const {
+    auto const& offset = m_offsets[slot];
+    return {sum(above.x, offset[0]), sum(above.y, offset[1]), sum(above.z, offset[2])};
+  }
+
+private:
+  static int sum(int corner, std::uint32_t offset) {
+    return static_cast<int>(static_cast<std::uint32_t>(corner) + offset);
+  }
+  std::array<std::array<std::uint32_t, 3>, static_cast<std::size_t>(TraitsT::kTileSize)> m_offsets;
+};
+
+/// Calls `f(slot)` for each slot of a set, rising.
+template <std::size_t N, class F> void forEachSlot(std::bitset<N> const& slots, F const& f) {
+  if constexpr (N <= 8) {
+    for (auto bits = slots.to_ulong(); bits != 0; bits &= bits - 1)
+      f(static_cast<std::size_t>(std::countr_zero(bits)));
+  } else {
+    for (std::size_t slot = 0; slot < N; ++slot)
+      if (slots[slot]) f(slot);
   }
 }
 
@@ -93,11 +132,32 @@ private:
                     TileLists* newTiles);
   /// Appends the corners of all tiles made since the counts were `before`.
   void listNewTiles(Counts const& before, TileLists* newTiles) const;
-  /// Finds the counterpart of each tile of a source's depth; `above` has those of the depth above.
-  /// @return How many are not there, for each chunk of a refining pass.
+  /// Children of a source's tiles of one depth that are not here, by parent, and how many for each chunk.
+  struct MissingChildren {
+    std::vector<std::bitset<static_cast<std::size_t>(kTileSize)>> slots;
+    std::vector<std::int64_t> counts;
+  };
+  /// Finds the counterparts of a source's tiles of a depth through those of their parents, which `above` has.
+  /// The tiles themselves are not looked at.
+  /// @param here Gets them, if it is not null; roots and dead tiles stay kDeadSource.
+  /// @return Whether there are neither, and the tiles lie in the order of their parents: so they do in trees
+  /// that were made at once, or sorted. If not, `missing` means nothing.
+  bool findChildren(Tree const& source, int depth, std::vector<std::int64_t> const& above,
+                    std::vector<std::int64_t>* here, MissingChildren& missing) const;
+  /// Finds the counterparts of those source tiles that are kDeadSource yet, each by itself.
+  /// @return How many of all tiles are not there, for each chunk of a refining pass.
   std::vector<std::int64_t> findCounterparts(TileArray<TileType> const& wanted, int depth,
                                              std::vector<std::int64_t> const& above,
                                              std::vector<std::int64_t>& here) const;
+  /// Makes and links what findChildren() missed, by parents; those of a chunk from its start on.
+  void makeChildren(Tree const& source, int depth, std::vector<std::int64_t> const& above,
+                    std::vector<std::int64_t>& here, MissingChildren const& missing,
+                    std::vector<std::int64_t> const& starts);
+  /// Makes those of a source's tiles that are not there by themselves, those of a chunk from its start on.
+  /// @param count How many they are. @return Those that have no parent here, by chunk.
+  std::vector<std::vector<DetachedTile>>
+  makeTiles(TileArray<TileType> const& wanted, int depth, std::vector<std::int64_t> const& above,
+            std::vector<std::int64_t>& here, std::vector<std::int64_t> const& starts, std::int64_t count);
   /// Takes the tiles that are there out of groups, and finds the groups' parents; -1 for none.
   /// @return How many tiles are left, for each chunk of groups.
   std::vector<std::int64_t> dropExisting(std::vector<Siblings>& groups, int depth, MadeAbove const& above,

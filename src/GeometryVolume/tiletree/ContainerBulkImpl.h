@@ -9,7 +9,6 @@
 #include "GeometryVolume/tiletree/Morton.h"
 
 #include <algorithm>
-#include <bit>
 #include <bitset>
 #include <new>
 #include <utility>
@@ -29,23 +28,8 @@ template <class TraitsT> struct Siblings {
   int3 parent;
   std::bitset<static_cast<std::size_t>(TraitsT::kTileSize)> slots;
 
-  /// @param depth Of the siblings.
-  int3 corner(std::size_t slot, int depth) const {
-    int3 const at = Tile<TraitsT, TraitsT::kTileSize>::childIJK(static_cast<int>(slot));
-    std::int64_t const w = TraitsT::width(depth);
-    return {static_cast<int>(parent.x + w * at.x), static_cast<int>(parent.y + w * at.y),
-            static_cast<int>(parent.z + w * at.z)};
-  }
   /// Calls `f(slot)` for each slot, rising.
-  template <class F> void forEachSlot(F const& f) const {
-    if constexpr (TraitsT::kTW == 2) {
-      for (auto bits = slots.to_ulong(); bits != 0; bits &= bits - 1)
-        f(static_cast<std::size_t>(std::countr_zero(bits)));
-    } else {
-      for (std::size_t slot = 0; slot < slots.size(); ++slot)
-        if (slots[slot]) f(slot);
-    }
-  }
+  template <class F> void forEachSlot(F const& f) const { Internal::forEachSlot(slots, f); }
   /// How many slots lie before one.
   std::int64_t countBefore(std::size_t slot) const {
     return static_cast<std::int64_t>((slots << (slots.size() - slot)).count());
@@ -304,6 +288,7 @@ std::vector<std::int64_t> ContainerBuilder<TraitsT>::dropExisting(std::vector<Si
   parallelChunks(
       0, count, Internal::kGroupGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
         auto const accessor = m_tree.growthAccessor();
+        Internal::ChildCorners<TraitsT> const corners(depth);
         MadeParents made(above, groups[static_cast<std::size_t>(begin)], depth);
         std::size_t missing = 0;
         for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
@@ -319,7 +304,7 @@ std::vector<std::int64_t> ContainerBuilder<TraitsT>::dropExisting(std::vector<Si
               if (hasParent) {
                 there = !tile(found).isLeaf(static_cast<int>(slot));
               } else {
-                int3 const corner = group.corner(slot, depth);
+                int3 const corner = corners(group.parent, slot);
                 there = accessor.treeIndex(corner.x, corner.y, corner.z, depth, false).depth == depth;
               }
               if (there) group.slots.reset(slot);
@@ -373,9 +358,12 @@ TileIndexLists ContainerBuilder<TraitsT>::makeSiblings(std::vector<Siblings> con
   auto& tiles = data().editTiles(depth);
   auto& above = data().editTiles(depth - 1);
   TileIndexLists roots(starts.size());
+  Internal::ChildCorners<TraitsT> const corners(depth);
   parallelChunks(0, static_cast<std::int64_t>(groups.size()), Internal::kGroupGrain,
                  [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
                    std::int64_t index = starts[static_cast<std::size_t>(chunk)];
+                   TileType* tile = tiles.begin() + index;
+                   int const d = depth;
                    for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
                      Siblings const& group = groups[n];
                      std::int64_t const parent = parents[n];
@@ -383,10 +371,9 @@ TileIndexLists ContainerBuilder<TraitsT>::makeSiblings(std::vector<Siblings> con
                      auto* const children = parent >= 0 ? above[parent].children() : nullptr;
                      firsts[n] = index;
                      group.forEachSlot([&](std::size_t slot) {
-                       int3 const corner = group.corner(slot, depth);
-                       auto* const tile = &tiles[index];
-                       if (depth == kMaxDepth) new (static_cast<void*>(tile)) TileType;
-                       tile->init(parent, corner.x, corner.y, corner.z, depth, index);
+                       int3 const corner = corners(group.parent, slot);
+                       if (d == kMaxDepth) new (static_cast<void*>(tile)) TileType;
+                       tile++->init(parent, corner.x, corner.y, corner.z, d, index);
                        if (children)
                          children[slot] = index;
                        else

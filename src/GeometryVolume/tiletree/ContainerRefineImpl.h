@@ -6,6 +6,8 @@
 #include "Ostil/Job.h"
 #include "Velorn/ExceptionMessage.h"
 
+#include <atomic>
+#include <cstdlib>
 #include <new>
 #include <stdexcept>
 #include <utility>
@@ -31,6 +33,19 @@ inline void refinePass(std::int64_t count,
     std::int64_t const chunk = count >= kParallelTiles ? kRefineGrain : count;
     for (std::int64_t n = 0, c = 0; n < count; n += chunk, ++c) body(c, n, std::min(count, n + chunk));
   }
+}
+
+/// Whether tiles lie near their siblings, by a few pairs of them: then they are best found through their
+/// parents.
+template <class TileType> bool siblingsLieTogether(TileArray<TileType> const& tiles) {
+  constexpr std::int64_t kPairs = 16;
+  if (tiles.size() < kParallelTiles) return tiles.size() > 0;
+  std::int64_t near = 0;
+  for (std::int64_t i = 0; i < kPairs; ++i) {
+    TileType const* const pair = tiles.begin() + tiles.size() / kPairs * i;
+    near += std::abs(pair[1].parentIndex() - pair[0].parentIndex()) <= 1;
+  }
+  return near > kPairs / 2;
 }
 
 /// Throws when the host has cancelled the job. Called between the passes, never while tiles lack their links.
@@ -88,20 +103,74 @@ void ContainerBuilder<TraitsT>::linkDetached(int depth, std::vector<std::vector<
 }
 
 template <class TraitsT>
+bool ContainerBuilder<TraitsT>::findChildren(Tree const& source, int depth,
+                                             std::vector<std::int64_t> const& above,
+                                             std::vector<std::int64_t>* here,
+                                             MissingChildren& missing) const {
+  /// The children of a chunk's parents, where they are neighbours.
+  struct Run {
+    std::int64_t begin = 0, end = 0;
+  };
+  auto const& parents = source.m_data->tiles(depth - 1);
+  std::int64_t const count = parents.size(), wanted = source.m_data->tiles(depth).size();
+  auto const chunks = static_cast<std::size_t>(Internal::refineChunks(count));
+  if (here) here->assign(static_cast<std::size_t>(wanted), kDeadSource);
+  missing.slots.resize(static_cast<std::size_t>(count));
+  missing.counts.assign(chunks, 0);
+  std::vector<Run> runs(chunks);
+  std::atomic<bool> inOrder{true};
+  Internal::refinePass(count, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+    if (!here && !inOrder.load(std::memory_order_relaxed)) return;
+    Run run;
+    bool neighbours = true;
+    std::int64_t notThere = 0;
+    for (std::int64_t n = begin; n < end; ++n) {
+      std::bitset<static_cast<std::size_t>(kTileSize)> slots;
+      if (std::int64_t const* const children = parents[n].children()) {
+        auto const& counterpart = tile({above[static_cast<std::size_t>(n)], depth - 1});
+        for (int slot = 0; slot < kTileSize; ++slot) {
+          std::int64_t const child = children[slot];
+          if (child < 0) continue;
+          if (run.begin == run.end) run = {child, child};
+          neighbours = neighbours && child == run.end++;
+          std::int64_t const found = counterpart.childIndex(slot);
+          if (here) (*here)[static_cast<std::size_t>(child)] = found >= 0 ? found : kNotThere;
+          if (found >= 0) continue;
+          slots[static_cast<std::size_t>(slot)] = true;
+          ++notThere;
+        }
+      }
+      missing.slots[static_cast<std::size_t>(n)] = slots;
+    }
+    if (!neighbours) inOrder.store(false, std::memory_order_relaxed);
+    runs[static_cast<std::size_t>(chunk)] = run;
+    missing.counts[static_cast<std::size_t>(chunk)] = notThere;
+  });
+  if (!inOrder) return false;
+  // From the first tile to the last.
+  std::int64_t next = 0;
+  for (Run const& run : runs) {
+    if (run.begin == run.end) continue;
+    if (run.begin != next) return false;
+    next = run.end;
+  }
+  return next == wanted;
+}
+
+template <class TraitsT>
 std::vector<std::int64_t> ContainerBuilder<TraitsT>::findCounterparts(TileArray<TileType> const& wanted,
                                                                       int depth,
                                                                       std::vector<std::int64_t> const& above,
                                                                       std::vector<std::int64_t>& here) const {
   std::int64_t const count = wanted.size();
-  here.resize(static_cast<std::size_t>(count));
   std::vector<std::int64_t> missing(static_cast<std::size_t>(Internal::refineChunks(count)));
   Internal::refinePass(count, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
     auto const accessor = m_tree.growthAccessor();
     std::int64_t notThere = 0;
     for (std::int64_t n = begin; n < end; ++n) {
+      std::int64_t& found = here[static_cast<std::size_t>(n)];
       TileType const& t = wanted[n];
-      std::int64_t found = kDeadSource;
-      if (t.valid()) {
+      if (found == kDeadSource && t.valid()) {
         if (t.isRoot()) {
           TreeIndex const at = accessor.treeIndex(t.ti(), t.tj(), t.tk(), depth, false);
           if (at.depth == depth) found = at.index;
@@ -109,47 +178,105 @@ std::vector<std::int64_t> ContainerBuilder<TraitsT>::findCounterparts(TileArray<
           TileType const& over = tile({above[static_cast<std::size_t>(t.parentIndex())], depth - 1});
           found = over.childIndex(Internal::slotOfCorner(over, t.tijk()));
         }
-        if (found < 0) found = kNotThere, ++notThere;
+        if (found < 0) found = kNotThere;
       }
-      here[static_cast<std::size_t>(n)] = found;
+      notThere += found == kNotThere;
     }
     missing[static_cast<std::size_t>(chunk)] = notThere;
   });
   return missing;
 }
 
+template <class TraitsT>
+void ContainerBuilder<TraitsT>::makeChildren(Tree const& source, int depth,
+                                             std::vector<std::int64_t> const& above,
+                                             std::vector<std::int64_t>& here, MissingChildren const& missing,
+                                             std::vector<std::int64_t> const& starts) {
+  auto const& parents = source.m_data->tiles(depth - 1);
+  auto& tiles = data().editTiles(depth);
+  auto& tilesAbove = data().editTiles(depth - 1);
+  Internal::ChildCorners<TraitsT> const corners(depth);
+  Internal::refinePass(parents.size(), [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+    std::int64_t index = starts[static_cast<std::size_t>(chunk)];
+    TileType* tile = tiles.begin() + index;
+    int const d = depth;
+    for (std::int64_t n = begin; n < end; ++n) {
+      auto const slots = missing.slots[static_cast<std::size_t>(n)];
+      if (slots.none()) continue;
+      std::int64_t const parent = above[static_cast<std::size_t>(n)];
+      TileType& over = tilesAbove[parent]; // by no other source tile
+      int3 const at = over.tijk();
+      std::int64_t* const children = over.children();
+      Internal::forEachSlot(slots, [&](std::size_t slot) {
+        int3 const corner = corners(at, slot);
+        if (d == kMaxDepth)
+          new (static_cast<void*>(tile)) TileType;
+        else
+          here[static_cast<std::size_t>(parents[n].children()[slot])] = index;
+        tile++->init(parent, corner.x, corner.y, corner.z, d, index);
+        children[slot] = index++;
+      });
+    }
+  });
+}
+
+template <class TraitsT>
+auto ContainerBuilder<TraitsT>::makeTiles(TileArray<TileType> const& wanted, int depth,
+                                          std::vector<std::int64_t> const& above,
+                                          std::vector<std::int64_t>& here,
+                                          std::vector<std::int64_t> const& starts, std::int64_t count)
+    -> std::vector<std::vector<DetachedTile>> {
+  std::vector<std::vector<DetachedTile>> parts(starts.size());
+  auto const make = [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+    auto const accessor = m_tree.growthAccessor();
+    std::int64_t index = starts[static_cast<std::size_t>(chunk)];
+    DetachedTile detached;
+    for (std::int64_t n = begin; n < end; ++n) {
+      if (here[static_cast<std::size_t>(n)] != kNotThere) continue;
+      TileType const& t = wanted[n];
+      std::int64_t const parent = t.isRoot() ? -1 : above[static_cast<std::size_t>(t.parentIndex())];
+      if (!initLinkedTile(index, depth, t.tijk(), parent, accessor, detached))
+        parts[static_cast<std::size_t>(chunk)].push_back(detached);
+      here[static_cast<std::size_t>(n)] = index++;
+    }
+  };
+  Internal::refinePass(wanted.size(), make, count);
+  return parts;
+}
+
 template <class TraitsT> void ContainerBuilder<TraitsT>::refine(Tree const& source, TileLists* newTiles) {
   if (&source == &m_tree) return;
   m_tree.tilesAdded();
-  // For each source tile of the depth above, and of this one, the index of its counterpart here. A tile with
-  // a parent in the source is found through the parent's counterpart, without a search.
+  // For each source tile of the depth above, and of this one, the index of its counterpart here.
   std::vector<std::int64_t> above, here;
+  MissingChildren missing;
   for (int d = 0; d <= kMaxDepth; ++d) {
     auto const& tiles = source.m_data->tiles(d);
-    std::vector<std::int64_t> starts = findCounterparts(tiles, d, above, here);
+    bool const together = d > 0 && Internal::siblingsLieTogether(tiles);
+    // Below the deepest depth nobody asks for counterparts: they are put down only where the order needs
+    // them.
+    bool const byParents =
+        together && findChildren(source, d, above, d < kMaxDepth ? &here : nullptr, missing);
+    if (!together)
+      here.assign(static_cast<std::size_t>(tiles.size()), kDeadSource);
+    else if (!byParents && d == kMaxDepth)
+      findChildren(source, d, above, &here, missing);
+    std::vector<std::int64_t> starts =
+        byParents ? std::move(missing.counts) : findCounterparts(tiles, d, above, here);
     Internal::refineCheckpoint();
     // Chunks are consecutive: new tiles lie in the order of the source.
     std::int64_t next = tileCount(d);
     for (std::int64_t& start : starts) next += std::exchange(start, next);
     if (next > tileCount(d)) {
       Growth growth(data(), newTiles);
-      allocateUninitialised(d, next - tileCount(d));
-      std::vector<std::vector<DetachedTile>> parts(starts.size());
-      auto const make = [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-        auto const accessor = m_tree.growthAccessor();
-        std::int64_t index = starts[static_cast<std::size_t>(chunk)];
-        DetachedTile detached;
-        for (std::int64_t n = begin; n < end; ++n) {
-          if (here[static_cast<std::size_t>(n)] != kNotThere) continue;
-          TileType const& t = tiles[n];
-          std::int64_t const parent = t.isRoot() ? -1 : above[static_cast<std::size_t>(t.parentIndex())];
-          if (!initLinkedTile(index, d, t.tijk(), parent, accessor, detached))
-            parts[static_cast<std::size_t>(chunk)].push_back(detached);
-          here[static_cast<std::size_t>(n)] = index++;
-        }
-      };
-      Internal::refinePass(tiles.size(), make, next - growth.before()[d]);
-      linkDetached(d, parts, growth, newTiles);
+      std::int64_t const count = next - tileCount(d);
+      allocateUninitialised(d, count);
+      std::vector<std::vector<DetachedTile>> detached;
+      if (byParents)
+        makeChildren(source, d, above, here, missing, starts);
+      else
+        detached = makeTiles(tiles, d, above, here, starts, count);
+      linkDetached(d, detached, growth, newTiles);
       growth.keep();
     }
     Internal::refineCheckpoint();
@@ -166,11 +293,13 @@ void Container<TraitsT>::refineInternal(Container const& source, bool last, Tile
 template <class TraitsT>
 void Container<TraitsT>::refine(std::vector<Container const*> const& sources, TileLists* newTiles,
                                 bool setBranchSizesAtEnd) {
+  ContainerBuilder<TraitsT> builder(*this);
+  std::int64_t const deepest = tileCount(kMaxDepth);
   try {
-    for (std::size_t n = 0; n < sources.size(); ++n)
-      refineInternal(*sources[n], setBranchSizesAtEnd && n + 1 == sources.size(), newTiles);
+    for (Container const* const source : sources) refineInternal(*source, false, newTiles);
+    if (setBranchSizesAtEnd && !sources.empty()) builder.setBranchSizes(Cancellation::kPoll, deepest);
   } catch (std::bad_alloc const&) {
-    if (setBranchSizesAtEnd) ContainerBuilder<TraitsT>(*this).setBranchSizes(Cancellation::kSuppress);
+    if (setBranchSizesAtEnd) builder.setBranchSizes(Cancellation::kSuppress);
     throw;
   }
 }
