@@ -1,5 +1,6 @@
 #include "GeometryVolume/channels/ElementReTile.h"
 
+#include "GeometryVolume/channels/ElementScanImpl.h"
 #include "GeometryVolume/channels/UpdateDispatch.h"
 #include "GeometryVolume/core/ElementTypes.h"
 #include "GeometryVolume/core/Numeric.h"
@@ -9,95 +10,16 @@
 #if VLN_HAS_ELEMENT_FLOAT3
 
 #include <algorithm>
-#include <cmath>
-#include <optional>
 #include <tuple>
 
 namespace VLN::TileTree3D {
 
 namespace {
 
-constexpr float kReach = 5.368709e+08f;
-constexpr std::int64_t kTilesOfARange = 50;
-constexpr std::int64_t kDropped = -1, kWaiting = -2;
-
-template <class TraitsT> using PositionsOf = Channel<TraitsT, float3, TraitsT::kTileDataWidth, 0>;
-
-/// What a scan of some tiles found.
-struct Found {
-  std::vector<ElementToFrom> moves;
-  std::vector<std::uint64_t> waiting; // positions in `moves` whose tile does not exist yet
-  std::vector<int3> missing;          // corners of those tiles
-
-  void append(Found const& b) {
-    std::uint64_t const offset = moves.size();
-    moves.insert(moves.end(), b.moves.begin(), b.moves.end());
-    for (std::uint64_t const at : b.waiting) waiting.push_back(offset + at);
-    missing.insert(missing.end(), b.missing.begin(), b.missing.end());
-  }
-};
-
-/// The positions on an axis that stay in a tile.
-struct StayRange {
-  double low, high;
-  bool holds(float q) const { return (double(q) >= low) & (double(q) < high); }
-};
-
-template <class TraitsT>
-void scanTile(Tile<TraitsT, TraitsT::kTileSize> const& tile, PositionsOf<TraitsT> const& positions, float s,
-              ConstTileAccessorOf<TraitsT> const& accessor, Found& found) {
-  auto const data = positions.tileData(tile.treeIndex());
-  float3 const* const points = data.data()->data();
-  int const count = data.size();
-  int const depth = tile.depth();
-
-  // Within the reach, q lies in the tile exactly when floor(q) does.
-  StayRange stay[3];
-  for (int a = 0; a < 3; ++a) {
-    double const low = tile.tijk()[a], high = low + tile.tileVoxelWidth();
-    stay[a] = {std::max(low, double(std::nextafter(-kReach, 0.0f))), std::min(high, double(kReach))};
-  }
-  for (int n = 0; n < count; ++n) {
-    float3 const q{points[n].x * s, points[n].y * s, points[n].z * s};
-    if (stay[0].holds(q.x) & stay[1].holds(q.y) & stay[2].holds(q.z)) continue;
-    std::int64_t to = kDropped;
-    // Written so that what is no number is out of reach.
-    if (std::abs(q.x) < kReach && std::abs(q.y) < kReach && std::abs(q.z) < kReach) {
-      int3 corner;
-      for (int a = 0; a < 3; ++a) corner[a] = TraitsT::align(toIntFloor(q[a]), depth);
-      TreeIndex const there = accessor.treeIndex(corner.x, corner.y, corner.z, depth, true);
-      if (there.valid()) {
-        to = there.index;
-      } else {
-        to = kWaiting;
-        found.waiting.push_back(found.moves.size());
-        if (found.missing.empty() || found.missing.back() != corner) found.missing.push_back(corner);
-      }
-    }
-    found.moves.push_back({to, tile.index(), n, depth});
-  }
-}
-
-template <class TraitsT>
-Found scanDepth(Container<TraitsT> const& tree, PositionsOf<TraitsT> const& positions, int depth) {
-  float const s = 1.0f / tree.voxelSize();
-  std::int64_t const tiles = std::min(tree.tileCount(depth), positions.tileCount(depth));
-  std::vector<Found> parts(static_cast<std::size_t>(chunkCount(0, tiles, kTilesOfARange)));
-  parallelChunks(0, tiles, kTilesOfARange, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-    auto const accessor = tree.tileAccessor();
-    for (std::int64_t n = begin; n < end; ++n) {
-      auto const& tile = tree.tile(n, depth);
-      if (tile.valid()) scanTile(tile, positions, s, accessor, parts[static_cast<std::size_t>(chunk)]);
-    }
-  });
-  // Chunks are consecutive: the moves are sorted by source.
-  Found all;
-  std::size_t count = 0;
-  for (Found const& part : parts) count += part.moves.size();
-  all.moves.reserve(count);
-  for (Found const& part : parts) all.append(part);
-  return all;
-}
+using Internal::Found;
+using Internal::kDropped;
+using Internal::PositionsOf;
+using Internal::scanDepth;
 
 /// Fills the scratch tree with the listed tiles and those between them and its first tile.
 template <class TraitsT>
