@@ -5,11 +5,11 @@
 #include "GeometryVolume/core/ElementTypes.h"
 #include "GeometryVolume/core/Numeric.h"
 #include "GeometryVolume/core/Parallel.h"
-#include "GeometryVolume/tiletree/Visitor.h"
 
 #if VLN_HAS_ELEMENT_FLOAT3
 
 #include <algorithm>
+#include <atomic>
 #include <tuple>
 
 namespace VLN::TileTree3D {
@@ -56,71 +56,40 @@ void settle(Container<TraitsT> const& tree, PositionsOf<TraitsT> const& position
   });
 }
 
-/// Finds the tiles that neither hold points nor have a descendant that does.
-template <class TraitsT> class DetermineActiveTilesVisitor final : public Visitor<Container<TraitsT>> {
-  using Base = Visitor<Container<TraitsT>>;
-
-public:
-  using TileType = typename Container<TraitsT>::TileType;
-  /// For each depth, a byte for each child slot of each tile.
-  using ChildMasks = std::vector<std::vector<std::uint8_t>>;
-
-  DetermineActiveTilesVisitor(PositionsOf<TraitsT> const& positions, ChildMasks& masks)
-      : m_positions(positions)
-      , m_masks(masks)
-      , m_inactive(static_cast<std::size_t>(TraitsT::kDepths)) {
-    this->setBeginTileOverridden(false);
-  }
-  using Base::endTile;
-  void endTile(TileType const& tile) override {
-    bool active =
-        tile.index() < m_positions.tileCount(tile.depth()) && m_positions.elementCount(tile.treeIndex()) > 0;
-    if (!active && !tile.isLeaf()) {
-      // The children have reported: a parent's end comes after theirs.
-      auto const* mask = childMask(tile.treeIndex());
-      active = std::any_of(mask, mask + TraitsT::kTileSize, [](std::uint8_t child) { return child != 0; });
-    }
-    if (!active)
-      m_inactive[static_cast<std::size_t>(tile.depth())].push_back(tile.index());
-    else if (!tile.isRoot())
-      childMask(tile.parentTreeIndex())[slotInParent(tile)] = 1;
-  }
-  void join(Base const& other) override {
-    auto const& b = static_cast<DetermineActiveTilesVisitor const&>(other);
-    for (std::size_t d = 0; d < m_inactive.size(); ++d)
-      m_inactive[d].insert(m_inactive[d].end(), b.m_inactive[d].begin(), b.m_inactive[d].end());
-  }
-  DetermineActiveTilesVisitor* clone() const override {
-    return new DetermineActiveTilesVisitor(m_positions, m_masks);
-  }
-  TileIndexLists& inactive() { return m_inactive; }
-
-private:
-  std::uint8_t* childMask(TreeIndex const& tile) const {
-    return m_masks[static_cast<std::size_t>(tile.depth)].data() + tile.index * TraitsT::kTileSize;
-  }
-  static int slotInParent(TileType const& tile) {
-    int3 const p = tile.parentIJK();
-    return TileType::slotOf(p.x, p.y, p.z);
-  }
-
-  PositionsOf<TraitsT> const& m_positions;
-  ChildMasks& m_masks;
-  TileIndexLists m_inactive;
-};
-
+/// The tiles that neither hold points nor have a descendant that does, rising.
+/// @error std::runtime_error(VLN::exceptionMessage) when the host cancels the job.
 template <class TraitsT>
 TileIndexLists tilesWithoutPoints(Container<TraitsT> const& tree, PositionsOf<TraitsT> const& positions) {
-  typename DetermineActiveTilesVisitor<TraitsT>::ChildMasks masks(
-      static_cast<std::size_t>(TraitsT::kMaxDepth));
-  for (int d = 0; d < TraitsT::kMaxDepth; ++d)
-    masks[static_cast<std::size_t>(d)].resize(
-        static_cast<std::size_t>(tree.tileCount(d) * TraitsT::kTileSize));
-  DetermineActiveTilesVisitor<TraitsT> visitor(positions, masks);
-  TraversalRange range;
-  range.maxDepth = positions.depth();
-  tree.reduce(visitor, kParallelDepthFirst, range);
-  return std::move(visitor.inactive());
+  constexpr std::int64_t kGrain = 2048;
+  TileIndexLists inactive(static_cast<std::size_t>(TraitsT::kDepths));
+  // Whether a tile has an active child. Children of one parent all write the same.
+  std::vector<std::uint8_t> marked, above;
+  for (int d = std::min(positions.depth(), TraitsT::kMaxDepth); d >= 0; --d) {
+    std::int64_t const tiles = tree.tileCount(d), known = std::min(tiles, positions.tileCount(d));
+    auto const* const held = known > 0 ? (*positions.tileArrays())[d].data() : nullptr;
+    marked.swap(above);
+    marked.resize(static_cast<std::size_t>(tiles));
+    above.assign(d > 0 ? static_cast<std::size_t>(tree.tileCount(d - 1)) : 0, 0);
+    std::vector<std::vector<std::int64_t>> parts(static_cast<std::size_t>(chunkCount(0, tiles, kGrain)));
+    parallelChunks(
+        0, tiles, kGrain,
+        [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+          for (std::int64_t n = begin; n < end; ++n) {
+            auto const& tile = tree.tile(n, d);
+            if (!tile.valid()) continue;
+            bool const active = (n < known && !held[n].empty()) || marked[static_cast<std::size_t>(n)] != 0;
+            if (!active)
+              parts[static_cast<std::size_t>(chunk)].push_back(n);
+            else if (!tile.isRoot())
+              std::atomic_ref(above[static_cast<std::size_t>(tile.parentIndex())])
+                  .store(1, std::memory_order_relaxed);
+          }
+        },
+        Cancellation::kPoll);
+    auto& list = inactive[static_cast<std::size_t>(d)];
+    for (auto const& part : parts) list.insert(list.end(), part.begin(), part.end());
+  }
+  return inactive;
 }
 
 /// Takes a component that lies in the object out of it for as long as this lives.
