@@ -196,6 +196,80 @@ TEST(ElementMovesOutOfRange, RegressionChannelsOfFixedSizeArePassedOver) {
   expectFixedSizeIsPassedOver<5, 0>();
 }
 
+/// Moves within a depth, each source once, take one pass over each tile; recorded ones grow, copy and remove.
+/// Both end with the same elements in the same order.
+TEST_P(ElementMoves, RequirementOnePassEndsAsGrowingCopyingAndRemovingDo) {
+  for (unsigned const stay : {0u, 1u, 5u, 9u}) {
+    for (unsigned seed = 1; seed <= 20; ++seed) {
+      SCOPED_TRACE("seed " + std::to_string(seed) + ", " + std::to_string(stay) + " of 10 stay");
+      std::mt19937 random(seed);
+      std::vector<int> sizes(1 + random() % 40);
+      for (int& n : sizes) n = random() % 4 == 0 ? 0 : static_cast<int>(random() % 20);
+      // Few destinations, so that some tiles receive much and others nothing.
+      auto const destinations = 1 + random() % sizes.size();
+      Points once = points(sizes, 3, GetParam()), recorded = points(sizes, 3, GetParam());
+      std::vector<ElementToFrom> moves;
+      TileDataElementAccessor record;
+      for (std::size_t i = 0; i < sizes.size(); ++i) {
+        for (int n = 0; n < sizes[i]; ++n) {
+          if (random() % 10 < stay) continue;
+          auto const to = static_cast<std::int64_t>(random() % (destinations + 1)) - 1;
+          ElementTreeIndex const from(static_cast<std::int64_t>(i), 3, n);
+          moves.push_back({to, from.index, n, 3});
+          if (to < 0)
+            record.remove(from);
+          else
+            record.move(from, TreeIndex{to, 3});
+        }
+      }
+      once.update(moves, 3, true);
+      recorded.update(record);
+      for (std::int64_t i = 0; i < once.tileCount(3); ++i) {
+        ASSERT_EQ(tile(once, i), tile(recorded, i)) << "tile " << i;
+        EXPECT_LE(once.tileData(i, 3).data()->capacity(), recorded.tileData(i, 3).data()->capacity() * 2);
+      }
+    }
+  }
+}
+
+TEST_P(ElementMoves, RequirementTilesThatExchangeElementsKeepTheirRoom) {
+  Points channel = points({8, 8}, 3, GetParam());
+  std::vector<ElementToFrom> moves;
+  for (std::int64_t i = 0; i < 2; ++i)
+    for (int n = 0; n < 8; ++n) moves.push_back({1 - i, i, n, 3});
+  int const* const before[] = {channel.tileData(0, 3).data()->data(), channel.tileData(1, 3).data()->data()};
+  channel.update(moves, 3, true);
+  EXPECT_EQ(tile(channel, 0), (Values{107, 106, 105, 104, 103, 102, 101, 100}));
+  EXPECT_EQ(tile(channel, 1), (Values{7, 6, 5, 4, 3, 2, 1, 0}));
+  for (std::int64_t i = 0; i < 2; ++i) {
+    EXPECT_EQ(channel.tileData(i, 3).data()->data(), before[i]);
+    EXPECT_EQ(channel.tileData(i, 3).data()->capacity(), 8u);
+    EXPECT_EQ(channel.isStatic(TreeIndex{i, 3}), GetParam());
+  }
+}
+
+/// A source that is listed twice is copied twice and leaves once, sorted or not.
+TEST_P(ElementMoves, BoundaryASourceListedTwice) {
+  Points channel = points({4, 1, 1}, 3, GetParam());
+  std::vector<ElementToFrom> moves = {{1, 0, 1, 3}, {2, 0, 1, 3}, {2, 0, 3, 3}};
+  channel.update(moves, 3, true);
+  EXPECT_EQ(tile(channel, 0), (Values{0, 2}));
+  EXPECT_EQ(tile(channel, 1), (Values{100, 1}));
+  EXPECT_EQ(tile(channel, 2), (Values{200, 1, 3}));
+}
+
+TEST_P(ElementMoves, RequirementACopyThatSharesTheStorageKeepsItsElements) {
+  Points channel = points({5, 2, 3}, 3, GetParam());
+  Points const copy = channel;
+  std::vector<ElementToFrom> moves = {{1, 0, 1, 3}, {2, 0, 4, 3}, {-1, 2, 0, 3}};
+  channel.update(moves, 3, true);
+  EXPECT_EQ(tile(copy, 0), (Values{0, 1, 2, 3, 4}));
+  EXPECT_EQ(tile(copy, 2), (Values{200, 201, 202}));
+  EXPECT_EQ(tile(channel, 0), (Values{0, 3, 2}));
+  EXPECT_EQ(tile(channel, 1), (Values{100, 101, 1}));
+  EXPECT_EQ(tile(channel, 2), (Values{4, 201, 202}));
+}
+
 TEST(ElementMovesPreparation, RequirementOrderTilesAndArrivals) {
   Points const channel = points({5, 2, 3});
   std::vector<ElementToFrom> moves = {{2, 1, 0, 3}, {0, 2, 1, 3}, {-1, 0, 2, 3}, {2, 0, 1, 3}};

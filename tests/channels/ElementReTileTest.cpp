@@ -117,6 +117,52 @@ TYPED_TEST(ReTile, PointsOutOfReachAreDropped) {
   }
 }
 
+// The scan takes points by fours and in blocks of 64: whichever leaves, it alone moves.
+TYPED_TEST(ReTile, AnyPointOfATileMayLeave) {
+  VoxelCoord const home = this->deepest(0, 0, 0), next = this->deepest(40, 0, 0);
+  for (int const count : {1, 2, 3, 4, 5, 7, 8, 63, 64, 65, 68, 130}) {
+    int const step = count < 10 ? 1 : 5;
+    for (int leaving = 0; leaving < count; leaving += step) {
+      SCOPED_TRACE(std::to_string(leaving) + " of " + std::to_string(count));
+      PointCloud<TypeParam> cloud(1.0f);
+      cloud.addTiles({home, next});
+      for (int n = 0; n < count; ++n) {
+        float3 p{0.25f, 0.5f, 0.75f};
+        if (n == leaving) p[n % 3] = n % 3 == 0 ? 40.5f : -30.5f;
+        cloud.addPoint(home, p);
+      }
+      cloud.counted();
+      cloud.reTile(false);
+      cloud.check();
+      ASSERT_EQ(cloud.points[home].size(), static_cast<std::size_t>(count - 1));
+      ASSERT_FALSE(this->HasFailure());
+    }
+  }
+}
+
+// Far out, corners of tiles lie between floats.
+TYPED_TEST(ReTile, BordersHoldWhereFloatsAreCoarse) {
+  for (int const far : {1 << 23, 1 << 24, (1 << 24) + 3, 1 << 27, (1 << 29) - 256}) {
+    for (int const sign : {-1, 1}) {
+      SCOPED_TRACE(sign * far);
+      PointCloud<TypeParam> cloud(1.0f);
+      VoxelCoord const home = this->deepest(sign * far, 5, -5);
+      std::vector<VoxelCoord> tiles{home};
+      int const width = TestFixture::M::width(home.depth);
+      for (int n = 1; n <= 24; ++n)
+        for (int const way : {-1, 1}) tiles.push_back(this->deepest(home.i + way * n * width, 5, -5));
+      cloud.addTiles(tiles);
+      auto at = static_cast<float>(home.i);
+      for (int n = 0; n < 6; ++n) at = std::nextafter(at, -1e30f);
+      for (int n = 0; n < 14; ++n, at = std::nextafter(at, 1e30f)) cloud.addPoint(home, {at, 5.5f, -4.5f});
+      cloud.counted();
+      cloud.reTile(false);
+      cloud.check();
+      ASSERT_FALSE(this->HasFailure());
+    }
+  }
+}
+
 TYPED_TEST(ReTile, PruningKeepsTheAncestorsOfPoints) {
   PointCloud<TypeParam> cloud(1.0f);
   std::vector<VoxelCoord> tiles;

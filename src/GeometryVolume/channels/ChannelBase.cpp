@@ -1,5 +1,6 @@
 #include "GeometryVolume/channels/ChannelBase.h"
 
+#include "GeometryVolume/channels/ElementExchangeImpl.h"
 #include "GeometryVolume/core/LoggerHooks.h"
 #include "GeometryVolume/core/Streaming.h"
 #include "GeometryVolume/core/YieldPointImpl.h"
@@ -109,6 +110,10 @@ template <class Body> void forEachList(ElementPermutation const& p, Body const& 
 
 void ChannelBase::updateElementsNoDispatch(ElementPermutation const& p) {
   if (layout().fixedSize()) return;
+  {
+    Change const change(*this);
+    if (Internal::exchangeElements(*this, p)) return;
+  }
   bool canFollow = true;
   forEachList(p, [&](auto const& moves, auto const&, auto const&, auto const&, int d) {
     canFollow = canFollow && holdsAll(moves, d);

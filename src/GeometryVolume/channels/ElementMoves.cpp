@@ -84,15 +84,20 @@ struct Run {
 /// Sorts by counting: linear, where the destinations are few. @return false when they are not.
 bool countByDestination(std::vector<ElementToFrom> const& moves, std::vector<std::uint64_t>& order,
                         std::vector<Run>& runs) {
-  std::int64_t lowest = 0, highest = 0;
-  for (ElementToFrom const& move : moves) {
-    lowest = std::min(lowest, move.to);
-    highest = std::max(highest, move.to);
-  }
   constexpr std::int64_t kLowest = -2; // dropped, or without a tile
-  if (lowest < kLowest || highest - kLowest >= static_cast<std::int64_t>(4 * moves.size())) return false;
-  std::vector<std::uint64_t> next(static_cast<std::size_t>(highest - kLowest + 2));
-  for (ElementToFrom const& move : moves) ++next[static_cast<std::size_t>(move.to - kLowest + 1)];
+  auto const mostBuckets = static_cast<std::uint64_t>(4 * moves.size());
+  // The count of bucket b lies at b + 1: it becomes the start of the next. It grows with what is met, so that
+  // the moves are read but once for it.
+  std::vector<std::uint64_t> next(std::min<std::uint64_t>(mostBuckets, moves.size() / 8) + 1);
+  std::uint64_t buckets = 0;
+  for (ElementToFrom const& move : moves) {
+    std::uint64_t const bucket = static_cast<std::uint64_t>(move.to) - static_cast<std::uint64_t>(kLowest);
+    if (bucket >= mostBuckets) return false;
+    if (bucket + 1 >= next.size()) next.resize(std::min(mostBuckets + 1, 2 * (bucket + 2)));
+    buckets = std::max(buckets, bucket + 1);
+    ++next[bucket + 1];
+  }
+  next.resize(buckets + 1);
   for (std::size_t bucket = 1; bucket < next.size(); ++bucket) {
     bool const holdsAny = next[bucket] > 0;
     auto const tile = static_cast<std::int64_t>(bucket) - 1 + kLowest;

@@ -1,103 +1,25 @@
 #include "GeometryVolume/channels/ElementReTile.h"
 
+#include "GeometryVolume/channels/ElementScanImpl.h"
 #include "GeometryVolume/channels/UpdateDispatch.h"
 #include "GeometryVolume/core/ElementTypes.h"
 #include "GeometryVolume/core/Numeric.h"
 #include "GeometryVolume/core/Parallel.h"
-#include "GeometryVolume/tiletree/Visitor.h"
 
 #if VLN_HAS_ELEMENT_FLOAT3
 
 #include <algorithm>
-#include <cmath>
-#include <optional>
+#include <atomic>
 #include <tuple>
 
 namespace VLN::TileTree3D {
 
 namespace {
 
-constexpr float kReach = 5.368709e+08f;
-constexpr std::int64_t kTilesOfARange = 50;
-constexpr std::int64_t kDropped = -1, kWaiting = -2;
-
-template <class TraitsT> using PositionsOf = Channel<TraitsT, float3, TraitsT::kTileDataWidth, 0>;
-
-/// What a scan of some tiles found.
-struct Found {
-  std::vector<ElementToFrom> moves;
-  std::vector<std::uint64_t> waiting; // positions in `moves` whose tile does not exist yet
-  std::vector<int3> missing;          // corners of those tiles
-
-  void append(Found const& b) {
-    std::uint64_t const offset = moves.size();
-    moves.insert(moves.end(), b.moves.begin(), b.moves.end());
-    for (std::uint64_t const at : b.waiting) waiting.push_back(offset + at);
-    missing.insert(missing.end(), b.missing.begin(), b.missing.end());
-  }
-};
-
-/// The positions on an axis that stay in a tile.
-struct StayRange {
-  double low, high;
-  bool holds(float q) const { return (double(q) >= low) & (double(q) < high); }
-};
-
-template <class TraitsT>
-void scanTile(Tile<TraitsT, TraitsT::kTileSize> const& tile, PositionsOf<TraitsT> const& positions, float s,
-              ConstTileAccessorOf<TraitsT> const& accessor, Found& found) {
-  auto const data = positions.tileData(tile.treeIndex());
-  float3 const* const points = data.data()->data();
-  int const count = data.size();
-  int const depth = tile.depth();
-
-  // Within the reach, q lies in the tile exactly when floor(q) does.
-  StayRange stay[3];
-  for (int a = 0; a < 3; ++a) {
-    double const low = tile.tijk()[a], high = low + tile.tileVoxelWidth();
-    stay[a] = {std::max(low, double(std::nextafter(-kReach, 0.0f))), std::min(high, double(kReach))};
-  }
-  for (int n = 0; n < count; ++n) {
-    float3 const q{points[n].x * s, points[n].y * s, points[n].z * s};
-    if (stay[0].holds(q.x) & stay[1].holds(q.y) & stay[2].holds(q.z)) continue;
-    std::int64_t to = kDropped;
-    // Written so that what is no number is out of reach.
-    if (std::abs(q.x) < kReach && std::abs(q.y) < kReach && std::abs(q.z) < kReach) {
-      int3 corner;
-      for (int a = 0; a < 3; ++a) corner[a] = TraitsT::align(toIntFloor(q[a]), depth);
-      TreeIndex const there = accessor.treeIndex(corner.x, corner.y, corner.z, depth, true);
-      if (there.valid()) {
-        to = there.index;
-      } else {
-        to = kWaiting;
-        found.waiting.push_back(found.moves.size());
-        if (found.missing.empty() || found.missing.back() != corner) found.missing.push_back(corner);
-      }
-    }
-    found.moves.push_back({to, tile.index(), n, depth});
-  }
-}
-
-template <class TraitsT>
-Found scanDepth(Container<TraitsT> const& tree, PositionsOf<TraitsT> const& positions, int depth) {
-  float const s = 1.0f / tree.voxelSize();
-  std::int64_t const tiles = std::min(tree.tileCount(depth), positions.tileCount(depth));
-  std::vector<Found> parts(static_cast<std::size_t>(chunkCount(0, tiles, kTilesOfARange)));
-  parallelChunks(0, tiles, kTilesOfARange, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-    auto const accessor = tree.tileAccessor();
-    for (std::int64_t n = begin; n < end; ++n) {
-      auto const& tile = tree.tile(n, depth);
-      if (tile.valid()) scanTile(tile, positions, s, accessor, parts[static_cast<std::size_t>(chunk)]);
-    }
-  });
-  // Chunks are consecutive: the moves are sorted by source.
-  Found all;
-  std::size_t count = 0;
-  for (Found const& part : parts) count += part.moves.size();
-  all.moves.reserve(count);
-  for (Found const& part : parts) all.append(part);
-  return all;
-}
+using Internal::Found;
+using Internal::kDropped;
+using Internal::PositionsOf;
+using Internal::scanDepth;
 
 /// Fills the scratch tree with the listed tiles and those between them and its first tile.
 template <class TraitsT>
@@ -134,71 +56,40 @@ void settle(Container<TraitsT> const& tree, PositionsOf<TraitsT> const& position
   });
 }
 
-/// Finds the tiles that neither hold points nor have a descendant that does.
-template <class TraitsT> class DetermineActiveTilesVisitor final : public Visitor<Container<TraitsT>> {
-  using Base = Visitor<Container<TraitsT>>;
-
-public:
-  using TileType = typename Container<TraitsT>::TileType;
-  /// For each depth, a byte for each child slot of each tile.
-  using ChildMasks = std::vector<std::vector<std::uint8_t>>;
-
-  DetermineActiveTilesVisitor(PositionsOf<TraitsT> const& positions, ChildMasks& masks)
-      : m_positions(positions)
-      , m_masks(masks)
-      , m_inactive(static_cast<std::size_t>(TraitsT::kDepths)) {
-    this->setBeginTileOverridden(false);
-  }
-  using Base::endTile;
-  void endTile(TileType const& tile) override {
-    bool active =
-        tile.index() < m_positions.tileCount(tile.depth()) && m_positions.elementCount(tile.treeIndex()) > 0;
-    if (!active && !tile.isLeaf()) {
-      // The children have reported: a parent's end comes after theirs.
-      auto const* mask = childMask(tile.treeIndex());
-      active = std::any_of(mask, mask + TraitsT::kTileSize, [](std::uint8_t child) { return child != 0; });
-    }
-    if (!active)
-      m_inactive[static_cast<std::size_t>(tile.depth())].push_back(tile.index());
-    else if (!tile.isRoot())
-      childMask(tile.parentTreeIndex())[slotInParent(tile)] = 1;
-  }
-  void join(Base const& other) override {
-    auto const& b = static_cast<DetermineActiveTilesVisitor const&>(other);
-    for (std::size_t d = 0; d < m_inactive.size(); ++d)
-      m_inactive[d].insert(m_inactive[d].end(), b.m_inactive[d].begin(), b.m_inactive[d].end());
-  }
-  DetermineActiveTilesVisitor* clone() const override {
-    return new DetermineActiveTilesVisitor(m_positions, m_masks);
-  }
-  TileIndexLists& inactive() { return m_inactive; }
-
-private:
-  std::uint8_t* childMask(TreeIndex const& tile) const {
-    return m_masks[static_cast<std::size_t>(tile.depth)].data() + tile.index * TraitsT::kTileSize;
-  }
-  static int slotInParent(TileType const& tile) {
-    int3 const p = tile.parentIJK();
-    return TileType::slotOf(p.x, p.y, p.z);
-  }
-
-  PositionsOf<TraitsT> const& m_positions;
-  ChildMasks& m_masks;
-  TileIndexLists m_inactive;
-};
-
+/// The tiles that neither hold points nor have a descendant that does, rising.
+/// @error std::runtime_error(VLN::exceptionMessage) when the host cancels the job.
 template <class TraitsT>
 TileIndexLists tilesWithoutPoints(Container<TraitsT> const& tree, PositionsOf<TraitsT> const& positions) {
-  typename DetermineActiveTilesVisitor<TraitsT>::ChildMasks masks(
-      static_cast<std::size_t>(TraitsT::kMaxDepth));
-  for (int d = 0; d < TraitsT::kMaxDepth; ++d)
-    masks[static_cast<std::size_t>(d)].resize(
-        static_cast<std::size_t>(tree.tileCount(d) * TraitsT::kTileSize));
-  DetermineActiveTilesVisitor<TraitsT> visitor(positions, masks);
-  TraversalRange range;
-  range.maxDepth = positions.depth();
-  tree.reduce(visitor, kParallelDepthFirst, range);
-  return std::move(visitor.inactive());
+  constexpr std::int64_t kGrain = 2048;
+  TileIndexLists inactive(static_cast<std::size_t>(TraitsT::kDepths));
+  // Whether a tile has an active child. Children of one parent all write the same.
+  std::vector<std::uint8_t> marked, above;
+  for (int d = std::min(positions.depth(), TraitsT::kMaxDepth); d >= 0; --d) {
+    std::int64_t const tiles = tree.tileCount(d), known = std::min(tiles, positions.tileCount(d));
+    auto const* const held = known > 0 ? (*positions.tileArrays())[d].data() : nullptr;
+    marked.swap(above);
+    marked.resize(static_cast<std::size_t>(tiles));
+    above.assign(d > 0 ? static_cast<std::size_t>(tree.tileCount(d - 1)) : 0, 0);
+    std::vector<std::vector<std::int64_t>> parts(static_cast<std::size_t>(chunkCount(0, tiles, kGrain)));
+    parallelChunks(
+        0, tiles, kGrain,
+        [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
+          for (std::int64_t n = begin; n < end; ++n) {
+            auto const& tile = tree.tile(n, d);
+            if (!tile.valid()) continue;
+            bool const active = (n < known && !held[n].empty()) || marked[static_cast<std::size_t>(n)] != 0;
+            if (!active)
+              parts[static_cast<std::size_t>(chunk)].push_back(n);
+            else if (!tile.isRoot())
+              std::atomic_ref(above[static_cast<std::size_t>(tile.parentIndex())])
+                  .store(1, std::memory_order_relaxed);
+          }
+        },
+        Cancellation::kPoll);
+    auto& list = inactive[static_cast<std::size_t>(d)];
+    for (auto const& part : parts) list.insert(list.end(), part.begin(), part.end());
+  }
+  return inactive;
 }
 
 /// Takes a component that lies in the object out of it for as long as this lives.
