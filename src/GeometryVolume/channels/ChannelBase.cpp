@@ -29,7 +29,7 @@ ChannelBase::Change::~Change() {
 }
 
 void ChannelBase::memUse(std::uint64_t& used, std::uint64_t& allocated, bool notShared) const {
-  VLN::Component::memUse(used, allocated, notShared);
+  Component::memUse(used, allocated, notShared);
 }
 
 void ChannelBase::dumpCounts(std::ostream& os) const {

@@ -52,7 +52,7 @@ struct ElementInTile {
   std::int64_t tile;
   std::int32_t element;
 
-  auto operator<=>(ElementInTile const&) const = default;
+  auto operator<=>(ElementInTile const&) const = default; // NOLINT(modernize-use-nullptr): none is there
 };
 
 // What changed, one entry for each depth. Lists may be shorter than kChannelDepths: the rest did not change.
