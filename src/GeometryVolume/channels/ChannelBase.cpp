@@ -29,7 +29,8 @@ ChannelBase::Change::~Change() {
 }
 
 void ChannelBase::memUse(std::uint64_t& used, std::uint64_t& allocated, bool notShared) const {
-  Component::memUse(used, allocated, notShared);
+  // Not TileTree3D::Component's, which counts the owner's name. NOLINTNEXTLINE(bugprone-parent-virtual-call)
+  VLN::Component::memUse(used, allocated, notShared);
 }
 
 void ChannelBase::dumpCounts(std::ostream& os) const {
