@@ -7,7 +7,9 @@ if(sources AND TARGET GeometryVolumeInterop)
   target_link_libraries(vln PRIVATE
     GeometryVolumeInterop GeometryVolumeRender GeometryVolume CLI11::CLI11 PNG::PNG ZLIB::ZLIB fmt::fmt nlohmann_json::nlohmann_json)
   # When the program starts, 60,000 of OpenVDB's names are looked up in each library before it: it comes first.
-  target_link_options(vln PRIVATE LINKER:--push-state,--no-as-needed "${OpenVDB_LIBRARY}" LINKER:--pop-state)
+  if(CMAKE_SYSTEM_NAME STREQUAL "Linux")
+    target_link_options(vln PRIVATE LINKER:--push-state,--no-as-needed "${OpenVDB_LIBRARY}" LINKER:--pop-state)
+  endif()
   file(RELATIVE_PATH lib_from_bin "/${CMAKE_INSTALL_BINDIR}" "/${CMAKE_INSTALL_LIBDIR}")
   set_target_properties(vln PROPERTIES INSTALL_RPATH "$ORIGIN/${lib_from_bin}")
 

@@ -35,15 +35,6 @@ struct TileExchange {
   std::uint64_t firstArrival, arriving;
 };
 
-/// Asks for what will soon be needed.
-inline void prefetch(void const* p) {
-#ifdef __GNUC__
-  __builtin_prefetch(p);
-#else
-  static_cast<void>(p);
-#endif
-}
-
 /// The moves to one depth, as a permutation lists them.
 struct DepthMoves {
   std::vector<ElementToFrom> const& moves;
@@ -202,7 +193,8 @@ private:
     constexpr std::uint64_t kMost = 64;
     T const* const elements = tiles[static_cast<std::size_t>(e.tile)].data();
     std::int32_t const* const places = m_places.data() + e.firstLeaving;
-    for (std::uint64_t n = 0, end = std::min(e.leaving, kMost); n < end; ++n) prefetch(elements + places[n]);
+    for (std::uint64_t n = 0, end = std::min(e.leaving, kMost); n < end; ++n)
+      __builtin_prefetch(elements + places[n]);
   }
 
   void apply(TileVector<T>& tile, TileExchange const& e) const {

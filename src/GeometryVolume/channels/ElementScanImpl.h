@@ -174,14 +174,10 @@ private:
 
 /// Asks for the elements of a tile that will be read soon.
 inline void prefetch(TileVector<float3> const& tile) {
-#ifdef __GNUC__
   constexpr std::size_t kLine = 64, kMost = 16 * kLine;
   auto const* const bytes = reinterpret_cast<char const*>(tile.data());
   for (std::size_t at = 0, n = std::min(tile.size() * sizeof(float3), kMost); at < n; at += kLine)
     __builtin_prefetch(bytes + at);
-#else
-  static_cast<void>(tile);
-#endif
 }
 
 /// Scans tiles of a depth, one after another.

@@ -286,20 +286,20 @@ template <class TraitsT> void ContainerBuilder<TraitsT>::refine(Tree const& sour
 
 template <class TraitsT>
 void Container<TraitsT>::refineInternal(Container const& source, bool last, TileLists* newTiles) {
-  ContainerBuilder<TraitsT>(*this).refine(source, newTiles);
-  if (last) setBranchSizes();
+  ContainerBuilder<TraitsT> builder(*this);
+  std::int64_t const deepest = tileCount(kMaxDepth); // those that are made have their sizes
+  builder.refine(source, newTiles);
+  if (last) builder.setBranchSizes(Cancellation::kPoll, deepest);
 }
 
 template <class TraitsT>
 void Container<TraitsT>::refine(std::vector<Container const*> const& sources, TileLists* newTiles,
                                 bool setBranchSizesAtEnd) {
-  ContainerBuilder<TraitsT> builder(*this);
-  std::int64_t const deepest = tileCount(kMaxDepth);
   try {
-    for (Container const* const source : sources) refineInternal(*source, false, newTiles);
-    if (setBranchSizesAtEnd && !sources.empty()) builder.setBranchSizes(Cancellation::kPoll, deepest);
+    for (std::size_t n = 0; n < sources.size(); ++n)
+      refineInternal(*sources[n], setBranchSizesAtEnd && n + 1 == sources.size(), newTiles);
   } catch (std::bad_alloc const&) {
-    if (setBranchSizesAtEnd) builder.setBranchSizes(Cancellation::kSuppress);
+    if (setBranchSizesAtEnd) ContainerBuilder<TraitsT>(*this).setBranchSizes(Cancellation::kSuppress);
     throw;
   }
 }
