@@ -11,7 +11,9 @@
 #include "GeometryVolume/volume/RunFinderImpl.h"
 
 #include <algorithm>
+#include <array>
 #include <cstddef>
+#include <random>
 #include <utility>
 
 namespace VLN::TileTree3D::Internal {
@@ -37,14 +39,22 @@ bool isAtRandom(std::span<int3 const> positions) {
 
 /// The axis along which positions in order go from block to block and never back, or -1.
 int slowestAxis(std::span<int3 const> positions) {
-  constexpr std::size_t kSamples = 8;
+  constexpr std::size_t kSamples = 16;
+  // One anywhere in each part: where steps are even and happen to be whole rows or planes, faster axes would
+  // seem to stand.
+  std::array<std::size_t, kSamples> samples;
+  std::minstd_rand random;
+  for (std::size_t n = 0; n < kSamples; ++n) {
+    std::size_t const begin = n * positions.size() / kSamples, end = (n + 1) * positions.size() / kSamples;
+    samples[n] = begin + random() % std::max<std::size_t>(end - begin, 1);
+  }
   int out = -1;
-  std::size_t fewest = kSamples;
+  std::size_t fewest = kSamples + 1;
   for (int axis = 0; axis < 3; ++axis) {
     std::size_t ups = 0, downs = 0;
     int last = positions[0][axis] >> 3;
-    for (std::size_t n = 1; n < kSamples; ++n) {
-      int const at = positions[n * (positions.size() - 1) / (kSamples - 1)][axis] >> 3;
+    for (std::size_t const sample : samples) {
+      int const at = positions[sample][axis] >> 3;
       ups += at > last, downs += at < last;
       last = at;
     }
