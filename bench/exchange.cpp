@@ -3,7 +3,8 @@
 //   topology  makes the tiles of all leaves, in the file's order or shuffled; an item is a leaf of 8 x 8 x 8
 //             voxels. touchLeaf makes room for values as well and writes them, and so does "bulk with
 //             values"; with zeros, large blocks of them come from the system when they are first used
-//   read      a million active voxels, leaf by leaf or at random; an item is a voxel
+//   read      a million active voxels, leaf by leaf or at random; an item is a voxel. "Many at once" gives an
+//             array of values, the others their sum
 //   sum       all active voxels; an item is an active voxel
 //   import    an item is an active voxel. A deep copy is less work: an import arranges the values anew, fills
 //             the coarser tiles, and finds out which state is implied by the values
@@ -193,6 +194,19 @@ void readReader(benchmark::State& state, ChannelReader<Values> const& reader,
   read(state, places, [&](Coord const& c) { return values.value(c.x(), c.y(), c.z()); });
 }
 
+void readMany(benchmark::State& state, ChannelReader<Values> const& reader,
+              std::vector<Coord> const& places) {
+  std::vector<int3> positions;
+  for (Coord const& c : places) positions.push_back({c.x(), c.y(), c.z()});
+  std::vector<float> values(positions.size());
+  for (auto _ : state) {
+    reader.read(positions, values);
+    benchmark::DoNotOptimize(values.data());
+    benchmark::ClobberMemory();
+  }
+  countItems(state, static_cast<double>(places.size()));
+}
+
 void readOpenVdb(benchmark::State& state, FloatGrid const& grid, std::vector<Coord> const& places) {
   auto const accessor = grid.getConstAccessor();
   read(state, places, [&](Coord const& c) { return accessor.getValue(c); });
@@ -372,6 +386,8 @@ void addAll(Subject const& s) {
     add(s, (order + "OpenVDB").c_str(), [&](auto& st) { readOpenVdb(st, *s.grid, places); });
     add(s, (order + "NanoVDB").c_str(), [&](auto& st) { readNano(st, *s.nano.grid<float>(), places); });
     add(s, (order + "ChannelReader").c_str(), [&](auto& st) { readReader(st, *s.reader, places); });
+    add(s, (order + "ChannelReader, many at once").c_str(),
+        [&](auto& st) { readMany(st, *s.reader, places); });
     add(s, (order + "accessor").c_str(), [&](auto& st) { readOurs(st, *s.tree, *s.values, places); });
   }
   for (int threads : {1, 2}) {

@@ -1,5 +1,5 @@
-// Writing single values through a volume's field, beside OpenVDB's accessor on the same positions in the same
-// run. "New" begins with an empty volume, "again" writes into tiles that exist.
+// Writing and reading values through a volume's field, beside OpenVDB's accessor on the same positions in the
+// same run. "New" begins with an empty volume, "again" writes into tiles that exist.
 #include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/volume/ForEach.h"
 #include "Interop/VdbTypesImpl.h"
@@ -193,6 +193,27 @@ void BM_FieldGet(benchmark::State& state) {
   report(state, c.positions.size());
 }
 BENCHMARK(BM_FieldGet)->Arg(kInOrder)->Arg(kAtRandom)->Unit(benchmark::kMillisecond);
+
+/// All positions in one call, on the threads of the second argument.
+void BM_FieldGetBulk(benchmark::State& state) {
+  Case const& c = cases(static_cast<Order>(state.range(0)));
+  VLN::withThreads(static_cast<int>(state.range(1)), [&] {
+    Volume volume;
+    auto field = volume.addField<float>("density", 0);
+    field.set(c.positions, c.values);
+    std::vector<float> values(c.positions.size());
+    for (auto _ : state) {
+      field.get(c.positions, values);
+      benchmark::DoNotOptimize(values.data());
+      benchmark::ClobberMemory();
+    }
+  });
+  report(state, c.positions.size());
+}
+BENCHMARK(BM_FieldGetBulk)
+    ->ArgsProduct({{kInOrder, kAtRandom}, {1, 2}})
+    ->Unit(benchmark::kMillisecond)
+    ->UseRealTime();
 
 /// A seven-point stencil over all samples, from one field to another, on the threads of the argument.
 void BM_FieldStencil(benchmark::State& state) {

@@ -61,6 +61,12 @@ void byHand() {
     float const value = reader.value(at.x, at.y, at.z);
     // end snippet
     expect(value == 1.0f, "read");
+    std::vector<int3> const positions{at, {0, 0, -1}, at};
+    // snippet: reader_many
+    std::vector<float> values(positions.size());
+    reader.read(positions, values);
+    // end snippet
+    expect(values == std::vector<float>{1.0f, reader.value(positions[1]), 1.0f}, "read many");
   }
   {
     float3 const position{10.5f, 20.5f, 30.5f};

@@ -115,13 +115,8 @@ public:
   }
 
   void get(int3 const* positions, std::int64_t count, void* out) const override {
-    auto* const values = static_cast<T*>(out);
-    parallelFor(0, count,
-                [&](std::int64_t begin, std::int64_t end) {
-                  TileTree3D::Field<T> const own(m_field);
-                  for (auto n = begin; n < end; ++n) values[n] = own.get(positions[n]);
-                },
-                {.grain = kGrain});
+    auto const n = static_cast<std::size_t>(count);
+    m_field.get(std::span(positions, n), std::span(static_cast<T*>(out), n));
   }
 
   ActiveSamples active(ActiveRule const& rule, bool positions) const override {

@@ -6,6 +6,8 @@
 
 #include <algorithm>
 #include <limits>
+#include <span>
+#include <stdexcept>
 #include <utility>
 #include <vector>
 
@@ -58,6 +60,81 @@ TYPED_TEST(ChannelReaderTest, GivesTheDeepestTilesSample) {
       expectModel<TypeParam, 1, 0>(seed);
     }
   }
+}
+
+/// Positions in the orders that read() tells apart: at random, in walks, and through whole blocks.
+template <class TraitsT> std::vector<int3> manyPositions(Support::RandomForest<TraitsT>& forest) {
+  std::vector<int3> out;
+  for (int n = 0; n < 700; ++n) out.push_back(forest.point());
+  for (int n = 0; n < 700; ++n)
+    out.push_back(n % 9 == 0 ? forest.point() : forest.near(out.back(), TraitsT::kMaxDepth));
+  constexpr int kBlock = TraitsT::width(TraitsT::kMaxDepth - 1);
+  for (int n = 0; n < 4; ++n) {
+    int3 const corner = TraitsT::align(forest.point(), TraitsT::kMaxDepth - 1);
+    for (int i = 0; i < kBlock; ++i)
+      for (int j = 0; j < kBlock; j += 1 + kBlock / 16)
+        for (int k = 0; k < kBlock; ++k) out.push_back({corner.x + i, corner.y + j, corner.z + k});
+  }
+  constexpr int kLow = std::numeric_limits<int>::min(), kTop = std::numeric_limits<int>::max();
+  for (int const c : {kLow, TraitsT::kMinTileCoord - 1, TraitsT::kMinTileCoord, TraitsT::kMaxTileCoord,
+                      TraitsT::kMaxTileCoord + 1, kTop})
+    out.push_back({c, out.back().y, c});
+  return out;
+}
+
+template <class ChannelT, class TraitsT> void expectReadsMany(std::uint32_t seed) {
+  using T = typename ChannelT::value_type;
+  Support::RandomForest<TraitsT> forest(seed);
+  for (int n = 0; n < 30; ++n) forest.grow();
+  // Tiles close together: blocks that are full, and no nodes between cells and blocks.
+  bool const close = seed % 2 == 0;
+  Container<TraitsT> box("", 1.0f);
+  constexpr int kTile = TraitsT::width(TraitsT::kMaxDepth);
+  for (int n = 0; n < 64; ++n)
+    box.tileAccessor().addTile(n % 4 * kTile, n / 4 % 4 * kTile, n / 16 * kTile, TraitsT::kMaxDepth);
+  auto const& tree = close ? box : forest.tree();
+  auto channel = channelOn<ChannelT>(tree, T{});
+  fillRandom(channel, tree, seed);
+  auto positions = manyPositions(forest);
+  if (close)
+    for (int3& p : positions)
+      for (int a = 0; a < 3; ++a) p[a] = p[a] & (8 * kTile - 1);
+  ChannelReader<ChannelT> const reader(tree, channel);
+  ChannelReader<ChannelT> const single(reader);
+  for (std::size_t const count : {std::size_t(0), std::size_t(1), std::size_t(7), std::size_t(256),
+                                  std::size_t(257), std::size_t(513), positions.size()}) {
+    auto const some = std::span(positions).last(count);
+    std::vector<T> values(count, T{});
+    reader.read(some, values);
+    for (std::size_t n = 0; n < count; ++n)
+      ASSERT_EQ(values[n], single.value(some[n])) << "seed " << seed << ", " << n << " of " << count;
+  }
+}
+
+// model: single reads, themselves tested above; elements of several sizes, all layouts
+TYPED_TEST(ChannelReaderTest, ReadsManyAsOneByOne) {
+  using Traits = TypeParam;
+  for (std::uint32_t seed = 1; seed <= 6; ++seed) {
+    expectReadsMany<Channel<Traits, float, Traits::kTDW, 0>, Traits>(seed);
+    expectReadsMany<Channel<Traits, float, Traits::kTDW, 2>, Traits>(seed);
+    expectReadsMany<Channel<Traits, std::uint8_t, Traits::kTDW, 0>, Traits>(seed);
+    expectReadsMany<Channel<Traits, double3, Traits::kTDW, 1>, Traits>(seed);
+    expectReadsMany<Channel<Traits, float3, Traits::kTDW + 1, 0>, Traits>(seed);
+    if (this->HasFatalFailure()) return;
+  }
+}
+
+TYPED_TEST(ChannelReaderTest, RefusesToReadManyIntoFewer) {
+  using Traits = TypeParam;
+  using ChannelT = Channel<Traits, float, Traits::kTDW, 0>;
+  Container<Traits> const tree("", 1.0f);
+  auto const channel = channelOn<ChannelT>(tree, 3.0f);
+  std::vector<float> values(1, -1.0f);
+  try {
+    ChannelReader<ChannelT>(tree, channel).read(std::vector<int3>(2), values);
+    FAIL();
+  } catch (std::invalid_argument const& e) { EXPECT_STREQ(e.what(), "2 positions with 1 values"); }
+  EXPECT_EQ(values[0], -1.0f);
 }
 
 // edge: every int32 position, empty trees, channels without storage

@@ -1,5 +1,5 @@
-// Many elements written in one call, in the orders that callers have: the result is that of as many single
-// writes.
+// Many elements written or read in one call, in the orders that callers have: the result is that of as many
+// single writes or reads.
 #include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/volume/Volume.h"
 #include "support/Print.h"
@@ -11,9 +11,12 @@
 #include <limits>
 #include <map>
 #include <random>
+#include <span>
+#include <stdexcept>
 #include <string>
 #include <tuple>
 #include <type_traits>
+#include <utility>
 #include <vector>
 
 namespace VLN::Test {
@@ -116,7 +119,7 @@ std::vector<Order> orders() {
 
 template <class T> T valueOf(std::size_t n) {
   auto const v = static_cast<float>(n % 251 + 1);
-  if constexpr (std::is_same_v<T, float3>)
+  if constexpr (std::is_class_v<T>)
     return {v, -v, 2 * v};
   else
     return static_cast<T>(v);
@@ -261,6 +264,68 @@ TEST(BulkSetTest, NegativeRowsThatLeaveTheDomain) {
   auto field = volume.addField<float>("f", 0);
   std::vector<int3> const wrapped{{kMost, 0, 0}, {-kMost - 1, 0, 0}};
   EXPECT_THROW(field.set(wrapped, std::vector<float>(2, 1.0f)), std::out_of_range);
+}
+
+/// Half of the positions have tiles of the deepest depth, others coarser ones or none.
+template <class T> void expectReadsAsOneByOne(Order const& order, int threads) {
+  Volume volume;
+  auto field = volume.addField<T>("f", valueOf<T>(250));
+  auto const half = std::span(order.positions).first(order.positions.size() / 2);
+  std::vector<T> values;
+  for (std::size_t n = 0; n < half.size(); ++n) values.push_back(valueOf<T>(n));
+  field.set(half, values);
+  auto const expectSame = [&](char const* when) {
+    std::vector<T> read(order.positions.size(), T{});
+    VLN::withThreads(threads, [&] { std::as_const(field).get(order.positions, read); });
+    for (std::size_t n = 0; n < read.size(); ++n)
+      ASSERT_EQ(read[n], field.get(order.positions[n])) << order.name << ", " << when << ", position " << n;
+  };
+  expectSame("pending");
+  field.editChannel().tileData(TreeIndex{0, PowerOfTwoTraits::kMaxDepth - 1}).set(valueOf<T>(77));
+  expectSame("in the tree");
+}
+
+TEST(BulkGetTest, RequirementEveryOrderIsThatOfSingleReads) {
+  for (Order const& order : orders())
+    for (int const threads : {1, 3}) {
+      expectReadsAsOneByOne<float>(order, threads);
+      if (HasFatalFailure()) return;
+    }
+}
+
+TEST(BulkGetTest, RequirementElementsOfEverySize) {
+  for (Order const& order : orders()) {
+    expectReadsAsOneByOne<std::uint8_t>(order, 2);
+    expectReadsAsOneByOne<double3>(order, 2);
+    if (HasFatalFailure()) return;
+  }
+}
+
+TEST(BulkGetTest, EdgesNothingToReadAndBeyondTheDomain) {
+  Volume volume;
+  auto field = volume.addField<float>("f", 3);
+  field.get(std::span<int3 const>(), std::span<float>());
+  constexpr int kLowest = std::numeric_limits<int>::min(), kTop = std::numeric_limits<int>::max();
+  field.set(kLow, kLow, kLow, 1);
+  field.set(kHigh, kHigh, kHigh, 2);
+  std::vector<int3> const positions{{kLow, kLow, kLow},        {kLow - 1, kLow, kLow}, {kHigh, kHigh, kHigh},
+                                    {kHigh, kHigh + 1, kHigh}, {kLowest, 0, kTop},     {kTop, kTop, kTop}};
+  std::vector<float> values(positions.size());
+  field.get(positions, values);
+  EXPECT_EQ(values, (std::vector<float>{1, 3, 2, 3, 3, 3}));
+}
+
+TEST(BulkGetTest, NegativeCountsThatDiffer) {
+  Volume volume;
+  auto field = volume.addField<float>("density", 3);
+  std::vector<float> values(2, -1.0f);
+  try {
+    field.get(std::vector<int3>(3), values);
+    FAIL();
+  } catch (std::invalid_argument const& e) {
+    EXPECT_STREQ(e.what(), "field \"density\": 3 positions with 2 values");
+  }
+  EXPECT_EQ(values, std::vector<float>(2, -1.0f));
 }
 
 } // namespace

@@ -1,5 +1,7 @@
 #include "GeometryVolume/channels/NonLeafDriverImpl.h"
 
+#include "GeometryVolume/channels/ElementSizeImpl.h"
+
 #include "GeometryVolume/core/Parallel.h"
 
 #include <algorithm>
@@ -64,20 +66,6 @@ void forChildren(NonLeafPass const& pass, std::vector<Pair> const& pairs,
     if (tile.isLeaf(slot)) continue;
     auto const* const child = static_cast<std::byte const*>(pass.tiles.elements(tile.childTreeIndex(slot)));
     if (child && f(own, child, std::span(pairs).subspan(static_cast<std::size_t>(slot) * each, each))) return;
-  }
-}
-
-// Calls f with the size of an element, for the usual ones as a constant.
-template <class F> void withSize(std::size_t size, F const& f) {
-  switch (size) {
-  case 4:
-    return f(std::integral_constant<std::size_t, 4>());
-  case 8:
-    return f(std::integral_constant<std::size_t, 8>());
-  case 12:
-    return f(std::integral_constant<std::size_t, 12>());
-  default:
-    return f(size);
   }
 }
 

@@ -1,5 +1,9 @@
 #include "GeometryVolume/channels/detail/ReadTables.h"
 
+#include "GeometryVolume/channels/ElementSizeImpl.h"
+#include "GeometryVolume/channels/ManyReadsImpl.h"
+#include "GeometryVolume/channels/detail/BlockCursor.h"
+
 #include <algorithm>
 #include <limits>
 #include <stdexcept>
@@ -118,6 +122,33 @@ ReadTables<TraitsT>::ReadTables(Container<TraitsT> const& tree,
     std::uint32_t const u[3] = {TraitsT::offset(corner.x), TraitsT::offset(corner.y),
                                 TraitsT::offset(corner.z)};
     makeBlock(corner).tiles[slot(u, kDepth)] = elements(n);
+  }
+}
+
+template <class TraitsT>
+void ReadTables<TraitsT>::read(std::span<int3 const> positions, ElementRows const& rows, void* values,
+                               FunctionRef<void(std::size_t n)> missing) const {
+  if constexpr (TraitsT::kTW == 2) {
+    withSize(rows.elementSize, [&](auto size) {
+      ManyReads<Block, decltype(size)> reads(rows, size);
+      reads.read(
+          positions,
+          [&](int3 const& p) {
+            if (m_cellDepth == kBlockDepth) __builtin_prefetch(cellIfBlocks(p.x, p.y, p.z));
+          },
+          [&](int3 const& p) { return block(p.x, p.y, p.z); }, values, missing);
+    });
+  } else {
+    BlockCursor<TraitsT> cursor(*this);
+    for (std::size_t n = 0; n < positions.size(); ++n) {
+      FinestSample const sample = cursor.find(positions[n].x, positions[n].y, positions[n].z);
+      auto const* const tile = static_cast<char const*>(sample.elements);
+      if (tile)
+        std::memcpy(static_cast<char*>(values) + n * rows.elementSize,
+                    tile + rows.offset(sample.i, sample.j, sample.k), rows.elementSize);
+      else
+        missing(n);
+    }
   }
 }
 

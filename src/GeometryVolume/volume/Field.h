@@ -47,8 +47,8 @@ template <class T> struct TileBlock {
 /// Elements are the samples of the deepest depth: one for each position of tile space. Coarser tiles stand in
 /// where there is no such tile.
 /// @threads Reads may run at once, each thread with a handle of its own. Writes, and everything that is not
-/// const here or in Volume, need the volume for themselves; forEachTile() and the bulk set() are parallel
-/// inside.
+/// const here or in Volume, need the volume for themselves; forEachTile() and the bulk set() and get()
+/// are parallel inside.
 template <class T> class VLN_API Field {
 public:
   using value_type = T;
@@ -105,6 +105,11 @@ public:
   /// value has changed then.
   /// @numeric The same volume for any number of threads.
   void set(std::span<int3 const> positions, std::span<T const> values);
+  /// values[n] = get(positions[n]), in parallel. @shape As many values as positions.
+  /// @cost At random places half of as many single calls, or less, on one thread: what they read is fetched
+  /// side by side.
+  /// @error std::invalid_argument where there are not as many values as positions.
+  void get(std::span<int3 const> positions, std::span<T> values) const;
   /// Every element of every tile, coarse ones too. Makes no tiles.
   void fill(T const& value);
 

@@ -1,9 +1,9 @@
 // BulkRuns: many positions, grouped so that threads may write their elements without meeting.
 #pragma once
 
+#include "GeometryVolume/channels/PartPlacesImpl.h"
 #include "GeometryVolume/core/FunctionRef.h"
 #include "GeometryVolume/pools/Jemalloc.h"
-#include "GeometryVolume/volume/PartPlacesImpl.h"
 #include "GeometryVolume/volume/detail/VolumeData.h"
 
 #include <algorithm>

@@ -2,6 +2,7 @@
 #pragma once
 
 #include "GeometryVolume/channels/Halo.h"
+#include "GeometryVolume/channels/ManyReadsImpl.h"
 #include "GeometryVolume/channels/NonLeafValues.h"
 #include "GeometryVolume/core/ElementTypes.h"
 #include "GeometryVolume/core/Parallel.h"
@@ -376,6 +377,11 @@ template <class T> Field<T>& Field<T>::operator=(Field&& other) noexcept = defau
 template <class T> Field<T>::~Field() = default;
 
 namespace Internal {
+inline void checkCounts(std::string const& field, std::size_t positions, std::size_t values) {
+  if (positions != values)
+    throw std::invalid_argument("field \"" + field + "\": " + std::to_string(positions) + " positions with " +
+                                std::to_string(values) + " values");
+}
 template <class T> TypedSlot<T>& typed(FieldSlot& slot) { return static_cast<TypedSlot<T>&>(slot); }
 } // namespace Internal
 
@@ -435,9 +441,7 @@ template <class T> T Field<T>::coarse(int i, int j, int k) const {
 
 template <class T> void Field<T>::set(std::span<int3 const> positions, std::span<T const> values) {
   using namespace Internal;
-  if (positions.size() != values.size())
-    throw std::invalid_argument("field \"" + m_slot->name + "\": " + std::to_string(positions.size()) +
-                                " positions with " + std::to_string(values.size()) + " values");
+  checkCounts(m_slot->name, positions.size(), values.size());
   auto const& slot = typed<T>(*m_slot);
   BulkRuns const plan = planBulk(*m_volume, *m_slot, positions, [&](std::size_t first) {
     return std::make_unique<TypedChunkTiles<T>>(slot, *m_volume->tree, values.data() + first);
@@ -451,6 +455,27 @@ template <class T> void Field<T>::set(std::span<int3 const> positions, std::span
           writeRun(run, &plan.places[first + run.begin], values.data() + first + run.begin);
       }
   });
+}
+
+template <class T> void Field<T>::get(std::span<int3 const> positions, std::span<T> values) const {
+  using namespace Internal;
+  checkCounts(m_slot->name, positions.size(), values.size());
+  m_volume->sync(*m_slot);
+  auto const& blocks = m_slot->blocks;
+  using Size = std::integral_constant<std::size_t, sizeof(T)>;
+  constexpr std::int64_t kGrain = 1 << 14;
+  parallelFor(
+      0, std::ssize(positions),
+      [&](std::int64_t begin, std::int64_t end) {
+        Field const own(*this); // for what each thread remembers
+        auto const first = static_cast<std::size_t>(begin), count = static_cast<std::size_t>(end - begin);
+        ManyReads<FieldBlock, Size> reads({sizeof(T), 4, 0}, Size());
+        reads.read(
+            positions.subspan(first, count), [&](int3 const& p) { blocks.prefetch(p); },
+            [&](int3 const& p) -> FieldBlock const* { return blocks.find(p.x, p.y, p.z); },
+            values.data() + first, [&](std::size_t n) { values[first + n] = own.get(positions[first + n]); });
+      },
+      {.grain = kGrain});
 }
 
 template <class T> void Field<T>::fill(T const& value) {
@@ -494,9 +519,7 @@ float Field<T>::sample(float3 const& position, SamplerSpace space) const require
 template <class T>
 void Field<T>::sample(std::span<float3 const> positions, std::span<float> values,
                       SamplerSpace space) const requires SampledElement<T> {
-  if (positions.size() != values.size())
-    throw std::invalid_argument("field \"" + m_slot->name + "\": " + std::to_string(positions.size()) +
-                                " positions with " + std::to_string(values.size()) + " values");
+  Internal::checkCounts(m_slot->name, positions.size(), values.size());
   static_cast<FloatVoxelSamplerLinear<Internal::VolumeShape> const*>(sampler())->sample(
       positions.data(), values.data(), static_cast<std::int64_t>(positions.size()),
       Internal::VolumeShape::kMaxDepth, space);

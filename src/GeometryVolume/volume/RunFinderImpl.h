@@ -5,9 +5,9 @@
 //   no block, scattered          --> list of a share, and the tiles are listed as missing
 #pragma once
 
+#include "GeometryVolume/channels/PartPlacesImpl.h"
 #include "GeometryVolume/core/detail/SimdLanes.h"
 #include "GeometryVolume/volume/FieldBulkImpl.h"
-#include "GeometryVolume/volume/PartPlacesImpl.h"
 
 #include <algorithm>
 #include <array>

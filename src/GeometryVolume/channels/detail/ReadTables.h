@@ -8,11 +8,14 @@
 // a cell, a block and the element: neither tile records nor the records of element vectors.
 #pragma once
 
+#include "GeometryVolume/channels/detail/ElementRows.h"
 #include "GeometryVolume/core/FunctionRef.h"
 #include "GeometryVolume/tiletree/Container.h"
 
 #include <array>
+#include <cstddef>
 #include <cstdint>
+#include <span>
 #include <vector>
 
 namespace VLN::TileTree3D::Internal {
@@ -24,6 +27,8 @@ public:
   /// Slots as in a tile.
   struct alignas(64) Block {
     std::array<void const*, static_cast<std::size_t>(TraitsT::kTileSize)> tiles{};
+
+    void const* tile(std::size_t slot) const { return tiles[slot]; }
   };
 
   /// `elements` gives the elements of a tile of the deepest depth, null for one without.
@@ -34,17 +39,19 @@ public:
   /// domain.
   Block const* block(int i, int j, int k) const noexcept {
     if (m_cellDepth != kBlockDepth) return blockInNodes(i, j, k);
-    // A cell for each block: depth and so the divisions are known here.
-    std::uint32_t const x = cellOf(i, 0), y = cellOf(j, 1), z = cellOf(k, 2);
-    if (x >= m_size[0] || y >= m_size[1] || z >= m_size[2]) return &noBlock();
-    std::size_t const cell = x + m_size[0] * (y + std::size_t(m_size[1]) * z);
-    return &m_blocks[static_cast<std::size_t>(m_cells[cell])];
+    auto const* const cell = cellIfBlocks(i, j, k);
+    return cell ? &m_blocks[static_cast<std::size_t>(*cell)] : &noBlock();
   }
   /// Asks for the elements of a block's tiles, unless that is `fetched`, and for those of the block at a
   /// point.
   /// @return The latter.
   Block const* fetch(Block const& here, Block const* fetched, int i, int j, int k,
                      std::size_t tileBytes) const noexcept;
+  /// @param values Gets an element for each position.
+  /// @param missing Called with the numbers of positions without a tile of the deepest depth, whose values it
+  /// is to give.
+  void read(std::span<int3 const> positions, ElementRows const& rows, void* values,
+            FunctionRef<void(std::size_t n)> missing) const;
   /// A block without tiles.
   Block const& noBlock() const { return m_blocks.front(); }
   std::uint64_t memUsage() const;
@@ -70,6 +77,13 @@ private:
       return (static_cast<std::uint32_t>(c) - m_low[axis]) / std::uint32_t(kBlockWidth);
     else
       return TraitsT::quotient(TraitsT::offset(c), kBlockDepth) - m_origin[axis];
+  }
+  /// The cell that holds a point, where each block has one; null beyond them.
+  std::int32_t const* cellIfBlocks(int i, int j, int k) const {
+    // Depth and so the divisions are known here.
+    std::uint32_t const x = cellOf(i, 0), y = cellOf(j, 1), z = cellOf(k, 2);
+    if (x >= m_size[0] || y >= m_size[1] || z >= m_size[2]) return nullptr;
+    return &m_cells[x + m_size[0] * (y + std::size_t(m_size[1]) * z)];
   }
   Block const* blockInNodes(int i, int j, int k) const noexcept;
   void chooseCells(Container<TraitsT> const& tree);

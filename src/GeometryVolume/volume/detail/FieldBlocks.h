@@ -41,7 +41,8 @@ struct alignas(64) FieldBlock {
             (position.z & ~7) + (n >> 2) * 4};
   }
   /// The tile that holds a sample, or null.
-  void* tile(Place at) const { return tiles[at.slot()].loadAcquire(); }
+  void* tile(Place at) const { return tile(at.slot()); }
+  void* tile(std::size_t slot) const { return tiles[slot].loadAcquire(); }
   void* tile(int i, int j, int k) const { return tile(place(i, j, k)); }
 };
 
@@ -75,7 +76,7 @@ public:
   FieldBlock::Entry& entry(int3 const& position) {
     return make(position).tiles[FieldBlock::place(position.x, position.y, position.z).slot()];
   }
-  /// Fetches what make() looks at.
+  /// Fetches what find() and make() look at.
   void prefetch(int3 const& position) const {
     __builtin_prefetch(&m_slots[hash({position.x >> 3, position.y >> 3, position.z >> 3}) & m_mask]);
   }

@@ -1,5 +1,5 @@
 // Places of many positions, by every way that this processor has, beside those told one by one.
-#include "GeometryVolume/volume/PartPlacesImpl.h"
+#include "GeometryVolume/channels/PartPlacesImpl.h"
 
 #include <gtest/gtest.h>
 

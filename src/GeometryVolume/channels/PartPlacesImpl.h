@@ -2,8 +2,7 @@
 // begins.
 #pragma once
 
-#include "GeometryVolume/volume/EightPlacesImpl.h"
-#include "GeometryVolume/volume/detail/FieldBlocks.h"
+#include "GeometryVolume/channels/EightPlacesImpl.h"
 
 #include <algorithm>
 #include <array>
@@ -53,8 +52,8 @@ public:
 
   /// @param places Gets `count` of them.
   /// @param values What is fetched meanwhile, from the part's own on; empty for nothing.
-  void find(int3 const* positions, std::size_t count, BulkPlace* places, ArrayAhead values) {
-    ArrayAhead const ahead{reinterpret_cast<std::uintptr_t>(positions), sizeof(int3)};
+  void find(Velorn::Math::int3 const* positions, std::size_t count, BulkPlace* places, ArrayAhead values) {
+    ArrayAhead const ahead{reinterpret_cast<std::uintptr_t>(positions), sizeof(Velorn::Math::int3)};
     auto* const first = reinterpret_cast<std::uint8_t*>(m_first.data());
     m_first.fill(0);
     std::size_t n = 0;
@@ -67,9 +66,9 @@ public:
       n += some;
     }
     if (n < count) {
-      int3 rest[8] = {};
+      Velorn::Math::int3 rest[8] = {};
       BulkPlace placesOfRest[8];
-      std::memcpy(rest, positions + n, (count - n) * sizeof(int3));
+      std::memcpy(rest, positions + n, (count - n) * sizeof(Velorn::Math::int3));
       m_findEights(rest, 1, positions[n - (n > 0)], {placesOfRest, m_slots.data() + n, first + n / 8});
       std::memcpy(places + n, placesOfRest, (count - n) * sizeof(BulkPlace));
     }
