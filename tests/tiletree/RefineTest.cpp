@@ -211,6 +211,24 @@ TYPED_TEST(Refine, BranchSizesOfOldTilesAreSetToo) {
   for (auto t = tree.cbeginTiles(); t != tree.cendTiles(); ++t) EXPECT_GT((*t).branchSize(), 0);
 }
 
+// Whoever had tiles to write may have changed any size, also of the tree that this one is a copy of.
+TYPED_TEST(Refine, BranchSizesThatATraversalWroteAreSetInCopiesToo) {
+  struct Writer : Visitor<Container<TypeParam>> {
+    using Visitor<Container<TypeParam>>::beginTile;
+    void beginTile(typename Container<TypeParam>::TileType& t) override { t.setBranchSize(-1); }
+    Writer* clone() const override { return new Writer; }
+  } writer;
+  Container<TypeParam> tree;
+  this->addRow(tree, 20);
+  tree.traverse(writer, kParallelFlat);
+  Container<TypeParam> copy(tree);
+  Container<TypeParam> source;
+  this->addRow(source, 20, 10);
+  copy.refine({&source}, nullptr, true);
+  EXPECT_TRUE(copy.checkBranchSizes(false));
+  EXPECT_EQ(tree.tile(0, TypeParam::kMaxDepth).branchSize(), -1);
+}
+
 TYPED_TEST(Refine, BranchSizesAreSetOnceAtTheEnd) {
   auto const a = this->randomTree(5, 120), b = this->randomTree(6, 120);
   Container<TypeParam> tree;

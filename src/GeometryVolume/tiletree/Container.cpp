@@ -215,7 +215,10 @@ template <class TraitsT> bool Container<TraitsT>::sharesTiles(Container const& o
 template <class TraitsT> auto Container<TraitsT>::getData() const -> Data const* {
   return m_data ? &data() : nullptr;
 }
-template <class TraitsT> void Container<TraitsT>::detachTiles() { data().detachTiles(); }
+template <class TraitsT> void Container<TraitsT>::handTilesOut() {
+  data().detachTiles();
+  data().m_tilesHandedOut = true;
+}
 template <class TraitsT> AffinityPartitioner& Container<TraitsT>::affinityPartitioner(int d) const {
   return *data().m_affinityPartitioners[d];
 }

@@ -277,8 +277,8 @@ protected:
   TreeIndex addTileBelow(TreeIndex above, int i, int j, int k, int depth);
   std::int64_t allocateTile(int depth, TileType*& out);
   void allocateTiles(int depth, std::int64_t n);
-  /// Makes the tile arrays this container's alone, before they are changed.
-  void detachTiles();
+  /// Before others get tiles to write: makes the arrays this container's alone.
+  void handTilesOut();
   /// Sets the count of the depth. The caller restores the total.
   void resize(std::int64_t n, int depth);
   std::int64_t tileCapacity(int depth) const { return m_data->tiles(depth).capacity(); }

@@ -105,8 +105,7 @@ template <class TileType> std::int64_t countChildren(TileType const& t) {
 
 } // namespace Internal
 
-template <class TraitsT>
-void ContainerBuilder<TraitsT>::setBranchSizes(Cancellation cancellation, std::int64_t deepest) {
+template <class TraitsT> void ContainerBuilder<TraitsT>::setBranchSizes(Cancellation cancellation) {
   // What a bottom-up traversal would do, as one loop over each array: nothing but sums of children.
   Canceller::cancelID(Canceller::kTraverse);
   data().detachTiles();
@@ -114,9 +113,9 @@ void ContainerBuilder<TraitsT>::setBranchSizes(Cancellation cancellation, std::i
     auto& tiles = data().editTiles(d);
     auto const* const below = d < kMaxDepth ? data().tiles(d + 1).begin() : nullptr;
     bool const belowIsDeepest = d + 1 == kMaxDepth; // whose sizes are known
-    // The host is asked whether to go on wherever there are tiles.
-    std::int64_t const count =
-        d < kMaxDepth ? tiles.size() : std::max(deepest, std::min<std::int64_t>(1, tiles.size()));
+    // The host is asked whether to go on wherever there are tiles, also where none needs to be looked at.
+    bool const all = d < kMaxDepth || data().m_tilesHandedOut;
+    std::int64_t const count = all ? tiles.size() : std::min<std::int64_t>(1, tiles.size());
     parallelFor(0, count,
                 [&](std::int64_t begin, std::int64_t end) {
                   for (std::int64_t n = begin; n < end; ++n) {

@@ -94,10 +94,7 @@ public:
   void truncate(int depth);
   /// Takes all scratch containers back, truncated from a depth on; for -1, from where each gained tiles.
   void returnThreadLocal(int fromDepth);
-  /// @param deepest How many tiles of the deepest depth are looked at, from the first on. Those behind them
-  /// are new, with the size that they were made with.
-  void setBranchSizes(Cancellation cancellation, std::int64_t deepest);
-  void setBranchSizes(Cancellation cancellation) { setBranchSizes(cancellation, tileCount(kMaxDepth)); }
+  void setBranchSizes(Cancellation cancellation);
 
 private:
   using Siblings = Internal::Siblings<TraitsT>;

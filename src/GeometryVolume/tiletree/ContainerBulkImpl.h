@@ -275,7 +275,7 @@ void ContainerBuilder<TraitsT>::addTilesInBulk(TileLists const& corners, TileLis
     listNewTiles(before, newTiles);
   }
   growth.keep();
-  setBranchSizes(Cancellation::kPoll, growth.before()[kMaxDepth]);
+  setBranchSizes(Cancellation::kPoll);
 }
 
 template <class TraitsT>

@@ -70,6 +70,9 @@ template <class TraitsT> struct VLN_API ContainerData : ContainerTiles<TraitsT> 
   std::shared_ptr<CompressedHaloTable<TraitsT> const> m_compressedHalos;
   HaloCompression m_haloCompression;
   RootTable m_roots;
+  /// Whether anyone else ever had tiles to write. Else those of the deepest depth have the sizes that they
+  /// were made with.
+  bool m_tilesHandedOut = false;
 
   // Acceleration grid: a dense box of tile indices at one depth.
   std::array<std::int32_t, 3> m_gridSize{0, 0, 0};

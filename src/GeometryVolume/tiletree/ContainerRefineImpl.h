@@ -287,9 +287,8 @@ template <class TraitsT> void ContainerBuilder<TraitsT>::refine(Tree const& sour
 template <class TraitsT>
 void Container<TraitsT>::refineInternal(Container const& source, bool last, TileLists* newTiles) {
   ContainerBuilder<TraitsT> builder(*this);
-  std::int64_t const deepest = tileCount(kMaxDepth); // those that are made have their sizes
   builder.refine(source, newTiles);
-  if (last) builder.setBranchSizes(Cancellation::kPoll, deepest);
+  if (last) builder.setBranchSizes(Cancellation::kPoll);
 }
 
 template <class TraitsT>

@@ -160,7 +160,7 @@ typename Container<TraitsT>::ConstTileIterator Container<TraitsT>::cendTiles() c
 }
 template <class TraitsT>
 typename Container<TraitsT>::TileIterator Container<TraitsT>::beginTiles(std::int64_t n) {
-  detachTiles();
+  handTilesOut();
   TileIterator it(*this);
   it.init(true);
   if (n > 0) it.increment(n);

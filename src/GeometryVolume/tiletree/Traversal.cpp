@@ -78,7 +78,7 @@ template <bool IsConst, class TraitsT>
 void TraversalEngine<IsConst, TraitsT>::run(ContainerRef container, VisitorType& visitor, TraversalMode mode,
                                             TraversalRange const& range, VisitorResults results) {
   Canceller::cancelID(Canceller::kTraverse);
-  if constexpr (!IsConst) container.detachTiles();
+  if constexpr (!IsConst) container.handTilesOut();
   if (static_cast<int>(mode) == 9) mode = kBreadthFirst;
   visitor.beginTraverse();
   TraversalEngine(container, visitor, range, results).dispatch(mode);
