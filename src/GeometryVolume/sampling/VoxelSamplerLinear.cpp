@@ -106,49 +106,65 @@ VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::forgetTiles() {
 }
 
 // Calls f with the corners of a position's cell and 1 / width of its tile's voxels.
+// @param p In tile space.
+// @param isAbove Whether the tables are known to have no tile there.
 // @return The default value where there is no tile.
 VLN_SAMPLER_TEMPLATE template <class F>
-[[gnu::always_inline]] inline float VLN_SAMPLER::withCorners(Position const& position, int depth,
-                                                             SamplerSpace space, F const& f) const {
+[[gnu::always_inline]] inline float VLN_SAMPLER::withCorners(Internal::FloatLanes p, int depth, bool isAbove,
+                                                             F const& f) const {
   using namespace Internal;
   if (depth > m_maxDepth) depth = m_maxDepth;
-  auto const p = this->toTileSpace(position, space);
-  SampleCell cell;
-  CellCorners corners;
   TileSamples samples;
   bool isKnown = tileArrays() == m_arrays;
   if (m_region.holds(p, depth) && isKnown)
     samples = m_region.samples();
   else
-    isKnown = isKnown && depth == TraitsT::kMaxDepth && m_blocks.isOpen() && findFinest(p, samples);
-  if (isKnown) [[likely]] {
-    placeInCell<D>(p, __builtin_convertvector(samples.corner, FloatLanes), samples.scale.samples,
-                   lanesOf(this->m_offset), cell);
-    if (m_channelWide) return f(wideCorners(samples.data, cell), samples.scale.invVoxelWidth);
-    if (isInside(cell)) {
-      ++m_accessCount;
-      return f(insideCorners(samples.data, cell), samples.scale.invVoxelWidth);
-    }
-    if (m_edge.is(samples.data, cell.ijk) || finestEdge(samples, cell)) {
-      ++m_accessCount;
-      return f({m_edge.low, m_edge.width, cell.weights}, samples.scale.invVoxelWidth);
-    }
+    isKnown =
+        isKnown && !isAbove && depth == TraitsT::kMaxDepth && m_blocks.isOpen() && findFinest(p, samples);
+  return isKnown ? withCornersIn(samples, p, depth, f) : withCornersFound(p, depth, f);
+}
+// The same where the tile is known.
+VLN_SAMPLER_TEMPLATE template <class F>
+[[gnu::always_inline]] inline float VLN_SAMPLER::withCornersIn(Internal::TileSamples const& samples,
+                                                               Internal::FloatLanes p, int depth,
+                                                               F const& f) const {
+  using namespace Internal;
+  SampleCell cell;
+  placeInCell<D>(p, __builtin_convertvector(samples.corner, FloatLanes), samples.scale.samples,
+                 lanesOf(this->m_offset), cell);
+  if (m_channelWide) return f(wideCorners(samples.data, cell), samples.scale.invVoxelWidth);
+  if (isInside(cell)) {
+    ++m_accessCount;
+    return f(insideCorners(samples.data, cell), samples.scale.invVoxelWidth);
   }
+  if (m_edge.is(samples.data, cell.ijk) || finestEdge(samples, cell)) {
+    ++m_accessCount;
+    return f({m_edge.low, m_edge.width, cell.weights}, samples.scale.invVoxelWidth);
+  }
+  return withCornersFound(p, depth, f);
+}
+// The same by a search.
+VLN_SAMPLER_TEMPLATE template <class F>
+[[gnu::always_inline]] inline float VLN_SAMPLER::withCornersFound(Internal::FloatLanes p, int depth,
+                                                                  F const& f) const {
+  SampleCell cell;
+  CellCorners corners;
   return findCorners(p, depth, cell, corners) ? f(corners, cell.invVoxelWidth) : m_defaultValue;
 }
 
 VLN_SAMPLER_TEMPLATE float VLN_SAMPLER::sample(Position const& position, int depth,
                                                SamplerSpace space) const {
-  return withCorners(position, depth, space,
+  return withCorners(this->toTileSpace(position, space), depth, false,
                      [](CellCorners const& corners, float) { return corners.value(); });
 }
 VLN_SAMPLER_TEMPLATE float VLN_SAMPLER::sampleGradient(Position const& position, int depth,
                                                        SamplerSpace space, Position* gradient) const {
   Position slope{0.0f, 0.0f, 0.0f}; // apart: the position may be where the gradient is to be
-  float const value = withCorners(position, depth, space, [&](CellCorners const& corners, float inverse) {
-    slope = corners.slope() * (inverse * 2.0f * m_invVoxelSize);
-    return corners.value();
-  });
+  float const value = withCorners(this->toTileSpace(position, space), depth, false,
+                                  [&](CellCorners const& corners, float inverse) {
+                                    slope = corners.slope() * (inverse * 2.0f * m_invVoxelSize);
+                                    return corners.value();
+                                  });
   *gradient = slope;
   return value;
 }
@@ -300,49 +316,76 @@ VLN_SAMPLER_TEMPLATE [[gnu::noinline]] bool VLN_SAMPLER::finestEdge(Internal::Ti
 }
 
 // Goes through positions by portions, whose data it fetches first.
+// @param f Called with the number of a position, the position, whether the tables were asked for its tile,
+// and what they gave.
 VLN_SAMPLER_TEMPLATE template <class F>
 void VLN_SAMPLER::forBatches(Position const* positions, std::int64_t count, int depth, SamplerSpace space,
                              F const& f) const {
-  constexpr std::int64_t kPortion = 32;
+  using namespace Internal;
+  constexpr std::size_t kPortion = 32;
   // So many reads pay for the tables if most of them go to other tiles.
   if (depth >= TraitsT::kMaxDepth) openTables(count / 8);
+  int const w = m_channelWide ? D + 1 : D;
+  std::array<FloatLanes, kPortion> p;
+  std::array<IntLanes, kPortion> corners;
+  std::array<float const*, kPortion> tiles;
   for (std::int64_t begin = 0; begin < count; begin += kPortion) {
-    std::int64_t const end = std::min(count, begin + kPortion);
-    if (m_blocks.isOpen() && depth >= TraitsT::kMaxDepth) {
-      std::array<Internal::IntLanes, kPortion> floors;
-      auto blocks = m_blocks;
-      for (std::int64_t n = begin; n < end; ++n) {
-        auto const c = Internal::floorLanesAnywhere(this->toTileSpace(positions[n], space));
-        floors[static_cast<std::size_t>(n - begin)] = c;
-        blocks.seek(c[0], c[1], c[2]);
-        blocks.prefetch();
-      }
-      blocks = m_blocks;
-      int const w = m_channelWide ? D + 1 : D;
-      for (std::int64_t n = begin; n < end; ++n) {
-        auto const c = floors[static_cast<std::size_t>(n - begin)];
-        auto const at = blocks.find(c[0], c[1], c[2]);
-        if (!at.elements) continue;
-        auto const* const low =
-            static_cast<float const*>(at.elements) + (int(at.i) + w * (int(at.j) + w * int(at.k)));
-        __builtin_prefetch(low);
-        __builtin_prefetch(low + (w * w + w + 1));
-      }
+    auto const n = static_cast<std::size_t>(std::min<std::int64_t>(kPortion, count - begin));
+    for (std::size_t i = 0; i < n; ++i)
+      p[i] = this->toTileSpace(positions[begin + static_cast<std::int64_t>(i)], space);
+    bool const byTables = m_blocks.isOpen() && depth >= TraitsT::kMaxDepth && tileArrays() == m_arrays;
+    // Ways through empty space stay in one region for long: there is nothing to fetch.
+    if (!byTables || (m_region.holds(p[0], m_maxDepth) && m_region.holds(p[n - 1], m_maxDepth))) {
+      for (std::size_t i = 0; i < n; ++i) f(begin + static_cast<std::int64_t>(i), p[i], false, nullptr);
+      continue;
     }
-    for (std::int64_t n = begin; n < end; ++n) f(n);
+    auto blocks = m_blocks;
+    for (std::size_t i = 0; i < n; ++i) {
+      corners[i] = floorLanesAnywhere(p[i]);
+      blocks.seek(corners[i][0], corners[i][1], corners[i][2]);
+      blocks.prefetch();
+    }
+    for (std::size_t i = 0; i < n; ++i) {
+      FinestSample const at = m_blocks.find(corners[i][0], corners[i][1], corners[i][2]);
+      tiles[i] = static_cast<float const*>(at.elements);
+      if (!tiles[i]) continue;
+      float const* const low = tiles[i] + (int(at.i) + w * (int(at.j) + w * int(at.k)));
+      __builtin_prefetch(low);
+      __builtin_prefetch(low + (w * w + w + 1));
+      corners[i] -= IntLanes{int(at.i), int(at.j), int(at.k), 0};
+    }
+    for (std::size_t i = 0; i < n; ++i) {
+      TileSamples const samples{tiles[i], corners[i], kSampleScales<TraitsT>[TraitsT::kMaxDepth]};
+      f(begin + static_cast<std::int64_t>(i), p[i], true, tiles[i] ? &samples : nullptr);
+    }
   }
 }
 
 VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::sample(Position const* positions, float* values, std::int64_t count,
                                               int depth, SamplerSpace space) const {
-  forBatches(positions, count, depth, space,
-             [&](std::int64_t n) { values[n] = sample(positions[n], depth, space); });
+  auto const value = [](CellCorners const& corners, float) { return corners.value(); };
+  forBatches(
+      positions, count, depth, space,
+      [&](std::int64_t n, Internal::FloatLanes p, bool isLookedUp, Internal::TileSamples const* samples) {
+        values[n] = samples ? withCornersIn(*samples, p, m_maxDepth, value)
+                            : withCorners(p, depth, isLookedUp, value);
+      });
 }
 VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::sampleGradient(Position const* positions, float* values,
                                                       Position* gradients, std::int64_t count, int depth,
                                                       SamplerSpace space) const {
-  forBatches(positions, count, depth, space,
-             [&](std::int64_t n) { values[n] = sampleGradient(positions[n], depth, space, &gradients[n]); });
+  forBatches(
+      positions, count, depth, space,
+      [&](std::int64_t n, Internal::FloatLanes p, bool isLookedUp, Internal::TileSamples const* samples) {
+        Position slope{0.0f, 0.0f, 0.0f};
+        auto const value = [&](CellCorners const& corners, float inverse) {
+          slope = corners.slope() * (inverse * 2.0f * m_invVoxelSize);
+          return corners.value();
+        };
+        values[n] = samples ? withCornersIn(*samples, p, m_maxDepth, value)
+                            : withCorners(p, depth, isLookedUp, value);
+        gradients[n] = slope;
+      });
 }
 
 // Finds the tile of the same depth that lies on in a direction.

@@ -159,8 +159,11 @@ private:
   bool covers(TreeIndex const& tile) const {
     return tile.index >= 0 && tile.depth >= (m_minDepth > 0 ? m_minDepth : 0);
   }
+  template <class F> float withCorners(Internal::FloatLanes p, int depth, bool isAbove, F const& f) const;
   template <class F>
-  float withCorners(Position const& position, int depth, SamplerSpace space, F const& f) const;
+  float withCornersIn(Internal::TileSamples const& samples, Internal::FloatLanes p, int depth,
+                      F const& f) const;
+  template <class F> float withCornersFound(Internal::FloatLanes p, int depth, F const& f) const;
   bool findCorners(Internal::FloatLanes p, int depth, SampleCell& cell, CellCorners& corners) const;
   CellCorners cornersOf(SampleCell const& cell) const;
   bool findFinest(Internal::FloatLanes p, Internal::TileSamples& samples) const;
