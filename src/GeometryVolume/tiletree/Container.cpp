@@ -15,6 +15,7 @@
 #include "GeometryVolume/tiletree/TileHalo.h"
 #include "GeometryVolume/tiletree/TraversalEngineImpl.h"
 
+#include <algorithm>
 #include <bit>
 #include <limits>
 #include <ostream>
@@ -100,7 +101,8 @@ void Container<TraitsT>::memUse(std::uint64_t& used, std::uint64_t& allocated, b
   used += sizeof(m_data), allocated += sizeof(m_data);
   std::uint64_t dataUsed = 0, dataAllocated = 0;
   data().memUse(dataUsed, dataAllocated);
-  auto const sharers = notShared ? std::uint64_t(1) : static_cast<std::uint64_t>(m_data.useCount());
+  auto const sharers =
+      static_cast<std::uint64_t>(notShared ? 1 : std::max<std::int64_t>(1, m_data.useCount()));
   used += dataUsed / sharers, allocated += dataAllocated / sharers;
 }
 

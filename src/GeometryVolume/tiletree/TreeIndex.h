@@ -29,7 +29,7 @@ struct VoxelCoord {
   Velorn::Math::int3 ijk() const { return {i, j, k}; }
   bool operator==(VoxelCoord const&) const = default;
   /// By i, j, k and then by depth.
-  auto operator<=>(VoxelCoord const&) const = default;
+  auto operator<=>(VoxelCoord const&) const = default; // NOLINT(modernize-use-nullptr): none is there
 };
 
 /// A voxel: a tile and the voxel's position inside it, each component in 0..kTW-1.
