@@ -7,7 +7,9 @@
 #include "GeometryVolume/pools/KeptBlocksImpl.h"
 
 #include <algorithm>
+#include <memory>
 #include <mutex>
+#include <utility>
 
 namespace VLN::TileTree3D::Internal {
 
@@ -22,13 +24,21 @@ std::int64_t tileSlotStride(std::int64_t elements, std::size_t elementSize) {
 void* BlockList::add(std::int64_t elements, std::size_t elementSize, Source source) {
   auto const count = static_cast<std::uint64_t>(elements);
   if (count > static_cast<std::uint64_t>(INT64_MAX) / elementSize) return nullptr;
-  m_blocks.push_back(nullptr); // first: a block without a place would be lost
-  void* const block = source(count, elementSize);
-  if (block)
-    m_blocks.back() = block;
-  else
-    m_blocks.pop_back();
-  return block;
+  auto entry = std::make_unique<Entry>(); // first: a block without a place would be lost
+  entry->block = source(count, elementSize);
+  if (!entry->block) return nullptr;
+  entry->next = m_first;
+  m_first = entry.release();
+  ++m_size;
+  return m_first->block;
+}
+
+void BlockList::take(BlockList& from) noexcept {
+  Entry** end = &from.m_first;
+  while (*end) end = &(*end)->next;
+  *end = m_first;
+  m_first = std::exchange(from.m_first, nullptr);
+  m_size += std::exchange(from.m_size, 0);
 }
 
 void* BlockList::allocate(std::int64_t elements, std::size_t elementSize) {
@@ -56,14 +66,14 @@ void* BlockList::allocate(std::int64_t elements, std::size_t elementSize, bool& 
 }
 
 void BlockList::clear() {
-  for (void* block : m_blocks) {
-    if (!block) continue;
+  while (m_first) {
+    std::unique_ptr<Entry> const entry(std::exchange(m_first, m_first->next));
     if (ChannelMemoryPool::enabled())
-      ChannelMemoryPool::deallocate(block);
+      ChannelMemoryPool::deallocate(entry->block);
     else
-      VLN::Internal::deallocateKept(block);
+      VLN::Internal::deallocateKept(entry->block);
   }
-  m_blocks.clear();
+  m_size = 0;
 }
 
 void handOverBlocks(BlockList& into, BlockList& from) noexcept {

@@ -76,7 +76,8 @@ public:
       throw std::invalid_argument(std::to_string(positions.size()) + " positions with " +
                                   std::to_string(values.size()) + " values");
     using Tile = typename ChannelT::ConstTile;
-    m_tables->read(positions, {sizeof(value_type), Tile::kWidth, Tile::index(0, 0, 0)}, values.data(),
+    m_tables->read(positions.data(), positions.size(),
+                   {sizeof(value_type), Tile::kWidth, Tile::index(0, 0, 0)}, values.data(),
                    [&](std::size_t n) { values[n] = value(positions[n]); });
   }
 

@@ -126,13 +126,13 @@ ReadTables<TraitsT>::ReadTables(Container<TraitsT> const& tree,
 }
 
 template <class TraitsT>
-void ReadTables<TraitsT>::read(std::span<int3 const> positions, ElementRows const& rows, void* values,
-                               FunctionRef<void(std::size_t n)> missing) const {
+void ReadTables<TraitsT>::read(int3 const* positions, std::size_t count, ElementRows const& rows,
+                               void* values, FunctionRef<void(std::size_t n)> missing) const {
   if constexpr (TraitsT::kTW == 2) {
     withSize(rows.elementSize, [&](auto size) {
       ManyReads<Block, decltype(size)> reads(rows, size);
       reads.read(
-          positions,
+          std::span(positions, count),
           [&](int3 const& p) {
             if (m_cellDepth == kBlockDepth) __builtin_prefetch(cellIfBlocks(p.x, p.y, p.z));
           },
@@ -140,7 +140,7 @@ void ReadTables<TraitsT>::read(std::span<int3 const> positions, ElementRows cons
     });
   } else {
     BlockCursor<TraitsT> cursor(*this);
-    for (std::size_t n = 0; n < positions.size(); ++n) {
+    for (std::size_t n = 0; n < count; ++n) {
       FinestSample const sample = cursor.find(positions[n].x, positions[n].y, positions[n].z);
       auto const* const tile = static_cast<char const*>(sample.elements);
       if (tile)

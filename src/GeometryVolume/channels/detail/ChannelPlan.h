@@ -9,7 +9,6 @@
 
 #include <cstddef>
 #include <cstdint>
-#include <list>
 #include <vector>
 
 namespace VLN::TileTree3D::Internal {
@@ -38,16 +37,21 @@ public:
   /// @param zeros Tells afterwards whether it is.
   void* allocate(std::int64_t elements, std::size_t elementSize, bool& zeros);
   /// Takes all blocks of another list. Needs no memory.
-  void take(BlockList& from) noexcept { m_blocks.splice(m_blocks.end(), from.m_blocks); }
+  void take(BlockList& from) noexcept;
   void clear();
-  bool empty() const { return m_blocks.empty(); }
-  std::size_t size() const { return m_blocks.size(); }
+  bool empty() const { return m_size == 0; }
+  std::size_t size() const { return m_size; }
 
 private:
   using Source = FunctionRef<void*(std::uint64_t elements, std::uint64_t elementSize)>;
   void* add(std::int64_t elements, std::size_t elementSize, Source source);
 
-  std::list<void*> m_blocks;
+  struct Entry {
+    void* block = nullptr;
+    Entry* next = nullptr;
+  };
+  Entry* m_first = nullptr;
+  std::size_t m_size = 0;
 };
 /// Appends `from` to `into` and empties it.
 /// @threads Several threads may hand blocks to one list.

@@ -15,7 +15,6 @@
 #include <array>
 #include <cstddef>
 #include <cstdint>
-#include <span>
 #include <vector>
 
 namespace VLN::TileTree3D::Internal {
@@ -47,10 +46,10 @@ public:
   /// @return The latter.
   Block const* fetch(Block const& here, Block const* fetched, int i, int j, int k,
                      std::size_t tileBytes) const noexcept;
-  /// @param values Gets an element for each position.
+  /// @param values Gets an element for each of `count` positions.
   /// @param missing Called with the numbers of positions without a tile of the deepest depth, whose values it
   /// is to give.
-  void read(std::span<int3 const> positions, ElementRows const& rows, void* values,
+  void read(int3 const* positions, std::size_t count, ElementRows const& rows, void* values,
             FunctionRef<void(std::size_t n)> missing) const;
   /// A block without tiles.
   Block const& noBlock() const { return m_blocks.front(); }

@@ -7,8 +7,8 @@
 #include "GeometryVolume/pools/TileDataAllocator.h"
 
 #include <cstddef>
-#include <iterator>
 #include <stdexcept>
+#include <vector>
 
 namespace VLN::TileTree3D::Internal {
 

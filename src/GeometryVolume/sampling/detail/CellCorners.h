@@ -5,7 +5,6 @@
 
 #include <array>
 #include <cstdint>
-#include <cstring>
 
 namespace VLN::TileTree3D::Internal {
 
@@ -19,8 +18,8 @@ struct CellCorners {
   static FloatLanes rows(float const* p, float const* q) {
     using Pair = float __attribute__((vector_size(8)));
     Pair a, b;
-    std::memcpy(&a, p, sizeof a);
-    std::memcpy(&b, q, sizeof b);
+    __builtin_memcpy(&a, p, sizeof a); // as std::memcpy, without its header
+    __builtin_memcpy(&b, q, sizeof b);
     return __builtin_shufflevector(a, b, 0, 1, 2, 3);
   }
   static float lerp(float a, float b, float t) { return (b - a) * t + a; }

@@ -5,8 +5,8 @@
 #include "GeometryVolume/sampling/detail/SampleCell.h"
 
 #include <array>
-#include <cstring>
-#include <limits>
+#include <bit>
+#include <climits>
 
 namespace VLN::TileTree3D::Internal {
 
@@ -22,9 +22,7 @@ public:
   /// @param depth What is asked for.
   bool holds(FloatLanes p, int depth) const {
     auto const inside = (p >= m_low) & (p < m_high);
-    std::array<std::int64_t, 2> both; // the fourth lane is always inside
-    static_assert(sizeof both == sizeof inside);
-    std::memcpy(&both, &inside, sizeof both);
+    auto const both = std::bit_cast<std::array<std::int64_t, 2>>(inside); // the fourth lane is always inside
     return (both[0] & both[1]) == -1 && depth == m_depth;
   }
   TileSamples const& samples() const { return m_samples; }
@@ -36,7 +34,7 @@ public:
     m_low = __builtin_convertvector(corner, FloatLanes), m_high = __builtin_convertvector(end, FloatLanes);
     auto const exact = (__builtin_convertvector(m_low, IntLanes) == corner) &
                        (__builtin_convertvector(m_high, IntLanes) == end);
-    m_low[3] = -std::numeric_limits<float>::infinity(), m_high[3] = std::numeric_limits<float>::infinity();
+    m_low[3] = -__builtin_huge_valf(), m_high[3] = __builtin_huge_valf();
     m_depth = exact[0] & exact[1] & exact[2] ? depth : INT_MIN;
     m_samples = samples;
   }
