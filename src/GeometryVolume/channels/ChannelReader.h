@@ -69,7 +69,8 @@ public:
   }
   value_type const& value(int3 const& p) const noexcept { return value(p.x, p.y, p.z); }
   /// Many positions: values[n] = value(positions[n]). @shape As many values as positions.
-  /// @cost At random places a third of as many single calls, or less: what they read is fetched side by side.
+  /// @cost At random places in a volume beyond the processor's caches a third to two thirds of as many single
+  /// calls: what they read is fetched side by side. Else about the same.
   /// @error std::invalid_argument where there are not as many values as positions.
   void read(std::span<int3 const> positions, std::span<value_type> values) const {
     if (positions.size() != values.size())

@@ -106,8 +106,8 @@ public:
   /// @numeric The same volume for any number of threads.
   void set(std::span<int3 const> positions, std::span<T const> values);
   /// values[n] = get(positions[n]), in parallel. @shape As many values as positions.
-  /// @cost At random places half of as many single calls, or less, on one thread: what they read is fetched
-  /// side by side.
+  /// @cost On one thread, at random places in a volume beyond the processor's caches, about a third of as
+  /// many single calls: what they read is fetched side by side. Else about the same.
   /// @error std::invalid_argument where there are not as many values as positions.
   void get(std::span<int3 const> positions, std::span<T> values) const;
   /// Every element of every tile, coarse ones too. Makes no tiles.

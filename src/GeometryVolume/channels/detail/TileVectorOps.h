@@ -8,7 +8,7 @@
 
 #include <cstddef>
 #include <stdexcept>
-#include <vector>
+#include <vector> // and iterators' categories, without all of <iterator>
 
 namespace VLN::TileTree3D::Internal {
 
