@@ -50,7 +50,7 @@ std::array<Rgb, 256> sequentialTable() {
   std::array<Rgb, 256> table;
   for (int n = 0; n < 256; ++n) {
     double const t = n / 255.0;
-    table[static_cast<std::size_t>(n)] = fromLch(0.24 + 0.69 * t, 0.145, 312 - 205 * t);
+    table[n] = fromLch(0.24 + 0.69 * t, 0.145, 312 - 205 * t);
   }
   return table;
 }
@@ -60,8 +60,7 @@ std::array<Rgb, 256> divergingTable() {
   for (int n = 0; n < 256; ++n) {
     double const t = (n - 127.5) / 127.5; // -1 .. 1
     double const far = std::abs(t);
-    table[static_cast<std::size_t>(n)] =
-        fromLch(0.97 - 0.55 * far, 0.19 * std::min(1.0, 1.4 * far), t < 0 ? 258 : 29);
+    table[n] = fromLch(0.97 - 0.55 * far, 0.19 * std::min(1.0, 1.4 * far), t < 0 ? 258 : 29);
   }
   return table;
 }
@@ -118,7 +117,7 @@ ColorMap ColorMap::forRange(double low, double high) {
 Rgb ColorMap::color(double value) const {
   if (std::isnan(value)) return notANumber();
   double const t = std::clamp((value - m_low) / (m_high - m_low), 0.0, 1.0);
-  return colorTable(m_kind)[static_cast<std::size_t>(std::lround(255 * t))];
+  return colorTable(m_kind)[std::lround(255 * t)];
 }
 
 Image ColorMap::scale(int height, int textScale, Marks const& marks) const {

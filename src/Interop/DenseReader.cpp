@@ -53,8 +53,8 @@ public:
                 at = accessor.tile(at).parentTreeIndex();
               for (; x < stop; ++x, to += bytes) {
                 T const& value =
-                    at.valid() ? elements(tiles, at)[static_cast<std::size_t>(ChannelT::ConstTile::index(
-                                     accessor.tile(at).childDataIJK(x * width, int(y) * width, z * width)))]
+                    at.valid() ? elements(tiles, at)[ChannelT::ConstTile::index(
+                                     accessor.tile(at).childDataIJK(x * width, int(y) * width, z * width))]
                                : m_channel->defaultValue();
                 std::memcpy(to, reinterpret_cast<char const*>(&value) + std::size_t(first) * sizeof(Scalar),
                             bytes);
@@ -80,7 +80,7 @@ private:
     return accessor.treeIndex(int(x * width), int(y * width), int(z * width), depth, false);
   }
   template <class Tiles> static auto const& elements(Tiles const& tiles, TileTree3D::TreeIndex const& at) {
-    return tiles[static_cast<std::size_t>(at.depth)][static_cast<std::size_t>(at.index)];
+    return tiles[at.depth][at.index];
   }
 
   Ostil::Ptr<Tree> m_tree;

@@ -134,7 +134,7 @@ bool isMeshFile(std::string const& path) {
   std::ifstream in(path, std::ios::binary);
   std::string head(1 << 16, '\0');
   in.read(head.data(), static_cast<std::streamsize>(head.size()));
-  head.resize(static_cast<std::size_t>(in.gcount()));
+  head.resize(in.gcount());
   head.resize(std::min(head.find("end_header"), head.size()));
   auto const faces = head.find("\nelement face ");
   if (faces == std::string::npos) return false;

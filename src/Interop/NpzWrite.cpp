@@ -26,7 +26,7 @@ void writeNpz(std::string const& path, DenseVolume const& volume, Progress const
     zip->begin(name + ".npy");
     std::string const header = npyHeader(descr, shape, true);
     zip->write(header.data(), header.size());
-    slice.resize(static_cast<std::size_t>(plan.count[0] * plan.count[1] * reader.scalarBytes));
+    slice.resize(plan.count[0] * plan.count[1] * reader.scalarBytes);
     for (int c = 0; c < reader.components; ++c)
       for (int z = plan.box.min.z; z < plan.box.max.z; ++z) {
         reader.slice(plan.box, z, volume.depth, c, c + 1, slice.data());

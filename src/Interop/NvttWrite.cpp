@@ -99,7 +99,7 @@ private:
     auto const count = static_cast<std::int64_t>(m_sections.size());
     parallelFor(0, count, [&](std::int64_t begin, std::int64_t end) {
       for (std::int64_t n = begin; n < end; ++n) {
-        NvttSection& s = m_sections[static_cast<std::size_t>(n)];
+        NvttSection& s = m_sections[n];
         s.hash = hash64(at(s.offset), s.length);
         unsigned char* const entry = m_directory.data() + static_cast<std::size_t>(n) * kNvttEntryBytes;
         store(entry + kNvttEntryTypeOffset, static_cast<std::uint32_t>(s.type));

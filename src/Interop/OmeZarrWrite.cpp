@@ -305,7 +305,7 @@ private:
       parallelFor(first, std::min(first + kChunksAtOnce, count), [&](std::int64_t begin, std::int64_t end) {
         std::vector<std::byte> values, slice;
         for (auto n = begin; n < end; ++n) {
-          auto const& place = places[static_cast<std::size_t>(n / reader.components)];
+          auto const& place = places[n / reader.components];
           auto const c = static_cast<int>(n % reader.components);
           values = empty;
           read(level, reader, place, c, chunk, values, slice);
@@ -328,8 +328,8 @@ private:
       std::array<std::int64_t, 3> first{}, last{};
       for (int a = 0; a < 3; ++a) {
         // Corners of tiles are multiples of their widths, and those of what the level's samples are.
-        first[static_cast<std::size_t>(a)] = low[a] / width;
-        last[static_cast<std::size_t>(a)] = (low[a] + wide) / width;
+        first[a] = low[a] / width;
+        last[a] = (low[a] + wide) / width;
       }
       marked.add(first, last);
     };
@@ -366,7 +366,7 @@ private:
                    std::vector<std::byte>& slice) {
     IndexBox box;
     for (int a = 0; a < 3; ++a) {
-      box.min[a] = static_cast<int>(level.plan.box.min[a] + place[static_cast<std::size_t>(2 - a)] * kChunk);
+      box.min[a] = static_cast<int>(level.plan.box.min[a] + place[2 - a] * kChunk);
       box.max[a] =
           static_cast<int>(std::min<std::int64_t>(std::int64_t(box.min[a]) + kChunk, level.plan.box.max[a]));
     }

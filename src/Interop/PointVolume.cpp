@@ -67,7 +67,7 @@ Placement placePoints(std::vector<float3> const& positions) {
   parallelSort(records.data(), static_cast<std::int64_t>(records.size()));
   auto& deepest = result.corners[kDeepest];
   for (auto const& record : records) {
-    int3 const& tile = tiles[static_cast<std::size_t>(record.value)];
+    int3 const& tile = tiles[record.value];
     if (deepest.empty() || deepest.back() != tile) {
       deepest.append(tile);
       result.starts.push_back(result.order.size());
@@ -93,7 +93,7 @@ void fillTiles(TileTree3D::Channel<PointTraits, T, 4, 0>& channel, std::vector<T
                Placement const& placement, Values const& values) {
   parallelFor(0, static_cast<std::int64_t>(tiles.size()),
               [&](std::int64_t begin, std::int64_t end) {
-                for (auto t = static_cast<std::size_t>(begin); t < static_cast<std::size_t>(end); ++t) {
+                for (auto t = begin; t < end; ++t) {
                   std::size_t const first = placement.starts[t], last = placement.starts[t + 1];
                   auto data = channel.tileDataAccessor().tileData(tiles[t]);
                   data.resize(static_cast<int>(last - first), T{});

@@ -36,7 +36,7 @@ std::string regularFileContent(std::string const& path) {
   std::ifstream in;
   std::string content(openRegular(path, in), '\0');
   in.read(content.data(), static_cast<std::streamsize>(content.size()));
-  content.resize(static_cast<std::size_t>(in.gcount()));
+  content.resize(in.gcount());
   return content;
 }
 

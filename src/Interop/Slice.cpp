@@ -189,15 +189,15 @@ std::size_t pixelCount(Plane const& plane) {
 template <class Prepare> std::vector<Sample> samplesOf(Plane const& plane, Prepare const& prepare) {
   using Take = decltype(prepare());
   std::vector<Sample> samples(pixelCount(plane));
-  std::vector<std::unique_ptr<Take>> takes(static_cast<std::size_t>(parallelThreads()));
+  std::vector<std::unique_ptr<Take>> takes(parallelThreads());
   parallelFor(0, plane.height,
               [&](std::int64_t begin, std::int64_t end) {
-                auto& take = takes[static_cast<std::size_t>(parallelThreadIndex())];
+                auto& take = takes[parallelThreadIndex()];
                 if (!take) take = std::make_unique<Take>(prepare());
                 for (std::int64_t y = begin; y < end; ++y)
                   for (int x = 0; x < plane.width; ++x)
                     if (double3 p; plane.indexOf(x, static_cast<int>(y), p))
-                      samples[static_cast<std::size_t>(y * plane.width + x)] = (*take)(p);
+                      samples[y * plane.width + x] = (*take)(p);
               },
               {.grain = 8});
   return samples;

@@ -144,7 +144,7 @@ public:
     walkOnlyIf(walked.memory <= memoryLeft);
     memoryLeft -= walked.memory;
     m_end = bytes.place();
-    m_places.reserve(static_cast<std::size_t>(walked.leaves));
+    m_places.reserve(walked.leaves);
     for (std::uint64_t n = 0; n < walked.leaves; ++n) {
       m_places.push_back(bytes.place());
       walkBuffers<Leaf>(bytes, coding);
@@ -306,7 +306,7 @@ private:
     std::int64_t leaves = 0;
     auto const read = [&] {
       if (parts.empty()) return;
-      tell(parts[0].tree->places()[static_cast<std::size_t>(parts[0].first)]);
+      tell(parts[0].tree->places()[parts[0].first]);
       parallelFor(0, std::int64_t(parts.size()), [&](std::int64_t first, std::int64_t last) {
         for (auto n = static_cast<std::size_t>(first); n < static_cast<std::size_t>(last); ++n)
           parts[n].tree->readLeaves(parts[n].first, parts[n].last);

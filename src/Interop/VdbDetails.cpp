@@ -86,9 +86,7 @@ std::vector<std::vector<double>> matrixOf(IndexToWorld const& transform) {
   auto const m = map.baseMap()->getAffineMap()->getMat4();
   std::vector<std::vector<double>> rows(4, std::vector<double>(4));
   for (int row = 0; row < 4; ++row)
-    for (int column = 0; column < 4; ++column)
-      rows[static_cast<std::size_t>(row)][static_cast<std::size_t>(column)] =
-          m(column, row); // it has row vectors
+    for (int column = 0; column < 4; ++column) rows[row][column] = m(column, row); // it has row vectors
   return rows;
 }
 

@@ -60,8 +60,7 @@ private:
       TileT const& tile = m_tree.tile(n, kLeafDepth);
       if (tile.isLeaf()) continue;
       Block block{toCoord(tile.tijk()), tile.treeIndex(), {}};
-      for (int slot = 0; slot < 8; ++slot)
-        block.quarters[static_cast<std::size_t>(slot)] = tile.childIndex(slot);
+      for (int slot = 0; slot < 8; ++slot) block.quarters[slot] = tile.childIndex(slot);
       blocks.push_back(block);
     }
     // Quarters without a tile above: gathered by the place of their leaf, which lie side by side in Morton
@@ -74,7 +73,7 @@ private:
       auto const [at, isNew] = loose.try_emplace({o.x, o.y, o.z});
       if (isNew) at->second = {toCoord(o), {}, {-1, -1, -1, -1, -1, -1, -1, -1}};
       int const slot = (c.x - o.x) / 4 + 2 * ((c.y - o.y) / 4) + 4 * ((c.z - o.z) / 4);
-      at->second.quarters[static_cast<std::size_t>(slot)] = root->second.index;
+      at->second.quarters[slot] = root->second.index;
     }
     for (auto const& entry : loose) blocks.push_back(entry.second);
     return blocks;
@@ -113,7 +112,7 @@ private:
     };
     for (int slot = 0; slot < 8; ++slot) {
       int const qi = 4 * (slot & 1), qj = 4 * (slot >> 1 & 1), qk = 4 * (slot >> 2);
-      std::int64_t const quarter = block.quarters[static_cast<std::size_t>(slot)];
+      std::int64_t const quarter = block.quarters[slot];
       TreeIndex const at{quarter, kMaxDepth};
       if (quarter < 0) {
         // A quarter that was left out has one value, which the tile above holds at its corner.
@@ -130,7 +129,7 @@ private:
         Value const value = fromElement<Value>(elements[n]);
         bool const on = states ? (states[n] & kVdbStateActive) != 0 : isActive(value);
         write(i * 64 + place, value);
-        active[static_cast<std::size_t>(i)] |= std::uint64_t(on) << place;
+        active[i] |= std::uint64_t(on) << place;
       }
     }
     for (openvdb::Index i = 0; i < 8; ++i) leaf.getValueMask().template getWord<std::uint64_t>(i) = active[i];
@@ -141,7 +140,7 @@ private:
     std::vector<std::unique_ptr<Leaf>> leaves(blocks.size());
     parallelFor(0, std::int64_t(blocks.size()),
                 [&](std::int64_t begin, std::int64_t end) {
-                  for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+                  for (auto n = begin; n < end; ++n) {
                     if (!hasLeaf(blocks[n])) continue;
                     // Its values come with the first look at them, and all are written.
                     leaves[n] = std::make_unique<Leaf>(openvdb::PartialCreate(), blocks[n].origin,

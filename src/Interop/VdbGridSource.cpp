@@ -48,8 +48,8 @@ RootPlaces::RootPlaces(std::vector<int3> const& corners, int depth)
     m_first[a] = (std::int64_t((*low)[static_cast<int>(a)]) >> m_shift) - 1;
     m_count[a] = (std::int64_t((*high)[static_cast<int>(a)]) >> m_shift) + 2 - m_first[a];
   }
-  m_held.resize(static_cast<std::size_t>(m_count[0] * m_count[1] * m_count[2]));
-  for (int3 const& c : corners) m_held[static_cast<std::size_t>(numberOf(c))] = 1;
+  m_held.resize(m_count[0] * m_count[1] * m_count[2]);
+  for (int3 const& c : corners) m_held[numberOf(c)] = 1;
   for (std::size_t side = 1; side < 8; ++side)
     m_step[side] = ((side & 1 ? m_count[1] : 0) + (side & 2 ? 1 : 0)) * m_count[2] + (side & 4 ? 1 : 0);
 }
@@ -153,7 +153,7 @@ std::uint64_t countBlocks(BlockList const& list) {
 
 std::vector<int3> cornersOf(BlockList const& list) {
   std::vector<int3> corners;
-  corners.reserve(static_cast<std::size_t>(countBlocks(list)));
+  corners.reserve(countBlocks(list));
   for (auto const& [place, blocks] : list)
     for (unsigned rest = blocks; rest != 0; rest &= rest - 1) {
       int const n = std::countr_zero(rest);

@@ -227,7 +227,7 @@ void addChannels(Group& group, Ostil::Array<VdbGridRecord> const& records, VLN::
                  TreeToFill const& tree, VLN::FunctionRef<void(double share)> filledShare) {
   auto const count = std::int64_t(group.grids.size()), tiles = tree.container.tileCount(-1);
   auto const make = [&](std::int64_t n, FilledTiles filled) {
-    auto& source = group.grids[static_cast<std::size_t>(n)];
+    auto& source = group.grids[n];
     VdbGridRecord const& record = records[n];
     GridChannels made{source->makeChannel(record.channel, tree, filled), nullptr};
     if (record.rule == VdbActiveRule::kChannel)
@@ -246,13 +246,12 @@ void addChannels(Group& group, Ostil::Array<VdbGridRecord> const& records, VLN::
   std::int64_t const atOnce = tiles < kSmall ? kAtOnce : 1;
   for (std::int64_t first = 0; first < count; first += atOnce) {
     std::int64_t const last = std::min(first + atOnce, count);
-    std::vector<GridChannels> made(static_cast<std::size_t>(last - first));
+    std::vector<GridChannels> made(last - first);
     if (made.size() == 1) {
       made[0] = make(first, tell);
     } else {
       parallelFor(first, last, [&](std::int64_t begin, std::int64_t end) {
-        for (std::int64_t n = begin; n < end; ++n)
-          made[static_cast<std::size_t>(n - first)] = make(n, [](std::int64_t) {});
+        for (std::int64_t n = begin; n < end; ++n) made[n - first] = make(n, [](std::int64_t) {});
       });
       tell(tiles * (last - first));
     }

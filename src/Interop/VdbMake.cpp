@@ -42,7 +42,7 @@ void fillLeaves(openvdb::FloatGrid& grid, Coord const& low, Coord const& high, E
                     Coord const block = first + Coord(i, int(n / count.z()), int(n % count.z()));
                     auto leaf = std::make_unique<Leaf>(Coord(block.x() * 8, block.y() * 8, block.z() * 8),
                                                        background);
-                    if (evaluate(*leaf)) slab[static_cast<std::size_t>(n)] = std::move(leaf);
+                    if (evaluate(*leaf)) slab[n] = std::move(leaf);
                   }
                 },
                 {.grain = 16});

@@ -31,8 +31,7 @@ public:
     std::sort(m_nodes.begin(), m_nodes.end());
     m_held.resize(m_nodes.size());
     parallelFor(0, std::int64_t(m_nodes.size()), [&](std::int64_t begin, std::int64_t end) {
-      for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n)
-        m_held[n] = tilesIn(*m_nodes[n]);
+      for (auto n = begin; n < end; ++n) m_held[n] = tilesIn(*m_nodes[n]);
     });
   }
 
@@ -40,9 +39,8 @@ public:
   Slots inside(Search& search, Lower const& node) const {
     std::array<Slots const*, 27> round;
     for (int n = 0; n < 27; ++n)
-      round[static_cast<std::size_t>(n)] =
-          &slotsAt(search, node.origin().offsetBy((n / 9 - 1) * kWidth, (n / 3 % 3 - 1) * kWidth,
-                                                  (n % 3 - 1) * kWidth));
+      round[n] = &slotsAt(search, node.origin().offsetBy((n / 9 - 1) * kWidth, (n / 3 % 3 - 1) * kWidth,
+                                                         (n % 3 - 1) * kWidth));
     std::uint32_t rows[kRows][kRows]; // without a place beside them on z
     for (int x = 0; x < kRows; ++x)
       for (int y = 0; y < kRows; ++y) {
@@ -55,7 +53,7 @@ public:
     for (int x = 0; x < kSlots; ++x)
       for (int y = 0; y < kSlots; ++y) {
         std::uint64_t const row = rows[x][y] & rows[x][y + 1] & rows[x][y + 2];
-        slots[static_cast<std::size_t>(4 * x + y / 4)] |= (row >> 1 & 0xFFFF) << 16 * (y % 4);
+        slots[4 * x + y / 4] |= (row >> 1 & 0xFFFF) << 16 * (y % 4);
       }
     return slots;
   }
@@ -76,7 +74,7 @@ private:
   Slots const& slotsAt(Search& search, Coord const& corner) const {
     if (Lower const* const node = search.lower(corner)) {
       auto const found = std::lower_bound(m_nodes.begin(), m_nodes.end(), node);
-      return m_held[static_cast<std::size_t>(found - m_nodes.begin())];
+      return m_held[found - m_nodes.begin()];
     }
     return sameBits(search.at(corner).value, m_value) ? m_all : m_none;
   }
@@ -85,7 +83,7 @@ private:
     auto const* const column = round.data() + 9 * node(x) + 3 * node(y);
     int const at = kSlots * (x & (kSlots - 1)) + (y & (kSlots - 1)); // of the row in its node
     auto const row = [&](Slots const& slots) {
-      return static_cast<std::uint32_t>(slots[static_cast<std::size_t>(at / 4)] >> 16 * (at % 4) & 0xFFFF);
+      return static_cast<std::uint32_t>(slots[at / 4] >> 16 * (at % 4) & 0xFFFF);
     };
     return row(*column[0]) >> (kSlots - 1) | row(*column[1]) << 1 | (row(*column[2]) & 1) << (kSlots + 1);
   }

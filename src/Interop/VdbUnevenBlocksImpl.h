@@ -26,7 +26,7 @@ public:
     collectInParallel(
         std::int64_t(m_grid.leaves.size()), 256,
         [&](std::int64_t n, Search& search, BlockList& own, BlockList& places) {
-          Leaf const& leaf = *m_grid.leaves[static_cast<std::size_t>(n)];
+          Leaf const& leaf = *m_grid.leaves[n];
           auto const& digest = m_grid.digestOf(leaf);
           Places round = placesRound(search, leaf.origin());
           unsigned blocks = activeBlocks(leaf);
@@ -58,7 +58,7 @@ public:
         collectInParallel(
             std::int64_t(exposed.size()), 96,
             [&](std::int64_t n, Search& search, BlockList& part) {
-              collectRound(search, exposed[static_cast<std::size_t>(n)]->corner, part);
+              collectRound(search, exposed[n]->corner, part);
             },
             out);
         continue;
@@ -67,8 +67,7 @@ public:
       collectInParallel(
           std::int64_t(exposed.size()) * rows, 1,
           [&](std::int64_t n, Search& search, BlockList& part) {
-            collectSlice(search, exposed[static_cast<std::size_t>(n / rows)]->corner, across,
-                         static_cast<int>(n % rows) - 1, part);
+            collectSlice(search, exposed[n / rows]->corner, across, static_cast<int>(n % rows) - 1, part);
           },
           out);
     }
@@ -93,7 +92,7 @@ private:
     std::vector<Part> parts(static_cast<std::size_t>(chunkCount(0, count, grain)));
     parallelChunks(0, count, grain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
       Search search(m_grid.tree);
-      Part& part = parts[static_cast<std::size_t>(chunk)];
+      Part& part = parts[chunk];
       for (std::int64_t n = begin; n < end; ++n)
         std::apply([&](auto&... list) { collect(n, search, list...); }, part);
     });

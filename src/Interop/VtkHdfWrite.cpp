@@ -274,7 +274,7 @@ private:
                    std::vector<std::size_t> const& offsets, std::size_t bytes, std::byte* values) {
     parallelFor(0, static_cast<std::int64_t>(offsets.size()),
                 [&](std::int64_t begin, std::int64_t end) {
-                  for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+                  for (auto n = begin; n < end; ++n) {
                     IndexBox const& box = level.boxes[first + n];
                     auto const side = static_cast<std::size_t>(box.max.x - box.min.x);
                     for (int z = box.min.z; z < box.max.z; ++z)

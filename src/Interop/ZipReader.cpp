@@ -29,8 +29,7 @@ std::string_view ZipReader::part(std::uint64_t at, std::uint64_t count) const {
 std::uint64_t ZipReader::number(std::uint64_t at, int bytes) const {
   auto const from = part(at, static_cast<std::uint64_t>(bytes));
   std::uint64_t value = 0;
-  for (int n = bytes - 1; n >= 0; --n)
-    value = value << 8 | static_cast<unsigned char>(from[static_cast<std::size_t>(n)]);
+  for (int n = bytes - 1; n >= 0; --n) value = value << 8 | static_cast<unsigned char>(from[n]);
   return value;
 }
 

@@ -188,7 +188,7 @@ std::vector<unsigned char> makeBounds(nanovtt::GridReader const& grid, BoundsOpt
         return Brick{reinterpret_cast<float const*>(block.samples), block.core, block.core + 1};
       allFinite = false;
     }
-    room.resize(static_cast<std::size_t>(brickSamples(block.core)));
+    room.resize(brickSamples(block.core));
     gather(tiles[n], block, room.data());
     return Brick{room.data(), block.core, block.core + 1};
   };

@@ -149,8 +149,7 @@ private:
     codes.resize(bricks.size() * kPackedSamples);
     forRanges(static_cast<std::int64_t>(bricks.size()), 16, m_options.threads,
               [&](std::int64_t begin, std::int64_t end) {
-                for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n)
-                  fillBrick(bricks[n], codes.data() + n * kPackedSamples);
+                for (auto n = begin; n < end; ++n) fillBrick(bricks[n], codes.data() + n * kPackedSamples);
               });
     // What is one value needs no codes, and the background no brick.
     std::size_t kept = 0, coded = 0;

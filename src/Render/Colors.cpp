@@ -88,7 +88,7 @@ bool colorMap(std::string const& name, std::array<Vec3, 256>& colors) {
         c[channel] = ((q - p) * f + p) / 255;
       }
     }
-    colors[static_cast<std::size_t>(n)] = {toLinear(c.x), toLinear(c.y), toLinear(c.z)};
+    colors[n] = {toLinear(c.x), toLinear(c.y), toLinear(c.z)};
   }
   return true;
 }

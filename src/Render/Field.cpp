@@ -148,7 +148,7 @@ void Field::weigh(Weight const& weight, int threads) {
       }
     }
   });
-  m_rootWeights.assign(static_cast<std::size_t>(FieldView::rootWeightsAt(7)), 0);
+  m_rootWeights.assign(FieldView::rootWeightsAt(7), 0);
   for (std::uint32_t slot = 0; slot < nanovtt::kMaxRoots; ++slot) {
     std::uint32_t const root = m_view.tree.root(slot);
     if (root == kNoTile || !(m_weights[root] > 0)) continue;

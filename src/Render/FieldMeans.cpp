@@ -79,7 +79,7 @@ void fillMeans(TileRef const& tile, Brick const& own, VoxelMeans& voxels, std::v
                float* out) {
   int const core = own.core;
   int const width = core + 2; // voxels from one before the tile to one behind it
-  room.resize(static_cast<std::size_t>(width * width * width));
+  room.resize(width * width * width);
   float* v = room.data();
   std::int64_t const w = voxels.width();
   for (int k = -1; k <= core; ++k)
@@ -91,8 +91,7 @@ void fillMeans(TileRef const& tile, Brick const& own, VoxelMeans& voxels, std::v
       for (int i = 0; i <= core; ++i) {
         double sum = 0;
         for (int c = 0; c < 8; ++c)
-          sum += double(room[static_cast<std::size_t>(((k + (c >> 2)) * width + j + (c >> 1 & 1)) * width +
-                                                      i + (c & 1))]);
+          sum += double(room[((k + (c >> 2)) * width + j + (c >> 1 & 1)) * width + i + (c & 1)]);
         *out++ = std::isnan(sum) ? *own.at(i, j, k) : static_cast<float>(sum / 8);
       }
 }
@@ -145,7 +144,7 @@ void Field::makeMeans(int depth, int threads) {
               std::vector<float> room;
               std::optional<VoxelMeans> voxels;
               for (std::int64_t c = begin; c < to; ++c) {
-                std::uint32_t const n = coarse[static_cast<std::size_t>(c)];
+                std::uint32_t const n = coarse[c];
                 int const core = whole.brick(n).core;
                 std::int64_t const width = m_tiles[n].width() / core;
                 if (!voxels || voxels->width() != width) voxels.emplace(whole, m_bounds, width, depth);

@@ -37,10 +37,10 @@ void sweep(LightView const& v, std::vector<float> const& extinctions, Vec3 toLig
             continue;
           }
           auto const at = before * stride[axis] + yy * stride[b] + zz * stride[c];
-          lit += w * light[at].*share, thick += w * extinctions[static_cast<std::size_t>(at)];
+          lit += w * light[at].*share, thick += w * extinctions[at];
         }
         auto const here = plane * stride[axis] + j * stride[b] + k * stride[c];
-        float const mean = 0.5f * (thick + extinctions[static_cast<std::size_t>(here)]);
+        float const mean = 0.5f * (thick + extinctions[here]);
         light[here].*share = lit * decay(Lanes(mean * toPlane)).first();
       }
   }
@@ -74,8 +74,7 @@ LightLattice sweepLights(FogView const& fog, Vec3 toLight, Vec3 up, Vec3 spacing
         Vec3 const p = v.low + Vec3{lattice3.x / v.scale.x, lattice3.y / v.scale.y, lattice3.z / v.scale.z};
         float const value = path.value(fog.field, p);
         float place;
-        if (path.height > 0)
-          extinctions[static_cast<std::size_t>(row * v.size[0] + i)] = fog.extinction(value, place);
+        if (path.height > 0) extinctions[row * v.size[0] + i] = fog.extinction(value, place);
       }
   });
   sweep(v, extinctions, toLight, &LightView::Shares::direct, lattice.values.data());

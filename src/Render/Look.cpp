@@ -11,7 +11,7 @@ namespace {
 
 // Of the values, sorted, that a field holds.
 float quantile(std::vector<float> const& sorted, double share) {
-  return sorted.empty() ? 0.0f : sorted[static_cast<std::size_t>(share * double(sorted.size() - 1))];
+  return sorted.empty() ? 0.0f : sorted[share * double(sorted.size() - 1)];
 }
 
 // As a level set has it: nearer to zero than the background, with both signs.

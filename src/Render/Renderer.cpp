@@ -230,7 +230,7 @@ double chooseUnit(Scene const& scene, FogView& fog, double voxel) {
       if (!scene.start((double(n % kAcross) + 0.5) / kAcross, (double(n / kAcross) + 0.5) / kAcross, s))
         continue;
       Ray const ray(s.origin, s.direction);
-      depths[static_cast<std::size_t>(n)] = opticalDepth(fog, ray, 0, s.end, static_cast<float>(2 * voxel));
+      depths[n] = opticalDepth(fog, ray, 0, s.end, static_cast<float>(2 * voxel));
     }
   });
   std::erase_if(depths, [](float d) { return !(d > 0); });

@@ -37,7 +37,7 @@ void forRanges(std::int64_t count, std::int64_t grain, int threads,
   };
   std::vector<std::thread> others;
   try {
-    others.reserve(static_cast<std::size_t>(threads));
+    others.reserve(threads);
     for (int n = 1; n < threads; ++n) others.emplace_back(work, false);
   } catch (std::exception const&) {} // fewer threads do the same work
   work(true);

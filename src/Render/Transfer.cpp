@@ -64,11 +64,10 @@ void keepExtremes(TransferView& view, Points const& points) {
       auto const isBeyond = [&](std::ptrdiff_t way) {
         auto at = static_cast<std::ptrdiff_t>(n);
         do at += way;
-        while (at >= 0 && at < static_cast<std::ptrdiff_t>(points.size()) &&
-               points[static_cast<std::size_t>(at)].second == own);
+        while (at >= 0 && at < static_cast<std::ptrdiff_t>(points.size()) && points[at].second == own);
         if (at < 0 || at >= static_cast<std::ptrdiff_t>(points.size())) return false;
         auto const last = static_cast<std::size_t>(at - way);
-        float const other = points[static_cast<std::size_t>(at)].second;
+        float const other = points[at].second;
         return std::abs(entryOf(last) - entryOf(n)) < 1 && (isPeak ? own > other : own < other);
       };
       float const at = entryOf(n);
@@ -128,7 +127,7 @@ Transfer::Transfer(TransferOptions const& options) {
   for (int n = 0; n < kTransferSize; ++n) {
     float const t = static_cast<float>(n) / (kTransferSize - 1);
     float const in = m_view.low + t / m_view.scale, value = options.log ? std::exp(in) : in;
-    m_view.color[n] = colors[static_cast<std::size_t>(n)];
+    m_view.color[n] = colors[n];
     m_view.opacity[n] = !isNamed ? between(points, value)
                         : options.awayFrom
                             ? named->shape(std::min(1.0f, std::abs(value - options.from) / farthest))

@@ -22,7 +22,7 @@ public:
   Ostil::Any extractProperty(Ostil::String const& key) override {
     auto const at = find(key);
     if (at == m_properties.end()) return {};
-    Ostil::Any value = std::move(m_properties[static_cast<std::size_t>(at - m_properties.begin())].second);
+    Ostil::Any value = std::move(m_properties[at - m_properties.begin()].second);
     m_properties.erase(at);
     return value;
   }
@@ -45,7 +45,7 @@ public:
     if (at == m_properties.end())
       m_properties.emplace_back(key, std::move(value));
     else
-      m_properties[static_cast<std::size_t>(at - m_properties.begin())].second = std::move(value);
+      m_properties[at - m_properties.begin()].second = std::move(value);
   }
 
 private:

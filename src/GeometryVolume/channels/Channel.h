@@ -140,7 +140,7 @@ protected:
   Ostil::Ptr<Data> getData() const { return Ostil::staticCast<Data>(this->m_data); }
 
 private:
-  template <class Vector> static auto& element(Vector& v, int at) { return v[static_cast<std::size_t>(at)]; }
+  template <class Vector> static auto& element(Vector& v, int at) { return v[at]; }
 };
 
 } // namespace VLN::TileTree3D

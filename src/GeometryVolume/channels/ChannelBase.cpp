@@ -131,8 +131,7 @@ void ChannelBase::applyHeldMoves(ElementPermutation const& p) {
   forEachList(p, [&](auto const& all, auto const&, auto const&, auto const&, int d) {
     if (d < 0 || d >= kChannelDepths) return;
     std::vector<ElementToFrom> others;
-    for (ElementToFrom const& move : all)
-      (holdsAll({move}, d) ? moves[static_cast<std::size_t>(d)] : others).push_back(move);
+    for (ElementToFrom const& move : all) (holdsAll({move}, d) ? moves[d] : others).push_back(move);
     Internal::addSources(others, ignored);
   });
   ElementOrder order;

@@ -96,9 +96,7 @@ public:
   // Access
   TileArrays<T>* dataPtr() const { return m_data.get(); }
   Ostil::Ptr<TileStorage<T>> const& storage() const { return m_data; }
-  Vector& vector(TreeIndex const& tile) const {
-    return (*m_data)[tile.depth][static_cast<std::size_t>(tile.index)];
-  }
+  Vector& vector(TreeIndex const& tile) const { return (*m_data)[tile.depth][tile.index]; }
   bool storageIsShared() const { return m_data && !m_data.unique(); }
 
   // Copying

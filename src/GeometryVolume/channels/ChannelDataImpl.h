@@ -115,34 +115,27 @@ void ChannelData<T>::rebuild(TileArrays<T> const& source, Counts const& counts, 
   Spans spans;
   for (int d = firstDepth(); d <= lastDepth(); ++d) {
     if (skipped(d)) continue;
-    kept[static_cast<std::size_t>(d)] = counts[static_cast<std::size_t>(d)];
-    spans.add(d, 0, kept[static_cast<std::size_t>(d)]);
+    kept[d] = counts[d];
+    spans.add(d, 0, kept[d]);
   }
   Internal::TileSlots slots;
   if (m_useStaticAllocation)
     slots = Internal::planSlots(
-        firstDepth(), lastDepth(), kept,
-        [&](int d, std::int64_t i) {
-          return source[static_cast<std::size_t>(d)][static_cast<std::size_t>(i)].size();
-        },
+        firstDepth(), lastDepth(), kept, [&](int d, std::int64_t i) { return source[d][i].size(); },
         [&](std::size_t n) { return slotElements(n); });
   Internal::BlockList blocks;
   void* const block = slots.total > 0 ? blocks.allocate(slots.total, sizeof(T)) : nullptr;
   auto fresh = Ostil::makePtr<TileStorage<T>>();
   if (block || slots.total == 0) {
-    Internal::forEachDepth(firstDepth(), lastDepth(), [&](int d) {
-      auto const depth = static_cast<std::size_t>(d);
-      (*fresh)[depth].resize(static_cast<std::size_t>(kept[depth]));
-    });
+    Internal::forEachDepth(firstDepth(), lastDepth(), [&](int d) { (*fresh)[d].resize(kept[d]); });
     spans.forEach(Internal::tileGrain(tileBytes()), [&](int d, std::int64_t begin, std::int64_t end) {
-      auto const depth = static_cast<std::size_t>(d);
-      for (auto i = static_cast<std::size_t>(begin); i < static_cast<std::size_t>(end); ++i) {
-        std::size_t const n = source[depth][i].size();
+      for (auto i = begin; i < end; ++i) {
+        std::size_t const n = source[d][i].size();
         if (n == 0) continue;
         T* const slot = block ? static_cast<T*>(block) + slots.at(d, static_cast<std::int64_t>(i)) : nullptr;
         Vector tile = unwrittenTile(static_cast<std::int64_t>(n), slot);
         std::memcpy(static_cast<void*>(tile.data()), values(d, static_cast<std::int64_t>(i)), n * sizeof(T));
-        (*fresh)[depth][i].swap(tile);
+        (*fresh)[d][i].swap(tile);
       }
     });
   } else {
@@ -157,9 +150,7 @@ template <class T> void ChannelData<T>::separateWithout(int skipFirst, int skipL
   if (!storageIsShared()) return;
   auto const old = m_data;
   auto const counts = m_tileCounts;
-  auto const values = [&](int d, std::int64_t i) -> T const* {
-    return (*old)[d][static_cast<std::size_t>(i)].data();
-  };
+  auto const values = [&](int d, std::int64_t i) -> T const* { return (*old)[d][i].data(); };
   rebuild(*old, counts, values, skipFirst, skipLast);
 }
 
@@ -173,9 +164,7 @@ template <class T> void ChannelData<T>::deepCopy(ChannelData const& source) {
     Internal::BlockList none;
     return replaceStorage(nullptr, none);
   }
-  auto const values = [&](int d, std::int64_t i) -> T const* {
-    return (*old)[d][static_cast<std::size_t>(i)].data();
-  };
+  auto const values = [&](int d, std::int64_t i) -> T const* { return (*old)[d][i].data(); };
   rebuild(*old, Counts(source.m_tileCounts), values, 0, -1);
 }
 
@@ -186,7 +175,7 @@ template <class T> void ChannelData<T>::compactStorage() {
     auto& tiles = depthTiles(d);
     parallelFor(0, static_cast<std::int64_t>(tiles.size()), [&](std::int64_t begin, std::int64_t end) {
       for (auto i = begin; i < end; ++i) {
-        Vector& tile = tiles[static_cast<std::size_t>(i)];
+        Vector& tile = tiles[i];
         // A static tile's room belongs to its block and cannot be given back alone.
         if (tile.capacity() == tile.size() || tile.get_allocator().isStatic()) continue;
         Vector exact = unwrittenTile(static_cast<std::int64_t>(tile.size()), nullptr);

@@ -12,8 +12,7 @@ namespace VLN::TileTree3D {
 /// Position of each tile's first element in the flat export.
 template <class T> Internal::TileSlots ChannelData<T>::tileOffsets() const {
   return Internal::planSlots(
-      firstDepth(), lastDepth(), m_tileCounts,
-      [&](int d, std::int64_t i) { return depthTiles(d)[static_cast<std::size_t>(i)].size(); },
+      firstDepth(), lastDepth(), m_tileCounts, [&](int d, std::int64_t i) { return depthTiles(d)[i].size(); },
       [](std::size_t n) { return static_cast<std::int64_t>(n); });
 }
 
@@ -26,7 +25,7 @@ template <class T> Ostil::Ptr<Ostil::Array<T>> ChannelData<T>::exportFlat() cons
   auto const offsets = tileOffsets();
   T* const to = array->data();
   allTiles().forEach(Internal::tileGrain(tileBytes()), [&](int d, std::int64_t begin, std::int64_t end) {
-    for (auto i = static_cast<std::size_t>(begin); i < static_cast<std::size_t>(end); ++i) {
+    for (auto i = begin; i < end; ++i) {
       Vector const& tile = depthTiles(d)[i];
       std::copy(tile.begin(), tile.end(), to + offsets.at(d, static_cast<std::int64_t>(i)));
     }
@@ -42,7 +41,7 @@ template <class T> Ostil::Ptr<NestedArrays<T>> ChannelData<T>::exportNested() co
     (*nested)[static_cast<std::uint64_t>(d)] = Ostil::makePtr<TileList>(static_cast<std::uint64_t>(count(d)));
   allTiles().forEach(Internal::tileGrain(tileBytes()), [&](int d, std::int64_t begin, std::int64_t end) {
     auto& list = *(*nested)[static_cast<std::uint64_t>(d)];
-    for (auto i = static_cast<std::size_t>(begin); i < static_cast<std::size_t>(end); ++i) {
+    for (auto i = begin; i < end; ++i) {
       Vector const& tile = depthTiles(d)[i];
       auto array = Ostil::makePtr<Ostil::Array<T>>(std::uint64_t(tile.size()));
       std::copy(tile.begin(), tile.end(), array->data());

@@ -84,10 +84,9 @@ void handOverBlocks(BlockList& into, BlockList& from) noexcept {
 }
 
 void TileSpans::add(int depth, std::int64_t begin, std::int64_t end) {
-  auto const d = static_cast<std::size_t>(depth);
-  m_begins[d] = begin;
+  m_begins[depth] = begin;
   std::int64_t const count = std::max<std::int64_t>(0, end - begin);
-  for (std::size_t n = d; n < m_ends.size(); ++n) m_ends[n] += count;
+  for (std::size_t n = depth; n < m_ends.size(); ++n) m_ends[n] += count;
 }
 
 void TileSpans::forEach(std::int64_t grain, FunctionRef<void(int, std::int64_t, std::int64_t)> body) const {
@@ -121,8 +120,8 @@ TileSlots planSlots(int first, int last, DepthCounts const& counts,
   TileSlots slots;
   for (int d = first; d <= last; ++d) {
     auto& list = slots.offsets[d];
-    std::int64_t const n = counts[static_cast<std::size_t>(d)];
-    list.reserve(static_cast<std::size_t>(n));
+    std::int64_t const n = counts[d];
+    list.reserve(n);
     for (std::int64_t i = 0; i < n; ++i) {
       list.push_back(slots.total);
       if (std::size_t const size = elements(d, i)) slots.total += slotOf(size);
@@ -135,12 +134,11 @@ GrowthPlan planGrowth(int first, int last, DepthCounts const& own, TileCounts co
                       std::int64_t fixedElements, std::int64_t stride) {
   GrowthPlan plan;
   for (int d = first; d <= last; ++d) {
-    auto const depth = static_cast<std::size_t>(d);
-    std::int64_t const n = std::max<std::int64_t>(0, source.tileCount(d)), begin = own[depth];
-    plan.wanted[depth] = n;
+    std::int64_t const n = std::max<std::int64_t>(0, source.tileCount(d)), begin = own[d];
+    plan.wanted[d] = n;
     plan.changes = plan.changes || n != begin;
     plan.added.add(d, begin, n);
-    auto& tiles = plan.tiles[depth];
+    auto& tiles = plan.tiles[d];
     if (fixedElements > 0)
       tiles = {fixedElements, plan.blockElements, stride};
     else if (stride > 0 && n > begin) {
@@ -153,8 +151,8 @@ GrowthPlan planGrowth(int first, int last, DepthCounts const& own, TileCounts co
       if (differs == n) {
         tiles = {size, plan.blockElements, size};
       } else {
-        auto& offsets = plan.slots.offsets[depth];
-        offsets.reserve(static_cast<std::size_t>(n - begin));
+        auto& offsets = plan.slots.offsets[d];
+        offsets.reserve(n - begin);
         for (auto i = begin; i < n; ++i) {
           offsets.push_back(plan.blockElements);
           plan.blockElements += i < differs ? size : elements(i);
@@ -169,15 +167,14 @@ GrowthPlan planGrowth(int first, int last, DepthCounts const& own, TileCounts co
 bool isPermutation(std::vector<std::vector<std::int64_t>> const& lists, int first, int last,
                    DepthCounts const& counts) {
   for (int d = first; d <= last; ++d) {
-    auto const& list = lists[static_cast<std::size_t>(d)];
-    auto const n = static_cast<std::size_t>(counts[static_cast<std::size_t>(d)]);
+    auto const& list = lists[d];
+    auto const n = static_cast<std::size_t>(counts[d]);
     if (list.empty()) continue;
     if (list.size() != n) return false;
     std::vector<bool> seen(n);
     for (std::int64_t index : list) {
-      if (index < 0 || static_cast<std::size_t>(index) >= n || seen[static_cast<std::size_t>(index)])
-        return false;
-      seen[static_cast<std::size_t>(index)] = true;
+      if (index < 0 || static_cast<std::size_t>(index) >= n || seen[index]) return false;
+      seen[index] = true;
     }
   }
   return true;

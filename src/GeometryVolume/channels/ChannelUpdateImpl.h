@@ -80,13 +80,11 @@ template <class T> bool ChannelData<T>::resizeTiles(Internal::TileCounts const& 
   if (m_tileCounts != before) return false;
 
   // Tiles are added first and dropped last: dropping cannot fail.
-  auto const wanted = [&](int d) {
-    return static_cast<std::size_t>(plan.wanted[static_cast<std::size_t>(d)]);
-  };
+  auto const wanted = [&](int d) { return static_cast<std::size_t>(plan.wanted[d]); };
   VLN::Internal::Rollback added([&] {
     for (int d = firstDepth(); d <= lastDepth(); ++d) {
       auto& tiles = depthTiles(d);
-      auto const n = static_cast<std::size_t>(before[static_cast<std::size_t>(d)]);
+      auto const n = static_cast<std::size_t>(before[d]);
       if (tiles.size() > n) tiles.erase(tiles.begin() + static_cast<std::ptrdiff_t>(n), tiles.end());
     }
   });
@@ -103,7 +101,7 @@ template <class T> bool ChannelData<T>::resizeTiles(Internal::TileCounts const& 
     if (wanted(d) < tiles.size())
       tiles.erase(tiles.begin() + static_cast<std::ptrdiff_t>(wanted(d)), tiles.end());
     if (!m_useStaticAllocation) Internal::trimDepthTiles(tiles);
-    count(d) = plan.wanted[static_cast<std::size_t>(d)];
+    count(d) = plan.wanted[d];
   });
   sumCounts();
   return true;
@@ -111,9 +109,9 @@ template <class T> bool ChannelData<T>::resizeTiles(Internal::TileCounts const& 
 
 template <class T> void ChannelData<T>::makeAdded(Internal::GrowthPlan const& plan, int depth, T* block) {
   auto& tiles = depthTiles(depth);
-  auto const wanted = static_cast<std::size_t>(plan.wanted[static_cast<std::size_t>(depth)]);
+  auto const wanted = static_cast<std::size_t>(plan.wanted[depth]);
   Internal::reserveDepthTiles(tiles, static_cast<std::int64_t>(wanted));
-  auto const& added = plan.tiles[static_cast<std::size_t>(depth)];
+  auto const& added = plan.tiles[depth];
   if (!block || added.elements <= 0) return tiles.resize(wanted);
   // Where they belong at once: a table of tiles is long enough to be written only once.
   using Elements = Internal::UnwrittenElements;
@@ -127,15 +125,14 @@ template <class T>
 void ChannelData<T>::fillAdded(Internal::GrowthPlan const& plan, Internal::TileCounts const& source, T* block,
                                bool zeros) {
   bool const write = m_callElementConstructor && !zeros;
-  auto const made = [&](int d) { return block && plan.tiles[static_cast<std::size_t>(d)].elements >= 0; };
+  auto const made = [&](int d) { return block && plan.tiles[d].elements >= 0; };
   bool allMade = true;
   for (int d = firstDepth(); d <= lastDepth(); ++d)
-    allMade = allMade && (plan.wanted[static_cast<std::size_t>(d)] <= count(d) || made(d));
+    allMade = allMade && (plan.wanted[d] <= count(d) || made(d));
   if (allMade && !write) return;
   plan.added.forEach(Internal::tileGrain(tileBytes()), [&](int d, std::int64_t begin, std::int64_t end) {
-    auto const depth = static_cast<std::size_t>(d);
     if (made(d)) {
-      auto const& added = plan.tiles[depth];
+      auto const& added = plan.tiles[d];
       T* slot = block + added.base + (begin - count(d)) * added.stride;
       for (auto i = begin; write && i < end; ++i, slot += added.stride)
         Internal::fillRun(slot, added.elements, m_defaultValue);
@@ -148,7 +145,7 @@ void ChannelData<T>::fillAdded(Internal::GrowthPlan const& plan, Internal::TileC
                                  : std::max<std::int64_t>(0, source.elementCount(TreeIndex{i, d}));
       if (n == 0) continue;
       T* const slot = block ? block + plan.slots.at(d, i - count(d)) : nullptr;
-      tiles[static_cast<std::size_t>(i)] = newTile(n, slot);
+      tiles[i] = newTile(n, slot);
     }
   });
 }
@@ -166,7 +163,7 @@ void ChannelData<T>::moveTiles(TileRemovalList const& removed, FunctionRef<std::
   // `body(target, source, dropped)` for each pair; the source of a dropped pair is of no further use.
   auto const forEachPair = [&](auto const& body) {
     Internal::forEachDepth(0, last, [&](int d) {
-      auto const& list = removed[static_cast<std::size_t>(d)];
+      auto const& list = removed[d];
       auto& tiles = depthTiles(d);
       auto const exists = [&](std::int64_t i) {
         return i >= 0 && i < static_cast<std::int64_t>(tiles.size());
@@ -178,10 +175,9 @@ void ChannelData<T>::moveTiles(TileRemovalList const& removed, FunctionRef<std::
           0, static_cast<std::int64_t>(list.size()),
           [&](std::int64_t begin, std::int64_t end) {
             for (auto n = begin; n < end; ++n) {
-              auto const [to, from] = list[static_cast<std::size_t>(n)];
+              auto const [to, from] = list[n];
               if (to == from || !exists(to) || !exists(from)) continue;
-              body(tiles[static_cast<std::size_t>(to)], tiles[static_cast<std::size_t>(from)],
-                   from >= remaining);
+              body(tiles[to], tiles[from], from >= remaining);
             }
           },
           options);
@@ -212,7 +208,7 @@ public:
     static TileVector<T> const none;
     auto at = static_cast<std::size_t>(n);
     if (depth <= m_lastDepth) {
-      auto const& list = m_newToOld[static_cast<std::size_t>(depth)];
+      auto const& list = m_newToOld[depth];
       if (at < list.size()) at = static_cast<std::size_t>(list[at]); // below 0: beyond every tile
     }
     auto& tiles = m_tiles[depth];
@@ -251,12 +247,11 @@ template <class T> bool ChannelData<T>::permuteTiles(TilePermutation const& newT
   if (slots.total > 0 && !block) return false;
 
   auto fresh = Ostil::makePtr<TileStorage<T>>();
-  Internal::forEachDepth(firstDepth(), lastDepth(),
-                         [&](int d) { (*fresh)[d].resize(static_cast<std::size_t>(count(d))); });
+  Internal::forEachDepth(firstDepth(), lastDepth(), [&](int d) { (*fresh)[d].resize(count(d)); });
   allTiles().forEach(Internal::tileGrain(tileBytes()), [&](int d, std::int64_t begin, std::int64_t end) {
     for (auto i = begin; i < end; ++i) {
       Vector& from = source(d, i);
-      Vector& to = (*fresh)[d][static_cast<std::size_t>(i)];
+      Vector& to = (*fresh)[d][i];
       if (steal) {
         to.swap(from);
       } else if (!from.empty()) {
@@ -299,7 +294,7 @@ template <class T> void ChannelData<T>::removeDepths(int first, int last) {
     parallelFor(
         0, static_cast<std::int64_t>(tiles.size()),
         [&](std::int64_t begin, std::int64_t end) {
-          for (auto i = begin; i < end; ++i) Vector().swap(tiles[static_cast<std::size_t>(i)]);
+          for (auto i = begin; i < end; ++i) Vector().swap(tiles[i]);
         },
         options);
     std::vector<Vector>().swap(tiles);
@@ -323,9 +318,7 @@ template <class T> bool ChannelData<T>::resizeDepth(int depth, std::int64_t tile
     tiles.erase(tiles.begin() + static_cast<std::ptrdiff_t>(n), tiles.end());
   else
     tiles.resize(n);
-  for (auto i = before; i < tileCount; ++i)
-    Internal::resizeVector(tiles[static_cast<std::size_t>(i)],
-                           static_cast<std::size_t>(std::max(0, elementCount)), T{});
+  for (auto i = before; i < tileCount; ++i) Internal::resizeVector(tiles[i], std::max(0, elementCount), T{});
   added.dismiss();
   m_tileCountTotal += tileCount - before;
   count(depth) = tileCount;
@@ -363,7 +356,7 @@ template <class T> void ChannelData<T>::growElements(Internal::TileCounts const&
     spans.forEach(64, [&](int d, std::int64_t begin, std::int64_t end) {
       auto& tiles = depthTiles(d);
       for (auto i = begin; i < end; ++i) {
-        Vector& tile = tiles[static_cast<std::size_t>(i)];
+        Vector& tile = tiles[i];
         std::int64_t const n = wanted(d, i);
         if (n > static_cast<std::int64_t>(tile.size())) body(tile, n);
       }
@@ -376,11 +369,8 @@ template <class T> void ChannelData<T>::growElements(Internal::TileCounts const&
     cloneData();
   }
   // Room first, so that all grow or none.
-  forEachShort(
-      [](Vector& tile, std::int64_t n) { Internal::growOutOfBlock(tile, static_cast<std::size_t>(n)); });
-  forEachShort([](Vector& tile, std::int64_t n) {
-    Internal::resizeOutOfBlock(tile, static_cast<std::size_t>(n), T{});
-  });
+  forEachShort([](Vector& tile, std::int64_t n) { Internal::growOutOfBlock(tile, n); });
+  forEachShort([](Vector& tile, std::int64_t n) { Internal::resizeOutOfBlock(tile, n, T{}); });
 }
 
 } // namespace VLN::TileTree3D

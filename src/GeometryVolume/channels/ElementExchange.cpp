@@ -60,11 +60,10 @@ public:
     if (m_in.order.size() != m_in.moves.size()) return false;
     auto const n = static_cast<std::int64_t>(m_in.moves.size());
     constexpr std::int64_t kGrain = 8192;
-    std::vector<std::vector<SourceRun>> runs(static_cast<std::size_t>(chunkCount(0, n, kGrain)));
+    std::vector<std::vector<SourceRun>> runs(chunkCount(0, n, kGrain));
     std::atomic<bool> held{true};
     parallelChunks(0, n, kGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-      if (!gatherChunk(tiles, static_cast<std::size_t>(begin), static_cast<std::size_t>(end),
-                       runs[static_cast<std::size_t>(chunk)]))
+      if (!gatherChunk(tiles, static_cast<std::size_t>(begin), static_cast<std::size_t>(end), runs[chunk]))
         held.store(false, std::memory_order_relaxed);
     });
     return held && plan(runs);
@@ -106,7 +105,7 @@ private:
       }
       goesOn = false;
       if (tile < 0 || tile >= count) return false;
-      auto const& vector = tiles[static_cast<std::size_t>(tile)];
+      auto const& vector = tiles[tile];
       auto const size = static_cast<std::int64_t>(vector.size());
       T const* const elements = vector.data();
       for (; n < end && moves[n].from == tile; ++n) {
@@ -181,9 +180,9 @@ private:
         [&](std::int64_t begin, std::int64_t end) {
           constexpr std::int64_t kAhead = 2;
           for (auto n = begin; n < end; ++n) {
-            if (n + kAhead < end) prefetchHoles(tiles, m_exchanges[static_cast<std::size_t>(n + kAhead)]);
-            TileExchange const& e = m_exchanges[static_cast<std::size_t>(n)];
-            body(tiles[static_cast<std::size_t>(e.tile)], e);
+            if (n + kAhead < end) prefetchHoles(tiles, m_exchanges[n + kAhead]);
+            TileExchange const& e = m_exchanges[n];
+            body(tiles[e.tile], e);
           }
         },
         options);
@@ -191,7 +190,7 @@ private:
 
   void prefetchHoles(Tiles const& tiles, TileExchange const& e) const {
     constexpr std::uint64_t kMost = 64;
-    T const* const elements = tiles[static_cast<std::size_t>(e.tile)].data();
+    T const* const elements = tiles[e.tile].data();
     std::int32_t const* const places = m_places.data() + e.firstLeaving;
     for (std::uint64_t n = 0, end = std::min(e.leaving, kMost); n < end; ++n)
       __builtin_prefetch(elements + places[n]);

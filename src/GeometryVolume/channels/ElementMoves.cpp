@@ -46,8 +46,7 @@ template <class Record, class Less> void sortRecords(std::vector<Record>& record
   parallelFor(
       0, static_cast<std::int64_t>(order.size()),
       [&](std::int64_t begin, std::int64_t end) {
-        for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n)
-          sorted[n] = records[order[n]];
+        for (auto n = begin; n < end; ++n) sorted[n] = records[order[n]];
       },
       options);
   records.swap(sorted);
@@ -60,8 +59,7 @@ TilePermutation invertPermutation(TilePermutation const& permutation) {
   for (std::size_t d = 0; d < permutation.size(); ++d) {
     auto const& list = permutation[d];
     inverse[d].assign(list.size(), -1);
-    for (std::size_t i = 0; i < list.size(); ++i)
-      inverse[d][static_cast<std::size_t>(list[i])] = static_cast<std::int64_t>(i);
+    for (std::size_t i = 0; i < list.size(); ++i) inverse[d][list[i]] = static_cast<std::int64_t>(i);
   }
   return inverse;
 }
@@ -105,8 +103,7 @@ bool countByDestination(std::vector<ElementToFrom> const& moves, std::vector<std
     next[bucket] += next[bucket - 1];
   }
   order.resize(moves.size());
-  for (std::uint64_t at = 0; at < moves.size(); ++at)
-    order[next[static_cast<std::size_t>(moves[at].to - kLowest)]++] = at;
+  for (std::uint64_t at = 0; at < moves.size(); ++at) order[next[moves[at].to - kLowest]++] = at;
   return true;
 }
 
@@ -121,7 +118,7 @@ void sortByDestination(std::vector<ElementToFrom> const& moves, std::vector<std:
     std::sort(order.begin(), order.end(), byDestination);
   else
     parallelSortPositions(order.data(), n, byDestination);
-  auto const destination = [&](std::int64_t at) { return moves[order[static_cast<std::size_t>(at)]].to; };
+  auto const destination = [&](std::int64_t at) { return moves[order[at]].to; };
   for (std::int64_t at = 0; at < n; ++at) {
     std::int64_t const to = destination(at);
     if (to >= 0 && (at == 0 || destination(at - 1) != to))
@@ -153,8 +150,8 @@ void groupByDestination(std::vector<ElementToFrom> const& moves, std::vector<std
 void addSources(std::vector<ElementToFrom> const& moves, ElementRemovals& removals) {
   removals.resize(kChannelDepths);
   for (ElementToFrom const& move : moves) {
-    auto const depth = static_cast<std::size_t>(move.fromDepth);
-    if (depth < removals.size()) removals[depth].push_back({move.from, move.fromElement});
+    if (move.fromDepth < std::ssize(removals))
+      removals[move.fromDepth].push_back({move.from, move.fromElement});
   }
 }
 
@@ -196,7 +193,7 @@ void ArrivalPlan::forEachRun(FunctionRef<void(std::size_t, std::uint64_t, std::u
 void forEachTileRun(std::vector<ElementInTile> const& elements,
                     FunctionRef<void(std::int64_t, std::int64_t)> body) {
   auto const n = static_cast<std::int64_t>(elements.size());
-  auto const tile = [&](std::int64_t at) { return elements[static_cast<std::size_t>(at)].tile; };
+  auto const tile = [&](std::int64_t at) { return elements[at].tile; };
   ParallelOptions options;
   options.grain = 512;
   parallelFor(

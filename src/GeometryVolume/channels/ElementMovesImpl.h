@@ -70,7 +70,7 @@ template <class T> bool ChannelData<T>::holdsAll(std::vector<ElementToFrom> cons
     if (move.to >= destinations || move.fromDepth < 0 || move.fromDepth >= kChannelDepths) return false;
     auto const& sources = depthTiles(move.fromDepth);
     return move.from >= 0 && move.from < static_cast<std::int64_t>(sources.size()) && move.fromElement >= 0 &&
-           static_cast<std::size_t>(move.fromElement) < sources[static_cast<std::size_t>(move.from)].size();
+           static_cast<std::size_t>(move.fromElement) < sources[move.from].size();
   };
   return parallelReduce(
       0, static_cast<std::int64_t>(moves.size()), 4096, true,
@@ -92,7 +92,7 @@ void ChannelData<T>::reserveElements(std::vector<std::uint64_t> const& tiles, Ti
   parallelFor(
       0, static_cast<std::int64_t>(tiles.size()),
       [&](std::int64_t begin, std::int64_t end) {
-        for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+        for (auto n = begin; n < end; ++n) {
           Vector& tile = all[tiles[n]];
           Internal::growOutOfBlock(tile, tile.size() + plan.count(n));
         }
@@ -112,7 +112,7 @@ void ChannelData<T>::allocateElements(std::vector<std::uint64_t> const& tiles, T
   parallelFor(
       0, static_cast<std::int64_t>(tiles.size()),
       [&](std::int64_t begin, std::int64_t end) {
-        for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+        for (auto n = begin; n < end; ++n) {
           Vector& tile = all[tiles[n]];
           Internal::resizeOutOfBlock(tile, tile.size() + (runs.start(n + 1) - runs.start(n)), T{});
         }
@@ -135,7 +135,7 @@ void ChannelData<T>::copyElements(std::vector<ElementToFrom> const& moves,
         T* to = tile.data() + (tile.size() - (next - start)) + (at - start);
         for (; at < stop; ++at) {
           ElementToFrom const& move = moves[order[at]];
-          *to++ = vector(TreeIndex{move.from, move.fromDepth})[static_cast<std::size_t>(move.fromElement)];
+          *to++ = vector(TreeIndex{move.from, move.fromDepth})[move.fromElement];
         }
       });
 }
@@ -146,12 +146,10 @@ void ChannelData<T>::removeElements(std::vector<ElementInTile> const& elements, 
   cloneData();
   auto& all = depthTiles(depth);
   Internal::forEachTileRun(elements, [&](std::int64_t low, std::int64_t end) {
-    auto const position = [&](std::int64_t at) {
-      return static_cast<std::size_t>(elements[static_cast<std::size_t>(at)].element);
-    };
-    std::int64_t const index = elements[static_cast<std::size_t>(low)].tile;
+    auto const position = [&](std::int64_t at) { return static_cast<std::size_t>(elements[at].element); };
+    std::int64_t const index = elements[low].tile;
     if (index < 0 || index >= static_cast<std::int64_t>(all.size())) return;
-    Vector& tile = all[static_cast<std::size_t>(index)];
+    Vector& tile = all[index];
     std::size_t size = tile.size();
     std::int64_t high = end - 1;
     // What the tile does not hold cannot be removed.

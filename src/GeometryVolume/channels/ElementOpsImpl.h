@@ -49,15 +49,15 @@ template <class T> struct TypedElementOps {
   using Blend = typename Traits::Blend;
 
   static void const* elements(void const* tileArrays, TreeIndex const& at, int count) {
-    auto const& tiles = (*static_cast<TileArrays<T> const*>(tileArrays))[static_cast<std::size_t>(at.depth)];
+    auto const& tiles = (*static_cast<TileArrays<T> const*>(tileArrays))[at.depth];
     if (at.index < 0 || static_cast<std::size_t>(at.index) >= tiles.size()) return nullptr;
-    auto const& tile = tiles[static_cast<std::size_t>(at.index)];
+    auto const& tile = tiles[at.index];
     return tile.size() >= static_cast<std::size_t>(count) ? tile.data() : nullptr;
   }
 
   static void elementsOf(void const* tileArrays, int depth, std::int64_t const* indices, int n, int count,
                          void const** found) {
-    auto const& tiles = (*static_cast<TileArrays<T> const*>(tileArrays))[static_cast<std::size_t>(depth)];
+    auto const& tiles = (*static_cast<TileArrays<T> const*>(tileArrays))[depth];
     std::size_t const size = tiles.size(), bytes = static_cast<std::size_t>(count) * sizeof(T);
     for (int i = 0; i < n; ++i) {
       // The first tile in place of one that is not there.
@@ -74,7 +74,7 @@ template <class T> struct TypedElementOps {
   }
 
   static void fetchRecords(void const* tileArrays, int depth, std::int64_t const* indices, int n) {
-    auto const& tiles = (*static_cast<TileArrays<T> const*>(tileArrays))[static_cast<std::size_t>(depth)];
+    auto const& tiles = (*static_cast<TileArrays<T> const*>(tileArrays))[depth];
     for (int i = 0; i < n; ++i) {
       auto const index = static_cast<std::size_t>(indices[i]);
       __builtin_prefetch(tiles.data() + (index < tiles.size() ? index : 0));

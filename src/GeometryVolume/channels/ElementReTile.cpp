@@ -45,7 +45,7 @@ template <class TraitsT>
 void settle(Container<TraitsT> const& tree, PositionsOf<TraitsT> const& positions, int depth, Found& found) {
   parallelFor(0, static_cast<std::int64_t>(found.waiting.size()), [&](std::int64_t begin, std::int64_t end) {
     auto const accessor = tree.tileAccessor();
-    for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+    for (auto n = begin; n < end; ++n) {
       ElementToFrom& move = found.moves[found.waiting[n]];
       float3 const& p = positions[ElementTreeIndex(move.from, move.fromDepth, move.fromElement)];
       // The position as it stands: the voxel size plays no part here.
@@ -61,32 +61,31 @@ void settle(Container<TraitsT> const& tree, PositionsOf<TraitsT> const& position
 template <class TraitsT>
 TileIndexLists tilesWithoutPoints(Container<TraitsT> const& tree, PositionsOf<TraitsT> const& positions) {
   constexpr std::int64_t kGrain = 2048;
-  TileIndexLists inactive(static_cast<std::size_t>(TraitsT::kDepths));
+  TileIndexLists inactive(TraitsT::kDepths);
   // Whether a tile has an active child. Children of one parent all write the same.
   std::vector<std::uint8_t> marked, above;
   for (int d = std::min(positions.depth(), TraitsT::kMaxDepth); d >= 0; --d) {
     std::int64_t const tiles = tree.tileCount(d), known = std::min(tiles, positions.tileCount(d));
     auto const* const held = known > 0 ? (*positions.tileArrays())[d].data() : nullptr;
     marked.swap(above);
-    marked.resize(static_cast<std::size_t>(tiles));
+    marked.resize(tiles);
     above.assign(d > 0 ? static_cast<std::size_t>(tree.tileCount(d - 1)) : 0, 0);
-    std::vector<std::vector<std::int64_t>> parts(static_cast<std::size_t>(chunkCount(0, tiles, kGrain)));
+    std::vector<std::vector<std::int64_t>> parts(chunkCount(0, tiles, kGrain));
     parallelChunks(
         0, tiles, kGrain,
         [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
           for (std::int64_t n = begin; n < end; ++n) {
             auto const& tile = tree.tile(n, d);
             if (!tile.valid()) continue;
-            bool const active = (n < known && !held[n].empty()) || marked[static_cast<std::size_t>(n)] != 0;
+            bool const active = (n < known && !held[n].empty()) || marked[n] != 0;
             if (!active)
-              parts[static_cast<std::size_t>(chunk)].push_back(n);
+              parts[chunk].push_back(n);
             else if (!tile.isRoot())
-              std::atomic_ref(above[static_cast<std::size_t>(tile.parentIndex())])
-                  .store(1, std::memory_order_relaxed);
+              std::atomic_ref(above[tile.parentIndex()]).store(1, std::memory_order_relaxed);
           }
         },
         Cancellation::kPoll);
-    auto& list = inactive[static_cast<std::size_t>(d)];
+    auto& list = inactive[d];
     for (auto const& part : parts) list.insert(list.end(), part.begin(), part.end());
   }
   return inactive;
@@ -133,10 +132,9 @@ void channelElementReTile(Container<TraitsT>& tree, PointTopology<TraitsT>& topo
   std::vector<Found> found(kChannelDepths);
   typename Container<TraitsT>::TileLists missing;
   for (int d = TraitsT::kMaxDepth; d >= 0; --d) {
-    auto const at = static_cast<std::size_t>(d);
     if (points.elementCount(d) == 0) continue;
-    found[at] = scanDepth(reading, points, d);
-    for (int3 const& corner : found[at].missing) missing[at].append(corner);
+    found[d] = scanDepth(reading, points, d);
+    for (int3 const& corner : found[d].missing) missing[d].append(corner);
   }
 
   // Grow.
@@ -155,10 +153,9 @@ void channelElementReTile(Container<TraitsT>& tree, PointTopology<TraitsT>& topo
   ElementMoves moves(kChannelDepths);
   bool anyMove = false;
   for (int d = TraitsT::kMaxDepth; d >= 0; --d) {
-    auto const at = static_cast<std::size_t>(d);
-    if (!found[at].waiting.empty()) settle(reading, points, d, found[at]);
-    moves[at] = std::move(found[at].moves);
-    anyMove |= !moves[at].empty();
+    if (!found[d].waiting.empty()) settle(reading, points, d, found[d]);
+    moves[d] = std::move(found[d].moves);
+    anyMove |= !moves[d].empty();
   }
   if (anyMove) {
     ElementOrder order;

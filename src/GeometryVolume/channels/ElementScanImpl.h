@@ -193,11 +193,10 @@ public:
   /// Calls `body(moves, count)` for the moves of the points that left a tile, block by block.
   template <class Body> void scan(std::int64_t i, std::vector<int3>& missing, Body const& body) {
     constexpr std::int64_t kAhead = 2;
-    if (i + kAhead < static_cast<std::int64_t>(m_tiles.size()))
-      prefetch(m_tiles[static_cast<std::size_t>(i + kAhead)]);
+    if (i + kAhead < static_cast<std::int64_t>(m_tiles.size())) prefetch(m_tiles[i + kAhead]);
     auto const& tile = m_tree.tile(i, m_depth);
     if (!tile.valid()) return;
-    auto const& held = m_tiles[static_cast<std::size_t>(i)];
+    auto const& held = m_tiles[i];
     float3 const* const points = held.data();
     TileBox const box(tile.tijk(), tile.tileVoxelWidth());
     constexpr int kBlock = 64;
@@ -258,10 +257,10 @@ template <class TraitsT>
 Found scanDepth(Container<TraitsT> const& tree, PositionsOf<TraitsT> const& positions, int depth) {
   std::int64_t const tiles = std::min(tree.tileCount(depth), positions.tileCount(depth));
   if (parallelThreads() == 1) return scanSerially(tree, positions, depth, tiles);
-  std::vector<FoundPart> parts(static_cast<std::size_t>(chunkCount(0, tiles, kTilesOfARange)));
+  std::vector<FoundPart> parts(chunkCount(0, tiles, kTilesOfARange));
   parallelChunks(0, tiles, kTilesOfARange, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
     TileScan<TraitsT> scan(tree, positions, depth);
-    FoundPart& part = parts[static_cast<std::size_t>(chunk)];
+    FoundPart& part = parts[chunk];
     for (std::int64_t i = begin; i < end; ++i)
       scan.scan(i, part.missing, [&](ElementToFrom const* moves, std::size_t n) {
         for (; n > 0; --n, ++moves)

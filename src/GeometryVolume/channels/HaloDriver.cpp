@@ -48,7 +48,7 @@ template <class TraitsT> void HaloDriver<TraitsT>::findPlaces(NeighborCache& cac
   cache.known |= steps, cache.open |= steps;
   for (; steps; steps &= steps - 1) {
     auto const step = static_cast<NeighborDirection>(std::countr_zero(steps));
-    OwnerTile& found = cache.around[static_cast<std::size_t>(step)];
+    OwnerTile& found = cache.around[step];
     found.children = nullptr;
     if (step == kNeighborSelf) {
       found.index = cache.tile.index, found.depth = depth;
@@ -70,7 +70,7 @@ template <class TraitsT> void HaloDriver<TraitsT>::findPlaces(NeighborCache& cac
 template <class TraitsT> void HaloDriver<TraitsT>::findChildren(NeighborCache& cache) {
   TileType const* const first = &m_accessor.container()->tile(0, cache.tile.depth);
   for (std::uint32_t steps = std::exchange(cache.open, 0); steps; steps &= steps - 1) {
-    OwnerTile& owner = cache.around[static_cast<std::size_t>(std::countr_zero(steps))];
+    OwnerTile& owner = cache.around[std::countr_zero(steps)];
     if (owner.depth == cache.tile.depth) owner.children = first[owner.index].children();
     if (!owner.children) {
       owner.children = kNoChildren<TraitsT::kTileSize>.data();
@@ -241,9 +241,7 @@ template <class TraitsT> void HaloDriver<TraitsT>::replicate(HaloBox const& box,
 
 template <class TraitsT>
 void HaloDriver<TraitsT>::blend(std::uint64_t missing, void* target, void const* parent) const {
-  auto const axis = [&](int slot) {
-    return m_table.parentAxis[static_cast<std::size_t>(slot % kAcross - 1)].data() + m_table.halo;
-  };
+  auto const axis = [&](int slot) { return m_table.parentAxis[slot % kAcross - 1].data() + m_table.halo; };
   HaloAxis const* const i = axis(m_blockSlot);
   HaloAxis const* const j = axis(m_blockSlot / kAcross);
   HaloAxis const* const k = axis(m_blockSlot / (kAcross * kAcross));
@@ -256,10 +254,9 @@ void HaloDriver<TraitsT>::nearest(HaloBox const& box, TileType const& tile, void
   int flat[3][HaloTable::kLargestWidth];
   int stride = 1;
   for (int a = 0; a < 3; ++a, stride *= m_table.sourceWidth) {
-    auto const axis = static_cast<std::size_t>(a);
-    for (int n = 0; n < box.count[axis]; ++n) {
+    for (int n = 0; n < box.count[a]; ++n) {
       // Both corners lie in the domain, but their difference may not fit when the depths are far apart.
-      std::int64_t const c = tile.tijk()[a] + std::int64_t(box.low[axis] + n) * tile.voxelDataWidth();
+      std::int64_t const c = tile.tijk()[a] + std::int64_t(box.low[a] + n) * tile.voxelDataWidth();
       flat[a][n] = stride * static_cast<int>((c - coarse.tijk()[a]) / coarse.voxelDataWidth());
     }
   }
@@ -396,7 +393,7 @@ void HaloDriver<TraitsT>::fill(TileType const& tile, void* target, HaloFill cons
       set(m_table.core, target, m_source.defaultValue);
   }
   for (int n = 0; n < m_table.regionCount; ++n) {
-    HaloRegion const& region = m_table.regions[static_cast<std::size_t>(n)];
+    HaloRegion const& region = m_table.regions[n];
     if (!(fill.type & (region.face ? kHaloFaces : kHaloEdges)) || fill.type & haloSkip(region.direction))
       continue;
     fillRegion(region, tile, target, fill, sampler);

@@ -102,7 +102,7 @@ private:
   /// The tile that owns a slot of the block: of the cached tile's children and those round them.
   OwnerTile const& ownerOf(NeighborCache& cache, NeighborSlot const& in) {
     if (!(cache.known >> in.direction & 1)) findPlaces(cache, 1u << in.direction), findChildren(cache);
-    return cache.around[static_cast<std::size_t>(in.direction)];
+    return cache.around[in.direction];
   }
   static NeighborSlot const& neighborSlot(int blockSlot) {
     return kNeighborSlots<TraitsT::kTW>[static_cast<std::size_t>(blockSlot)];

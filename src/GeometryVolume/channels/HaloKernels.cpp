@@ -153,7 +153,7 @@ constexpr auto kTable = makeKernels(std::make_index_sequence<kHaloElementSizes.s
 HaloKernels const& haloKernels(std::size_t elementSize) {
   auto const at = std::find(kHaloElementSizes.begin(), kHaloElementSizes.end(), elementSize);
   assert(at != kHaloElementSizes.end());
-  return kTable[static_cast<std::size_t>(at - kHaloElementSizes.begin())];
+  return kTable[at - kHaloElementSizes.begin()];
 }
 
 } // namespace VLN::TileTree3D::Internal

@@ -81,7 +81,7 @@ struct HaloTable {
 
   /// The region of the lowest bit of some places.
   HaloRegion const& regionOf(std::uint64_t places) const {
-    return regions[regionAt[static_cast<std::size_t>(std::countr_zero(places))]];
+    return regions[regionAt[std::countr_zero(places)]];
   }
 };
 
@@ -138,7 +138,7 @@ constexpr HaloTable makeHaloTable(ChannelLayout const& source, ChannelLayout con
       longAxes |= r.count[a] == w ? std::size_t(1) << a : r.count[a] == 1 ? 0 : 8;
     if (longAxes < 8) t.aroundByLength[longAxes] |= std::uint64_t(1) << place;
     t.regionAt[place] = static_cast<std::uint8_t>(t.regionCount);
-    t.regions[static_cast<std::size_t>(t.regionCount++)] = r;
+    t.regions[t.regionCount++] = r;
   };
   for (int3 const step : {int3{1, 0, 0}, int3{0, 1, 0}, int3{0, 0, 1}, int3{1, 1, 0}, int3{1, 0, 1},
                           int3{0, 1, 1}, int3{1, 1, 1}})
@@ -152,8 +152,7 @@ constexpr HaloTable makeHaloTable(ChannelLayout const& source, ChannelLayout con
       target.core - 1 < target.core + target.halo - 2 ? target.core - 1 : target.core + target.halo - 2;
   for (int child = 0; child < tileWidth; ++child)
     for (int n = 0; n < t.targetWidth; ++n)
-      t.parentAxis[static_cast<std::size_t>(child)][static_cast<std::size_t>(n)] =
-          parentAxisAt(child, n - target.halo, w, tileWidth, largest);
+      t.parentAxis[child][n] = parentAxisAt(child, n - target.halo, w, tileWidth, largest);
   return t;
 }
 
@@ -196,7 +195,7 @@ template <int Width> constexpr auto makeBlockSteps() {
   std::array<int, kNeighborCount> table{};
   for (int d = 0; d < kNeighborCount; ++d) {
     int3 const step = neighborOffset(d);
-    table[static_cast<std::size_t>(d)] = step.x + across * (step.y + across * step.z);
+    table[d] = step.x + across * (step.y + across * step.z);
   }
   return table;
 }
@@ -214,8 +213,7 @@ template <int Width> constexpr auto makeNeighborPlaces() {
   std::array<std::size_t, kNeighborCount> count{};
   for (std::size_t n = 0; n < kNeighborSlots<Width>.size(); ++n) {
     auto const& in = kNeighborSlots<Width>[n];
-    auto const d = static_cast<std::size_t>(in.direction);
-    table[d][count[d]++] = {static_cast<std::uint8_t>(n), in.slot};
+    table[in.direction][count[in.direction]++] = {static_cast<std::uint8_t>(n), in.slot};
   }
   return table;
 }

@@ -67,7 +67,7 @@ template <class TraitsT> void HaloSampler<TraitsT>::read(int3 const& p, void* ou
 template <class TraitsT>
 auto HaloSampler<TraitsT>::beside(Around& around, NeighborDirection direction, int3 const& at) const
     -> Beside const& {
-  auto& found = around.beside[static_cast<std::size_t>(direction)];
+  auto& found = around.beside[direction];
   if (around.known >> direction & 1) return found;
   around.known |= 1u << direction;
   found = {};
@@ -142,7 +142,7 @@ bool HaloSampler<TraitsT>::sampleBox(TileType const& from, Places const& places,
     int const n = static_cast<int>(a);
     AxisPlaces const wanted{places.count[a], places.first[n],       places.step,
                             from.tijk()[n],  from.voxelDataWidth(), m_offset[n]};
-    Axis& axis = m_axes[a][static_cast<std::size_t>(places.side[a] + 1)];
+    Axis& axis = m_axes[a][places.side[a] + 1];
     if (axis.places != wanted) axis.set(wanted, stride * size);
     return axis;
   };

@@ -98,8 +98,7 @@ private:
     for (std::size_t r = 0; r < part.runs; ++r) {
       std::uint32_t slots = part.where.slotsOf(starts[r], starts[r + 1] - starts[r]).bits();
       for (; slots; slots &= slots - 1) {
-        auto const* const tile =
-            static_cast<char const*>(part.blocks[r]->tile(static_cast<std::size_t>(std::countr_zero(slots))));
+        auto const* const tile = static_cast<char const*>(part.blocks[r]->tile(std::countr_zero(slots)));
         for (std::size_t byte = 0; byte < m_tileBytes; byte += 64) __builtin_prefetch(tile + byte);
       }
     }

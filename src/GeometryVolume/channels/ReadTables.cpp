@@ -51,8 +51,8 @@ auto ReadTables<TraitsT>::blockInNodes(int i, int j, int k) const noexcept -> Bl
   }
   if (!inside) return &noBlock();
   std::int32_t id = m_cells[cell];
-  for (int d = m_cellDepth + 1; d <= kBlockDepth; ++d) id = m_nodes[static_cast<std::size_t>(id)][slot(u, d)];
-  return &m_blocks[static_cast<std::size_t>(id)];
+  for (int d = m_cellDepth + 1; d <= kBlockDepth; ++d) id = m_nodes[id][slot(u, d)];
+  return &m_blocks[id];
 }
 
 template <class TraitsT>
@@ -102,7 +102,7 @@ template <class TraitsT> auto ReadTables<TraitsT>::makeBlock(int3 const& corner)
     m_blocks.emplace_back();
     entry() = static_cast<std::int32_t>(m_blocks.size() - 1);
   }
-  return m_blocks[static_cast<std::size_t>(entry())];
+  return m_blocks[entry()];
 }
 
 template <class TraitsT>
@@ -114,7 +114,7 @@ ReadTables<TraitsT>::ReadTables(Container<TraitsT> const& tree,
   std::int64_t const count = tree.tileCount(kDepth);
   if (count == 0) return;
   chooseCells(tree);
-  m_blocks.reserve(static_cast<std::size_t>(count / 4 + 1));
+  m_blocks.reserve(count / 4 + 1);
   for (std::int64_t n = 0; n < count; ++n) {
     auto const& tile = tree.tile(n, kDepth);
     if (!tile.valid()) continue;

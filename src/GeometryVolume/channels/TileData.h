@@ -237,7 +237,7 @@ public:
 
 protected:
   /// Drops the tail, or appends zeros.
-  void resize(int n) { Internal::resizeVector(*this->vector(), static_cast<std::size_t>(n), T{}); }
+  void resize(int n) { Internal::resizeVector(*this->vector(), n, T{}); }
 
 private:
   T* elements() { return this->vector()->data(); }

@@ -11,13 +11,12 @@ TileDataElementAccessor::TileDataElementAccessor()
     , m_elementsFrom(kChannelDepths) {}
 
 void TileDataElementAccessor::move(ElementTreeIndex const& from, TreeIndex const& to) {
-  m_elementsTo[static_cast<std::size_t>(to.depth)].push_back(
-      {to.index, from.index, from.element, from.depth});
+  m_elementsTo[to.depth].push_back({to.index, from.index, from.element, from.depth});
   remove(from);
 }
 
 void TileDataElementAccessor::remove(ElementTreeIndex const& element) {
-  m_elementsFrom[static_cast<std::size_t>(element.depth)].push_back({element.index, element.element});
+  m_elementsFrom[element.depth].push_back({element.index, element.element});
 }
 
 void TileDataElementAccessor::join(TileDataElementAccessor const& other) {

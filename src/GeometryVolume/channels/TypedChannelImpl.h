@@ -166,14 +166,14 @@ void TypedChannel<T>::setChannelData(unsigned int kind, Ostil::Any const& type,
 template <class T> void TypedChannel<T>::fillTiles(int depth, std::vector<std::int64_t> const& tiles) {
   if (tiles.empty() || depth < 0 || depth >= kChannelDepths) return;
   cloneData();
-  auto& vectors = (*m_data->dataPtr())[static_cast<std::size_t>(depth)];
+  auto& vectors = (*m_data->dataPtr())[depth];
   auto const count = static_cast<std::int64_t>(vectors.size());
   parallelFor(0, static_cast<std::int64_t>(tiles.size()),
               [&](std::int64_t begin, std::int64_t end) {
                 for (std::int64_t n = begin; n < end; ++n) {
-                  std::int64_t const tile = tiles[static_cast<std::size_t>(n)];
+                  std::int64_t const tile = tiles[n];
                   if (tile < 0 || tile >= count) continue;
-                  auto& values = vectors[static_cast<std::size_t>(tile)];
+                  auto& values = vectors[tile];
                   std::fill(values.begin(), values.end(), m_data->defaultValue());
                 }
               },

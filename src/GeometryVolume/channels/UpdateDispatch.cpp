@@ -30,7 +30,7 @@ public:
     parallelFor(0, n, [&](std::int64_t begin, std::int64_t end) {
       for (auto i = begin; i < end; ++i) {
         VLN_YIELD_POINT();
-        body(*m_channels[static_cast<std::size_t>(i)]);
+        body(*m_channels[i]);
       }
     });
   }

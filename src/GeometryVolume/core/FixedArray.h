@@ -25,6 +25,6 @@ template <class T, std::size_t N> struct FixedArray : std::array<T, N> {
 namespace VLN {
 
 /// One entry for each depth, from 0 on.
-template <class T, int Depths> using PerDepth = Dense1D::FixedArray<T, static_cast<std::size_t>(Depths)>;
+template <class T, int Depths> using PerDepth = Dense1D::FixedArray<T, Depths>;
 
 } // namespace VLN

@@ -75,10 +75,10 @@ void sortByDigit(SortRecord const* from, SortRecord* to, std::int64_t n, std::ui
                  int shift) {
   constexpr std::int64_t kGrain = 32768;
   using Counts = std::array<std::uint32_t, kBuckets>;
-  std::vector<Counts> starts(static_cast<std::size_t>(chunkCount(0, n, kGrain)));
+  std::vector<Counts> starts(chunkCount(0, n, kGrain));
   auto const digit = [=](SortRecord const& r) { return (r.*word >> shift) & (kBuckets - 1); };
   parallelChunks(0, n, kGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-    auto& counts = starts[static_cast<std::size_t>(chunk)];
+    auto& counts = starts[chunk];
     for (std::int64_t i = begin; i < end; ++i) ++counts[digit(from[i])];
   });
   std::uint32_t next = 0;
@@ -86,7 +86,7 @@ void sortByDigit(SortRecord const* from, SortRecord* to, std::int64_t n, std::ui
     for (Counts& counts : starts) next += std::exchange(counts[bucket], next);
   }
   parallelChunks(0, n, kGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-    auto& at = starts[static_cast<std::size_t>(chunk)];
+    auto& at = starts[chunk];
     for (std::int64_t i = begin; i < end; ++i) to[at[digit(from[i])]++] = from[i];
   });
 }
@@ -118,7 +118,7 @@ void parallelSort(SortRecord* records, std::int64_t n) {
     return;
   }
   // Digit by digit from the lowest: linear. Digits in which no two records differ are left out.
-  std::vector<SortRecord> room(static_cast<std::size_t>(n));
+  std::vector<SortRecord> room(n);
   SortRecord *from = records, *to = room.data();
   for (auto const word : {&SortRecord::low, &SortRecord::high}) {
     for (int digit = 0; digit < kDigitsOfAWord; ++digit) {

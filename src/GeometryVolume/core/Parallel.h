@@ -61,12 +61,10 @@ T parallelReduce(std::int64_t begin, std::int64_t end, std::int64_t grain, T ide
   struct Part { // so that parts of bool are objects of their own too
     T value;
   };
-  std::vector<Part> parts(static_cast<std::size_t>(chunkCount(begin, end, grain)), Part{identity});
+  std::vector<Part> parts(chunkCount(begin, end, grain), Part{identity});
   parallelChunks(
       begin, end, grain,
-      [&](std::int64_t chunk, std::int64_t b, std::int64_t e) {
-        parts[static_cast<std::size_t>(chunk)].value = map(b, e);
-      },
+      [&](std::int64_t chunk, std::int64_t b, std::int64_t e) { parts[chunk].value = map(b, e); },
       cancellation);
   T result = std::move(identity);
   for (Part& part : parts) result = join(std::move(result), std::move(part.value));

@@ -47,7 +47,7 @@ using Matrix = std::array<std::uint32_t, 32>;
 
 std::uint32_t times(Matrix const& m, std::uint32_t v) {
   std::uint32_t sum = 0;
-  for (; v; v &= v - 1) sum ^= m[static_cast<std::size_t>(std::countr_zero(v))];
+  for (; v; v &= v - 1) sum ^= m[std::countr_zero(v)];
   return sum;
 }
 Matrix square(Matrix const& m) {
@@ -72,9 +72,9 @@ std::uint32_t crc32Combine(std::uint32_t first, std::uint32_t second, std::uint6
 std::uint32_t crc32(std::uint8_t const* bytes, std::uint64_t size) {
   constexpr std::int64_t kPiece = 1 << 20;
   auto const length = static_cast<std::int64_t>(size);
-  std::vector<std::uint32_t> parts(static_cast<std::size_t>(VLN::chunkCount(0, length, kPiece)));
+  std::vector<std::uint32_t> parts(VLN::chunkCount(0, length, kPiece));
   VLN::parallelChunks(0, length, kPiece, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-    parts[static_cast<std::size_t>(chunk)] = crcOf(bytes + begin, static_cast<std::uint64_t>(end - begin));
+    parts[chunk] = crcOf(bytes + begin, static_cast<std::uint64_t>(end - begin));
   });
   std::uint32_t sum = crcOf(bytes, 0);
   for (std::size_t n = 0; n < parts.size(); ++n) {

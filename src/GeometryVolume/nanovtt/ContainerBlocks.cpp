@@ -10,8 +10,7 @@
 namespace nanovtt::Internal {
 
 void ContainerLayout::findBlocks() {
-  for (int d = m_rootDepth; d <= m_maxDepth; ++d)
-    m_coalesced[d].resize(static_cast<std::size_t>(m_tree.tileCount(d)));
+  for (int d = m_rootDepth; d <= m_maxDepth; ++d) m_coalesced[d].resize(m_tree.tileCount(d));
 
   // Children before parents.
   for (int d = m_maxDepth - 1; d >= m_rootDepth; --d) {
@@ -19,7 +18,6 @@ void ContainerLayout::findBlocks() {
     CoalescedTiles& below = m_coalesced[static_cast<std::size_t>(d) + 1];
     bool const last = d == m_maxDepth - 1;
     forEachTile(m_tree, d, [&](TileType const& tile, std::int64_t index) {
-      auto const n = static_cast<std::size_t>(index);
       int height = 0, children = 0, levels = -1;
       bool same = true;
       for (int slot = 0; slot < TileType::kTileSize; ++slot) {
@@ -30,28 +28,26 @@ void ContainerLayout::findBlocks() {
         if (levels < 0) levels = below.full[child];
         same = same && below.full[child] == levels;
       }
-      here.height[n] = static_cast<std::uint8_t>(height);
+      here.height[index] = static_cast<std::uint8_t>(height);
       if (children != TileType::kTileSize) return;
-      here.full[n] = last                                   ? 1
-                     : same && levels < kMaxCoalescedLevels ? static_cast<std::uint8_t>(levels + 1)
-                                                            : 0;
-      if (here.full[n] == 0) return;
-      for (int slot = 0; slot < TileType::kTileSize; ++slot)
-        below.inBlock[static_cast<std::size_t>(tile.childIndex(slot))] = 1;
+      here.full[index] = last                                   ? 1
+                         : same && levels < kMaxCoalescedLevels ? static_cast<std::uint8_t>(levels + 1)
+                                                                : 0;
+      if (here.full[index] == 0) return;
+      for (int slot = 0; slot < TileType::kTileSize; ++slot) below.inBlock[tile.childIndex(slot)] = 1;
     });
   }
 }
 
 void ContainerLayout::numberBlocks() {
   for (int d = m_rootDepth + 1; d <= m_maxDepth; ++d) {
-    auto const depth = static_cast<std::size_t>(d);
-    auto& order = m_order[depth];
+    auto& order = m_order[d];
     std::vector<std::uint32_t> before(order.size() + 1);
-    for (std::size_t n = 0; n < order.size(); ++n) before[order[n] + 1] = !m_coalesced[depth].inBlock[n];
+    for (std::size_t n = 0; n < order.size(); ++n) before[order[n] + 1] = !m_coalesced[d].inBlock[n];
     for (std::size_t n = 1; n < before.size(); ++n) before[n] += before[n - 1];
     for (auto& number : order) number = before[number];
-    m_log.line("Compacted tiles[", d, "] from ", m_counts[depth], " to ", before.back());
-    m_counts[depth] = before.back();
+    m_log.line("Compacted tiles[", d, "] from ", m_counts[d], " to ", before.back());
+    m_counts[d] = before.back();
   }
 }
 

@@ -10,8 +10,7 @@ namespace nanovtt::Internal {
 void ContainerLayout::chooseHaloDepth(std::uint64_t total) {
   float const fraction = m_settings.haloFraction;
   auto const share = [&](int d) {
-    return static_cast<float>(
-               m_tileCountAccum[static_cast<std::size_t>(std::min(d, kTileCountAccumEntries - 1))]) /
+    return static_cast<float>(m_tileCountAccum[std::min(d, kTileCountAccumEntries - 1)]) /
            static_cast<float>(total);
   };
   int d = m_rootDepth + 1;

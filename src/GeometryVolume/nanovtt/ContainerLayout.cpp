@@ -129,18 +129,17 @@ void ContainerLayout::numberTiles() {
   std::vector<std::vector<std::int64_t>> morton;
   if (m_settings.morton) m_tree.computeMortonPermutations(morton);
   for (int d = m_rootDepth; d <= m_maxDepth; ++d) {
-    auto const depth = static_cast<std::size_t>(d);
     std::int64_t const count = m_tree.tileCount(d);
     if (count >= std::int64_t(kNoTile)) throw std::runtime_error("VTTToNanoVTT: too many tiles to number");
-    m_counts[depth] = static_cast<std::uint32_t>(count);
+    m_counts[d] = static_cast<std::uint32_t>(count);
     if (!m_settings.morton && !coalesced()) continue;
-    auto& order = m_order[depth];
-    order.resize(static_cast<std::size_t>(count));
+    auto& order = m_order[d];
+    order.resize(count);
     VLN::parallelFor(0, count,
                      [&](std::int64_t begin, std::int64_t end) {
-                       for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n)
-                         order[n] = static_cast<std::uint32_t>(m_settings.morton ? morton[depth][n]
-                                                                                 : std::int64_t(n));
+                       for (auto n = begin; n < end; ++n)
+                         order[n] =
+                             static_cast<std::uint32_t>(m_settings.morton ? morton[d][n] : std::int64_t(n));
                      },
                      {.grain = 16384});
   }
@@ -149,7 +148,7 @@ void ContainerLayout::numberTiles() {
 void ContainerLayout::countTiles() {
   std::uint64_t total = 0;
   for (int d = 0; d < kTileCountAccumEntries; ++d) {
-    m_tileCountAccum[static_cast<std::size_t>(d)] = static_cast<std::uint32_t>(total);
+    m_tileCountAccum[d] = static_cast<std::uint32_t>(total);
     if (d >= m_rootDepth && d <= m_maxDepth) total += m_counts[d];
     if (total >= kNoTile) throw std::runtime_error("VTTToNanoVTT: too many tiles to number");
   }

@@ -57,8 +57,7 @@ public:
   /// The number of a tile that is not inside a block.
   std::uint32_t number(int depth, std::int64_t index) const {
     auto const& order = m_order[depth];
-    return m_tileCountAccum[static_cast<std::size_t>(depth)] +
-           (order.empty() ? static_cast<std::uint32_t>(index) : order[static_cast<std::size_t>(index)]);
+    return m_tileCountAccum[depth] + (order.empty() ? static_cast<std::uint32_t>(index) : order[index]);
   }
   bool hasHalo(std::uint32_t number) const {
     return m_halo == Halo::kSome ? m_halosBefore[number + 1] != m_halosBefore[number] : m_halo == Halo::kAll;
@@ -71,7 +70,7 @@ public:
   // Coalescing
   bool coalesced() const { return m_settings.coalesce; }
   bool inBlock(int depth, std::int64_t index) const {
-    return coalesced() && m_coalesced[depth].inBlock[static_cast<std::size_t>(index)];
+    return coalesced() && m_coalesced[depth].inBlock[index];
   }
   /// Levels of the block that the tile heads; 0 for a tile that heads none.
   int blockLevels(TileType const& tile) const;
@@ -84,16 +83,9 @@ public:
 private:
   enum class Halo : std::uint8_t { kNone, kAll, kSome };
 
-  std::uint32_t depthCount(int depth) const {
-    auto const d = static_cast<std::size_t>(depth);
-    return m_tileCountAccum[d + 1] - m_tileCountAccum[d];
-  }
-  int fullLevels(TreeIndex const& at) const {
-    return m_coalesced[at.depth].full[static_cast<std::size_t>(at.index)];
-  }
-  int height(TileType const& tile) const {
-    return m_coalesced[tile.depth()].height[static_cast<std::size_t>(tile.index())];
-  }
+  std::uint32_t depthCount(int depth) const { return m_tileCountAccum[depth + 1] - m_tileCountAccum[depth]; }
+  int fullLevels(TreeIndex const& at) const { return m_coalesced[at.depth].full[at.index]; }
+  int height(TileType const& tile) const { return m_coalesced[tile.depth()].height[tile.index()]; }
   /// Whether the tile's children are found by number: it has some, of a depth that is converted, and they are
   /// not all inside its own block.
   bool hasChildTable(TileType const& tile) const;

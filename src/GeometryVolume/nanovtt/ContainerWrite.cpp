@@ -25,7 +25,7 @@ void ContainerLayout::write(std::uint8_t* bytes, std::uint64_t bufferSize) const
   if (m_log) {
     m_log.line("voxelSize = ", m_tree.voxelSize());
     for (int d = 0; d < kTileCountAccumEntries; ++d)
-      m_log.line("tileCountAccum[", d, "] = ", m_tileCountAccum[static_cast<std::size_t>(d)]);
+      m_log.line("tileCountAccum[", d, "] = ", m_tileCountAccum[d]);
     for (int d = 0; d <= kMaxDepth; ++d) m_log.line("tileCount[", d, "] = ", depthCount(d));
     m_log.line("BufferSize = ", bufferSize);
   }

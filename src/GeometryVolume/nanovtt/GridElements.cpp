@@ -147,17 +147,17 @@ Ostil::Ptr<ChannelBase> withCoarser(ChannelBase const& channel, Tree const& tree
     copy = Ostil::makePtr<ChannelOf<T>>(source.name(), &defaultValue, kInitializeDefaultValue, false, true,
                                         source.minDepth(), source.depth());
   VLN::PerDepth<std::int64_t, kChannelDepths> counts;
-  for (int d = 0; d < kChannelDepths; ++d) counts[static_cast<std::size_t>(d)] = tree.tileCount(d);
+  for (int d = 0; d < kChannelDepths; ++d) counts[d] = tree.tileCount(d);
   copy->resize(counts.data(), kTileSamples);
 
   auto const from = VLN::TileTree3D::Internal::untypedTiles<T>(source);
   auto const storage = copy->cloneData();
   for (int d = std::max(source.minDepth(), 0); d <= std::min(source.depth(), kMaxDepth); ++d) {
-    auto& to = (*storage)[static_cast<std::size_t>(d)];
+    auto& to = (*storage)[d];
     VLN::parallelFor(0, static_cast<std::int64_t>(to.size()),
                      [&](std::int64_t begin, std::int64_t end) {
                        for (std::int64_t n = begin; n < end; ++n) {
-                         auto& tile = to[static_cast<std::size_t>(n)];
+                         auto& tile = to[n];
                          auto const* const samples = static_cast<T const*>(from.elements({n, d}));
                          if (tile.size() != std::size_t(kTileSamples))
                            tile.resize(kTileSamples, defaultValue);

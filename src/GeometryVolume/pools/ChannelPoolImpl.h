@@ -73,10 +73,10 @@ template <class T> void reset(ChannelBase& channel, void const* value, int maxDe
   int const first = std::max(0, channel.minDepth()), last = std::min(maxDepth, channel.depth());
   parallelFor(first, last + 1, [&](std::int64_t begin, std::int64_t end) {
     for (std::int64_t d = begin; d < end; ++d) {
-      auto& tiles = (*storage)[static_cast<std::size_t>(d)];
+      auto& tiles = (*storage)[d];
       parallelFor(0, static_cast<std::int64_t>(tiles.size()), [&](std::int64_t b, std::int64_t e) {
         for (std::int64_t t = b; t < e; ++t) {
-          auto& tile = tiles[static_cast<std::size_t>(t)];
+          auto& tile = tiles[t];
           std::fill(tile.begin(), tile.end(), *static_cast<T const*>(value));
         }
       });

@@ -46,7 +46,7 @@ std::uint64_t parseBytes(std::string_view text, std::string_view unit = "") {
   std::uint64_t value = 0;
   auto const [end, error] = std::from_chars(text.data(), text.data() + text.size(), value);
   if (end == text.data()) throw std::runtime_error("no number");
-  auto rest = text.substr(static_cast<std::size_t>(end - text.data()));
+  auto rest = text.substr(end - text.data());
   rest.remove_prefix(std::min(rest.size(), rest.find_first_not_of(" \t\r")));
   if (auto const last = rest.find_last_not_of(" \t\r"); last != rest.npos) rest = rest.substr(0, last + 1);
   if (rest != unit) throw std::runtime_error("no number");

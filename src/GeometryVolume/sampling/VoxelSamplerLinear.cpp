@@ -41,8 +41,8 @@ VLN_SAMPLER_TEMPLATE VLN_SAMPLER::VoxelSamplerLinear(ContainerT const& container
     : Base(container, topology)
     , m_tileAccessor(container.tileAccessor())
     , m_offsetTypeLinear(topology.offsetType())
-    , m_cacheOneSided(static_cast<std::size_t>(TraitsT::kDepths))
-    , m_cacheTwoSided(static_cast<std::size_t>(TraitsT::kDepths))
+    , m_cacheOneSided(TraitsT::kDepths)
+    , m_cacheTwoSided(TraitsT::kDepths)
     , m_container(&container)
     , m_topology(&topology)
     , m_invVoxelSize(1.0f / container.voxelSize()) {
@@ -244,16 +244,14 @@ VLN_SAMPLER_TEMPLATE float VLN_SAMPLER::sampleAbove(TreeIndex const& tile, int3 
 VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::cachedCorners(TreeIndex const& tile, int3 const& ijk,
                                                      Position const& weights) const -> CellCorners {
   auto const entry = [&](auto& cache) -> auto& {
-    auto const d = static_cast<std::size_t>(tile.depth);
-    if (m_lastTile[d] == tile.index) return cache[static_cast<std::size_t>(m_lastSlot[d])];
+    if (m_lastTile[tile.depth] == tile.index) return cache[m_lastSlot[tile.depth]];
     return updateCache(tile.index, tile.depth, cache);
   };
   if (this->m_offsetType == kVoxelOffsetCorner) {
     // A tile that is asked for gaps again and again is worth widening.
-    auto const d = static_cast<std::size_t>(tile.depth);
     int budget = kMostParentCells;
-    if (m_lastTile[d] != tile.index &&
-        (m_highSides[d].tile != tile.index || m_highSides[d].gaps < kGapsWorthWidening) &&
+    if (m_lastTile[tile.depth] != tile.index &&
+        (m_highSides[tile.depth].tile != tile.index || m_highSides[tile.depth].gaps < kGapsWorthWidening) &&
         edgeCorners(tile, ijk, m_corners.data(), budget))
       return {m_corners.data(), 2, Internal::lanesOf(weights)};
     constexpr int w = D + 1;
@@ -278,12 +276,10 @@ VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::openTables(std::int64_t tileChanges) cons
     try {
       shared.tables = std::make_unique<Internal::ReadTables<TraitsT>>(
           *m_container, [this](std::int64_t n) -> void const* {
-            constexpr auto depth = static_cast<std::size_t>(TraitsT::kMaxDepth);
             auto const size =
                 static_cast<std::size_t>(m_channelWide ? WideChannel::kSize : CoreChannel::kSize);
-            auto const& arrays = (*tileArrays())[depth];
-            auto const at = static_cast<std::size_t>(n);
-            return at < arrays.size() && arrays[at].size() >= size ? arrays[at].data() : nullptr;
+            auto const& arrays = (*tileArrays())[TraitsT::kMaxDepth];
+            return n < std::ssize(arrays) && arrays[n].size() >= size ? arrays[n].data() : nullptr;
           });
     } catch (std::exception const&) { return; } // no memory, or too many tiles: it goes without
     shared.ready.store(tables = shared.tables.get(), std::memory_order_release);
@@ -455,8 +451,7 @@ VLN_SAMPLER_TEMPLATE bool VLN_SAMPLER::edgeCorners(TreeIndex const& tile, int3 c
   for (unsigned c = 0; c < 8; ++c) {
     if (!(gaps >> c & 1)) continue;
     Internal::HaloAxis axis[3];
-    for (int a = 0; a < 3; ++a)
-      axis[a] = axes[static_cast<std::size_t>(child[a])][static_cast<std::size_t>(low[a] + int(c >> a & 1))];
+    for (int a = 0; a < 3; ++a) axis[a] = axes[child[a]][low[a] + int(c >> a & 1)];
     int3 const cell{axis[0].at, axis[1].at, axis[2].at};
     if (cell != lowOfParent) {
       if (budget-- == 0 || !edgeCorners(parent, cell, cornersOfParent.data(), budget)) return false;
@@ -472,13 +467,12 @@ VLN_SAMPLER_TEMPLATE bool VLN_SAMPLER::edgeCorners(TreeIndex const& tile, int3 c
 // The entry that holds the tile, or null.
 VLN_SAMPLER_TEMPLATE template <class Tile>
 auto VLN_SAMPLER::probe(std::int64_t tile, int depth, Cache<Tile>& cache) const -> CacheEntry<Tile>* {
-  auto const d = static_cast<std::size_t>(depth);
-  if (m_lastTile[d] == tile) return &cache[static_cast<std::size_t>(m_lastSlot[d])];
+  if (m_lastTile[depth] == tile) return &cache[m_lastSlot[depth]];
   for (int n = depth; n < depth + kCacheSizeCoarserLevels; ++n) {
-    auto& entry = cache[static_cast<std::size_t>(n)];
+    auto& entry = cache[n];
     if (entry.tile != tile) continue;
     entry.lastUse = m_accessCount;
-    m_lastTile[d] = tile, m_lastSlot[d] = n;
+    m_lastTile[depth] = tile, m_lastSlot[depth] = n;
     return &entry;
   }
   return nullptr;
@@ -488,9 +482,9 @@ auto VLN_SAMPLER::probe(std::int64_t tile, int depth, Cache<Tile>& cache) const 
 VLN_SAMPLER_TEMPLATE template <class Tile> int VLN_SAMPLER::chooseSlot(int depth, Cache<Tile>& cache) const {
   int slot = depth;
   for (int n = depth; n < depth + kCacheSizeCoarserLevels; ++n) {
-    auto const& entry = cache[static_cast<std::size_t>(n)];
+    auto const& entry = cache[n];
     if (entry.tile < 0) return n;
-    if (entry.lastUse < cache[static_cast<std::size_t>(slot)].lastUse) slot = n;
+    if (entry.lastUse < cache[slot].lastUse) slot = n;
   }
   return slot;
 }
@@ -499,7 +493,7 @@ VLN_SAMPLER_TEMPLATE template <class Tile> int VLN_SAMPLER::chooseSlot(int depth
 VLN_SAMPLER_TEMPLATE template <class Tile>
 auto VLN_SAMPLER::keep(std::int64_t tile, int depth, int slot, Cache<Tile>& cache) const
     -> CacheEntry<Tile>& {
-  auto& entry = cache[static_cast<std::size_t>(slot)];
+  auto& entry = cache[slot];
   entry.tile = tile;
   m_lastTile[depth] = tile;
   m_lastSlot[depth] = slot;
@@ -515,7 +509,7 @@ VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::updateCache(std::int64_t index, int depth
     -> CacheEntry<OneSidedTile>& {
   if (auto* const found = probe(index, depth, cache)) return *found;
   int const slot = chooseSlot(depth, cache);
-  auto& entry = cache[static_cast<std::size_t>(slot)];
+  auto& entry = cache[slot];
   entry.tile = -1, entry.lastUse = m_accessCount;
   if (!entry.data) entry.data = OneSidedTile(OneSidedTile::kSize);
   auto const& tile = m_container->tile(index, depth);
@@ -537,7 +531,7 @@ VLN_SAMPLER_TEMPLATE auto VLN_SAMPLER::updateCache(std::int64_t index, int depth
     -> CacheEntry<TwoSidedTile>& {
   if (auto* const found = probe(index, depth, cache)) return *found;
   int const slot = chooseSlot(depth, cache);
-  auto& entry = cache[static_cast<std::size_t>(slot)];
+  auto& entry = cache[slot];
   entry.tile = -1, entry.lastUse = m_accessCount;
   if (!entry.data) entry.data = TwoSidedTile(TwoSidedTile::kSize);
   auto const& tile = m_container->tile(index, depth);
@@ -560,7 +554,7 @@ VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::fillTwoSided(typename ContainerT::TileTyp
     // Two units never leave a tile upwards, not even the narrowest: nothing can be found there.
     if (n == kNeighborSelf || step.x > 0 || step.y > 0 || step.z > 0) continue;
     auto found = findTile(tile.ti() + 2 * step.x, tile.tj() + 2 * step.y, tile.tk() + 2 * step.z, depth);
-    if (found && found.data() != own.data()) around[static_cast<std::size_t>(n)] = found;
+    if (found && found.data() != own.data()) around[n] = found;
   }
 
   struct Axis {
@@ -568,13 +562,13 @@ VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::fillTwoSided(typename ContainerT::TileTyp
     float fraction;
   };
   int3 const child = m_container->tile(tile.parentTreeIndex()).childIJK(tile);
-  std::array<std::array<Axis, static_cast<std::size_t>(D + 2)>, 3> axes;
+  std::array<std::array<Axis, D + 2>, 3> axes;
   for (int a = 0; a < 3; ++a) {
     float const o = this->m_offset[a];
     for (int q = -1; q <= D; ++q) {
       float const x = (static_cast<float>(child[a] * D + q) + o) / static_cast<float>(TraitsT::kTW) - o;
       int const low = std::min(toIntFloor(x), D - 1);
-      axes[static_cast<std::size_t>(a)][static_cast<std::size_t>(q + 1)] = {low, x - static_cast<float>(low)};
+      axes[a][q + 1] = {low, x - static_cast<float>(low)};
     }
   }
 
@@ -587,13 +581,10 @@ VLN_SAMPLER_TEMPLATE void VLN_SAMPLER::fillTwoSided(typename ContainerT::TileTyp
         float& value = out(flat(i, j, k));
         if (si == 0 && sj == 0 && sk == 0) {
           value = own(i, j, k);
-        } else if (auto const& there = around[static_cast<std::size_t>(neighborDirection(si, sj, sk))];
-                   there) {
+        } else if (auto const& there = around[neighborDirection(si, sj, sk)]; there) {
           value = there(i - si * D, j - sj * D, k - sk * D);
         } else {
-          Axis const &x = axes[0][static_cast<std::size_t>(i + 1)],
-                     &y = axes[1][static_cast<std::size_t>(j + 1)],
-                     &z = axes[2][static_cast<std::size_t>(k + 1)];
+          Axis const &x = axes[0][i + 1], &y = axes[1][j + 1], &z = axes[2][k + 1];
           float const* const low = parent.data()->data() + flat(x.low, y.low, z.low);
           value = CellCorners{low, D + 2, {x.fraction, y.fraction, z.fraction, 0.0f}}.value();
         }

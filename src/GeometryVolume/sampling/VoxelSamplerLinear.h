@@ -191,9 +191,7 @@ private:
     auto const weights = cell.weights + __builtin_convertvector(below, Internal::FloatLanes);
     return {data + at[0] + w * (at[1] + w * at[2]), w, weights};
   }
-  float const* dataOf(TreeIndex const& tile) const {
-    return (*tileArrays())[tile.depth][static_cast<std::size_t>(tile.index)].data();
-  }
+  float const* dataOf(TreeIndex const& tile) const { return (*tileArrays())[tile.depth][tile.index].data(); }
   float sampleAbove(TreeIndex const& tile, int3 const& ijk, Position const& weights) const;
   CellCorners cachedCorners(TreeIndex const& tile, int3 const& ijk, Position const& weights) const;
   bool finestEdge(Internal::TileSamples const& samples, SampleCell const& cell) const;

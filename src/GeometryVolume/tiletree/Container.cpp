@@ -322,7 +322,7 @@ template <class TraitsT> void Container<TraitsT>::precomputeCompressedTileHalos(
 }
 template <class TraitsT> TileHalo<TraitsT> const* Container<TraitsT>::tileHalo(TreeIndex const& at) const {
   if (!data().m_halos) return nullptr;
-  return &(*data().m_halos)[at.depth][static_cast<std::size_t>(at.index)];
+  return &(*data().m_halos)[at.depth][at.index];
 }
 template <class TraitsT>
 TileHaloVisitor<TraitsT> Container<TraitsT>::tileHaloVisitor(TreeIndex const& at) const {

@@ -68,8 +68,7 @@ std::int64_t ContainerBuilder<TraitsT>::insertChild(TreeIndex parent, TreeIndex 
 template <class TraitsT>
 void ContainerBuilder<TraitsT>::listNewTiles(Counts const& before, TileLists* newTiles) const {
   for (int d = 0; newTiles && d <= kMaxDepth; ++d) {
-    for (std::int64_t n = before[static_cast<std::size_t>(d)]; n < tileCount(d); ++n)
-      (*newTiles)[d].append(tile({n, d}).tijk());
+    for (std::int64_t n = before[d]; n < tileCount(d); ++n) (*newTiles)[d].append(tile({n, d}).tijk());
   }
 }
 

@@ -34,8 +34,8 @@ public:
     for (int slot = 0; slot < TraitsT::kTileSize; ++slot) {
       int3 const at = Tile<TraitsT, TraitsT::kTileSize>::childIJK(slot);
       auto const w = static_cast<std::uint32_t>(TraitsT::width(depth));
-      auto& offset = m_offsets[static_cast<std::size_t>(slot)];
-      for (int a = 0; a < 3; ++a) offset[static_cast<std::size_t>(a)] = w * static_cast<std::uint32_t>(at[a]);
+      auto& offset = m_offsets[slot];
+      for (int a = 0; a < 3; ++a) offset[a] = w * static_cast<std::uint32_t>(at[a]);
     }
   }
   int3 operator()(int3 const& above, std::size_t slot) const {
@@ -47,7 +47,7 @@ private:
   static int sum(int corner, std::uint32_t offset) {
     return static_cast<int>(static_cast<std::uint32_t>(corner) + offset);
   }
-  std::array<std::array<std::uint32_t, 3>, static_cast<std::size_t>(TraitsT::kTileSize)> m_offsets;
+  std::array<std::array<std::uint32_t, 3>, TraitsT::kTileSize> m_offsets;
 };
 
 /// Calls `f(slot)` for each slot of a set, rising.
@@ -131,7 +131,7 @@ private:
   void listNewTiles(Counts const& before, TileLists* newTiles) const;
   /// Children of a source's tiles of one depth that are not here, by parent, and how many for each chunk.
   struct MissingChildren {
-    std::vector<std::bitset<static_cast<std::size_t>(kTileSize)>> slots;
+    std::vector<std::bitset<kTileSize>> slots;
     std::vector<std::int64_t> counts;
   };
   /// Finds the counterparts of a source's tiles of a depth through those of their parents, which `above` has.

@@ -26,7 +26,7 @@ inline constexpr std::int64_t kPointGrain = 4096;
 template <class TraitsT> struct Siblings {
   SortRecord key; ///< of the parent's corner
   int3 parent;
-  std::bitset<static_cast<std::size_t>(TraitsT::kTileSize)> slots;
+  std::bitset<TraitsT::kTileSize> slots;
 
   /// Calls `f(slot)` for each slot, rising.
   template <class F> void forEachSlot(F const& f) const { Internal::forEachSlot(slots, f); }
@@ -100,8 +100,7 @@ public:
                          [&](std::int64_t begin, std::int64_t end, Groups& to) {
                            auto const accessor = makeAccessor();
                            std::vector<CoverageQuery> queries = above;
-                           for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end);
-                                ++n) {
+                           for (auto n = begin; n < end; ++n) {
                              int3 const& p = here[n].parent;
                              TreeIndex const there = accessor.treeIndex(p.x, p.y, p.z, d - 1, false);
                              if (there.depth == d - 1) continue;
@@ -134,9 +133,9 @@ private:
   /// Groups that chunks of a range make, in the range's order.
   template <class Make>
   static std::vector<Groups> listed(std::int64_t count, std::int64_t grain, Make const& make) {
-    std::vector<Groups> parts(static_cast<std::size_t>(chunkCount(0, count, grain)));
+    std::vector<Groups> parts(chunkCount(0, count, grain));
     parallelChunks(0, count, grain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-      make(begin, end, parts[static_cast<std::size_t>(chunk)]);
+      make(begin, end, parts[chunk]);
     });
     return parts;
   }
@@ -149,9 +148,9 @@ private:
     std::vector<SortRecord> order(starts.back());
     parallelFor(0, static_cast<std::int64_t>(parts.size()), [&](std::int64_t first, std::int64_t last) {
       for (std::int64_t part = first; part < last; ++part) {
-        std::size_t next = starts[static_cast<std::size_t>(part)];
+        std::size_t next = starts[part];
         std::int64_t value = part << kPartShift;
-        for (Group& group : parts[static_cast<std::size_t>(part)])
+        for (Group& group : parts[part])
           group.key = order[next++] = mortonRecord<TraitsT>(group.parent, value++);
       }
     });
@@ -161,7 +160,7 @@ private:
   /// Where a sorted group lies: its part, and its place there.
   static constexpr int kPartShift = 32;
   static Group const& groupOf(std::vector<Groups> const& parts, SortRecord const& record) {
-    return parts[static_cast<std::size_t>(record.value >> kPartShift)]
+    return parts[record.value >> kPartShift]
                 [static_cast<std::size_t>(record.value & ((std::int64_t(1) << kPartShift) - 1))];
   }
   static bool sameParent(SortRecord const& a, SortRecord const& b) {
@@ -171,7 +170,7 @@ private:
     return parallelReduce(
         1, std::max<std::int64_t>(1, static_cast<std::int64_t>(order.size())), kPointGrain, true,
         [&](std::int64_t begin, std::int64_t end) {
-          for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+          for (auto n = begin; n < end; ++n) {
             SortRecord const &a = order[n - 1], &b = order[n];
             if (a.high != b.high ? a.high > b.high : a.low > b.low) return false;
           }
@@ -183,19 +182,18 @@ private:
   static Groups united(std::vector<Groups> const& parts, std::vector<SortRecord> const& order) {
     auto const isFirst = [&](std::size_t n) { return n == 0 || !sameParent(order[n - 1], order[n]); };
     auto const count = static_cast<std::int64_t>(order.size());
-    std::vector<std::size_t> starts(static_cast<std::size_t>(chunkCount(0, count, kPointGrain)));
+    std::vector<std::size_t> starts(chunkCount(0, count, kPointGrain));
     parallelChunks(0, count, kPointGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
       std::size_t firsts = 0;
-      for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n)
-        firsts += isFirst(n);
-      starts[static_cast<std::size_t>(chunk)] = firsts;
+      for (auto n = begin; n < end; ++n) firsts += isFirst(n);
+      starts[chunk] = firsts;
     });
     std::size_t total = 0;
     for (std::size_t& start : starts) total += std::exchange(start, total);
     Groups sorted(total);
     parallelChunks(0, count, kPointGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-      std::size_t next = starts[static_cast<std::size_t>(chunk)];
-      for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+      std::size_t next = starts[chunk];
+      for (auto n = begin; n < end; ++n) {
         if (!isFirst(n)) continue;
         Group& group = sorted[next++] = groupOf(parts, order[n]);
         for (std::size_t same = n + 1; same < order.size() && !isFirst(same); ++same)
@@ -284,14 +282,14 @@ std::vector<std::int64_t> ContainerBuilder<TraitsT>::dropExisting(std::vector<Si
                                                                   std::vector<std::int64_t>& parents) const {
   auto const count = static_cast<std::int64_t>(groups.size());
   parents.resize(groups.size());
-  std::vector<std::int64_t> left(static_cast<std::size_t>(chunkCount(0, count, Internal::kGroupGrain)));
+  std::vector<std::int64_t> left(chunkCount(0, count, Internal::kGroupGrain));
   parallelChunks(
       0, count, Internal::kGroupGrain, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
         auto const accessor = m_tree.growthAccessor();
         Internal::ChildCorners<TraitsT> const corners(depth);
-        MadeParents made(above, groups[static_cast<std::size_t>(begin)], depth);
+        MadeParents made(above, groups[begin], depth);
         std::size_t missing = 0;
-        for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+        for (auto n = begin; n < end; ++n) {
           Siblings& group = groups[n];
           int3 const& p = group.parent;
           parents[n] = made.index(group);
@@ -312,7 +310,7 @@ std::vector<std::int64_t> ContainerBuilder<TraitsT>::dropExisting(std::vector<Si
           }
           missing += group.slots.count();
         }
-        left[static_cast<std::size_t>(chunk)] = static_cast<std::int64_t>(missing);
+        left[chunk] = static_cast<std::int64_t>(missing);
       });
   return left;
 }
@@ -361,10 +359,10 @@ TileIndexLists ContainerBuilder<TraitsT>::makeSiblings(std::vector<Siblings> con
   Internal::ChildCorners<TraitsT> const corners(depth);
   parallelChunks(0, static_cast<std::int64_t>(groups.size()), Internal::kGroupGrain,
                  [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-                   std::int64_t index = starts[static_cast<std::size_t>(chunk)];
+                   std::int64_t index = starts[chunk];
                    TileType* tile = tiles.begin() + index;
                    int const d = depth;
-                   for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+                   for (auto n = begin; n < end; ++n) {
                      Siblings const& group = groups[n];
                      std::int64_t const parent = parents[n];
                      // Each group has its parent to itself.
@@ -377,7 +375,7 @@ TileIndexLists ContainerBuilder<TraitsT>::makeSiblings(std::vector<Siblings> con
                        if (children)
                          children[slot] = index;
                        else
-                         roots[static_cast<std::size_t>(chunk)].push_back(index);
+                         roots[chunk].push_back(index);
                        ++index;
                      });
                    }

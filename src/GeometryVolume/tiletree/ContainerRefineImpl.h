@@ -114,8 +114,8 @@ bool ContainerBuilder<TraitsT>::findChildren(Tree const& source, int depth,
   auto const& parents = source.m_data->tiles(depth - 1);
   std::int64_t const count = parents.size(), wanted = source.m_data->tiles(depth).size();
   auto const chunks = static_cast<std::size_t>(Internal::refineChunks(count));
-  if (here) here->assign(static_cast<std::size_t>(wanted), kDeadSource);
-  missing.slots.resize(static_cast<std::size_t>(count));
+  if (here) here->assign(wanted, kDeadSource);
+  missing.slots.resize(count);
   missing.counts.assign(chunks, 0);
   std::vector<Run> runs(chunks);
   std::atomic<bool> inOrder{true};
@@ -125,26 +125,26 @@ bool ContainerBuilder<TraitsT>::findChildren(Tree const& source, int depth,
     bool neighbours = true;
     std::int64_t notThere = 0;
     for (std::int64_t n = begin; n < end; ++n) {
-      std::bitset<static_cast<std::size_t>(kTileSize)> slots;
+      std::bitset<kTileSize> slots;
       if (std::int64_t const* const children = parents[n].children()) {
-        auto const& counterpart = tile({above[static_cast<std::size_t>(n)], depth - 1});
+        auto const& counterpart = tile({above[n], depth - 1});
         for (int slot = 0; slot < kTileSize; ++slot) {
           std::int64_t const child = children[slot];
           if (child < 0) continue;
           if (run.begin == run.end) run = {child, child};
           neighbours = neighbours && child == run.end++;
           std::int64_t const found = counterpart.childIndex(slot);
-          if (here) (*here)[static_cast<std::size_t>(child)] = found >= 0 ? found : kNotThere;
+          if (here) (*here)[child] = found >= 0 ? found : kNotThere;
           if (found >= 0) continue;
-          slots[static_cast<std::size_t>(slot)] = true;
+          slots[slot] = true;
           ++notThere;
         }
       }
-      missing.slots[static_cast<std::size_t>(n)] = slots;
+      missing.slots[n] = slots;
     }
     if (!neighbours) inOrder.store(false, std::memory_order_relaxed);
-    runs[static_cast<std::size_t>(chunk)] = run;
-    missing.counts[static_cast<std::size_t>(chunk)] = notThere;
+    runs[chunk] = run;
+    missing.counts[chunk] = notThere;
   });
   if (!inOrder) return false;
   // From the first tile to the last.
@@ -163,26 +163,26 @@ std::vector<std::int64_t> ContainerBuilder<TraitsT>::findCounterparts(TileArray<
                                                                       std::vector<std::int64_t> const& above,
                                                                       std::vector<std::int64_t>& here) const {
   std::int64_t const count = wanted.size();
-  std::vector<std::int64_t> missing(static_cast<std::size_t>(Internal::refineChunks(count)));
+  std::vector<std::int64_t> missing(Internal::refineChunks(count));
   Internal::refinePass(count, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
     auto const accessor = m_tree.growthAccessor();
     std::int64_t notThere = 0;
     for (std::int64_t n = begin; n < end; ++n) {
-      std::int64_t& found = here[static_cast<std::size_t>(n)];
+      std::int64_t& found = here[n];
       TileType const& t = wanted[n];
       if (found == kDeadSource && t.valid()) {
         if (t.isRoot()) {
           TreeIndex const at = accessor.treeIndex(t.ti(), t.tj(), t.tk(), depth, false);
           if (at.depth == depth) found = at.index;
         } else {
-          TileType const& over = tile({above[static_cast<std::size_t>(t.parentIndex())], depth - 1});
+          TileType const& over = tile({above[t.parentIndex()], depth - 1});
           found = over.childIndex(Internal::slotOfCorner(over, t.tijk()));
         }
         if (found < 0) found = kNotThere;
       }
       notThere += found == kNotThere;
     }
-    missing[static_cast<std::size_t>(chunk)] = notThere;
+    missing[chunk] = notThere;
   });
   return missing;
 }
@@ -197,13 +197,13 @@ void ContainerBuilder<TraitsT>::makeChildren(Tree const& source, int depth,
   auto& tilesAbove = data().editTiles(depth - 1);
   Internal::ChildCorners<TraitsT> const corners(depth);
   Internal::refinePass(parents.size(), [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
-    std::int64_t index = starts[static_cast<std::size_t>(chunk)];
+    std::int64_t index = starts[chunk];
     TileType* tile = tiles.begin() + index;
     int const d = depth;
     for (std::int64_t n = begin; n < end; ++n) {
-      auto const slots = missing.slots[static_cast<std::size_t>(n)];
+      auto const slots = missing.slots[n];
       if (slots.none()) continue;
-      std::int64_t const parent = above[static_cast<std::size_t>(n)];
+      std::int64_t const parent = above[n];
       TileType& over = tilesAbove[parent]; // by no other source tile
       int3 const at = over.tijk();
       std::int64_t* const children = over.children();
@@ -212,7 +212,7 @@ void ContainerBuilder<TraitsT>::makeChildren(Tree const& source, int depth,
         if (d == kMaxDepth)
           new (static_cast<void*>(tile)) TileType;
         else
-          here[static_cast<std::size_t>(parents[n].children()[slot])] = index;
+          here[parents[n].children()[slot]] = index;
         tile++->init(parent, corner.x, corner.y, corner.z, d, index);
         children[slot] = index++;
       });
@@ -229,15 +229,15 @@ auto ContainerBuilder<TraitsT>::makeTiles(TileArray<TileType> const& wanted, int
   std::vector<std::vector<DetachedTile>> parts(starts.size());
   auto const make = [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {
     auto const accessor = m_tree.growthAccessor();
-    std::int64_t index = starts[static_cast<std::size_t>(chunk)];
+    std::int64_t index = starts[chunk];
     DetachedTile detached;
     for (std::int64_t n = begin; n < end; ++n) {
-      if (here[static_cast<std::size_t>(n)] != kNotThere) continue;
+      if (here[n] != kNotThere) continue;
       TileType const& t = wanted[n];
-      std::int64_t const parent = t.isRoot() ? -1 : above[static_cast<std::size_t>(t.parentIndex())];
+      std::int64_t const parent = t.isRoot() ? -1 : above[t.parentIndex()];
       if (!initLinkedTile(index, depth, t.tijk(), parent, accessor, detached))
-        parts[static_cast<std::size_t>(chunk)].push_back(detached);
-      here[static_cast<std::size_t>(n)] = index++;
+        parts[chunk].push_back(detached);
+      here[n] = index++;
     }
   };
   Internal::refinePass(wanted.size(), make, count);
@@ -258,7 +258,7 @@ template <class TraitsT> void ContainerBuilder<TraitsT>::refine(Tree const& sour
     bool const byParents =
         together && findChildren(source, d, above, d < kMaxDepth ? &here : nullptr, missing);
     if (!together)
-      here.assign(static_cast<std::size_t>(tiles.size()), kDeadSource);
+      here.assign(tiles.size(), kDeadSource);
     else if (!byParents && d == kMaxDepth)
       findChildren(source, d, above, &here, missing);
     std::vector<std::int64_t> starts =

@@ -49,7 +49,7 @@ std::int64_t ContainerBuilder<TraitsT>::invalidateBranch(TreeIndex const& at, Ti
     for (auto child = t.begin(); child != t.end(); ++child)
       count += invalidateBranch(child.treeIndex(), removed);
   t.invalidate();
-  removed[static_cast<std::size_t>(at.depth)].push_back(at.index);
+  removed[at.depth].push_back(at.index);
   return count;
 }
 
@@ -72,7 +72,7 @@ std::int64_t ContainerBuilder<TraitsT>::unlinkTile(TreeIndex const& at, bool wit
         ++data().m_rootCounts[c.depth()];
       }
       t.invalidate();
-      removed[static_cast<std::size_t>(at.depth)].push_back(at.index);
+      removed[at.depth].push_back(at.index);
       return 1;
     }
   } else {
@@ -87,17 +87,17 @@ std::int64_t ContainerBuilder<TraitsT>::unlinkTile(TreeIndex const& at, bool wit
 
 template <class TraitsT>
 void ContainerBuilder<TraitsT>::reserveMoves(TileIndexLists const& lists, TileMoves& moves) {
-  moves.assign(static_cast<std::size_t>(kMaxDepth) + 1, {});
+  moves.assign(kMaxDepth + 1, {});
   for (std::size_t d = 0; d < lists.size(); ++d) moves[d].reserve(lists[d].capacity());
 }
 
 template <class TraitsT> bool ContainerBuilder<TraitsT>::areRisingLeaves(TileIndexLists const& lists) const {
   for (int d = 0; d <= kMaxDepth && d < static_cast<int>(lists.size()); ++d) {
-    auto const& list = lists[static_cast<std::size_t>(d)];
+    auto const& list = lists[d];
     bool const all = parallelReduce(
         0, static_cast<std::int64_t>(list.size()), Internal::kRemovalGrain, true,
         [&](std::int64_t begin, std::int64_t end) {
-          for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+          for (auto n = begin; n < end; ++n) {
             TreeIndex const at{list[n], d};
             if (at.index < 0 || at.index >= tileCount(d) || (n > 0 && list[n - 1] >= at.index)) return false;
             TileType const& t = tile(at);
@@ -140,14 +140,14 @@ void ContainerBuilder<TraitsT>::unlinkLeaves(std::int64_t const* indices, std::i
 
 template <class TraitsT>
 void ContainerBuilder<TraitsT>::removeLeaves(TileIndexLists& lists, TileMoves* moves) {
-  lists.resize(static_cast<std::size_t>(kMaxDepth) + 1);
+  lists.resize(kMaxDepth + 1);
   TileMoves ownMoves;
   TileMoves& made = moves ? *moves : ownMoves;
   reserveMoves(lists, made);
   data().detachTiles();
   std::int64_t count = 0;
   for (int d = 1; d <= kMaxDepth; ++d) {
-    auto const& list = lists[static_cast<std::size_t>(d)];
+    auto const& list = lists[d];
     auto const n = static_cast<std::int64_t>(list.size());
     parallelFor(
         0, n,
@@ -173,7 +173,7 @@ void ContainerBuilder<TraitsT>::removeTiles(TileIndexLists& lists, bool withBran
     return at.index >= 0 && at.index < tileCount(at.depth) && tile(at).valid();
   };
   for (int d = 0; d <= kMaxDepth && d < static_cast<int>(lists.size()); ++d) {
-    for (std::int64_t const index : lists[static_cast<std::size_t>(d)]) {
+    for (std::int64_t const index : lists[d]) {
       TreeIndex const at{index, d};
       if (!live(at)) continue;
       countBranch(at, counts, budget);
@@ -181,9 +181,9 @@ void ContainerBuilder<TraitsT>::removeTiles(TileIndexLists& lists, bool withBran
         spareRoots.try_emplace({static_cast<int>(spareRoots.size()), 0, 0, 0});
     }
   }
-  TileIndexLists removed(static_cast<std::size_t>(kMaxDepth) + 1);
+  TileIndexLists removed(kMaxDepth + 1);
   for (std::size_t d = 0; d < removed.size(); ++d)
-    removed[d].reserve(static_cast<std::size_t>(budget < 0 ? data().m_tileCounts[d] : counts[d]));
+    removed[d].reserve(budget < 0 ? data().m_tileCounts[d] : counts[d]);
   TileMoves ownMoves;
   TileMoves& made = moves ? *moves : ownMoves;
   reserveMoves(removed, made);
@@ -191,7 +191,7 @@ void ContainerBuilder<TraitsT>::removeTiles(TileIndexLists& lists, bool withBran
 
   std::int64_t count = 0;
   for (int d = 0; d <= kMaxDepth && d < static_cast<int>(lists.size()); ++d) {
-    for (std::int64_t const index : lists[static_cast<std::size_t>(d)])
+    for (std::int64_t const index : lists[d])
       count += unlinkTile({index, d}, withBranch, removed, spareRoots);
   }
   // Refused and dead entries have left the lists; branches have joined them.
@@ -203,10 +203,10 @@ void ContainerBuilder<TraitsT>::removeTiles(TileIndexLists& lists, bool withBran
 }
 
 template <class TraitsT> void ContainerBuilder<TraitsT>::compact(TileMoves* moves) {
-  TileIndexLists dead(static_cast<std::size_t>(kMaxDepth) + 1);
+  TileIndexLists dead(kMaxDepth + 1);
   for (int d = 0; d <= kMaxDepth; ++d) {
     for (std::int64_t n = 0; n < tileCount(d); ++n) {
-      if (!tile({n, d}).valid()) dead[static_cast<std::size_t>(d)].push_back(n);
+      if (!tile({n, d}).valid()) dead[d].push_back(n);
     }
   }
   TileMoves ownMoves;
@@ -219,12 +219,12 @@ template <class TraitsT> void ContainerBuilder<TraitsT>::compact(TileMoves* move
 
 template <class TraitsT> void ContainerBuilder<TraitsT>::fillHoles(TileIndexLists& lists, TileMoves& moves) {
   for (int d = 0; d <= kMaxDepth; ++d) {
-    auto& holes = lists[static_cast<std::size_t>(d)];
+    auto& holes = lists[d];
     if (holes.empty()) continue;
     if (!std::is_sorted(holes.begin(), holes.end())) std::sort(holes.begin(), holes.end());
     holes.erase(std::unique(holes.begin(), holes.end()), holes.end());
     auto const& tiles = data().tiles(d);
-    auto& made = moves[static_cast<std::size_t>(d)];
+    auto& made = moves[d];
     // Dead tiles at the very end go without a move, also those that an earlier removal left behind.
     std::int64_t last = tiles.size() - 1;
     std::int64_t filled = -1; // the highest hole that has a tile coming, which is not there yet
@@ -240,7 +240,7 @@ template <class TraitsT> void ContainerBuilder<TraitsT>::fillHoles(TileIndexList
     }
     std::atomic<bool> anyRoot{false};
     parallelFor(0, static_cast<std::int64_t>(made.size()), [&](std::int64_t begin, std::int64_t end) {
-      for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n) {
+      for (auto n = begin; n < end; ++n) {
         auto const [dst, src] = made[n];
         data().editTiles(d).relocate(dst, src);
         TileType& t = editTile({dst, d});
@@ -266,8 +266,8 @@ template <class TraitsT> void ContainerBuilder<TraitsT>::fillHoles(TileIndexList
 
 template <class TraitsT>
 void Container<TraitsT>::removeTile(TreeIndex const& at, bool withBranch, TileMoves* moves) {
-  TileIndexLists lists(static_cast<std::size_t>(kMaxDepth) + 1);
-  if (TraitsT::isDepth(at.depth)) lists[static_cast<std::size_t>(at.depth)].push_back(at.index);
+  TileIndexLists lists(kMaxDepth + 1);
+  if (TraitsT::isDepth(at.depth)) lists[at.depth].push_back(at.index);
   removeTiles(lists, withBranch, moves);
 }
 
@@ -283,12 +283,10 @@ template <class TraitsT> void Container<TraitsT>::permute(std::vector<std::int64
   tilesAdded();
   data().detachTiles();
   auto const mapped = [&](std::int64_t index, int d) {
-    auto const& perm = perms[static_cast<std::size_t>(d)];
-    return index < 0 || perm.empty() ? index : perm[static_cast<std::size_t>(index)];
+    auto const& perm = perms[d];
+    return index < 0 || perm.empty() ? index : perm[index];
   };
-  auto const permuted = [&](int d) {
-    return TraitsT::isDepth(d) && !perms[static_cast<std::size_t>(d)].empty();
-  };
+  auto const permuted = [&](int d) { return TraitsT::isDepth(d) && !perms[d].empty(); };
   PerDepth<typename Data::Array::Room, TraitsT::kDepths> rooms;
   for (int d = 0; d <= kMaxDepth; ++d)
     if (permuted(d)) rooms[d] = data().tiles(d).roomToPermute();
@@ -297,7 +295,7 @@ template <class TraitsT> void Container<TraitsT>::permute(std::vector<std::int64
     for (int d = static_cast<int>(firstDepth); d < static_cast<int>(lastDepth); ++d) {
       if (!permuted(d - 1) && !permuted(d) && !permuted(d + 1)) continue;
       auto& tiles = data().editTiles(d);
-      if (permuted(d)) tiles.permute(perms[static_cast<std::size_t>(d)].data(), rooms[d]);
+      if (permuted(d)) tiles.permute(perms[d].data(), rooms[d]);
       parallelFor(0, tiles.size(),
                   [&](std::int64_t begin, std::int64_t end) {
                     for (std::int64_t n = begin; n < end; ++n) {
@@ -317,22 +315,21 @@ template <class TraitsT> void Container<TraitsT>::permute(std::vector<std::int64
 
 template <class TraitsT>
 void Container<TraitsT>::computeMortonPermutations(std::vector<std::vector<std::int64_t>>& perms) const {
-  perms.assign(static_cast<std::size_t>(kMaxDepth) + 1, {});
+  perms.assign(kMaxDepth + 1, {});
   parallelFor(0, kMaxDepth + 1, [&](std::int64_t firstDepth, std::int64_t lastDepth) {
     for (int d = static_cast<int>(firstDepth); d < static_cast<int>(lastDepth); ++d) {
       auto const& tiles = data().tiles(d);
-      std::vector<SortRecord> order(static_cast<std::size_t>(tiles.size()));
+      std::vector<SortRecord> order(tiles.size());
       parallelFor(0, tiles.size(),
                   [&](std::int64_t begin, std::int64_t end) {
                     for (std::int64_t n = begin; n < end; ++n)
-                      order[static_cast<std::size_t>(n)] = mortonRecord<TraitsT>(tiles[n].tijk(), n);
+                      order[n] = mortonRecord<TraitsT>(tiles[n].tijk(), n);
                   },
                   {.grain = 1024});
       parallelSort(order.data(), tiles.size());
-      auto& perm = perms[static_cast<std::size_t>(d)];
+      auto& perm = perms[d];
       perm.resize(order.size());
-      for (std::size_t n = 0; n < order.size(); ++n)
-        perm[static_cast<std::size_t>(order[n].value)] = static_cast<std::int64_t>(n);
+      for (std::size_t n = 0; n < order.size(); ++n) perm[order[n].value] = static_cast<std::int64_t>(n);
     }
   });
 }

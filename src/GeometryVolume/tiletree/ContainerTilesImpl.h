@@ -78,7 +78,7 @@ template <class TraitsT> TreeIndex Container<TraitsT>::entry(int i, int j, int k
       };
       std::int64_t const nx = data.m_gridSize[0], ny = data.m_gridSize[1];
       std::int64_t const at = (cell(k, o.z) * ny + cell(j, o.y)) * nx + cell(i, o.x);
-      std::int64_t const index = data.m_gridTable[static_cast<std::size_t>(at)];
+      std::int64_t const index = data.m_gridTable[at];
       if (index >= 0) return {index, d};
     }
   }
@@ -140,7 +140,7 @@ template <class TraitsT> void Container<TraitsT>::tilesRemoved(TileMoves const* 
   tilesAdded();
   if (!moves) return;
   for (int d = 0; d <= kMaxDepth && d < static_cast<int>(moves->size()); ++d) {
-    if (!(*moves)[static_cast<std::size_t>(d)].empty()) {
+    if (!(*moves)[d].empty()) {
       ContainerBuilder<TraitsT>(*this).returnThreadLocal(d);
       return;
     }

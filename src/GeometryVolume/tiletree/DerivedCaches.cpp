@@ -64,7 +64,7 @@ std::vector<std::uint8_t> packHalo(typename Container<TraitsT>::TileType const& 
                                    TileHalo<TraitsT> const& halo, HaloCompression const& table) {
   std::uint32_t sameDepth = 0, coarser = 0;
   for (int n = 0; n < kNeighborCount; ++n) {
-    int const levels = n == kNeighborSelf ? -1 : halo.levelDifference[static_cast<std::size_t>(n)];
+    int const levels = n == kNeighborSelf ? -1 : halo.levelDifference[n];
     sameDepth += levels == 0;
     coarser += levels > 0;
   }
@@ -72,11 +72,10 @@ std::vector<std::uint8_t> packHalo(typename Container<TraitsT>::TileType const& 
   out.write(sameDepth, table.sameDepthBits);
   out.write(coarser, table.coarserBits);
   for (int n = 0; n < kNeighborCount; ++n) {
-    if (n != kNeighborSelf && halo.levelDifference[static_cast<std::size_t>(n)] == 0)
-      out.write(static_cast<std::uint32_t>(n), 5);
+    if (n != kNeighborSelf && halo.levelDifference[n] == 0) out.write(static_cast<std::uint32_t>(n), 5);
   }
   for (int n = 0; n < kNeighborCount; ++n) {
-    int const levels = halo.levelDifference[static_cast<std::size_t>(n)];
+    int const levels = halo.levelDifference[n];
     if (levels <= 0) continue;
     out.write(static_cast<std::uint32_t>(n), 5);
     out.write(static_cast<std::uint32_t>(levels > 3 ? 0 : levels), 2);
@@ -131,7 +130,7 @@ template <class TraitsT> Grid computeGrid(Container<TraitsT> const& tree, int ma
     std::size_t cells = 1;
     for (int a = 0; a < 3; ++a) {
       grid.extent[a] = static_cast<int>(extent(box, a));
-      grid.size[static_cast<std::size_t>(a)] = static_cast<std::int32_t>(extent(box, a) / w);
+      grid.size[a] = static_cast<std::int32_t>(extent(box, a) / w);
       cells *= extent(box, a) / w;
     }
     grid.tiles.assign(cells, -1);
@@ -142,7 +141,7 @@ template <class TraitsT> Grid computeGrid(Container<TraitsT> const& tree, int ma
       for (int a = 2; a >= 0; --a) {
         auto const cell =
             (static_cast<std::uint32_t>(tile.tijk()[a]) - static_cast<std::uint32_t>(box.min[a])) / w;
-        at = at * static_cast<std::size_t>(grid.size[static_cast<std::size_t>(a)]) + cell;
+        at = at * static_cast<std::size_t>(grid.size[a]) + cell;
       }
       grid.tiles[at] = n;
     }
@@ -159,10 +158,10 @@ void markDeeperRoots(Container<TraitsT> const& tree, TileLookupTable<TraitsT>& t
     std::size_t cell = 0;
     bool inside = true;
     for (int a = 2; a >= 0; --a) {
-      std::uint32_t const c = TraitsT::quotient(TraitsT::offset(it->first.ijk()[a]), table.gridDepth) -
-                              table.first[static_cast<std::size_t>(a)];
-      inside = inside && c < table.size[static_cast<std::size_t>(a)];
-      cell = cell * table.size[static_cast<std::size_t>(a)] + c;
+      std::uint32_t const c =
+          TraitsT::quotient(TraitsT::offset(it->first.ijk()[a]), table.gridDepth) - table.first[a];
+      inside = inside && c < table.size[a];
+      cell = cell * table.size[a] + c;
     }
     if (inside) table.cells[cell] = table.kUnknown;
   }
@@ -194,11 +193,11 @@ void fillCells(Container<TraitsT> const& tree, Grid const& grid, TileLookupTable
 template <class TraitsT> void fillPlaces(Container<TraitsT> const& tree, TileLookupTable<TraitsT>& table) {
   int const g = table.gridDepth, width = static_cast<int>(table.placeWidth);
   auto const size = static_cast<int>(table.blockSize);
-  table.places.resize(static_cast<std::size_t>(tree.tileCount(g) * size));
+  table.places.resize(tree.tileCount(g) * size);
   parallelFor(0, tree.tileCount(g), [&](std::int64_t begin, std::int64_t end) {
     for (std::int64_t n = begin; n < end; ++n) {
       if (!tree.tile(n, g).valid()) continue;
-      auto* const block = &table.places[static_cast<std::size_t>(n * size)];
+      auto* const block = &table.places[n * size];
       for (int place = 0; place < size; ++place) {
         int const p[3] = {place % width, place / width % width, place / (width * width)};
         TreeIndex at{n, g};
@@ -228,10 +227,9 @@ std::shared_ptr<TileLookupTable<TraitsT> const> computeLookupTable(Container<Tra
   table->placeWidth = static_cast<std::uint32_t>(TraitsT::width(g) / TraitsT::width(last));
   table->blockSize = table->placeWidth * table->placeWidth * table->placeWidth;
   for (int a = 0; a < 3; ++a) {
-    auto const axis = static_cast<std::size_t>(a);
-    table->first[axis] = TraitsT::quotient(TraitsT::offset(grid.origin[a]), g);
-    table->size[axis] = static_cast<std::uint32_t>(grid.size[axis]);
-    table->low[axis] = static_cast<std::uint32_t>(grid.origin[a]);
+    table->first[a] = TraitsT::quotient(TraitsT::offset(grid.origin[a]), g);
+    table->size[a] = static_cast<std::uint32_t>(grid.size[a]);
+    table->low[a] = static_cast<std::uint32_t>(grid.origin[a]);
   }
   auto const lastWidth = static_cast<std::uint32_t>(TraitsT::width(last));
   table->placeBits = static_cast<std::uint32_t>(std::countr_zero(lastWidth));
@@ -272,9 +270,9 @@ computeTileNeighbors(Container<TraitsT> const& tree) {
   auto table = std::make_shared<typename ContainerData<TraitsT>::NeighborTable>();
   for (int d = 0; d <= TraitsT::kMaxDepth; ++d) {
     auto& records = (*table)[d];
-    records.resize(static_cast<std::size_t>(tree.tileCount(d)));
+    records.resize(tree.tileCount(d));
     forEachLiveTile(tree, d, [&](auto const& tile, auto const& accessor) {
-      records[static_cast<std::size_t>(tile.index())] = haloOf<TraitsT>(tile, accessor).neighbors;
+      records[tile.index()] = haloOf<TraitsT>(tile, accessor).neighbors;
     });
   }
   return table;
@@ -286,9 +284,9 @@ computeTileHalos(Container<TraitsT> const& tree) {
   auto table = std::make_shared<typename ContainerData<TraitsT>::HaloTable>();
   for (int d = 0; d <= TraitsT::kMaxDepth; ++d) {
     auto& records = (*table)[d];
-    records.resize(static_cast<std::size_t>(tree.tileCount(d)));
+    records.resize(tree.tileCount(d));
     forEachLiveTile(tree, d, [&](auto const& tile, auto const& accessor) {
-      records[static_cast<std::size_t>(tile.index())] = haloOf<TraitsT>(tile, accessor);
+      records[tile.index()] = haloOf<TraitsT>(tile, accessor);
     });
   }
   return table;
@@ -303,7 +301,7 @@ computeCompressedTileHalos(Container<TraitsT> const& tree) {
   for (int d = 0; d <= TraitsT::kMaxDepth; ++d) {
     auto& records = table->records[d];
     std::int64_t const count = tree.tileCount(d);
-    records.resize(static_cast<std::size_t>(count));
+    records.resize(count);
     std::size_t const firstBlock = table->storage.size();
     table->storage.resize(firstBlock + static_cast<std::size_t>(chunkCount(0, count, kChunk)));
     parallelChunks(0, count, kChunk, [&](std::int64_t chunk, std::int64_t begin, std::int64_t end) {

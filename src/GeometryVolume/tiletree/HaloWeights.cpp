@@ -14,8 +14,8 @@ constexpr std::array<int, kHaloWeightCount> makeNumerators() {
   std::array<bool, kUnit + 1> taken{};
   int n = 0;
   auto const take = [&](int numerator) {
-    taken[static_cast<std::size_t>(numerator)] = true;
-    table[static_cast<std::size_t>(n++)] = numerator;
+    taken[numerator] = true;
+    table[n++] = numerator;
   };
   constexpr int kLast = 175 * kUnit / 1024;
   taken[kLast] = true;
@@ -72,9 +72,7 @@ int nearestHaloWeight(float w) {
   auto const& weights = haloWeights();
   int best = 0;
   for (int n = 1; n < kHaloWeightCount; ++n) {
-    if (std::abs(weights[static_cast<std::size_t>(n)] - w) <
-        std::abs(weights[static_cast<std::size_t>(best)] - w))
-      best = n;
+    if (std::abs(weights[n] - w) < std::abs(weights[best] - w)) best = n;
   }
   return best;
 }

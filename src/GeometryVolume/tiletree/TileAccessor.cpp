@@ -21,7 +21,7 @@ TreeIndex ConstTileAccessorOf<TraitsT>::findNear(int i, int j, int k, int depth)
     auto const side = [w](int c, int corner) { return c < corner ? 0 : distance(c, corner) < w ? 1 : 2; };
     auto const entry =
         static_cast<std::size_t>(9 * side(i, m_corner.x) + 3 * side(j, m_corner.y) + side(k, m_corner.z));
-    TreeIndex const next = (*table)[m_depth][static_cast<std::size_t>(m_index)][entry];
+    TreeIndex const next = (*table)[m_depth][m_index][entry];
     if (next.depth >= 0 && next.depth <= depth && m_container->tile(next).contains(i, j, k)) {
       setCursor(m_container->tile(next));
       return next;
@@ -103,7 +103,7 @@ auto ConstTileAccessorOf<TraitsT>::tileNeighbor(TileType const& t, NeighborDirec
     -> TileType const& {
   if (t.depth() < 0 || t.index() < 0) return invalidTile();
   if (auto const* table = m_container->neighborData()) {
-    TreeIndex const at = (*table)[t.depth()][static_cast<std::size_t>(t.index())][n];
+    TreeIndex const at = (*table)[t.depth()][t.index()][n];
     return at.valid() ? m_container->tile(at) : m_container->invalidTile();
   }
   return tileNeighbor(t, neighborOffset(n), t.depth(), false);
@@ -264,8 +264,8 @@ void TileAccessorOf<TraitsT>::removeTiles(TileIndexLists const& lists, bool with
 template <class TraitsT>
 void TileAccessorOf<TraitsT>::removeTiles(std::vector<std::int64_t> const& indices, int depth,
                                           bool withBranch, TileMoves* moves) {
-  TileIndexLists lists(static_cast<std::size_t>(TraitsT::kDepths));
-  if (TraitsT::isDepth(depth)) lists[static_cast<std::size_t>(depth)] = indices;
+  TileIndexLists lists(TraitsT::kDepths);
+  if (TraitsT::isDepth(depth)) lists[depth] = indices;
   removeTiles(lists, withBranch, moves);
 }
 

@@ -59,7 +59,7 @@ public:
 
   /// Width of a tile of depth `d` in tile-space units, for d in -1..kMaxDepth+3.
   /// Beyond 0..kMaxDepth+1 lie pads that keep divisions defined: the domain width above, 1 below.
-  static constexpr std::int32_t width(int d) { return kWidths[static_cast<std::size_t>(d + 1)]; }
+  static constexpr std::int32_t width(int d) { return kWidths[d + 1]; }
 
   static constexpr bool inDomain(std::int32_t c) { return c >= kMinTileCoord && c <= kMaxTileCoord; }
   static constexpr bool inDomain(std::int32_t i, std::int32_t j, std::int32_t k) {
@@ -85,7 +85,7 @@ public:
   /// @formula A shift by the width's logarithm, or the high word of the product with ceil(2^64 / width),
   /// which is exact for every 32-bit dividend and divisor above 1.
   static constexpr std::uint32_t quotient(std::uint32_t offset, int d) {
-    auto const& divider = kDividers[static_cast<std::size_t>(d)];
+    auto const& divider = kDividers[d];
     if constexpr (kTW == 2)
       return offset >> divider;
     else
@@ -98,7 +98,7 @@ public:
 
 private:
   static constexpr auto kDividers = [] {
-    std::array<std::uint64_t, static_cast<std::size_t>(kMaxDepth + 1)> divider{};
+    std::array<std::uint64_t, kMaxDepth + 1> divider{};
     std::uint64_t w = static_cast<std::uint64_t>(kDomainWidth);
     for (auto& entry : divider) {
       if constexpr (kTW == 2) {
@@ -111,7 +111,7 @@ private:
     return divider;
   }();
   static constexpr auto kWidths = [] {
-    std::array<std::int32_t, static_cast<std::size_t>(kMaxDepth + 5)> w{};
+    std::array<std::int32_t, kMaxDepth + 5> w{};
     std::int32_t value = kDomainWidth;
     w[0] = value;
     for (std::size_t n = 1; n < w.size(); ++n) {

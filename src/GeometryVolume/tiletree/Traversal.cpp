@@ -193,11 +193,11 @@ void TraversalEngine<IsConst, TraitsT>::parallelRange(std::int64_t count, Affini
                 {.grain = grain, .cancellation = Cancellation::kPoll, .affinity = affinity});
   } else {
     std::int64_t const chunk = std::max(grain, (count + kJoinedChunks - 1) / kJoinedChunks);
-    std::vector<std::unique_ptr<VisitorType>> parts(static_cast<std::size_t>(chunkCount(0, count, chunk)));
+    std::vector<std::unique_ptr<VisitorType>> parts(chunkCount(0, count, chunk));
     parallelChunks(
         0, count, chunk,
         [&](std::int64_t c, std::int64_t begin, std::int64_t end) {
-          auto& part = parts[static_cast<std::size_t>(c)];
+          auto& part = parts[c];
           part.reset(m_visitor.clone());
           pass(*part, begin, end);
         },
@@ -277,8 +277,7 @@ template <bool IsConst, class TraitsT> void TraversalEngine<IsConst, TraitsT>::b
 template <bool IsConst, class TraitsT> void TraversalEngine<IsConst, TraitsT>::parallelBreadth() {
   std::vector<TreeIndex> level = std::move(m_starts);
   while (!level.empty()) {
-    parallelRange(static_cast<std::int64_t>(level.size()), nullptr,
-                  [&](std::int64_t n) { return level[static_cast<std::size_t>(n)]; });
+    parallelRange(static_cast<std::int64_t>(level.size()), nullptr, [&](std::int64_t n) { return level[n]; });
     std::vector<TreeIndex> next;
     for (TreeIndex const& at : level) {
       TileType const& t = tile(at);
@@ -354,19 +353,18 @@ template <bool IsConst, class TraitsT> void TraversalEngine<IsConst, TraitsT>::p
     parallelFor(0, count,
                 [&](std::int64_t begin, std::int64_t end) {
                   VisitorType& v = *m_visitor.visitorCopy();
-                  for (std::int64_t n = begin; n < end; ++n)
-                    depthFirst(v, branches[static_cast<std::size_t>(n)]);
+                  for (std::int64_t n = begin; n < end; ++n) depthFirst(v, branches[n]);
                 },
                 {.cancellation = Cancellation::kPoll});
   } else {
     std::int64_t const chunk = std::max<std::int64_t>(1, (count + kJoinedChunks - 1) / kJoinedChunks);
-    std::vector<std::unique_ptr<VisitorType>> parts(static_cast<std::size_t>(chunkCount(0, count, chunk)));
+    std::vector<std::unique_ptr<VisitorType>> parts(chunkCount(0, count, chunk));
     parallelChunks(
         0, count, chunk,
         [&](std::int64_t c, std::int64_t begin, std::int64_t end) {
-          auto& part = parts[static_cast<std::size_t>(c)];
+          auto& part = parts[c];
           part.reset(m_visitor.clone());
-          for (std::int64_t n = begin; n < end; ++n) depthFirst(*part, branches[static_cast<std::size_t>(n)]);
+          for (std::int64_t n = begin; n < end; ++n) depthFirst(*part, branches[n]);
         },
         Cancellation::kPoll);
     for (auto const& part : parts) m_visitor.join(*part);

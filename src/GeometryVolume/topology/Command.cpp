@@ -69,9 +69,9 @@ void initializeTileData(Container<TraitsT> const& container,
   PerDepth<std::vector<std::int64_t>, TraitsT::kDepths> tiles;
   auto accessor = container.tileAccessor();
   for (int d = 0; d < TraitsT::kDepths; ++d) {
-    for (int3 const& corner : newTiles[static_cast<std::size_t>(d)]) {
+    for (int3 const& corner : newTiles[d]) {
       auto const& tile = accessor.tile(corner, d, true);
-      if (tile.valid()) tiles[static_cast<std::size_t>(d)].push_back(tile.index());
+      if (tile.valid()) tiles[d].push_back(tile.index());
     }
   }
   for (auto const& name : object.componentRange()) {
@@ -79,8 +79,7 @@ void initializeTileData(Container<TraitsT> const& container,
     VLN::Internal::ScopedExtraction<ChannelBase> const taken(object, name);
     ChannelBase& channel = *taken;
     int const last = std::min(channel.depth(), TraitsT::kMaxDepth);
-    for (int d = std::max(channel.minDepth(), 0); d <= last; ++d)
-      channel.fillTiles(d, tiles[static_cast<std::size_t>(d)]);
+    for (int d = std::max(channel.minDepth(), 0); d <= last; ++d) channel.fillTiles(d, tiles[d]);
   }
 }
 

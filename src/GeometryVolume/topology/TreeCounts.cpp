@@ -17,9 +17,8 @@ template <int Depths> void TreeCounts<Depths>::countTiles(Component const& tree,
   }
   tileCountTotal = tree.tileCount(-1);
   for (int d = 0; d < Depths; ++d) {
-    auto const depth = static_cast<std::size_t>(d);
-    tileCounts[depth] = tree.tileCount(d);
-    elementsPerTile[depth].resize(static_cast<std::size_t>(tileCounts[depth]), newElements);
+    tileCounts[d] = tree.tileCount(d);
+    elementsPerTile[d].resize(tileCounts[d], newElements);
   }
 }
 
@@ -40,22 +39,20 @@ template <int Depths> void TreeCounts<Depths>::countElements(Component const& so
   } sums{*this};
   elementCountTotal = 0;
   for (int d = 0; d < Depths; ++d) {
-    auto const depth = static_cast<std::size_t>(d);
-    auto& tiles = elementsPerTile[depth];
+    auto& tiles = elementsPerTile[d];
     std::int64_t const known = source.tileCount(d); // the source may cover fewer depths
-    elementCounts[depth] = parallelReduce(
-        0, tileCounts[depth], 4096, std::int64_t(0),
+    elementCounts[d] = parallelReduce(
+        0, tileCounts[d], 4096, std::int64_t(0),
         [&](std::int64_t begin, std::int64_t end) {
           std::int64_t sum = 0;
           for (std::int64_t n = begin; n < end; ++n) {
             int const elements = n < known ? source.elementCount(TreeIndex{n, d}) : 0;
-            sum += tiles[static_cast<std::size_t>(n)] =
-                std::max(static_cast<std::uint32_t>(elements), atLeast);
+            sum += tiles[n] = std::max(static_cast<std::uint32_t>(elements), atLeast);
           }
           return sum;
         },
         [](std::int64_t x, std::int64_t y) { return x + y; });
-    elementCountTotal += elementCounts[depth];
+    elementCountTotal += elementCounts[d];
   }
   sums.taken = true;
 }

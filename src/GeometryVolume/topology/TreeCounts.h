@@ -24,7 +24,7 @@ template <int Depths> struct TreeCounts {
   std::int64_t tileCount(int depth) const { return at(tileCounts, tileCountTotal, depth); }
   std::int64_t elementCount(int depth) const { return at(elementCounts, elementCountTotal, depth); }
   int elementCount(TreeIndex const& tile) const {
-    return static_cast<int>(elementsPerTile[tile.depth][static_cast<std::size_t>(tile.index)]);
+    return static_cast<int>(elementsPerTile[tile.depth][tile.index]);
   }
 
   /// Takes the tile counts of a tree. Tiles that are new get `newElements` elements.
@@ -36,7 +36,7 @@ template <int Depths> struct TreeCounts {
 private:
   static std::int64_t at(Counts const& counts, std::int64_t total, int depth) {
     if (depth == -1) return total;
-    return depth >= 0 && depth < Depths ? counts[static_cast<std::size_t>(depth)] : 0;
+    return depth >= 0 && depth < Depths ? counts[depth] : 0;
   }
 };
 

@@ -87,7 +87,7 @@ template <class T> struct TypedSlot final : FieldSlot {
   void follow(VolumeData& volume) override {
     VolumeTree const& tree = *volume.tree;
     auto const missing = [&](int d) {
-      return tree.tileCount(d) - static_cast<std::int64_t>(tiles()[static_cast<std::size_t>(d)].size());
+      return tree.tileCount(d) - static_cast<std::int64_t>(tiles()[d].size());
     };
     std::int64_t added = 0;
     for (int d = 0; d <= kFinest; ++d) added += std::max<std::int64_t>(0, missing(d));
@@ -121,7 +121,7 @@ template <class T> struct TypedSlot final : FieldSlot {
     VLN::Internal::Rollback entries([&] {
       for (BlockTiles& made : tiles.first(entered)) {
         for (std::uint32_t left = made.slots; left; left &= left - 1)
-          made.block->tiles[static_cast<std::size_t>(std::countr_zero(left))].storeRelaxed(nullptr);
+          made.block->tiles[std::countr_zero(left)].storeRelaxed(nullptr);
       }
     });
     if (tiles.size() > 1) blocks.reserve(tiles.size());
@@ -130,7 +130,7 @@ template <class T> struct TypedSlot final : FieldSlot {
       BlockTiles& wanted = tiles[n];
       wanted.block = &blocks.make(wanted.position);
       for (std::uint32_t left = wanted.slots; left; left &= left - 1) {
-        auto& entry = wanted.block->tiles[static_cast<std::size_t>(std::countr_zero(left))];
+        auto& entry = wanted.block->tiles[std::countr_zero(left)];
         if (entry.loadRelaxed())
           wanted.slots &= ~(left & -left);
         else
@@ -184,7 +184,7 @@ template <class T> struct TypedSlot final : FieldSlot {
     detach(volume);
     m_channel->updateTilesRemoved(moves, *volume.topology);
     m_tiles = m_channel->cloneData().get();
-    for (int d = 0; d <= kFinest; ++d) m_filled[static_cast<std::size_t>(d)] = volume.tree->tileCount(d);
+    for (int d = 0; d <= kFinest; ++d) m_filled[d] = volume.tree->tileCount(d);
     blocksBuilt = false;
     enterBlocks(*volume.tree);
     written.store(true, std::memory_order_relaxed);
@@ -232,28 +232,24 @@ template <class T> struct TypedSlot final : FieldSlot {
     }
   }
   TileArrays<T> const& tiles() const { return *std::as_const(*m_channel).tileArrays(); }
-  TileVector<T> const& tile(TreeIndex const& at) const {
-    return tiles()[static_cast<std::size_t>(at.depth)][static_cast<std::size_t>(at.index)];
-  }
+  TileVector<T> const& tile(TreeIndex const& at) const { return tiles()[at.depth][at.index]; }
   ChannelType& typed() { return *m_channel; }
 
 private:
   /// New tiles take the values of the coarser samples that were read at their places.
   void fillNew(VolumeTree const& tree, int depth) {
-    auto const d = static_cast<std::size_t>(depth);
-    std::int64_t const begin = m_filled[d], end = static_cast<std::int64_t>(tiles()[d].size());
+    std::int64_t const begin = m_filled[depth], end = static_cast<std::int64_t>(tiles()[depth].size());
     if (begin >= end) return;
     if (depth > 0) {
       auto const body = [&](std::int64_t b, std::int64_t e) {
-        for (auto n = b; n < e; ++n)
-          fillFromParent(tree, {n, depth}, (*m_tiles)[d][static_cast<std::size_t>(n)]);
+        for (auto n = b; n < e; ++n) fillFromParent(tree, {n, depth}, (*m_tiles)[depth][n]);
       };
       if (end - begin < kFewTiles)
         body(begin, end);
       else
         parallelFor(begin, end, body, {.grain = kFewTiles});
     }
-    m_filled[d] = end;
+    m_filled[depth] = end;
   }
   void fillFromParent(VolumeTree const& tree, TreeIndex const& place, TileVector<T>& to) {
     auto const& made = tree.tile(place);
@@ -279,8 +275,7 @@ private:
     auto const& above = tree.tile(at);
     int3 const p[2] = {above.childDataIJK(corner), above.childDataIJK(corner + int3{2, 2, 2})};
     for (std::size_t n = 0; n < kTileElements; ++n)
-      to[n] = from[static_cast<std::size_t>(
-          ConstTileData<T, 4, 0>::index(p[n >> 1 & 1].x, p[n >> 3 & 1].y, p[n >> 5].z))];
+      to[n] = from[ConstTileData<T, 4, 0>::index(p[n >> 1 & 1].x, p[n >> 3 & 1].y, p[n >> 5].z)];
   }
 
   void makeGroup(VolumeTree const& tree, std::span<BlockTiles const> tiles,
@@ -293,8 +288,8 @@ private:
   /// Makes the finest tiles of the tree that the channel lacks, pending ones by handing over their elements.
   /// What is thrown leaves all as it was.
   void adoptPending(VolumeTree const& tree) {
-    auto const first = static_cast<std::int64_t>(tiles()[static_cast<std::size_t>(kFinest)].size());
-    std::vector<TileVector<T>> arriving(static_cast<std::size_t>(tree.tileCount(kFinest) - first));
+    auto const first = static_cast<std::int64_t>(tiles()[kFinest].size());
+    std::vector<TileVector<T>> arriving(tree.tileCount(kFinest) - first);
     parallelFor(0, static_cast<std::int64_t>(m_pending.groupCount()),
                 [&](std::int64_t begin, std::int64_t end) {
                   auto const accessor = tree.tileAccessor();
@@ -307,15 +302,14 @@ private:
                 {.grain = 4});
     auto const swapAll = [&] {
       for (std::size_t n = 0; n < m_pending.groupCount(); ++n)
-        for (PendingTile<T>& tile : m_pending.group(n))
-          arriving[static_cast<std::size_t>(tile.arrival)].swap(tile.elements);
+        for (PendingTile<T>& tile : m_pending.group(n)) arriving[tile.arrival].swap(tile.elements);
     };
     swapAll();
     VLN::Internal::Rollback swapped(swapAll);
     parallelFor(0, static_cast<std::int64_t>(arriving.size()),
                 [&](std::int64_t begin, std::int64_t end) {
                   for (auto n = begin; n < end; ++n) {
-                    auto& elements = arriving[static_cast<std::size_t>(n)];
+                    auto& elements = arriving[n];
                     if (!elements.empty()) continue;
                     elements = m_channel->newTile();
                     fillFromParent(tree, {first + n, kFinest}, elements);
@@ -325,7 +319,7 @@ private:
     m_channel->appendTiles(kFinest, arriving);
     swapped.dismiss();
     m_pending.clear();
-    m_filled[static_cast<std::size_t>(kFinest)] = tree.tileCount(kFinest);
+    m_filled[kFinest] = tree.tileCount(kFinest);
   }
   /// Enters the finest tiles that the table lacks.
   void enterBlocks(VolumeTree const& tree) {
@@ -333,13 +327,13 @@ private:
       blocks.clear();
       m_entered = 0;
     }
-    auto const& finest = tiles()[static_cast<std::size_t>(kFinest)];
+    auto const& finest = tiles()[kFinest];
     auto const count = std::min(static_cast<std::int64_t>(finest.size()), tree.tileCount(kFinest));
     // Most blocks hold several tiles; those that do not make the table grow.
     if (count - m_entered > kFewTiles) blocks.reserve(static_cast<std::size_t>(count - m_entered) / 4);
     for (; m_entered < count; ++m_entered) {
       auto const& at = tree.tile(m_entered, kFinest);
-      TileVector<T> const& elements = finest[static_cast<std::size_t>(m_entered)];
+      TileVector<T> const& elements = finest[m_entered];
       if (at.valid() && elements.size() >= kTileElements)
         blocks.entry(at.tijk()).storeRelease(const_cast<T*>(elements.data()));
     }
@@ -432,7 +426,7 @@ template <class T> T Field<T>::coarse(int i, int j, int k) const {
     auto const& tile = accessor.tile(at);
     if (elements.size() >= kTileElements) {
       int3 const p = tile.childDataIJK(i, j, k);
-      return elements[static_cast<std::size_t>(ConstTileData<T, 4, 0>::index(p))];
+      return elements[ConstTileData<T, 4, 0>::index(p)];
     }
     at = tile.parentTreeIndex();
   }
@@ -448,7 +442,7 @@ template <class T> void Field<T>::set(std::span<int3 const> positions, std::span
   });
   m_volume->valuesChanged(*m_slot);
   parallelFor(0, static_cast<std::int64_t>(plan.shares), [&](std::int64_t begin, std::int64_t end) {
-    for (auto share = static_cast<std::size_t>(begin); share < static_cast<std::size_t>(end); ++share)
+    for (auto share = begin; share < end; ++share)
       for (std::size_t chunk = 0; chunk < plan.chunks(); ++chunk) {
         std::size_t const first = plan.begins[chunk];
         for (BulkRun const& run : plan.list(chunk, share))

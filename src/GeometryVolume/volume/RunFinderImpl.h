@@ -242,7 +242,7 @@ private:
   }
   static bool holds(FieldBlock const& block, SlotBytes slots) {
     for (std::uint32_t left = slots.bits(); left; left &= left - 1)
-      if (!block.tiles[static_cast<std::size_t>(std::countr_zero(left))].loadAcquire()) return false;
+      if (!block.tiles[std::countr_zero(left)].loadAcquire()) return false;
     return true;
   }
   /// The block that holds a position, with tiles at `slots`. Null beyond the domain.
@@ -270,7 +270,7 @@ private:
     } else {
       FieldBlock& listed = seen.kind == SeenBlock::kListed ? *seen.block : list(p);
       for (std::uint32_t left = missing; left; left &= left - 1)
-        listed.tiles[static_cast<std::size_t>(std::countr_zero(left))].storeRelaxed(this);
+        listed.tiles[std::countr_zero(left)].storeRelaxed(this);
     }
     seen.unknown.drop(missing);
     return true;

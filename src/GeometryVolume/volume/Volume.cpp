@@ -169,7 +169,7 @@ void Volume::refineWhere(int3 const& low, int3 const& high, FunctionRef<bool(Til
         0, count, 256, std::vector<int3>(),
         [&](std::int64_t begin, std::int64_t end) {
           std::vector<int3> accepted;
-          for (auto n = static_cast<std::size_t>(begin); n < static_cast<std::size_t>(end); ++n)
+          for (auto n = begin; n < end; ++n)
             for (int slot = 0; slot < Shape::kTileSize; ++slot) {
               int3 const corner = frontier[n] + int3{slot & 1, slot >> 1 & 1, slot >> 2} * width;
               if (meets(corner, width) && predicate({corner, width, d})) accepted.push_back(corner);
@@ -180,15 +180,15 @@ void Volume::refineWhere(int3 const& low, int3 const& high, FunctionRef<bool(Til
           a.insert(a.end(), b.begin(), b.end());
           return a;
         });
-    for (int3 const& corner : frontier) lists[static_cast<std::size_t>(d)].append(corner);
+    for (int3 const& corner : frontier) lists[d].append(corner);
   }
   m_data->makeTiles(lists);
 }
 
 std::int64_t Volume::removeWhere(FunctionRef<bool(TileBox const&)> predicate) {
   Tree const& tree = this->tree();
-  TileIndexLists lists(static_cast<std::size_t>(Shape::kDepths));
-  auto& finest = lists[static_cast<std::size_t>(kFinest)];
+  TileIndexLists lists(Shape::kDepths);
+  auto& finest = lists[kFinest];
   finest = parallelReduce(
       0, tree.tileCount(kFinest), 1024, std::vector<std::int64_t>(),
       [&](std::int64_t begin, std::int64_t end) {

@@ -102,7 +102,7 @@ void VolumeData::flush() {
 void VolumeData::flushLocked() {
   if (!hasPending()) return;
   VolumeTree::TileLists lists;
-  auto& finest = lists[static_cast<std::size_t>(kFinest)];
+  auto& finest = lists[kFinest];
   for (auto const& slot : slots) slot->listPending(finest);
   VolumeTree& edited = editTree();
   epoch.fetch_add(1, std::memory_order_relaxed);
@@ -170,11 +170,11 @@ void VolumeData::makeTiles(VolumeTree::TileLists& lists) {
 
 void VolumeData::addTiles(VolumeTree& edited, VolumeTree::TileLists& lists) {
   int const root = rootDepth();
-  auto& roots = lists[static_cast<std::size_t>(root)];
+  auto& roots = lists[root];
   int3 last{0, 0, 0};
   bool any = false;
   for (int d = root + 1; d <= kFinest; ++d)
-    for (int3 const& p : lists[static_cast<std::size_t>(d)]) {
+    for (int3 const& p : lists[d]) {
       int3 const corner{VolumeShape::align(p.x, root), VolumeShape::align(p.y, root),
                         VolumeShape::align(p.z, root)};
       if (!any || corner != last) roots.append(corner);

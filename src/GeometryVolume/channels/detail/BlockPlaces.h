@@ -33,7 +33,7 @@ private:
   static_assert(kWidth * kWidth * kWidth <= 1 << kElementBits && kSlots <= 16);
 
   static constexpr auto kCodes = [] {
-    std::array<std::array<std::uint32_t, static_cast<std::size_t>(kBlockWidth)>, 3> codes{};
+    std::array<std::array<std::uint32_t, kBlockWidth>, 3> codes{};
     std::uint32_t slot = 1, element = 1;
     for (auto& axis : codes) {
       std::uint32_t c = 0;

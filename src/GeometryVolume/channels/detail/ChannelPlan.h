@@ -101,9 +101,7 @@ struct TileSlots {
   PerDepth<std::vector<std::int64_t>, kChannelDepths> offsets;
   std::int64_t total = 0;
 
-  std::int64_t at(int depth, std::int64_t tile) const {
-    return offsets[depth][static_cast<std::size_t>(tile)];
-  }
+  std::int64_t at(int depth, std::int64_t tile) const { return offsets[depth][tile]; }
 };
 /// Slots one behind the other for the first `counts[d]` tiles of each depth. Tiles without elements take
 /// none; `slotOf(elements)` gives the room of the others.

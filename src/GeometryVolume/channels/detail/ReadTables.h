@@ -25,7 +25,7 @@ public:
   static constexpr int kBlockWidth = TraitsT::width(kBlockDepth);
   /// Slots as in a tile.
   struct alignas(64) Block {
-    std::array<void const*, static_cast<std::size_t>(TraitsT::kTileSize)> tiles{};
+    std::array<void const*, TraitsT::kTileSize> tiles{};
 
     void const* tile(std::size_t slot) const { return tiles[slot]; }
   };
@@ -39,7 +39,7 @@ public:
   Block const* block(int i, int j, int k) const noexcept {
     if (m_cellDepth != kBlockDepth) return blockInNodes(i, j, k);
     auto const* const cell = cellIfBlocks(i, j, k);
-    return cell ? &m_blocks[static_cast<std::size_t>(*cell)] : &noBlock();
+    return cell ? &m_blocks[*cell] : &noBlock();
   }
   /// Asks for the elements of a block's tiles, unless that is `fetched`, and for those of the block at a
   /// point.
@@ -56,7 +56,7 @@ public:
   std::uint64_t memUsage() const;
 
 private:
-  using Node = std::array<std::int32_t, static_cast<std::size_t>(TraitsT::kTileSize)>;
+  using Node = std::array<std::int32_t, TraitsT::kTileSize>;
 
   /// Slot, in its parent, of the tile of depth `d` at an offset.
   static std::size_t slot(std::uint32_t const* u, int d) {
