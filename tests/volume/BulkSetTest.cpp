@@ -233,6 +233,39 @@ TEST(BulkSetTest, NegativeBeyondTheDomainAfterManyTiles) {
   }
 }
 
+/// Blocks that the field has with some of their tiles get others before the position beyond is met, and lose
+/// them again.
+TEST(BulkSetTest, NegativeBeyondTheDomainAtRandom) {
+  auto positions = boxOf({-30, -30, -30}, {70, 70, 70}, 2, 0);
+  std::shuffle(positions.begin(), positions.end(), std::mt19937(7));
+  std::span const some(positions.data(), 500);
+  auto beyond = positions;
+  int3 const first{5, kLow - 1, 6};
+  beyond.insert(beyond.end() - 1000, {first, {kHigh + 1, 0, 0}, {0, 0, kHigh + 9}, {kHigh + 1, 7, 7}});
+  std::vector<float> const ones(beyond.size(), 1.0f);
+  for (int const threads : {1, 2, 3})
+    VLN::withThreads(threads, [&] {
+      Volume volume;
+      auto field = volume.addField<float>("f", 7);
+      field.set(some, std::vector<float>(some.size(), 5.0f));
+      if (threads != 2) volume.tileCount(); // tiles of the tree; pending ones else
+      std::string message;
+      try {
+        field.set(beyond, ones);
+      } catch (std::out_of_range const& e) { message = e.what(); }
+      EXPECT_EQ(message, "(5, " + std::to_string(first.y) + ", 6) lies outside the domain of a volume");
+      std::size_t written = 0;
+      for (int3 const& p : positions) written += field.get(p) == 5.0f;
+      EXPECT_EQ(written, some.size());
+      for (float const& element : field.channel()) ASSERT_TRUE(element == 5.0f || element == 7.0f);
+      field.set(positions, std::span(ones).first(positions.size()));
+      for (int3 const& p : positions) ASSERT_EQ(field.get(p), 1.0f) << threads << " threads";
+      std::size_t ofOne = 0;
+      for (float const& element : field.channel()) ofOne += element == 1.0f;
+      EXPECT_EQ(ofOne, positions.size());
+    });
+}
+
 /// The first position that is beyond names itself, wherever in a row it is, and nothing is written.
 TEST(BulkSetTest, NegativeRowsThatLeaveTheDomain) {
   constexpr int kMost = std::numeric_limits<int>::max();

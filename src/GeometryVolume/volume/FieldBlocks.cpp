@@ -12,13 +12,13 @@ FieldBlock* FieldBlocks::noBlock() {
 
 FieldBlock& FieldBlocks::make(int3 const& position, FieldBlock* block) {
   if (2 * (m_used + 1) > m_slots.size()) resize(2 * m_slots.size());
-  int3 const at{position.x >> 3, position.y >> 3, position.z >> 3};
-  std::size_t n = hash(at) & m_mask;
-  while (m_slots[n].block && m_slots[n].at != at) n = (n + 1) & m_mask;
+  Key const key(position);
+  std::size_t n = key.hash & m_mask;
+  while (m_slots[n].block && m_slots[n].key.at != key.at) n = (n + 1) & m_mask;
   Slot& slot = m_slots[n];
   if (slot.block) return *slot.block;
   FieldBlock& made = block ? *block : newBlock();
-  slot = {at, &made};
+  slot = {key, &made};
   ++m_used;
   return made;
 }
@@ -47,12 +47,12 @@ void FieldBlocks::reserve(std::size_t blocks) {
 }
 
 void FieldBlocks::resize(std::size_t slots) {
-  std::vector<Slot> old(slots, Slot{{0, 0, 0}, nullptr});
+  std::vector<Slot> old(slots);
   old.swap(m_slots);
   m_mask = slots - 1;
   for (Slot const& slot : old) {
     if (!slot.block) continue;
-    std::size_t n = hash(slot.at) & m_mask;
+    std::size_t n = slot.key.hash & m_mask;
     while (m_slots[n].block) n = (n + 1) & m_mask;
     m_slots[n] = slot;
   }

@@ -1,4 +1,5 @@
-// Writing many elements: chunks of positions find their runs, and the field gets the tiles that they need.
+// Writing many elements whose positions are in order of some kind: chunks of positions find their runs, and
+// the field gets the tiles that they need. (Random positions: FieldScatter.cpp.)
 //
 // A round of chunks, one for each thread or all that are left:
 //
@@ -27,15 +28,6 @@ constexpr std::size_t kChunks = 16, kLeastGrain = 16384, kMostGrain = 1 << 20;
 /// Where one of so many of its blocks is another chunk's too, the chunks that follow make none for
 /// themselves.
 constexpr std::size_t kShared = 8;
-
-/// Whether positions go to another block nearly each time. Asked before chunks make tiles that other chunks
-/// make, too: in small volumes that takes longer than all the rest.
-bool isAtRandom(std::span<int3 const> positions) {
-  auto const some = positions.first(std::min<std::size_t>(positions.size(), 256));
-  std::size_t changes = 0;
-  for (std::size_t n = 1; n < some.size(); ++n) changes += !inBlock(cornerOf(some[n - 1]), some[n]);
-  return 4 * changes > 3 * some.size();
-}
 
 /// The axis along which positions in order go from block to block and never back, or -1.
 int slowestAxis(std::span<int3 const> positions) {
@@ -95,10 +87,9 @@ public:
       , m_slot(slot)
       , m_positions(positions)
       , m_out(out)
-      , m_found(out.chunks())
-      , m_isScattered(isAtRandom(positions)) {}
+      , m_found(out.chunks()) {}
 
-  /// Positions at random ask for the same tiles over and over: rounds are each as long as all before it then,
+  /// Scattered positions ask for the same tiles over and over: rounds are each as long as all before it then,
   /// and what the first ones have made is not listed again.
   void plan(ChunkTilesBegin chunkTiles) {
     std::size_t const chunks = m_out.chunks();
@@ -215,7 +206,7 @@ private:
   std::size_t m_first = 0, m_last = 0; ///< chunks of the round
   std::vector<std::unique_ptr<ChunkTiles>> m_tiles;
   std::vector<FieldBlock const*> m_shared; ///< in order: blocks with tiles that several chunks have made
-  bool m_isScattered;
+  bool m_isScattered = false;
 };
 
 } // namespace

@@ -71,6 +71,8 @@ struct ChunkTiles {
   virtual void make(BlockTiles const& tiles) = 0;
   /// Writes runs that begin at these places and values of the chunk.
   virtual void write(std::span<BulkRun const> runs, BulkPlace const* places) const = 0;
+  /// Takes its tiles out of the field's blocks.
+  virtual void takeOut() noexcept = 0;
 
   ArrayAhead const values; ///< of the chunk
 };
@@ -108,11 +110,51 @@ struct BulkRuns {
 /// Begins the own tiles of a chunk whose first position has this number. Any thread may call it.
 using ChunkTilesBegin = FunctionRef<std::unique_ptr<ChunkTiles>(std::size_t)>;
 
-/// Makes the tiles that are missing, writes those that one chunk alone writes, and groups the positions that
-/// are left to be written.
+/// For positions in order of some kind: makes the tiles that are missing, writes those that one chunk alone
+/// writes, and groups the positions that are left to be written.
 /// @error std::out_of_range beyond the domain. What is thrown leaves all values as they were.
 VLN_API BulkRuns planBulk(VolumeData& volume, FieldSlot& slot, std::span<int3 const> positions,
                           ChunkTilesBegin chunkTiles);
+
+/// Whether positions go to another block nearly each time.
+VLN_API bool isAtRandom(std::span<int3 const> positions);
+
+/// Elements at random positions. Those of one block belong to one share, in the order of the positions.
+struct VLN_API ScatteredElements {
+  explicit ScatteredElements(std::size_t positions);
+
+  std::size_t shares;
+  std::vector<std::size_t> begins; ///< of the chunks of positions, and the end
+  std::vector<std::size_t> ends;   ///< in the lists, of each share of each chunk
+  BulkList<std::uint32_t> numbers; ///< of positions, from the chunk's first one
+  BulkList<void*> elements;
+
+  std::size_t chunks() const { return begins.size() - 1; }
+  std::size_t begin(std::size_t chunk, std::size_t share) const {
+    return share > 0 ? ends[chunk * shares + share - 1] : begins[chunk];
+  }
+  std::span<std::uint32_t const> numbersOf(std::size_t chunk, std::size_t share) const {
+    std::size_t const first = begin(chunk, share);
+    return {numbers.data() + first, ends[chunk * shares + share] - first};
+  }
+  template <class T> void write(std::size_t share, T const* values) const {
+    for (std::size_t c = 0; c < chunks(); ++c) {
+      std::size_t n = begin(c, share);
+      for (std::uint32_t const number : numbersOf(c, share)) {
+        __builtin_prefetch(elements[std::min(n + kElementsAhead, elements.size() - 1)], 1);
+        *static_cast<T*>(elements[n++]) = values[begins[c] + number];
+      }
+    }
+  }
+
+private:
+  static constexpr std::size_t kElementsAhead = 16;
+};
+
+/// Makes the tiles that are missing, and finds the elements of the positions.
+/// @error As planBulk().
+VLN_API ScatteredElements findScattered(VolumeData& volume, FieldSlot& slot, std::span<int3 const> positions,
+                                        ChunkTilesBegin chunkTiles);
 
 template <int kAxis, class T>
 [[gnu::always_inline]] inline void writeRow(BulkRun const& row, T const* values) {

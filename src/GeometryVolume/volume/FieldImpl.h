@@ -46,6 +46,7 @@ template <class T> struct TypedChunkTiles final : ChunkTiles {
   void write(std::span<BulkRun const> runs, BulkPlace const* places) const override {
     for (BulkRun const& run : runs) writeRun(run, places + run.begin, m_values + run.begin);
   }
+  void takeOut() noexcept override { m_slot.takeOut(tiles, 0); }
 
   PendingTiles<T> tiles;
 
@@ -171,12 +172,7 @@ template <class T> struct TypedSlot final : FieldSlot {
                 });
   }
   void dropGroups(std::size_t first) noexcept override {
-    for (std::size_t n = first; n < m_pending.groupCount(); ++n)
-      for (PendingTile<T> const& tile : m_pending.group(n)) {
-        int3 const& p = tile.corner;
-        if (FieldBlock* const block = blocks.find(p.x, p.y, p.z); block != FieldBlocks::noBlock())
-          block->tiles[FieldBlock::place(p.x, p.y, p.z).slot()].storeRelease(nullptr);
-      }
+    takeOut(m_pending, first);
     m_pending.cutBack(first);
   }
 
@@ -230,6 +226,15 @@ template <class T> struct TypedSlot final : FieldSlot {
         block.block->tiles[slot].storeRelease(out.back().elements.data());
       }
     }
+  }
+  /// Takes the tiles of the groups from `first` on out of `blocks`.
+  void takeOut(PendingTiles<T> const& pending, std::size_t first) const noexcept {
+    for (std::size_t n = first; n < pending.groupCount(); ++n)
+      for (PendingTile<T> const& tile : pending.group(n)) {
+        int3 const& p = tile.corner;
+        if (FieldBlock* const block = blocks.find(p.x, p.y, p.z); block != FieldBlocks::noBlock())
+          block->tiles[FieldBlock::place(p.x, p.y, p.z).slot()].storeRelease(nullptr);
+      }
   }
   TileArrays<T> const& tiles() const { return *std::as_const(*m_channel).tileArrays(); }
   TileVector<T> const& tile(TreeIndex const& at) const { return tiles()[at.depth][at.index]; }
@@ -437,9 +442,18 @@ template <class T> void Field<T>::set(std::span<int3 const> positions, std::span
   using namespace Internal;
   checkCounts(m_slot->name, positions.size(), values.size());
   auto const& slot = typed<T>(*m_slot);
-  BulkRuns const plan = planBulk(*m_volume, *m_slot, positions, [&](std::size_t first) {
+  auto const chunkTiles = [&](std::size_t first) {
     return std::make_unique<TypedChunkTiles<T>>(slot, *m_volume->tree, values.data() + first);
-  });
+  };
+  if (isAtRandom(positions)) {
+    ScatteredElements const found = findScattered(*m_volume, *m_slot, positions, chunkTiles);
+    m_volume->valuesChanged(*m_slot);
+    parallelFor(0, static_cast<std::int64_t>(found.shares), [&](std::int64_t begin, std::int64_t end) {
+      for (auto share = begin; share < end; ++share) found.write(share, values.data());
+    });
+    return;
+  }
+  BulkRuns const plan = planBulk(*m_volume, *m_slot, positions, chunkTiles);
   m_volume->valuesChanged(*m_slot);
   parallelFor(0, static_cast<std::int64_t>(plan.shares), [&](std::int64_t begin, std::int64_t end) {
     for (auto share = begin; share < end; ++share)

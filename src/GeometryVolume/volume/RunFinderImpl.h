@@ -24,9 +24,6 @@ namespace VLN::TileTree3D::Internal {
 /// Where positions lie as far apart as that many to a tile or fewer, chunks would make the same tiles again
 /// and again.
 inline constexpr std::uint64_t kScattered = 3;
-/// Positions far apart are in no block that was seen lately: one part of so many tells, the others do not
-/// look.
-inline constexpr std::uint32_t kFarParts = 32;
 
 /// Four positions as they lie in memory: x y z x, y z x y, z x y z.
 struct FourPositions {
@@ -149,8 +146,7 @@ public:
   /// @param isScattered Whether the chunk is to make no blocks for itself.
   Chunk find(std::span<int3 const> positions, BulkPlace* places, bool isScattered) {
     m_out.isScattered = isScattered;
-    m_count = positions.size();
-    auto const count = static_cast<std::uint32_t>(m_count);
+    auto const count = static_cast<std::uint32_t>(positions.size());
     for (std::uint32_t n = 0; n < count && !m_out.outside;) {
       int3 const* const p = positions.data() + n;
       int const axis = rowAxis(p, count - n);
@@ -198,52 +194,21 @@ private:
     ArrayAhead const values{m_tiles.values.begin + begin * m_tiles.values.elementSize,
                             m_writesOwn ? m_tiles.values.elementSize : 0};
     m_part.find(p, count, places, values);
-    if (m_farParts > 0) {
-      --m_farParts;
-      addRuns<true>(p, begin, count);
-    } else {
-      m_lookUps = 0;
-      std::uint32_t const runs = addRuns<false>(p, begin, count);
-      if (2 * m_lookUps > runs) expectFarApart();
-    }
+    addRuns(p, begin, count);
     return count;
   }
-  void expectFarApart() {
-    m_farParts = kFarParts;
-    // A run for each position, in shares that are not quite equal.
-    for (std::size_t n = 0; n < m_plan.shares; ++n)
-      m_lists[n].reserve(m_count / m_plan.shares + m_count / 16);
-  }
-  /// @tparam kFarApart Whether the field's own blocks are looked up first, not those that were seen lately.
-  /// @return How many runs the part has.
-  template <bool kFarApart> std::uint32_t addRuns(int3 const* p, std::uint32_t begin, std::uint32_t count) {
+  void addRuns(int3 const* p, std::uint32_t begin, std::uint32_t count) {
     std::uint32_t const* const starts = m_part.runStarts();
-    std::uint32_t run = 0;
-    for (; starts[run] < count; ++run) {
+    for (std::uint32_t run = 0; starts[run] < count; ++run) {
       std::uint32_t first = starts[run], length = starts[run + 1] - first;
       int3 const& at = p[first];
-      SlotBytes const slots = m_part.slotsOf(first, length);
-      FieldBlock* block = kFarApart ? m_blocks.find(at.x, at.y, at.z) : nullptr;
-      std::size_t n;
-      if (kFarApart && holds(*block, slots)) {
-        n = m_plan.shareOf(at);
-      } else {
-        SeenBlock const* const seen = see(at, slots, MemoPlace(at));
-        if (!seen) break;
-        n = seen->list;
-        block = seen->block;
-      }
-      auto& list = m_lists[n];
+      SeenBlock const* const seen = see(at, m_part.slotsOf(first, length), MemoPlace(at));
+      if (!seen) return;
+      auto& list = m_lists[seen->list];
       for (; length > 255; first += 255, length -= 255)
-        list.push_back({block, begin + first, 255, BulkRun::kLoose, 0, 0});
-      list.push_back({block, begin + first, static_cast<std::uint8_t>(length), BulkRun::kLoose, 0, 0});
+        list.push_back({seen->block, begin + first, 255, BulkRun::kLoose, 0, 0});
+      list.push_back({seen->block, begin + first, static_cast<std::uint8_t>(length), BulkRun::kLoose, 0, 0});
     }
-    return run;
-  }
-  static bool holds(FieldBlock const& block, SlotBytes slots) {
-    for (std::uint32_t left = slots.bits(); left; left &= left - 1)
-      if (!block.tiles[std::countr_zero(left)].loadAcquire()) return false;
-    return true;
   }
   /// The block that holds a position, with tiles at `slots`. Null beyond the domain.
   SeenBlock* see(int3 const& p, SlotBytes slots, MemoPlace const& memo) {
@@ -260,10 +225,7 @@ private:
       remember(p, seen);
     }
     std::uint32_t const missing = slots.bits() & seen.unknown.bits();
-    if (!missing) {
-      m_lookUps += seen.kind == SeenBlock::kOfField;
-      return true;
-    }
+    if (!missing) return true;
     if (seen.kind == SeenBlock::kOwn) {
       m_tiles.make({p, missing, seen.block});
       m_ownTiles += static_cast<std::uint64_t>(std::popcount(missing));
@@ -320,10 +282,7 @@ private:
   BulkRuns const& m_plan;
   ChunkTiles& m_tiles;
   BulkRunList* m_lists;
-  std::size_t m_count = 0; ///< of positions
   std::uint64_t m_ownTiles = 0;
-  std::uint32_t m_lookUps = 0;  ///< of whole blocks of the field, in the part
-  std::uint32_t m_farParts = 0; ///< to come
   std::size_t m_ownWritten = 0; ///< of the runs
   bool m_writesOwn = false;
   PartPlaces m_part;

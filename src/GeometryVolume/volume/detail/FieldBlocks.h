@@ -56,12 +56,31 @@ struct BlockTiles {
 /// @threads As a container of the standard library.
 class VLN_API FieldBlocks {
 public:
+  /// What a block is looked up by: its place among blocks, and where the search begins in any table.
+  struct Key {
+    explicit Key(int3 const& position)
+        : at{position.x >> 3, position.y >> 3, position.z >> 3} {
+      std::uint64_t h = static_cast<std::uint32_t>(at.x) * 0x9e3779b97f4a7c15ull;
+      h ^= (static_cast<std::uint32_t>(at.y) * 0xc2b2ae3d27d4eb4full) ^
+           (static_cast<std::uint32_t>(at.z) * 0x165667b19e3779f9ull);
+      hash = static_cast<std::uint32_t>((h ^ h >> 32) * 0xd6e8feb86659fd93ull >> 32);
+    }
+
+    int3 at;
+    std::uint32_t hash;
+  };
+
   /// The block that holds the position; noBlock() where there is none.
-  FieldBlock* find(int i, int j, int k) const {
-    int3 const at{i >> 3, j >> 3, k >> 3};
-    for (std::size_t n = hash(at) & m_mask;; n = (n + 1) & m_mask) {
+  FieldBlock* find(int i, int j, int k) const { return find(Key({i, j, k})); }
+  FieldBlock* find(Key const& key) const {
+    FieldBlock* const found = look(key);
+    return found ? found : noBlock();
+  }
+  /// The same; null where there is none.
+  FieldBlock* look(Key const& key) const {
+    for (std::size_t n = key.hash & m_mask;; n = (n + 1) & m_mask) {
       Slot const& slot = m_slots[n];
-      if (!slot.block || slot.at == at) return slot.block ? slot.block : noBlock();
+      if (!slot.block || slot.key.at == key.at) return slot.block;
     }
   }
   /// The elements of the tile at a position, or null.
@@ -77,9 +96,8 @@ public:
     return make(position).tiles[FieldBlock::place(position.x, position.y, position.z).slot()];
   }
   /// Fetches what find() and make() look at.
-  void prefetch(int3 const& position) const {
-    __builtin_prefetch(&m_slots[hash({position.x >> 3, position.y >> 3, position.z >> 3}) & m_mask]);
-  }
+  void prefetch(int3 const& position) const { prefetch(Key(position)); }
+  void prefetch(Key const& key) const { __builtin_prefetch(&m_slots[key.hash & m_mask]); }
   void clear();
   /// Makes room, so that making `blocks` blocks more moves no slots.
   void reserve(std::size_t blocks);
@@ -88,21 +106,15 @@ public:
 
 private:
   struct Slot {
-    int3 at;
-    FieldBlock* block;
+    Key key{{0, 0, 0}};
+    FieldBlock* block = nullptr;
   };
   static constexpr std::size_t kFirstChunk = 8, kMostChunk = 256;
 
-  static std::size_t hash(int3 const& at) {
-    std::uint64_t h = static_cast<std::uint32_t>(at.x) * 0x9e3779b97f4a7c15ull;
-    h ^= (static_cast<std::uint32_t>(at.y) * 0xc2b2ae3d27d4eb4full) ^
-         (static_cast<std::uint32_t>(at.z) * 0x165667b19e3779f9ull);
-    return static_cast<std::size_t>((h ^ h >> 32) * 0xd6e8feb86659fd93ull >> 32);
-  }
   void resize(std::size_t slots);
   FieldBlock& newBlock();
 
-  std::vector<Slot> m_slots = std::vector<Slot>(16, Slot{{0, 0, 0}, nullptr});
+  std::vector<Slot> m_slots = std::vector<Slot>(16);
   std::size_t m_mask = 15, m_used = 0;
   std::vector<std::vector<FieldBlock>> m_chunks; ///< none grows: blocks stay where they are
   std::size_t m_left = 0;                        ///< blocks of the last chunk that are not in use
