@@ -318,31 +318,37 @@ VLN_SAMPLER_TEMPLATE template <class F>
 void VLN_SAMPLER::forBatches(Position const* positions, std::int64_t count, int depth, SamplerSpace space,
                              F const& f) const {
   using namespace Internal;
-  constexpr std::size_t kPortion = 32;
+  constexpr std::size_t kPortion = 16;
   // So many reads pay for the tables if most of them go to other tiles.
   if (depth >= TraitsT::kMaxDepth) openTables(count / 8);
   int const w = m_channelWide ? D + 1 : D;
   std::array<FloatLanes, kPortion> p;
   std::array<IntLanes, kPortion> corners;
+  std::array<typename ReadTables<TraitsT>::Block const*, kPortion> blocks;
   std::array<float const*, kPortion> tiles;
-  for (std::int64_t begin = 0; begin < count; begin += kPortion) {
+  for (std::int64_t begin = 0, end; begin < count; begin = end) {
     auto const n = static_cast<std::size_t>(std::min<std::int64_t>(kPortion, count - begin));
-    for (std::size_t i = 0; i < n; ++i)
-      p[i] = this->toTileSpace(positions[begin + static_cast<std::int64_t>(i)], space);
+    for (std::size_t i = 0; i < n; ++i) p[i] = this->toTileSpace(positions[begin + std::int64_t(i)], space);
     bool const byTables = m_blocks.isOpen() && depth >= TraitsT::kMaxDepth && tileArrays() == m_arrays;
     // Ways through empty space stay in one region for long: there is nothing to fetch.
-    if (!byTables || (m_region.holds(p[0], m_maxDepth) && m_region.holds(p[n - 1], m_maxDepth))) {
-      for (std::size_t i = 0; i < n; ++i) f(begin + static_cast<std::int64_t>(i), p[i], false, nullptr);
-      continue;
+    std::size_t near = 0;
+    while (near < n && (!byTables || m_region.holds(p[near], m_maxDepth))) {
+      f(begin + std::int64_t(near), p[near], false, nullptr);
+      ++near;
     }
-    auto blocks = m_blocks;
+    end = begin + std::int64_t(near > 0 ? near : n);
+    if (near > 0) continue;
+    auto cursor = m_blocks;
     for (std::size_t i = 0; i < n; ++i) {
       corners[i] = floorLanesAnywhere(p[i]);
-      blocks.seek(corners[i][0], corners[i][1], corners[i][2]);
-      blocks.prefetch();
+      cursor.seek(corners[i][0], corners[i][1], corners[i][2]);
+      blocks[i] = &cursor.block();
+      __builtin_prefetch(blocks[i]);
     }
+    m_blocks = cursor;
     for (std::size_t i = 0; i < n; ++i) {
-      FinestSample const at = m_blocks.find(corners[i][0], corners[i][1], corners[i][2]);
+      FinestSample const at =
+          Internal::BlockCursor<TraitsT>::findIn(*blocks[i], corners[i][0], corners[i][1], corners[i][2]);
       tiles[i] = static_cast<float const*>(at.elements);
       if (!tiles[i]) continue;
       float const* const low = tiles[i] + (int(at.i) + w * (int(at.j) + w * int(at.k)));
@@ -352,7 +358,7 @@ void VLN_SAMPLER::forBatches(Position const* positions, std::int64_t count, int 
     }
     for (std::size_t i = 0; i < n; ++i) {
       TileSamples const samples{tiles[i], corners[i], kSampleScales<TraitsT>[TraitsT::kMaxDepth]};
-      f(begin + static_cast<std::int64_t>(i), p[i], true, tiles[i] ? &samples : nullptr);
+      f(begin + std::int64_t(i), p[i], true, tiles[i] ? &samples : nullptr);
     }
   }
 }

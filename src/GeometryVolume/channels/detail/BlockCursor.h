@@ -28,13 +28,8 @@ public:
   /// @cost In the block of the last one: a test, and one load. Elsewhere two loads more.
   FinestSample find(int i, int j, int k) {
     seek(i, j, k);
-    auto const [x, y, z] = steps(i, j, k);
-    constexpr std::uint32_t w = TraitsT::kTDW, slots = TraitsT::kTW;
-    // Sums of whole tile widths before the division: powers of two need one shift then.
-    return {m_block->tiles[((x - x % w) + slots * ((y - y % w) + slots * (z - z % w))) / w], x % w, y % w,
-            z % w};
+    return sample(*m_block, steps(i, j, k));
   }
-
   /// The same for tiles whose elements lie kWidth in a row from element kFirst on.
   /// @return The element itself; null where there is no such tile.
   /// @cost As find(). Where blocks are read one after another, what they hold is fetched ahead.
@@ -55,7 +50,11 @@ public:
     if (!steps(i, j, k).inBlock()) [[unlikely]]
       move<0>(i, j, k);
   }
-  void prefetch() const { __builtin_prefetch(m_block); }
+  typename Tables::Block const& block() const { return *m_block; }
+  /// A sample of the block that holds a point.
+  static FinestSample findIn(typename Tables::Block const& block, int i, int j, int k) {
+    return sample(block, {step(i, alignToBlock(i)), step(j, alignToBlock(j)), step(k, alignToBlock(k))});
+  }
 
 private:
   static constexpr auto kBlockWidth = std::uint32_t(Tables::kBlockWidth);
@@ -70,6 +69,13 @@ private:
       return kBits ? (x | y | z) < kBlockWidth : x < kBlockWidth && y < kBlockWidth && z < kBlockWidth;
     }
   };
+  static FinestSample sample(typename Tables::Block const& block, Steps const& at) {
+    auto const [x, y, z] = at;
+    constexpr std::uint32_t w = TraitsT::kTDW, slots = TraitsT::kTW;
+    // Sums of whole tile widths before the division: powers of two need one shift then.
+    return {block.tiles[((x - x % w) + slots * ((y - y % w) + slots * (z - z % w))) / w], x % w, y % w,
+            z % w};
+  }
   Steps steps(int i, int j, int k) const { return {step(i, m_x), step(j, m_y), step(k, m_z)}; }
   static std::uint32_t step(int c, int corner) {
     auto const a = static_cast<std::uint32_t>(c), b = static_cast<std::uint32_t>(corner);
