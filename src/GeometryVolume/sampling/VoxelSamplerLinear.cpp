@@ -313,7 +313,7 @@ VLN_SAMPLER_TEMPLATE template <class F>
 void VLN_SAMPLER::forBatches(Position const* positions, std::int64_t count, int depth, SamplerSpace space,
                              F const& f) const {
   using namespace Internal;
-  constexpr std::size_t kPortion = 16;
+  constexpr std::size_t kPortion = 24;
   // So many reads pay for the tables if most of them go to other tiles.
   if (depth >= TraitsT::kMaxDepth) openTables(count / 8);
   int const w = m_channelWide ? D + 1 : D;
