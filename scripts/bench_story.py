@@ -72,6 +72,8 @@ ROWS = [
      ["BM_VdbSetValue/0/0"]),
     ("write in bulk, new, a band by leaves, 2 threads", "volume", "BM_FieldSetBulk/2/0/2/real_time",
      ["BM_VdbSetValue/2/0"]),
+    ("write in bulk, new, at random, 2 threads", "volume", "BM_FieldSetBulk/1/0/2/real_time",
+     ["BM_VdbSetValue/1/0"]),
     ("read in bulk, in order, 1 thread", "volume", "BM_FieldGetBulk/0/1/real_time", ["BM_VdbGetValue/0"]),
     ("read in bulk, at random, 1 thread", "volume", "BM_FieldGetBulk/1/1/real_time", ["BM_VdbGetValue/1"]),
     ("flatten float, bunny, 2 threads", "flatten", "bunny_ls_512_half/flatten/ours float/threads:2/real_time",

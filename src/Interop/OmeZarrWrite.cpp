@@ -264,7 +264,7 @@ private:
   }
 
   void writeArray(std::string const& folder, DenseVolume const& volume, Level const& level,
-                  DenseReader const& reader, bool flags, auto const& tell) {
+                  DenseReader const& reader, bool flags, auto const& reportProgress) {
     DensePlan const& plan = level.plan;
     auto const background = reader.background();
     auto const scalar = static_cast<std::size_t>(reader.scalarBytes);
@@ -301,7 +301,7 @@ private:
       std::memcpy(&empty[at], background.data(), scalar);
     auto const count = static_cast<std::int64_t>(places.size()) * reader.components;
     for (std::int64_t first = 0; first < count; first += kChunksAtOnce) {
-      tell(double(first) / double(count));
+      reportProgress(double(first) / double(count));
       parallelFor(first, std::min(first + kChunksAtOnce, count), [&](std::int64_t begin, std::int64_t end) {
         std::vector<std::byte> values, slice;
         for (auto n = begin; n < end; ++n) {

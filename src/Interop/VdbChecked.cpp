@@ -191,14 +191,14 @@ private:
 
 class CheckedReader : public openvdb::io::Archive {
 public:
-  CheckedReader(WalkedBytes bytes, std::uint64_t memoryBytes, std::function<void(double)> const& told,
+  CheckedReader(WalkedBytes bytes, std::uint64_t memoryBytes, std::function<void(double)> const& progress,
                 LeafMemory leafMemory)
       : m_leafMemory(leafMemory)
       , m_bytes(bytes)
       , m_all(bytes)
       , m_in(bytes)
       , m_memoryLeft(memoryBytes)
-      , m_told(told) {}
+      , m_progress(progress) {}
 
   void read(VdbFile& file) {
     m_bytes.take(8); // it starts as it should
@@ -306,7 +306,7 @@ private:
     std::int64_t leaves = 0;
     auto const read = [&] {
       if (parts.empty()) return;
-      tell(parts[0].tree->places()[parts[0].first]);
+      reportProgress(parts[0].tree->places()[parts[0].first]);
       parallelFor(0, std::int64_t(parts.size()), [&](std::int64_t first, std::int64_t last) {
         for (auto n = static_cast<std::size_t>(first); n < static_cast<std::size_t>(last); ++n)
           parts[n].tree->readLeaves(parts[n].first, parts[n].last);
@@ -325,10 +325,10 @@ private:
     read();
   }
 
-  void tell(std::size_t place) const {
-    if (!m_told) return;
+  void reportProgress(std::size_t place) const {
+    if (!m_progress) return;
     try {
-      m_told(double(place) / double(m_bytes.size()));
+      m_progress(double(place) / double(m_bytes.size()));
     } catch (...) { throw ReadingStopped{std::current_exception()}; }
   }
 
@@ -338,14 +338,14 @@ private:
   WalkedBytes m_bytes, m_all; ///< what is to come, and all of the file
   MemoryStream m_in;
   std::uint64_t m_memoryLeft;
-  std::function<void(double)> const& m_told;
+  std::function<void(double)> const& m_progress;
   std::vector<std::unique_ptr<TreeToRead>> m_trees; ///< of the file's grids
 };
 
 } // namespace
 
 std::optional<VdbFile> readChecked(std::string const& path, std::uint64_t fileSize, std::uint64_t memoryBytes,
-                                   std::function<void(double)> const& told, LeafMemory leafMemory) {
+                                   std::function<void(double)> const& progress, LeafMemory leafMemory) {
   if (fileSize > memoryBytes) return std::nullopt;
   try {
     auto const size = static_cast<std::size_t>(fileSize);
@@ -354,7 +354,7 @@ std::optional<VdbFile> readChecked(std::string const& path, std::uint64_t fileSi
     VdbFile file;
     file.path = path;
     file.memoryBytes = memoryBytes;
-    CheckedReader(WalkedBytes(bytes.get(), size), memoryBytes - fileSize, told, leafMemory).read(file);
+    CheckedReader(WalkedBytes(bytes.get(), size), memoryBytes - fileSize, progress, leafMemory).read(file);
     return file;
   } catch (ReadingStopped const& stopped) {
     std::rethrow_exception(stopped.reason);

@@ -21,7 +21,7 @@ openvdb::MetaMap read(std::string const& bytes) {
 }
 
 // Of these the rest of the report tells, or they say nothing to a reader.
-bool toldElsewhere(std::string const& name) {
+bool listedElsewhere(std::string const& name) {
   for (char const* known : {"name", "class", "is_saved_as_half_float", "file_compression", "file_bbox_min",
                             "file_bbox_max", "file_mem_bytes", "file_voxel_count", "file_delayed_load"})
     if (name == known) return true;
@@ -31,7 +31,7 @@ bool toldElsewhere(std::string const& name) {
 std::vector<VdbMetadatum> listOf(openvdb::MetaMap const& map) {
   std::vector<VdbMetadatum> list;
   for (auto it = map.beginMeta(); it != map.endMeta(); ++it)
-    if (it->second && !toldElsewhere(it->first)) list.push_back({it->first, it->second->str()});
+    if (it->second && !listedElsewhere(it->first)) list.push_back({it->first, it->second->str()});
   return list;
 }
 

@@ -104,11 +104,11 @@ void probeVdbFile(std::string const& path, VdbReadLimits const& limits) {
 }
 
 VdbFile readVdbFile(std::string const& path, VdbReadLimits const& limits,
-                    std::function<void(double)> const& told, LeafMemory leafMemory) {
+                    std::function<void(double)> const& progress, LeafMemory leafMemory) {
   openvdb::initialize();
   std::uint64_t const size = checkHeader(path);
   VdbReadLimits const bounds = effectiveLimits(limits, size);
-  if (auto file = readChecked(path, size, bounds.memoryBytes, told, leafMemory)) return std::move(*file);
+  if (auto file = readChecked(path, size, bounds.memoryBytes, progress, leafMemory)) return std::move(*file);
   return readGuarded(path, bounds, size, [&] { return readWhole(path); });
 }
 

@@ -236,7 +236,7 @@ void addChannels(Group& group, Ostil::Array<VdbGridRecord> const& records, VLN::
     return made;
   };
   double filled = 0;
-  auto const tell = [&](std::int64_t more) {
+  auto const reportProgress = [&](std::int64_t more) {
     filled += double(more);
     filledShare(filled / (double(tiles) * double(count)));
   };
@@ -248,12 +248,12 @@ void addChannels(Group& group, Ostil::Array<VdbGridRecord> const& records, VLN::
     std::int64_t const last = std::min(first + atOnce, count);
     std::vector<GridChannels> made(last - first);
     if (made.size() == 1) {
-      made[0] = make(first, tell);
+      made[0] = make(first, reportProgress);
     } else {
       parallelFor(first, last, [&](std::int64_t begin, std::int64_t end) {
         for (std::int64_t n = begin; n < end; ++n) made[n - first] = make(n, [](std::int64_t) {});
       });
-      tell(tiles * (last - first));
+      reportProgress(tiles * (last - first));
     }
     for (GridChannels& channels : made) {
       object.addComponent(std::move(channels.values));

@@ -84,14 +84,14 @@ public:
              FileBytes& bytes) const {
     std::ostream out(&bytes);
     out.exceptions(std::ios::badbit); // there was no memory
-    auto const toldAs = [&](auto const& step) {
+    auto const withFileErrors = [&](auto const& step) {
       try {
         step();
       } catch (openvdb::Exception const& error) {
         throw FileError(path, "cannot be written: " + oneLine(error.what()));
       }
     };
-    toldAs([&] {
+    withFileErrors([&] {
       openvdb::io::setWriteGridStatsMetadata(out, isGridStatsMetadataEnabled());
       writeHeader(out, /*seekable=*/true);
       metadata.writeMeta(out);
@@ -103,7 +103,7 @@ public:
     std::set<std::string> taken;
     for (auto const& inTurn : grids) {
       auto const grid = inTurn.make();
-      toldAs([&] {
+      withFileErrors([&] {
         // Written anew; one of a foreign type would be in the way.
         grid->removeMeta(openvdb::GridBase::META_FILE_COMPRESSION);
         openvdb::io::GridDescriptor descriptor(uniqueName(inTurn.name, alike[inTurn.name] > 1, taken),

@@ -79,28 +79,28 @@ void Field::fillBricks(Scalar const& scalar, bool isAllFinite, int threads) {
     }
   });
   auto const* const first = reinterpret_cast<unsigned char const*>(m_grid.name()) - nanovtt::kGridNameOffset;
-  std::uint64_t beside = 0;
+  std::uint64_t next = 0;
   for (std::uint32_t n = 0; n < count; ++n) {
     if (!m_tiles[n].valid()) continue;
     TileBlock const b = m_grid.block(n);
     if (gathered[n]) {
-      m_bricks[n] = beside | kBrickBeside;
-      beside += static_cast<std::uint64_t>(brickSamples(b.core));
+      m_bricks[n] = next | kBrickGathered;
+      next += static_cast<std::uint64_t>(brickSamples(b.core));
     } else {
       m_bricks[n] = static_cast<std::uint64_t>(b.samples - first) / 4;
     }
     m_bricks[n] |= static_cast<std::uint64_t>(levelsOf(b)) << kBrickLevelsShift;
   }
-  m_gathered = beside;
-  m_beside.resize(beside);
+  m_gatheredCount = next;
+  m_gathered.resize(next);
   m_view.inBuffer = reinterpret_cast<float const*>(first);
-  m_view.beside = m_beside.data();
+  m_view.gathered = m_gathered.data();
   m_view.bricks = m_bricks.data();
   Gather const gather{m_grid, scalar};
   forRanges(count, kGrain, threads, [&](std::int64_t begin, std::int64_t end) {
     for (auto n = static_cast<std::uint32_t>(begin); n < static_cast<std::uint32_t>(end); ++n)
       if (gathered[n])
-        gather(m_tiles[n], m_grid.block(n), m_beside.data() + (m_bricks[n] & kBrickOffsetMask));
+        gather(m_tiles[n], m_grid.block(n), m_gathered.data() + (m_bricks[n] & kBrickOffsetMask));
   });
 }
 

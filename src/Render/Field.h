@@ -89,10 +89,10 @@ private:
   bool m_isEmpty = true;
   std::vector<nanovtt::TileRef> m_tiles;
   std::vector<std::uint64_t> m_bricks;
-  std::vector<float> m_beside;
+  std::vector<float> m_gathered;
   std::vector<unsigned char> m_madeBounds;
   nanovtt::BoundsReader m_bounds;
-  std::uint64_t m_gathered = 0; ///< floats beside the buffer, which bricks of means follow
+  std::uint64_t m_gatheredCount = 0; ///< floats beside the buffer, which bricks of means follow
   // Of tiles down to a limited depth.
   std::vector<std::uint64_t> m_limitedBricks;
   std::vector<std::pair<float, float>> m_limitedRanges;

@@ -109,8 +109,8 @@ FieldView Field::wholeView() const {
 void Field::limitDepth(int depth, int threads) {
   if (depth == m_view.maxDepth) return;
   m_limitedRanges.clear();
-  m_beside.resize(m_gathered);
-  m_view.beside = m_beside.data();
+  m_gathered.resize(m_gatheredCount);
+  m_view.gathered = m_gathered.data();
   m_view.bricks = m_bricks.data();
   m_view.maxDepth = depth;
   // Coarse samples spread what there is as far as the next one.
@@ -124,7 +124,7 @@ void Field::makeMeans(int depth, int threads) {
   auto const& tree = m_view.tree;
   std::uint32_t const end = tree.tilesAbove(depth + 1);
   std::vector<std::uint32_t> coarse; // tiles where rays stop above others
-  std::uint64_t floats = m_gathered;
+  std::uint64_t floats = m_gatheredCount;
   m_limitedBricks.assign(m_bricks.begin(), m_bricks.begin() + end);
   m_limitedRanges.resize(end);
   for (std::uint32_t n = 0; n < end; ++n) {
@@ -133,11 +133,11 @@ void Field::makeMeans(int depth, int threads) {
     if (!t.valid() || !tree.hasChildren(n) || t.depth + tree.children(n).levels + 1 <= depth) continue;
     coarse.push_back(n);
     std::uint64_t const levels = m_bricks[n] >> kBrickLevelsShift & 7, core = std::uint64_t(4) << levels;
-    m_limitedBricks[n] = floats | kBrickBeside | levels << kBrickLevelsShift;
+    m_limitedBricks[n] = floats | kBrickGathered | levels << kBrickLevelsShift;
     floats += (core + 1) * (core + 1) * (core + 1);
   }
-  m_beside.resize(floats);
-  m_view.beside = m_beside.data();
+  m_gathered.resize(floats);
+  m_view.gathered = m_gathered.data();
   FieldView const whole = wholeView();
   forRanges(static_cast<std::int64_t>(coarse.size()), kGrain, threads,
             [&](std::int64_t begin, std::int64_t to) {
@@ -148,7 +148,7 @@ void Field::makeMeans(int depth, int threads) {
                 int const core = whole.brick(n).core;
                 std::int64_t const width = m_tiles[n].width() / core;
                 if (!voxels || voxels->width() != width) voxels.emplace(whole, m_bounds, width, depth);
-                float* const out = m_beside.data() + (m_limitedBricks[n] & kBrickOffsetMask);
+                float* const out = m_gathered.data() + (m_limitedBricks[n] & kBrickOffsetMask);
                 fillMeans(m_tiles[n], whole.brick(n), *voxels, room, out);
                 auto& [low, high] = m_limitedRanges[n];
                 for (int s = 0; s < (core + 1) * (core + 1) * (core + 1); ++s) {

@@ -16,9 +16,9 @@
 namespace VLN::Render {
 
 /// Bits of an entry of FieldView::bricks.
-inline constexpr std::uint64_t kBrickOffsetMask = 0xFFFFFFFFFFFFFull; ///< in floats
-inline constexpr int kBrickLevelsShift = 56;                          ///< of a merged block: log2(core / 4)
-inline constexpr std::uint64_t kBrickBeside = std::uint64_t(1) << 63; ///< not in the buffer, but beside it
+inline constexpr std::uint64_t kBrickOffsetMask = 0xFFFFFFFFFFFFFull;   ///< in floats
+inline constexpr int kBrickLevelsShift = 56;                            ///< of a merged block: log2(core / 4)
+inline constexpr std::uint64_t kBrickGathered = std::uint64_t(1) << 63; ///< not in the buffer, but beside it
 
 struct Brick {
   float const* samples;
@@ -33,7 +33,7 @@ struct Brick {
 struct FieldView {
   nanovtt::ContainerReader tree;
   float const* inBuffer = nullptr;
-  float const* beside = nullptr;
+  float const* gathered = nullptr;
   std::uint64_t const* bricks = nullptr;
   float const* weights = nullptr;
   std::uint64_t const* cells = nullptr;
@@ -46,7 +46,7 @@ struct FieldView {
   NANOVTT_HD Brick brick(std::uint32_t tile) const {
     std::uint64_t const e = bricks[tile];
     int const core = nanovtt::kTileWidth << (e >> kBrickLevelsShift & 7);
-    return {(e & kBrickBeside ? beside : inBuffer) + (e & kBrickOffsetMask), core, core + 1};
+    return {(e & kBrickGathered ? gathered : inBuffer) + (e & kBrickOffsetMask), core, core + 1};
   }
   /// The largest weight of a block of roots 2^level wide on each axis, level 1 to 6.
   /// @pre The position lies in the table.

@@ -11,18 +11,18 @@ template <class TraitsT> void HaloSampler<TraitsT>::sample(int3 const& p, float 
   if (scale != 1.0f) m_source.ops->scale(out, scale);
 }
 
-template <class TraitsT> auto HaloSampler<TraitsT>::aroundOf(TileType const& tile) -> Around& {
-  Around& around = m_recent[static_cast<std::size_t>(tile.index()) % kRecent];
-  if (around.tile != &tile) {
-    around.tile = &tile, around.known = 0;
-    around.elements = tile.valid() ? m_source.elements(tile.treeIndex()) : nullptr;
+template <class TraitsT> auto HaloSampler<TraitsT>::cacheOf(TileType const& tile) -> NeighborCache& {
+  NeighborCache& cache = m_recent[static_cast<std::size_t>(tile.index()) % kRecent];
+  if (cache.tile != &tile) {
+    cache.tile = &tile, cache.known = 0;
+    cache.elements = tile.valid() ? m_source.elements(tile.treeIndex()) : nullptr;
   }
-  return around;
+  return cache;
 }
 
 template <class TraitsT> void HaloSampler<TraitsT>::setTile(int3 const& p, int depth) {
   auto const& found = m_accessor.tile(p, depth, false);
-  m_at = &aroundOf(found);
+  m_at = &cacheOf(found);
   m_extent = 0;
   if (!found.valid()) return;
   int const covered = found.depth() == depth ? depth : found.depth() + 1;
@@ -65,19 +65,19 @@ template <class TraitsT> void HaloSampler<TraitsT>::read(int3 const& p, void* ou
 }
 
 template <class TraitsT>
-auto HaloSampler<TraitsT>::beside(Around& around, NeighborDirection direction, int3 const& at) const
-    -> Beside const& {
-  auto& found = around.beside[direction];
-  if (around.known >> direction & 1) return found;
-  around.known |= 1u << direction;
+auto HaloSampler<TraitsT>::neighbor(NeighborCache& cache, NeighborDirection direction, int3 const& at) const
+    -> NeighborTile const& {
+  auto& found = cache.neighbors[direction];
+  if (cache.known >> direction & 1) return found;
+  cache.known |= 1u << direction;
   found = {};
   // The whole tile beside lies in the domain, or nothing of it.
-  auto const place = placeOf(*around.tile, at);
+  auto const place = placeOf(*cache.tile, at);
   for (std::int64_t const c : place)
     if (c < TraitsT::kMinTileCoord || c > TraitsT::kMaxTileCoord) return found;
   auto const& there = m_accessor.tile(
       int3{static_cast<int>(place[0]), static_cast<int>(place[1]), static_cast<int>(place[2])},
-      around.tile->depth(), false);
+      cache.tile->depth(), false);
   return found = {&there, there.valid() ? m_source.elements(there.treeIndex()) : nullptr};
 }
 
@@ -92,7 +92,7 @@ template <class TraitsT> void const* HaloSampler<TraitsT>::corner(int3 const& at
   auto const direction =
       neighborDirection(sideOf<TraitsT>(at.x), sideOf<TraitsT>(at.y), sideOf<TraitsT>(at.z));
   if (direction == kNeighborSelf) return flat(m_at->elements, at);
-  auto const& there = beside(*m_at, direction, at);
+  auto const& there = neighbor(*m_at, direction, at);
   if (there.elements) {
     auto const place = placeOf(*m_at->tile, at);
     return flat(there.elements,
@@ -133,7 +133,7 @@ template <class TraitsT> void HaloSampler<TraitsT>::Axis::set(AxisPlaces const& 
 
 template <class TraitsT>
 bool HaloSampler<TraitsT>::sampleBox(TileType const& from, Places const& places, float scale) {
-  m_at = &aroundOf(from);
+  m_at = &cacheOf(from);
   m_extent = 0; // the next sample() looks for its tile
   if (!m_at->elements) return false;
 
@@ -175,8 +175,8 @@ bool HaloSampler<TraitsT>::sampleBox(TileType const& from, Places const& places,
           alike(zi, zj, zk, m_at->elements, x.wrapped, y.wrapped, z.wrapped);
           continue;
         }
-        Beside const& there =
-            beside(*m_at, direction, {x.first + zi.begin, y.first + zj.begin, z.first + zk.begin});
+        NeighborTile const& there =
+            neighbor(*m_at, direction, {x.first + zi.begin, y.first + zj.begin, z.first + zk.begin});
         if (!there.elements)
           alike(zi, zj, zk, m_at->elements, x.nearest, y.nearest, z.nearest);
         else if (there.tile->depth() == from.depth())

@@ -51,7 +51,7 @@ public:
 
 private:
   /// What lies beside the tile in a direction, at its depth or above: the same tile for every sample there.
-  struct Beside {
+  struct NeighborTile {
     TileType const* tile;
     void const* elements;
   };
@@ -84,18 +84,18 @@ private:
   };
 
   /// A tile, its elements, and what lies beside it as far as it was asked for.
-  struct Around {
+  struct NeighborCache {
     TileType const* tile = nullptr;
     void const* elements = nullptr;
     std::uint32_t known = 0; ///< bits of the directions that were looked up
-    std::array<Beside, kNeighborCount> beside;
+    std::array<NeighborTile, kNeighborCount> neighbors;
   };
 
   void read(int3 const& p, void* out);
   void setTile(int3 const& p, int depth);
   /// Tiles that were used last keep what lies beside them: those round a tile come again for the tiles near
   /// it.
-  Around& aroundOf(TileType const& tile);
+  NeighborCache& cacheOf(TileType const& tile);
   /// Whether the tile of the last sample is that of the point too.
   bool holds(int3 const& p) const {
     for (int a = 0; a < 3; ++a)
@@ -103,7 +103,7 @@ private:
         return false;
     return true;
   }
-  Beside const& beside(Around& around, NeighborDirection direction, int3 const& at) const;
+  NeighborTile const& neighbor(NeighborCache& cache, NeighborDirection direction, int3 const& at) const;
   void const* corner(int3 const& at);
   void const* flat(void const* tile, int3 const& at) const {
     auto const index = m_origin + at.x + (at.y + at.z * m_width) * m_width;
@@ -119,12 +119,12 @@ private:
   int m_width, m_origin;
   float3 m_offset;
   Accessor const& m_accessor;
-  Around* m_at = nullptr; ///< of the last sample's tile
+  NeighborCache* m_at = nullptr; ///< of the last sample's tile
   /// Where that is the tile: all of it at the deepest depth that is asked for, else a voxel without a child.
   int3 m_corner{0, 0, 0};
   std::uint32_t m_extent = 0;
   static constexpr std::size_t kRecent = 32;
-  std::array<Around, kRecent> m_recent;
+  std::array<NeighborCache, kRecent> m_recent;
   /// By axis and side: regions of a tile on the same side have the same places there.
   std::array<std::array<Axis, 3>, 3> m_axes;
 };

@@ -101,6 +101,7 @@ public:
 
   // Many elements
   /// As set() for each position in turn: of equal positions the last counts. In parallel.
+  /// @cost Meanwhile up to some 20 bytes of memory for each position.
   /// @error std::invalid_argument for spans of different lengths, std::out_of_range beyond the domain; no
   /// value has changed then.
   /// @numeric The same volume for any number of threads.
