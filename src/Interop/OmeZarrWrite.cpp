@@ -239,10 +239,11 @@ private:
         translation += (translation.empty() ? "" : ", ") +
                        digits(plan.toWorld[a][3] + plan.toWorld[a][a] * double(plan.box.min[a]));
       }
-      sets += std::string(n ? ",\n" : "") + "   {\"path\": \"" + std::to_string(n) +
-              "\", \"coordinateTransformations\": [{\"type\": \"scale\", \"scale\": [" +
-              (vector ? "1.0, " : "") + scale + "]}, {\"type\": \"translation\", \"translation\": [" +
-              (vector ? "0.0, " : "") + translation + "]}]}";
+      sets.append(n ? ",\n" : "").append("   {\"path\": \"").append(std::to_string(n));
+      sets.append("\", \"coordinateTransformations\": [{\"type\": \"scale\", \"scale\": [");
+      sets.append(vector ? "1.0, " : "").append(scale);
+      sets.append("]}, {\"type\": \"translation\", \"translation\": [");
+      sets.append(vector ? "0.0, " : "").append(translation).append("]}]}");
     }
     std::string axes = vector ? "{\"name\": \"c\", \"type\": \"channel\"}, " : "";
     axes += "{\"name\": \"z\", \"type\": \"space\"}, {\"name\": \"y\", \"type\": \"space\"}, "

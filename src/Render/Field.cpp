@@ -16,7 +16,6 @@
 namespace VLN::Render {
 
 using nanovtt::GridReader;
-using nanovtt::GridType;
 using nanovtt::kNoTile;
 using nanovtt::TileBlock;
 using nanovtt::TileRef;
