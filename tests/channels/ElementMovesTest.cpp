@@ -153,7 +153,8 @@ TEST(ElementMovesOutOfRange, RegressionMovesOfTilesThatAreNotThereDoNothing) {
   EXPECT_EQ(empty.tileCount(5), 0);
   EXPECT_EQ(tile(empty, 0, 3), (Values{302, 301}));
   // A list that names tiles, elements and depths that nobody has.
-  std::vector<ElementToFrom> wild = {{7, 0, 0, 3}, {1, 9, 0, 3}, {1, 0, 8, 3}, {1, 0, 0, 28}, {1, 0, 0, 3}};
+  std::vector<ElementToFrom> wild = {{7, 0, 0, 3},  {1, 9, 0, 3},  {1, 0, 8, 3}, {1, 0, 0, 28},
+                                     {1, 0, 0, -1}, {1, 0, 0, -9}, {1, 0, 0, 3}};
   Points channel = threeDepths();
   channel.update(wild, 3, false);
   EXPECT_EQ(tile(channel, 0, 3), (Values{302, 301}));

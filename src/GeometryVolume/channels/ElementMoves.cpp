@@ -150,7 +150,7 @@ void groupByDestination(std::vector<ElementToFrom> const& moves, std::vector<std
 void addSources(std::vector<ElementToFrom> const& moves, ElementRemovals& removals) {
   removals.resize(kChannelDepths);
   for (ElementToFrom const& move : moves) {
-    if (move.fromDepth < std::ssize(removals))
+    if (move.fromDepth >= 0 && move.fromDepth < std::ssize(removals))
       removals[move.fromDepth].push_back({move.from, move.fromElement});
   }
 }

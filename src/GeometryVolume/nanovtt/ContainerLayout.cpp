@@ -138,8 +138,7 @@ void ContainerLayout::numberTiles() {
     VLN::parallelFor(0, count,
                      [&](std::int64_t begin, std::int64_t end) {
                        for (auto n = begin; n < end; ++n)
-                         order[n] =
-                             static_cast<std::uint32_t>(m_settings.morton ? morton[d][n] : std::int64_t(n));
+                         order[n] = static_cast<std::uint32_t>(m_settings.morton ? morton[d][n] : n);
                      },
                      {.grain = 16384});
   }
