@@ -44,7 +44,8 @@ struct StridedArray {
 struct ActiveRule {
   enum class Kind { kNotBackground, kInsideBand, kStates };
   Kind kind = Kind::kNotBackground;
-  std::string states; ///< name of the field of state bytes
+  std::string states;     ///< name of the field of state bytes
+  std::vector<int3> also; ///< active whatever their values
 };
 
 /// Active samples of the deepest depth, and wider ones.

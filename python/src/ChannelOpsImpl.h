@@ -125,15 +125,14 @@ public:
     if (rule.kind == ActiveRule::Kind::kStates) {
       auto const states = m_volume.field<unsigned char>(rule.states);
       auto const& channel = states.channel();
-      collect(channel, kFinest, positions, result, [](unsigned char s) { return (s & 1) != 0; });
-      for (int const depth : {16, 21, 25})
-        collect(channel, depth, positions, result, [](unsigned char s) { return (s & 1) != 0; });
+      auto const isOn = [](unsigned char s) { return (s & 1) != 0; };
+      for (int const depth : {kFinest, 16, 21, 25}) collect(channel, depth, positions, result, isOn);
     } else if (rule.kind == ActiveRule::Kind::kInsideBand) {
-      collect(m_field.channel(), kFinest, positions, result,
-              [&](T const& value) { return insideBand(value, background); });
+      collectByValue(rule.also, positions, result,
+                     [&](T const& value) { return insideBand(value, background); });
     } else {
-      collect(m_field.channel(), kFinest, positions, result,
-              [&](T const& value) { return std::memcmp(&value, &background, sizeof(T)) != 0; });
+      collectByValue(rule.also, positions, result,
+                     [&](T const& value) { return std::memcmp(&value, &background, sizeof(T)) != 0; });
     }
     return result;
   }
@@ -377,28 +376,75 @@ private:
     return false;
   }
 
+  /// Active samples of a depth.
+  struct Found {
+    std::vector<int3> samples;
+    std::int64_t count = 0;
+    std::int64_t low[3], high[3];
+
+    void add(int3 const& p, std::int64_t width) {
+      for (int a = 0; a < 3; ++a) {
+        low[a] = count ? std::min<std::int64_t>(low[a], p[a]) : p[a];
+        high[a] = count ? std::max<std::int64_t>(high[a], p[a] + width) : p[a] + width;
+      }
+      ++count;
+    }
+    void join(Found const& b) {
+      if (b.count == 0) return;
+      for (int a = 0; a < 3; ++a) {
+        low[a] = count ? std::min(low[a], b.low[a]) : b.low[a];
+        high[a] = count ? std::max(high[a], b.high[a]) : b.high[a];
+      }
+      count += b.count;
+      samples.insert(samples.end(), b.samples.begin(), b.samples.end());
+    }
+    void addTo(ActiveSamples& result, int width) && {
+      if (count == 0) return;
+      auto const clip = [](std::int64_t v) { return int(std::min<std::int64_t>(v, Shape::kMaxTileCoord)); };
+      for (int a = 0; a < 3; ++a) {
+        result.low[a] = result.count ? std::min(result.low[a], int(low[a])) : int(low[a]);
+        result.high[a] = result.count ? std::max(result.high[a], clip(high[a])) : clip(high[a]);
+      }
+      result.count += count * std::int64_t(width) * width * width;
+      if (width > 1)
+        for (int3 const& p : samples) result.wide.push_back({p, width});
+      else
+        result.voxels = std::move(samples);
+    }
+  };
+
   template <class U, class Rule>
   void collect(TileTree3D::Channel<Shape, U, 4, 0> const& channel, int depth, bool positions,
                ActiveSamples& result, Rule const& rule) const {
+    find(channel, depth, positions, rule).addTo(result, sampleWidth(depth));
+  }
+  /// Voxels whose values pass the rule, and those of `also` that have a tile.
+  template <class Rule>
+  void collectByValue(std::vector<int3> const& also, bool positions, ActiveSamples& result,
+                      Rule const& rule) const {
+    Found all = find(m_field.channel(), kFinest, positions, rule);
+    auto const tiles = m_volume.tree().tileAccessor();
+    for (int3 const& p : also) {
+      auto const at = tiles.treeIndex(p.x, p.y, p.z, kFinest, true);
+      if (!at.valid()) continue;
+      auto const values = m_field.channel().tileData(at);
+      if (values.size() < int(kElements) || rule(values(p.x & 3, p.y & 3, p.z & 3))) continue;
+      all.add(p, 1);
+      if (positions) all.samples.push_back(p);
+    }
+    std::move(all).addTo(result, 1);
+  }
+
+  template <class U, class Rule>
+  Found find(TileTree3D::Channel<Shape, U, 4, 0> const& channel, int depth, bool positions,
+             Rule const& rule) const {
     auto const& tree = m_volume.tree();
     int const width = sampleWidth(depth);
-    struct Part {
-      std::vector<int3> voxels;
-      std::int64_t count = 0;
-      std::int64_t low[3], high[3];
-    };
-    auto const grow = [](Part& to, int3 const& p, std::int64_t w) {
-      for (int a = 0; a < 3; ++a) {
-        to.low[a] = to.count ? std::min<std::int64_t>(to.low[a], p[a]) : p[a];
-        to.high[a] = to.count ? std::max<std::int64_t>(to.high[a], p[a] + w) : p[a] + w;
-      }
-      ++to.count;
-    };
     bool const keep = positions || width > 1;
-    Part all = parallelReduce(
-        0, tree.tileCount(depth), 1024, Part(),
+    return parallelReduce(
+        0, tree.tileCount(depth), 1024, Found(),
         [&](std::int64_t begin, std::int64_t end) {
-          Part part;
+          Found part;
           for (auto n = begin; n < end; ++n) {
             auto const& tile = tree.tile(n, depth);
             auto const values = channel.tileData(n, depth);
@@ -408,34 +454,16 @@ private:
               if (!rule(values[e])) continue;
               int3 const p{corner.x + (e & 3) * width, corner.y + (e >> 2 & 3) * width,
                            corner.z + (e >> 4) * width};
-              grow(part, p, width);
-              if (keep) part.voxels.push_back(p);
+              part.add(p, width);
+              if (keep) part.samples.push_back(p);
             }
           }
           return part;
         },
-        [](Part a, Part const& b) {
-          if (b.count == 0) return a;
-          if (a.count == 0) return b;
-          for (int i = 0; i < 3; ++i) {
-            a.low[i] = std::min(a.low[i], b.low[i]);
-            a.high[i] = std::max(a.high[i], b.high[i]);
-          }
-          a.count += b.count;
-          a.voxels.insert(a.voxels.end(), b.voxels.begin(), b.voxels.end());
+        [](Found a, Found const& b) {
+          a.join(b);
           return a;
         });
-    if (all.count == 0) return;
-    auto const clip = [](std::int64_t v) { return int(std::min<std::int64_t>(v, Shape::kMaxTileCoord)); };
-    for (int a = 0; a < 3; ++a) {
-      result.low[a] = result.count ? std::min(result.low[a], int(all.low[a])) : int(all.low[a]);
-      result.high[a] = result.count ? std::max(result.high[a], clip(all.high[a])) : clip(all.high[a]);
-    }
-    result.count += all.count * std::int64_t(width) * width * width;
-    if (width > 1)
-      for (int3 const& p : all.voxels) result.wide.push_back({p, width});
-    else
-      result.voxels = std::move(all.voxels);
   }
 
   static int3 blockCorner(int3 const& first, std::int64_t x, std::int64_t y, std::int64_t z) {

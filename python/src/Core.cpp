@@ -89,6 +89,7 @@ std::map<std::string, GridNote> Core::notes() const {
       note.rule.kind = ActiveRule::Kind::kStates;
       note.rule.states = record.stateChannel;
     }
+    note.rule.also.assign(record.alsoActive.begin(), record.alsoActive.end());
     result[record.channel] = note;
   }
   return result;

@@ -129,6 +129,20 @@ def test_requirement_set_marks_active_where_states_are_kept(data, tmp_path):
     assert vln.open(tmp_path / "a.vdb")["shadow"].active_count == before + 2
 
 
+def test_requirement_active_voxels_that_were_rounded_to_the_background_count(data, tmp_path):
+    file = vln.open(data / "vdb" / "bunny_ls_512_half.vdb")
+    channel = file["ls_bunny"]
+    active = channel.active()
+    values = channel.get(active)
+    assert channel.active_count == len(active) == len(np.unique(active, axis=0)) == 3_778_680
+    assert np.count_nonzero(np.abs(values) == channel.background) == 989
+    low, high = channel.box
+    assert np.array_equal(active.min(axis=0), low) and np.array_equal(active.max(axis=0) + 1, high)
+    assert list(file) == ["ls_bunny"]
+    file.volume.save(tmp_path / "a.vdb")
+    assert vln.open(tmp_path / "a.vdb")["ls_bunny"].active_count == 3_778_680
+
+
 def test_requirement_blends_of_each_type_match_a_slow_model():
     rng = np.random.default_rng(5)
     for dtype, inner in [(np.float32, ()), (np.float64, ()), (np.float32, (3,)), (np.float64, (3,))]:

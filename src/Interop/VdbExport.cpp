@@ -39,7 +39,11 @@ openvdb::GridBase::Ptr toGrid(Object const& object, VdbGridRecord const& record)
   bool const complete = container && channel && (record.rule != VdbActiveRule::kChannel || state);
   bool const mask = record.type == kMaskType;
   auto grid = complete ? makeGrid(mask ? Ostil::String("bool") : record.type,
-                                  {*container, *channel, state.get(), record.rule})
+                                  {*container,
+                                   *channel,
+                                   state.get(),
+                                   record.rule,
+                                   {record.alsoActive.data(), record.alsoActive.size()}})
                        : nullptr;
   if (grid && mask) grid = maskOf(*grid);
   if (!grid)

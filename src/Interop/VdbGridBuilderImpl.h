@@ -9,7 +9,9 @@
 #include <array>
 #include <cstdint>
 #include <map>
+#include <tuple>
 #include <type_traits>
+#include <vector>
 
 namespace VLN::Interop {
 
@@ -29,7 +31,10 @@ public:
       , m_tree(from.container)
       , m_channel(dynamic_cast<ChannelT const&>(from.channel))
       , m_background(fromElement<Value>(m_channel.defaultValue()))
-      , m_grid(GridT::create(m_background)) {}
+      , m_alsoActive(from.alsoActive.begin(), from.alsoActive.end())
+      , m_grid(GridT::create(m_background)) {
+    std::sort(m_alsoActive.begin(), m_alsoActive.end(), PlaceBefore());
+  }
 
   typename GridT::Ptr build() {
     writeLeaves();
@@ -79,8 +84,30 @@ private:
     return blocks;
   }
 
+  // By the places of their leaves.
+  struct PlaceBefore {
+    bool operator()(int3 const& a, int3 const& b) const {
+      int3 const p = alignTo(a, kLeafDepth), q = alignTo(b, kLeafDepth);
+      return std::tie(p.x, p.y, p.z) < std::tie(q.x, q.y, q.z);
+    }
+  };
+  // Calls `f(from the block's corner)` for the voxels of a block's tiles that are active whatever their
+  // values.
+  template <class F> void forAlsoActive(Block const& block, F const& f) const {
+    if (m_alsoActive.empty()) return;
+    int3 const o = toInt3(block.origin);
+    auto const [begin, end] = std::equal_range(m_alsoActive.begin(), m_alsoActive.end(), o, PlaceBefore());
+    for (auto at = begin; at != end; ++at) {
+      int3 const v{at->x - o.x, at->y - o.y, at->z - o.z};
+      if (block.quarters[v.x / 4 + 2 * (v.y / 4) + 4 * (v.z / 4)] >= 0) f(v);
+    }
+  }
+
   // Whether the grid has a leaf of its own at a block.
   bool hasLeaf(Block const& block) const {
+    bool any = false;
+    forAlsoActive(block, [&](int3 const&) { any = true; });
+    if (any) return true;
     Value const uniform = block.above.valid() ? valueAt(block.above, {0, 0, 0}) : m_background;
     for (std::int64_t const quarter : block.quarters) {
       if (quarter < 0) continue;
@@ -132,6 +159,7 @@ private:
         active[i] |= std::uint64_t(on) << place;
       }
     }
+    forAlsoActive(block, [&](int3 const& v) { active[v.x] |= std::uint64_t(1) << (8 * v.y + v.z); });
     for (openvdb::Index i = 0; i < 8; ++i) leaf.getValueMask().template getWord<std::uint64_t>(i) = active[i];
   }
 
@@ -217,6 +245,7 @@ private:
   VdbContainer const& m_tree;
   ChannelT const& m_channel;
   Value m_background;
+  std::vector<int3> m_alsoActive; ///< by places of leaves
   typename GridT::Ptr m_grid;
 };
 

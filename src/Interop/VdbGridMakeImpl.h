@@ -4,6 +4,7 @@
 #include "Interop/VdbRecord.h"
 #include "Interop/VdbTreeImpl.h"
 
+#include <span>
 #include <string>
 
 namespace VLN::Interop {
@@ -14,6 +15,7 @@ struct GridToWrite {
   TileTree3D::ChannelBase const& channel;
   StateChannel const* state; ///< null unless the rule is kChannel
   VdbActiveRule rule;
+  std::span<Velorn::Math::int3 const> alsoActive; ///< whatever the rule says
 };
 
 // A grid with the values and the active states of a channel; null for a type name that is none of the half's.

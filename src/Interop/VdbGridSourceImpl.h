@@ -101,6 +101,8 @@ public:
   virtual void collectBeyondRoots(RootPlaces const& roots, std::vector<Velorn::Math::int3>& out) const = 0;
   /// The rule by which values tell what is active, or kChannel.
   virtual VdbActiveRule activeRule() const = 0;
+  /// Voxels that are active although the rule says that they are not.
+  virtual std::vector<Velorn::Math::int3> const& alsoActive() const = 0;
   /// A channel with the grid's values for every sample of the tree. Voxels that lie in packed leaves are gone
   /// afterwards.
   virtual Ostil::Ptr<TileTree3D::ChannelBase> makeChannel(std::string const& name, TreeToFill const& tree,

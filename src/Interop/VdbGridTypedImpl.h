@@ -3,12 +3,14 @@
 
 #include "GeometryVolume/core/Parallel.h"
 #include "Interop/VdbGridSourceImpl.h"
+#include "Interop/VdbRuleCheckImpl.h"
 #include "Interop/VdbStateTilesImpl.h"
 #include "Interop/VdbStoredGridImpl.h"
 #include "Interop/VdbTileMakerImpl.h"
 #include "Interop/VdbUnevenBlocksImpl.h"
 
 #include <algorithm>
+#include <initializer_list>
 
 namespace VLN::Interop {
 
@@ -51,6 +53,7 @@ public:
   std::optional<std::string> whyNotPlaced() const override { return m_whyNot; }
   GridSummary summarize() const override { return m_summary; }
   VdbActiveRule activeRule() const override { return m_rule; }
+  std::vector<int3> const& alsoActive() const override { return m_alsoActive; }
 
   void collectStored(std::vector<int3>& leaves, std::vector<int3>& tiles) const override {
     for (Leaf const* leaf : m_stored.leaves) leaves.push_back(toInt3(leaf->origin()));
@@ -197,16 +200,22 @@ private:
   struct Findings {
     GridSummary summary;
     ValueRange range;
-    bool byBackground = true, byBand = true; ///< whether the rule holds for every voxel
+    RuleCheck<TreeT> byBackground, byBand;
+
+    explicit Findings(std::size_t mostAlso)
+        : byBackground(VdbActiveRule::kNotBackground, mostAlso)
+        , byBand(VdbActiveRule::kInsideBand, mostAlso) {}
   };
 
   /// Goes through all voxels once: summary, rule and digests.
   void lookThrough() {
     m_stored.digests.resize(m_stored.leaves.size());
+    // A place takes 12 bytes, and the states of a leaf up to a hundred times that.
+    Findings const nothing(m_stored.leaves.size());
     Findings found = parallelReduce(
-        0, std::int64_t(m_stored.leaves.size()), 64, Findings{},
+        0, std::int64_t(m_stored.leaves.size()), 64, nothing,
         [&](std::int64_t begin, std::int64_t end) {
-          Findings part;
+          Findings part = nothing;
           for (std::int64_t n = begin; n < end; ++n) {
             if (n + 1 < end) fetchAhead(m_stored.valuesOf(*m_stored.leaves[static_cast<std::size_t>(n) + 1]));
             lookAt(static_cast<std::size_t>(n), part);
@@ -216,8 +225,8 @@ private:
         [](Findings a, Findings const& b) {
           a.summary = joinSummaries(a.summary, b.summary);
           a.range.join(b.range);
-          a.byBackground = a.byBackground && b.byBackground;
-          a.byBand = a.byBand && b.byBand;
+          a.byBackground.join(b.byBackground);
+          a.byBand.join(b.byBand);
           return a;
         });
     m_summary = found.summary;
@@ -225,11 +234,8 @@ private:
       growBy(m_summary.stored, tile.corner, tile.width);
       int const depth = tile.active ? depthOfSamples(tile.width) : depthOfTiles(tile.width);
       m_summary.shallowest = std::min(m_summary.shallowest, depth);
-      found.byBackground =
-          found.byBackground && !tile.active &&
-          !followsRule<Value>(VdbActiveRule::kNotBackground, tile.value, m_stored.background);
-      found.byBand = found.byBand && !tile.active &&
-                     !followsRule<Value>(VdbActiveRule::kInsideBand, tile.value, m_stored.background);
+      found.byBackground.look(tile, m_stored.background);
+      found.byBand.look(tile, m_stored.background);
       if (!tile.active) continue;
       growBy(m_summary.active, tile.corner, tile.width);
       m_summary.activeVoxels += std::int64_t(tile.width) * tile.width * tile.width;
@@ -238,9 +244,16 @@ private:
     }
     m_summary.hasRange = !found.range.empty();
     if (m_summary.hasRange) m_summary.minimum = found.range.minimum, m_summary.maximum = found.range.maximum;
-    m_rule = found.byBackground ? VdbActiveRule::kNotBackground
-             : found.byBand     ? VdbActiveRule::kInsideBand
-                                : VdbActiveRule::kChannel;
+    chooseRule({&found.byBackground, &found.byBand});
+  }
+  /// The first rule that holds without exceptions, else the first one that holds.
+  void chooseRule(std::initializer_list<RuleCheck<TreeT> const*> checks) {
+    RuleCheck<TreeT> const* chosen = nullptr;
+    for (auto const* check : checks) {
+      if (!check->holds()) continue;
+      if (!chosen || (check->alsoActive().empty() && !chosen->alsoActive().empty())) chosen = check;
+    }
+    if (chosen) m_rule = chosen->rule(), m_alsoActive = chosen->alsoActive();
   }
 
   void lookAt(std::size_t n, Findings& found) {
@@ -252,14 +265,8 @@ private:
     if (IndexBox const box = activeBox(leaf); !box.empty())
       found.summary.active.grow(box.min), found.summary.active.grow(box.max);
     found.range.join(activeRange(leaf, values));
-    auto const holds = [&](VdbActiveRule rule) {
-      for (int i = 0; i < kLeafWidth; ++i)
-        if (wordByRule<Value>(rule, values.data() + 64 * i, m_stored.background) != maskWord(leaf, i))
-          return false;
-      return true;
-    };
-    found.byBackground = found.byBackground && holds(VdbActiveRule::kNotBackground);
-    found.byBand = found.byBand && holds(VdbActiveRule::kInsideBand);
+    found.byBackground.look(leaf, values.data(), m_stored.background);
+    found.byBand.look(leaf, values.data(), m_stored.background);
   }
 
   std::vector<Leaf const*> leavesByNumber() const {
@@ -294,6 +301,7 @@ private:
   std::optional<std::string> m_whyNot;
   GridSummary m_summary;
   VdbActiveRule m_rule = VdbActiveRule::kChannel;
+  std::vector<int3> m_alsoActive;
 };
 
 /// Source of the one type among `Grids` that fits.

@@ -205,7 +205,8 @@ Ostil::Array<VdbGridRecord> tellOfGrids(Group const& group, VdbVolume& volume) {
   for (std::size_t n = 0; n < group.grids.size(); ++n) {
     GridSource const& source = *group.grids[n];
     GridSummary const& summary = group.summaries[n];
-    VdbGridRecord record{names[n], group.types[n], source.activeRule(), "", metadataBytes(source.grid())};
+    VdbGridRecord record{names[n], group.types[n], source.activeRule(), "", metadataBytes(source.grid()), {}};
+    for (int3 const& voxel : source.alsoActive()) record.alsoActive.append(voxel);
     if (record.rule == VdbActiveRule::kChannel) record.stateChannel = freeName(names[n] + "_active", taken);
     records.append(record);
     volume.channels.push_back({names[n], source.grid().getName(), group.types[n], 4, 0, summary.activeVoxels,

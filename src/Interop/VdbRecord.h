@@ -3,10 +3,11 @@
 
 #include "Ostil/Array.h"
 #include "Ostil/String.h"
+#include "Velorn/Math.h"
 
 namespace VLN::Interop {
 
-/// How to tell which samples of a grid are active.
+/// How to tell which samples of a grid are active, but for those that VdbGridRecord::alsoActive lists.
 enum class VdbActiveRule {
   kNotBackground, ///< those whose value is not the background, bit for bit
   kInsideBand,    ///< those nearer to zero than the background, as in a narrow band
@@ -24,6 +25,8 @@ struct VdbGridRecord {
   VdbActiveRule rule = VdbActiveRule::kNotBackground;
   Ostil::String stateChannel; ///< for kChannel
   Ostil::String metadata;     ///< OpenVDB's own bytes; name, class and half storage are part of it
+  /// Voxels that are active although the rule takes their values for those of inactive ones.
+  Ostil::Array<Velorn::Math::int3> alsoActive;
 };
 
 /// Key of an Ostil::Array<VdbGridRecord>, the grids in the order of the file.

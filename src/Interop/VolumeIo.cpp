@@ -63,7 +63,7 @@ Object withRecords(Volume const& volume, std::string const& path) {
     std::string const type = vdbTypeOf(object.component<ChannelBase>(name)->elementType());
     if (type.empty())
       throw FileError(path, "the field '" + name + "' is of a type that .vdb files do not have");
-    records.append({name, type, VdbActiveRule::kNotBackground, "", nameAsMetadata(name)});
+    records.append({name, type, VdbActiveRule::kNotBackground, "", nameAsMetadata(name), {}});
   }
   object.setProperty(kVdbGridsProperty, Ostil::Any(std::move(records)));
   if (!object.hasProperty(kVdbTransformProperty))
