@@ -1,5 +1,6 @@
 #include "Interop/VdbExport.h"
 
+#include "GeometryVolume/pools/Jemalloc.h"
 #include "Interop/IndexToWorldImpl.h"
 #include "Interop/VdbExportImpl.h"
 #include "Interop/VdbGridMakeImpl.h"
@@ -10,6 +11,7 @@
 #include <algorithm>
 #include <sstream>
 #include <stdexcept>
+#include <utility>
 
 namespace VLN::Interop {
 
@@ -32,10 +34,19 @@ openvdb::GridBase::Ptr makeGrid(std::string const& type, GridToWrite const& from
   return grid ? grid : makeVectorGrid(type, from);
 }
 
-openvdb::GridBase::Ptr toGrid(Object const& object, VdbGridRecord const& record) {
+/// @param release Whether the channels of the grid go meanwhile.
+openvdb::GridBase::Ptr toGrid(Object& object, VdbGridRecord const& record, bool release) {
+  using TileTree3D::ChannelBase;
   auto const container = object.component<VdbContainer>(kVdbContainerName);
-  auto const channel = object.component<TileTree3D::ChannelBase>(record.channel);
+  Ostil::MutablePtr<ChannelBase> released;
+  Ostil::Ptr<ChannelBase> kept;
+  if (release)
+    released = object.extractComponent<ChannelBase>(record.channel);
+  else
+    kept = object.component<ChannelBase>(record.channel);
+  ChannelBase const* const channel = release ? released.get() : kept.get();
   auto const state = object.component<StateChannel>(record.stateChannel);
+  if (release && state) object.removeComponent(record.stateChannel);
   bool const complete = container && channel && (record.rule != VdbActiveRule::kChannel || state);
   bool const mask = record.type == kMaskType;
   auto grid = complete ? makeGrid(mask ? Ostil::String("bool") : record.type,
@@ -43,7 +54,8 @@ openvdb::GridBase::Ptr toGrid(Object const& object, VdbGridRecord const& record)
                                    *channel,
                                    state.get(),
                                    record.rule,
-                                   {record.alsoActive.data(), record.alsoActive.size()}})
+                                   {record.alsoActive.data(), record.alsoActive.size()},
+                                   released.get()})
                        : nullptr;
   if (grid && mask) grid = maskOf(*grid);
   if (!grid)
@@ -52,12 +64,15 @@ openvdb::GridBase::Ptr toGrid(Object const& object, VdbGridRecord const& record)
   return grid;
 }
 
-// The grids of volumes, which must stay, in the order of their records.
+// The grids of volumes in the order of their records.
 class ExportedGrids {
 public:
+  /// @param volumes Stay as they are; where they are to be released they are nobody else's.
   /// @param metadata Takes that of the volumes.
-  ExportedGrids(std::vector<VdbVolume> const& volumes, openvdb::MetaMap& metadata, Progress const& progress)
-      : m_progress(progress) {
+  ExportedGrids(std::vector<VdbVolume> volumes, bool release, openvdb::MetaMap& metadata,
+                Progress const& progress)
+      : m_progress(progress)
+      , m_release(release) {
     for (auto const& volume : volumes) {
       m_count += volume.channels.size();
       Ostil::Any holder;
@@ -76,15 +91,20 @@ public:
     auto const name = metadata[openvdb::GridBase::META_GRID_NAME];
     return name ? name->str() : std::string();
   }
-  openvdb::GridBase::Ptr make(std::size_t n) const {
+  openvdb::GridBase::Ptr make(std::size_t n) {
     if (m_progress)
       m_progress("building the grids", 0.8 * double(n) / double(std::max<std::size_t>(1, m_count)));
-    auto const& [object, record] = m_grids[n];
-    auto grid = toGrid(*object, record);
+    auto& [object, record] = m_grids[n];
+    auto grid = toGrid(*object, record, m_release);
     Ostil::Any holder;
     auto const* transform = property<Ostil::String>(*object, kVdbTransformProperty, holder);
     IndexToWorld const indexToWorld = transform ? IndexToWorld(*transform) : IndexToWorld();
     grid->setTransform(indexToWorld.impl().transform->copy());
+    if (m_release) {
+      // With the last of its grids the volume.
+      object.reset();
+      jemalloc_purge();
+    }
     return grid;
   }
 
@@ -94,17 +114,18 @@ private:
     VdbGridRecord record;
   };
   Progress const& m_progress;
+  bool m_release;
   std::size_t m_count = 0;
   std::vector<Grid> m_grids;
 };
 
-void write(std::vector<VdbVolume> const& volumes, std::vector<PointVolume> const& points,
+void write(std::vector<VdbVolume> volumes, bool release, std::vector<PointVolume> const& points,
            std::string const& fileMetadata, std::string const& path, Progress const& progress) {
   openvdb::initialize();
   OutputFile out(path);
   openvdb::MetaMap metadata;
   if (!fileMetadata.empty()) readMetadata(fileMetadata, metadata);
-  ExportedGrids const exported(volumes, metadata, progress);
+  ExportedGrids exported(std::move(volumes), release, metadata, progress);
   std::vector<GridInTurn> grids;
   for (std::size_t n = 0; n < exported.size(); ++n)
     grids.push_back({exported.nameOf(n), [&exported, n] { return exported.make(n); }});
@@ -123,18 +144,22 @@ void write(std::vector<VdbVolume> const& volumes, std::vector<PointVolume> const
 openvdb::GridPtrVec exportedGrids(VdbImport const& content, Progress const& progress) {
   openvdb::initialize();
   openvdb::MetaMap metadata;
-  ExportedGrids const exported(content.volumes, metadata, progress);
+  ExportedGrids exported(content.volumes, false, metadata, progress);
   openvdb::GridPtrVec grids;
   for (std::size_t n = 0; n < exported.size(); ++n) grids.push_back(exported.make(n));
   return grids;
 }
 
 void exportVdb(std::vector<VdbVolume> const& volumes, std::string const& path, Progress const& progress) {
-  write(volumes, {}, "", path, progress);
+  write(volumes, false, {}, "", path, progress);
 }
 
 void exportVdb(VdbImport const& content, std::string const& path, Progress const& progress) {
-  write(content.volumes, content.points, content.metadata, path, progress);
+  write(content.volumes, false, content.points, content.metadata, path, progress);
+}
+
+void exportVdbReleasing(VdbImport& content, std::string const& path, Progress const& progress) {
+  write(std::exchange(content.volumes, {}), true, content.points, content.metadata, path, progress);
 }
 
 } // namespace VLN::Interop

@@ -2,6 +2,7 @@
 #pragma once
 
 #include "GeometryVolume/core/Parallel.h"
+#include "GeometryVolume/pools/Jemalloc.h"
 #include "Interop/VdbGridMakeImpl.h"
 #include "Interop/VdbGridNodesImpl.h"
 
@@ -9,6 +10,7 @@
 #include <array>
 #include <cstdint>
 #include <map>
+#include <optional>
 #include <tuple>
 #include <type_traits>
 #include <vector>
@@ -34,6 +36,7 @@ public:
       , m_alsoActive(from.alsoActive.begin(), from.alsoActive.end())
       , m_grid(GridT::create(m_background)) {
     std::sort(m_alsoActive.begin(), m_alsoActive.end(), PlaceBefore());
+    if (from.released) m_released.emplace(dynamic_cast<ChannelT&>(*from.released).tileDataAccessor());
   }
 
   typename GridT::Ptr build() {
@@ -163,20 +166,33 @@ private:
     for (openvdb::Index i = 0; i < 8; ++i) leaf.getValueMask().template getWord<std::uint64_t>(i) = active[i];
   }
 
+  // Blocks after which what their tiles held goes back to the system: grids have another allocator.
+  static constexpr auto kReleasedAtOnce = (std::int64_t(8) << 20) / std::int64_t(Leaf::SIZE * sizeof(Value));
+  // Nothing is read of a block's tiles any more.
+  void drop(Block const& block) {
+    auto* const tiles = m_released->tileData({0, kMaxDepth}).data();
+    for (std::int64_t const quarter : block.quarters)
+      if (quarter >= 0) TileVector<Element>().swap(tiles[quarter]);
+  }
+
   void writeLeaves() {
     std::vector<Block> blocks = leafBlocks();
     std::vector<std::unique_ptr<Leaf>> leaves(blocks.size());
-    parallelFor(0, std::int64_t(blocks.size()),
-                [&](std::int64_t begin, std::int64_t end) {
-                  for (auto n = begin; n < end; ++n) {
-                    if (!hasLeaf(blocks[n])) continue;
-                    // Its values come with the first look at them, and all are written.
-                    leaves[n] = std::make_unique<Leaf>(openvdb::PartialCreate(), blocks[n].origin,
-                                                       m_background, false);
-                    fillLeaf(*leaves[n], blocks[n]);
-                  }
-                },
-                {.grain = 64});
+    auto const make = [&](std::int64_t begin, std::int64_t end) {
+      for (auto n = begin; n < end; ++n) {
+        if (hasLeaf(blocks[n])) {
+          // Its values come with the first look at them, and all are written.
+          leaves[n] = std::make_unique<Leaf>(openvdb::PartialCreate(), blocks[n].origin, m_background, false);
+          fillLeaf(*leaves[n], blocks[n]);
+        }
+        if (m_released) drop(blocks[n]);
+      }
+    };
+    auto const count = std::int64_t(blocks.size()), piece = m_released ? kReleasedAtOnce : count;
+    for (std::int64_t first = 0; first < count; first += piece) {
+      parallelFor(first, std::min(first + piece, count), make, {.grain = 64});
+      if (m_released) jemalloc_purge();
+    }
     for (auto& leaf : leaves)
       if (leaf) m_grid->tree().addLeaf(leaf.release());
   }
@@ -246,6 +262,7 @@ private:
   ChannelT const& m_channel;
   Value m_background;
   std::vector<int3> m_alsoActive; ///< by places of leaves
+  std::optional<typename ChannelT::TileDataAccessor> m_released;
   typename GridT::Ptr m_grid;
 };
 

@@ -16,6 +16,8 @@ struct GridToWrite {
   StateChannel const* state; ///< null unless the rule is kChannel
   VdbActiveRule rule;
   std::span<Velorn::Math::int3 const> alsoActive; ///< whatever the rule says
+  /// The channel once more where its tiles go when they have been read; else null.
+  TileTree3D::ChannelBase* released = nullptr;
 };
 
 // A grid with the values and the active states of a channel; null for a type name that is none of the half's.

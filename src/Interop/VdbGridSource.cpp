@@ -173,16 +173,24 @@ void addSorted(std::vector<int3>& corners, std::vector<int3> others) {
 }
 
 bool tilesFollowLeaves(VdbContainer const& container) {
-  return parallelReduce(
-      1, std::max<std::int64_t>(1, container.tileCount(kMaxDepth)), 4096, true,
-      [&](std::int64_t begin, std::int64_t end) {
-        for (std::int64_t n = begin; n < end; ++n)
-          if (comesBefore<LeadingAxis::kZ>(leafPlaceOf(container.tile(n, kMaxDepth).tijk()),
-                                           leafPlaceOf(container.tile(n - 1, kMaxDepth).tijk())))
-            return false;
-        return true;
-      },
-      [](bool a, bool b) { return a && b; });
+  auto const follow = [&](int depth) {
+    // Those of one leaf may come in any order.
+    auto const place = [&](std::int64_t n) {
+      int3 const corner = container.tile(n, depth).tijk();
+      return depth == kMaxDepth ? leafPlaceOf(corner) : corner;
+    };
+    return parallelReduce(
+        1, std::max<std::int64_t>(1, container.tileCount(depth)), 4096, true,
+        [&](std::int64_t begin, std::int64_t end) {
+          for (std::int64_t n = begin; n < end; ++n)
+            if (comesBefore<LeadingAxis::kZ>(place(n), place(n - 1))) return false;
+          return true;
+        },
+        [](bool a, bool b) { return a && b; });
+  };
+  for (int depth = 0; depth <= kMaxDepth; ++depth)
+    if (!follow(depth)) return false;
+  return true;
 }
 
 void completeCorners(TileCorners& corners, int rootDepth) {

@@ -132,7 +132,8 @@ int cheapestRootDepth(std::vector<Velorn::Math::int3> leaves, std::vector<Velorn
                       int deepest);
 /// Adds corners to others that are along the Z-shaped curve, and drops duplicates.
 void addSorted(std::vector<Velorn::Math::int3>& corners, std::vector<Velorn::Math::int3> others);
-/// Whether the deepest tiles lie in the order of the places of leaves that they are in.
+/// Whether the tiles of each depth lie in the order of leaves, the deepest ones by the leaves that they are
+/// in.
 bool tilesFollowLeaves(VdbContainer const& container);
 /// Joins extents and counts; neither has a range yet.
 GridSummary joinSummaries(GridSummary a, GridSummary const& b);

@@ -11,6 +11,7 @@
 
 #include <algorithm>
 #include <initializer_list>
+#include <utility>
 
 namespace VLN::Interop {
 
@@ -116,30 +117,28 @@ public:
     auto channel = makeEmptyOn<ChannelT>(name, background, tree.topology);
     auto tiles = channel->tileDataAccessor();
     ZeroTiles<Element> zeros(ChannelT::kSize);
-    constexpr std::int64_t kPart = 1 << 16, kPiece = 1 << 14;
-    // The deepest tiles come last, and read the voxels leaf by leaf.
-    std::vector<Leaf const*> const packed =
-        m_stored.packed && tree.followsLeaves ? leavesByNumber() : std::vector<Leaf const*>();
-    for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth) {
-      std::int64_t const count = container.tileCount(depth);
-      for (std::int64_t first = 0, told = 0; first < count; first += kPiece) {
-        std::int64_t const last = std::min(first + kPiece, count);
-        parallelFor(first, last,
-                    [&](std::int64_t begin, std::int64_t end) {
-                      TileMaker<TreeT, ChannelT> make(m_stored, *channel, zeros);
-                      TileVector<Element>* const made = tiles.tileData({0, depth}).data();
-                      for (std::int64_t n = begin; n < end; ++n)
-                        make(container.tile(n, depth).tijk(), depth, made[n]);
-                    },
-                    {.grain = 256});
-        if (!packed.empty() && depth == VdbTraits::kMaxDepth && last < count)
-          m_stored.packed->drop(leavesBefore(packed, container.tile(last, depth).tijk()) * Leaf::SIZE *
-                                sizeof(Value));
-        if (last - told < kPart && last < count) continue;
-        filled(last - told);
-        told = last;
-      }
+    constexpr std::int64_t kPart = 1 << 16;
+    std::int64_t untold = 0;
+    auto const fill = [&](int depth, std::int64_t first, std::int64_t last) {
+      parallelFor(first, last,
+                  [&](std::int64_t begin, std::int64_t end) {
+                    TileMaker<TreeT, ChannelT> make(m_stored, *channel, zeros);
+                    TileVector<Element>* const made = tiles.tileData({0, depth}).data();
+                    for (std::int64_t n = begin; n < end; ++n)
+                      make(container.tile(n, depth).tijk(), depth, made[n]);
+                  },
+                  {.grain = 256});
+      untold += last - first;
+      if (untold >= kPart) filled(std::exchange(untold, 0));
+    };
+    if (m_stored.packed && tree.followsLeaves) {
+      fillAlongLeaves(container, fill);
+    } else {
+      for (int depth = 0; depth <= VdbTraits::kMaxDepth; ++depth)
+        for (std::int64_t first = 0; first < container.tileCount(depth); first += kPart)
+          fill(depth, first, std::min(first + kPart, container.tileCount(depth)));
     }
+    filled(untold);
     if (m_stored.packed) m_stored.packed->drop(m_stored.leaves.size() * Leaf::SIZE * sizeof(Value));
     zeros.leaveTo(*channel->cloneData());
     return channel;
@@ -269,14 +268,40 @@ private:
     found.byBand.look(leaf, values.data(), m_stored.background);
   }
 
+  /// Calls `fill(depth, first, last)` for the tiles of all depths, along the leaves, whose voxels go as soon
+  /// as they have been read for the last time.
+  template <class Fill> void fillAlongLeaves(VdbContainer const& container, Fill const& fill) const {
+    constexpr std::int64_t kPiece = 1 << 13;
+    constexpr int kMaxDepth = VdbTraits::kMaxDepth;
+    std::vector<Leaf const*> const leaves = leavesByNumber();
+    PerDepth<std::int64_t, VdbTraits::kDepths> next{};
+    for (bool more = true; more;) {
+      std::int64_t const last = std::min(next[kMaxDepth] + kPiece, container.tileCount(kMaxDepth));
+      more = last < container.tileCount(kMaxDepth);
+      int3 const place = more ? leafPlaceOf(container.tile(last, kMaxDepth).tijk()) : int3();
+      for (int depth = kMaxDepth; depth >= 0; --depth) {
+        std::int64_t end = last;
+        if (depth < kMaxDepth) {
+          // Of the tiles that begin before the next leaf: each reads nothing in front of its corner.
+          end = more ? next[depth] : container.tileCount(depth);
+          while (end < container.tileCount(depth) &&
+                 comesBefore<LeadingAxis::kZ>(container.tile(end, depth).tijk(), place))
+            ++end;
+        }
+        if (end > next[depth]) fill(depth, next[depth], end);
+        next[depth] = end;
+      }
+      if (more) m_stored.packed->drop(leavesBefore(leaves, place) * Leaf::SIZE * sizeof(Value));
+    }
+  }
+
   std::vector<Leaf const*> leavesByNumber() const {
     std::vector<Leaf const*> leaves(m_stored.leaves.size());
     for (Leaf const* leaf : m_stored.leaves) leaves[leaf->transientData()] = leaf;
     return leaves;
   }
-  /// How many packed leaves lie before the place of a tile.
-  static std::size_t leavesBefore(std::vector<Leaf const*> const& packed, int3 const& corner) {
-    int3 const place = leafPlaceOf(corner);
+  /// How many packed leaves lie before a place.
+  static std::size_t leavesBefore(std::vector<Leaf const*> const& packed, int3 const& place) {
     auto const found = std::partition_point(packed.begin(), packed.end(), [&](Leaf const* leaf) {
       return comesBefore<LeadingAxis::kZ>(toInt3(leaf->origin()), place);
     });

@@ -65,4 +65,12 @@ void exportVolumes(VdbImport const& content, std::string const& path, Progress c
   }
 }
 
+void exportVolumesReleasing(VdbImport& content, std::string const& path, Progress const& progress,
+                            ExportOptions const& options) {
+  if (checkOutputFor(FileContent::kExports, path) != FileFormat::kVdb)
+    return exportVolumes(content, path, progress, options);
+  grids(content);
+  exportVdbReleasing(content, path, progress);
+}
+
 } // namespace VLN::Interop

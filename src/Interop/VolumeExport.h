@@ -19,5 +19,8 @@ struct ExportOptions {
 /// be written.
 VLN_API void exportVolumes(VdbImport const& content, std::string const& path, Progress const& progress = {},
                            ExportOptions const& options = {});
+/// The same, and releases the volumes where that saves memory: see exportVdbReleasing().
+VLN_API void exportVolumesReleasing(VdbImport& content, std::string const& path,
+                                    Progress const& progress = {}, ExportOptions const& options = {});
 
 } // namespace VLN::Interop

@@ -201,6 +201,29 @@ TEST(VdbExport, RequirementGridsInTurnGiveTheBytesThatOpenVdbWritesOfAll) {
   EXPECT_EQ(stages, wanted);
 }
 
+TEST(VdbExport, RequirementReleasedVolumesGiveTheSameFile) {
+  openvdb::initialize();
+  VdbFile file;
+  file.path = "memory";
+  // Two volumes; grids with states and without, of several types, a mask among them.
+  file.grids = {randomGrid<openvdb::FloatGrid>(1), randomGrid<openvdb::Vec3SGrid>(2),
+                randomGrid<openvdb::BoolGrid>(3), openvdb::MaskGrid::create(),
+                openvdb::FloatGrid::create(1.0f)};
+  openvdb::gridPtrCast<openvdb::MaskGrid>(file.grids[3])->tree().setValueOn({1, 2, 3});
+  auto const cube = openvdb::gridPtrCast<openvdb::FloatGrid>(file.grids[4]);
+  cube->denseFill({{-90, -90, -90}, {90, 90, 90}}, 2.0f);
+  cube->tree().voxelizeActiveTiles();
+  for (std::size_t n = 0; n < file.grids.size(); ++n) file.grids[n]->setName("grid " + std::to_string(n));
+  cube->setTransform(openvdb::math::Transform::createLinearTransform(0.5));
+  VdbImport import = importGrids(file);
+  ASSERT_EQ(import.volumes.size(), 2u);
+  Removed const kept{scratch("kept")}, released{scratch("released")};
+  exportVdb(import, kept.path.string());
+  exportVdbReleasing(import, released.path.string());
+  EXPECT_TRUE(import.volumes.empty());
+  EXPECT_TRUE(withoutIdentity(kept.path) == withoutIdentity(released.path));
+}
+
 TEST(VdbExport, NegativeFailedWriteLeavesWhatWasThere) {
   openvdb::initialize();
   VdbFile file;

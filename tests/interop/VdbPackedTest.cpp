@@ -9,6 +9,7 @@
 
 #include <gtest/gtest.h>
 
+#include <cmath>
 #include <cstring>
 
 namespace {
@@ -113,6 +114,41 @@ TEST(VdbPacked, GivesTheVolumesOfRealFiles) {
       ++found;
     }
   if (found == 0) GTEST_SKIP() << "no volumes at hand";
+}
+
+/// A narrow band about a sphere, whose leaves take tens of megabytes, with voxels beside it that make tiles
+/// of all widths.
+openvdb::FloatGrid::Ptr largeBand() {
+  constexpr int kRadius = 160, kFar = kRadius + 3;
+  auto grid = openvdb::FloatGrid::create(3.0f);
+  auto to = grid->getAccessor();
+  for (int x = -kFar; x <= kFar; ++x)
+    for (int y = -kFar; y <= kFar; ++y) {
+      int const inner = (kRadius - 3) * (kRadius - 3) - x * x - y * y, outer = kFar * kFar - x * x - y * y;
+      if (outer < 0) continue;
+      int const first = inner > 0 ? int(std::sqrt(double(inner))) : 0;
+      for (int z = first; z * z < outer; ++z)
+        for (int const side : {-z, z})
+          if (float const d = std::sqrt(float(x * x + y * y + z * z)) - kRadius; std::abs(d) < 3)
+            to.setValueOn(Coord(x, y, side), d);
+    }
+  grid->tree().addTile(2, Coord(0, 0, 0), -3.0f, false);
+  grid->tree().setValueOn(Coord(2000, -3000, 100), 1.0f);
+  grid->setName("large");
+  return grid;
+}
+
+// requirement: what was read goes piece by piece, and nothing is read behind that
+TEST(VdbPacked, GivesTheVolumesOfLargeGrids) {
+  openvdb::initialize();
+  TempFolder const folder;
+  std::string const path = folder / "large.vdb";
+  auto const grid = largeBand();
+  ASSERT_GT(grid->tree().leafCount() * 2048, std::size_t(16) << 20);
+  write(path, {grid}, kMask);
+  auto const wanted = importedFromOwnLeaves(path);
+  for (int const threads : {1, 2, 8})
+    withThreads(threads, [&] { EXPECT_TRUE(bytesOf(importVdb(path, kLimits)) == wanted) << threads; });
 }
 
 // regression: OpenVDB makes a buffer of any values for a leaf that has none when it is asked for one

@@ -54,8 +54,8 @@ void convert(ConvertOptions const& options) {
     if (options.strict && !holdsPoints && !content.points.empty())
       throw FileError(content.file,
                       "would not be written whole: it has points, which such files do not hold");
-    exportVolumes(content, options.output, bar.progress(0.7, 1),
-                  {.surface = {options.iso, options.adaptivity}, .voxelByVoxel = options.sparse});
+    exportVolumesReleasing(content, options.output, bar.progress(0.7, 1),
+                           {.surface = {options.iso, options.adaptivity}, .voxelByVoxel = options.sparse});
   }
   for (auto const& s : content.skipped)
     std::cerr << fmt::format("vln: {}: note: '{}' is left out: {}\n", options.file, oneLine(s.grid, 60),

@@ -18,13 +18,14 @@ namespace {
 std::mutex g_flushMutex;
 std::atomic<bool> g_flushing{false};
 
+void purgeArenas() { vlje_mallctl("arenas.purge", nullptr, nullptr, nullptr, 0); }
 void flushOwnCache() { vlje_mallctl("thread.tcache.flush", nullptr, nullptr, nullptr, 0); }
 
 /// Caches are flushed when memory is short, so that there may be none for the flushing itself: then they stay
 /// as they are.
 void flushWorkers() noexcept {
   try {
-    if (Internal::runOnEachWorker(&flushOwnCache)) vlje_mallctl("arenas.purge", nullptr, nullptr, nullptr, 0);
+    if (Internal::runOnEachWorker(&flushOwnCache)) purgeArenas();
   } catch (...) {}
 }
 
@@ -50,6 +51,8 @@ void* allocateZeros_jemalloc(std::uint64_t count, std::uint64_t elementSize) {
 }
 
 void deallocate_jemalloc(void* block) { vlje_free(block); }
+
+void jemalloc_purge() { purgeArenas(); }
 
 void jemalloc_flushCache() {
   if (g_flushing.load(std::memory_order_acquire)) return;

@@ -26,6 +26,11 @@ VLN_API void* allocate_jemalloc(std::uint64_t count, std::uint64_t elementSize);
 VLN_API void* allocateZeros_jemalloc(std::uint64_t count, std::uint64_t elementSize);
 VLN_API void deallocate_jemalloc(void* block);
 
+/// Gives memory back to the system that is free in all arenas. What threads keep cached stays.
+/// @cost Linear in what goes; the system clears it anew for whoever gets it next.
+/// @threads Any thread.
+VLN_API void jemalloc_purge();
+
 /// Gives memory that threads keep cached back to the system, as far as it can be reached: the caches of the
 /// calling thread and of the scheduler's workers, then all arenas. With one thread only its own cache goes.
 /// @cost Starts a thread and wakes every worker; for the path where memory is short.
