@@ -6,6 +6,7 @@
 //   validate   of the whole buffer before it is trusted
 //   read       a million active voxels, leaf by leaf or at random, through NanoVDB's accessor and through a
 //              cursor on the flat buffer; an item is a voxel
+//              "cells": with a table beside the buffer that leads to tiles, of 16 bytes a tile at the most
 //   trilinear  in the cells of the same voxels, through NanoVDB's sampler and from tiles with halo
 //   bounds     smallest, largest and mean value of each tile, for rays, of a buffer with halos
 //
@@ -147,6 +148,20 @@ void readBench(benchmark::State& state, Subject const& subject, bool random, Rea
                           static_cast<std::int64_t>(state.iterations()));
 }
 
+/// A table of cells with its memory.
+struct Cells {
+  nanovtt::CellTable table;
+  std::vector<std::uint32_t> memory;
+
+  explicit Cells(nanovtt::ContainerReader const& tree)
+      : table(tree)
+      , memory(table.bytes() / sizeof(std::uint32_t)) {
+    table.write(tree, memory.data());
+  }
+  Cells(Cells const&) = delete;
+  Cells& operator=(Cells const&) = delete;
+};
+
 void addReads(Subject const* subject) {
   for (bool random : {false, true}) {
     std::string const tail = random ? "random/" : "coherent/";
@@ -172,6 +187,14 @@ void addReads(Subject const* subject) {
       readBench(state, *subject, random,
                 [&](openvdb::Coord const& c) { return cursor.value(c.x(), c.y(), c.z()); });
     });
+    add("read/" + tail + "ours, type known, cells", [=](benchmark::State& state) {
+      auto const flat = flatten<void>(*subject);
+      auto const grid = nanovtt::BufferReader(flat.data()).grid(0);
+      Cells const cells(grid.container());
+      nanovtt::Cursor<nanovtt::GridType::kFloat> cursor(grid, cells.table);
+      readBench(state, *subject, random,
+                [&](openvdb::Coord const& c) { return cursor.value(c.x(), c.y(), c.z()); });
+    });
     add("trilinear/" + tail + "NanoVDB", [=](benchmark::State& state) {
       auto const flat = nanoFlatten<void>(*subject);
       auto const accessor = flat.grid<float>()->getAccessor();
@@ -194,7 +217,23 @@ void addReads(Subject const* subject) {
         return cursor.trilinear(float(c.x()) + 0.25f, float(c.y()) + 0.5f, float(c.z()) + 0.75f);
       });
     });
+    add("trilinear/" + tail + "ours, halo tiles, type known, cells", [=](benchmark::State& state) {
+      auto const flat = flatten<void>(*subject, 1.0f);
+      auto const grid = nanovtt::BufferReader(flat.data()).grid(0);
+      Cells const cells(grid.container());
+      nanovtt::Cursor<nanovtt::GridType::kFloat> cursor(grid, cells.table);
+      readBench(state, *subject, random, [&](openvdb::Coord const& c) {
+        return cursor.trilinear(float(c.x()) + 0.25f, float(c.y()) + 0.5f, float(c.z()) + 0.75f);
+      });
+    });
   }
+}
+
+void cellsBench(benchmark::State& state, Subject const* subject) {
+  auto const flat = flatten<void>(*subject);
+  auto const tree = nanovtt::BufferReader(flat.data()).container();
+  for (auto _ : state) benchmark::DoNotOptimize(Cells(tree).memory.data());
+  state.counters["MB"] = double(Cells(tree).table.bytes()) / 1e6;
 }
 
 // Of a build with codes of 8 bits, which float grids are read from as well.
@@ -270,6 +309,8 @@ void addAll(Subject const* subject) {
   addReads(subject);
   addQuantisedReads(subject);
   addBounds(subject);
+  benchmark::RegisterBenchmark((subject->name + "/cells").c_str(), cellsBench, subject)
+      ->Unit(benchmark::kMillisecond);
   benchmark::RegisterBenchmark((subject->name + "/validate").c_str(), validateBench, subject)
       ->Unit(benchmark::kMillisecond);
   addBuild<void>("float", subject);

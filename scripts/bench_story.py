@@ -76,6 +76,12 @@ ROWS = [
      ["BM_VdbSetValue/1/0"]),
     ("read in bulk, in order, 1 thread", "volume", "BM_FieldGetBulk/0/1/real_time", ["BM_VdbGetValue/0"]),
     ("read in bulk, at random, 1 thread", "volume", "BM_FieldGetBulk/1/1/real_time", ["BM_VdbGetValue/1"]),
+    *[(f"read {what} of a flat buffer with cells, {grid}", "flatten",
+       f"{grid}/{name}/ours, {ours}", [f"{grid}/{name}/NanoVDB"])
+      for grid in GRIDS
+      for what, name, ours in (("at random", "read/random", "type known, cells"),
+                               ("coherently", "read/coherent", "type known, cells"),
+                               ("blends at random", "trilinear/random", "halo tiles, type known, cells"))],
     ("flatten float, bunny, 2 threads", "flatten", "bunny_ls_512_half/flatten/ours float/threads:2/real_time",
      ["bunny_ls_512_half/flatten/NanoVDB float/threads:2/real_time"]),
     ("flatten Fp8, bunny, 2 threads", "flatten", "bunny_ls_512_half/flatten/ours Fp8/threads:2/real_time",

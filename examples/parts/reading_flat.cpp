@@ -36,6 +36,19 @@ double meanOf(nanovtt::GridReader const& grid, int low, int high, int depth) {
 }
 // end snippet
 
+// snippet: cells
+// Reads at random places: a table of cells beside the buffer leads from a place to its tile.
+double meanAt(nanovtt::GridReader const& grid, std::vector<nanovtt::Coord> const& places) {
+  nanovtt::CellTable cells(grid.container()); // of 16 bytes a tile at the most
+  std::vector<std::uint32_t> memory(cells.bytes() / sizeof(std::uint32_t));
+  cells.write(grid.container(), memory.data());
+  nanovtt::GridCursor cursor(grid, cells);
+  double sum = 0;
+  for (auto const& p : places) sum += cursor.value(p.x, p.y, p.z);
+  return sum / double(places.size());
+}
+// end snippet
+
 // snippet: typed
 // The type known when it is compiled: vectors, blended between their samples.
 nanovtt::Float3 velocityAt(nanovtt::GridReader const& grid, float x, float y, float z) {
@@ -91,6 +104,7 @@ int main() {
   auto const grid = reader.grid(reader.find("density"));
   expect(grid.valueAt(3, 4, 5) == 31, "a value");
   expect(std::abs(meanOf(grid, 0, 16, nanovtt::kMaxDepth) - 52.5) < 1e-9, "a mean");
+  expect(meanAt(grid, {{3, 4, 5}, {15, 0, 1}, {-9, 0, 0}}) == (31 + 19 + 0) / 3.0, "a mean of places");
   expect(largestOf(grid) == 105, "the largest value");
   auto const v = velocityAt(reader.grid(reader.find("velocity")), 3.5f, 4.25f, 5.75f);
   expect(v.v[0] == 3.5f && v.v[1] == 4.25f && v.v[2] == 5.75f, "a vector");

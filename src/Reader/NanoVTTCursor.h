@@ -53,18 +53,26 @@ public:
 
   /// @param maxDepth Deeper tiles are not read: a coarse picture of the same field.
   NANOVTT_HD explicit CursorOf(GridReader const& grid, int maxDepth = kMaxDepth)
+      : CursorOf(grid, CellTable(), maxDepth) {}
+  /// @param cells Where searches begin, for reads at random.
+  NANOVTT_HD CursorOf(GridReader const& grid, CellTable const& cells, int maxDepth = kMaxDepth)
       : m_grid(grid)
-      , m_path(grid.container(), maxDepth)
-      , m_default(load<Value>(grid.defaultValue().samples)) {}
+      , m_path(grid.container(), cells, maxDepth)
+      , m_llc(grid.container().lowestCorner())
+      , m_default(load<Value>(grid.defaultValue().samples)) {
+    if (cells.depth() < kMaxDepth - 1 || maxDepth < kMaxDepth) return;
+    m_cells = cells;
+    m_firstOfCells = grid.container().tilesAbove(cells.depth());
+  }
 
   /// The sample that holds the position, of the deepest tile there; the default value where there is none.
   /// @space Tile space.
   /// @cost In the tile of the read before: one test and one load. Else up the tree as far as need be, and
-  /// down.
+  /// down; with cells as wide as the deepest tiles or their parents, a cell and a table or two.
   NANOVTT_HD Value value(std::int32_t x, std::int32_t y, std::int32_t z) {
-    if (!holds(x, y, z) && !moveTo(x, y, z)) return m_default;
-    return Samples::get(
-        m_block, m_block.index(at(x, m_tile.corner.x), at(y, m_tile.corner.y), at(z, m_tile.corner.z)));
+    std::uint32_t const ux = distance(x, m_llc.x), uy = distance(y, m_llc.y), uz = distance(z, m_llc.z);
+    if (!holds(ux, uy, uz) && !moveTo(x, y, z)) return m_default;
+    return Samples::get(m_block, m_block.index(at(ux), at(uy), at(uz)));
   }
 
   /// The blend of the eight samples round a position, samples on the low corners of their voxels.
@@ -95,7 +103,9 @@ public:
   }
 
   /// The tile that was read last. @pre The read before found one.
-  NANOVTT_HD TileRef const& tile() const { return m_tile; }
+  NANOVTT_HD TileRef tile() const {
+    return {m_number, m_depth, {corner(m_llc.x, m_x), corner(m_llc.y, m_y), corner(m_llc.z, m_z)}};
+  }
 
 private:
   /// Eight samples, and where the position lies between them.
@@ -119,12 +129,13 @@ private:
 
   NANOVTT_HD bool cellAt(float x, float y, float z, Cell& cell) {
     std::int32_t const px = floorOf(x), py = floorOf(y), pz = floorOf(z);
-    if (!holds(px, py, pz) && !moveTo(px, py, pz)) return false;
-    int i = at(px, m_tile.corner.x), j = at(py, m_tile.corner.y), k = at(pz, m_tile.corner.z);
+    std::uint32_t const ux = distance(px, m_llc.x), uy = distance(py, m_llc.y), uz = distance(pz, m_llc.z);
+    if (!holds(ux, uy, uz) && !moveTo(px, py, pz)) return false;
+    int i = at(ux), j = at(uy), k = at(uz);
     float const perSample = 1 / static_cast<float>(std::int32_t(1) << m_shift);
-    cell.fx = place(x, m_tile.corner.x, perSample, i);
-    cell.fy = place(y, m_tile.corner.y, perSample, j);
-    cell.fz = place(z, m_tile.corner.z, perSample, k);
+    cell.fx = place(x, corner(m_llc.x, ux), perSample, i);
+    cell.fy = place(y, corner(m_llc.y, uy), perSample, j);
+    cell.fz = place(z, corner(m_llc.z, uz), perSample, k);
     Blend* const v = cell.v;
     if (i + 1 < m_block.width && j + 1 < m_block.width && k + 1 < m_block.width) {
       std::uint64_t const n = m_block.index(i, j, k), dj = m_block.strideJ, dk = m_block.strideK;
@@ -151,14 +162,15 @@ private:
   /// A sample of the tile, or beyond it on the high side.
   NANOVTT_HD Blend sampleBeside(int i, int j, int k) const {
     if (i < m_block.width && j < m_block.width && k < m_block.width) return sample(m_block.index(i, j, k));
-    std::int64_t const x = m_tile.corner.x + (std::int64_t(i) << m_shift),
-                       y = m_tile.corner.y + (std::int64_t(j) << m_shift),
-                       z = m_tile.corner.z + (std::int64_t(k) << m_shift);
+    TileRef const here = tile();
+    std::int64_t const x = here.corner.x + (std::int64_t(i) << m_shift),
+                       y = here.corner.y + (std::int64_t(j) << m_shift),
+                       z = here.corner.z + (std::int64_t(k) << m_shift);
     if (x > INT32_MAX || y > INT32_MAX || z > INT32_MAX) return blend(m_default);
     auto const px = static_cast<std::int32_t>(x), py = static_cast<std::int32_t>(y),
                pz = static_cast<std::int32_t>(z);
     // Samples of a merged block are those of the tiles at its bottom.
-    TileRef const there = m_grid.container().find(px, py, pz, m_grid.sampleDepth(m_block, m_tile));
+    TileRef const there = m_grid.container().find(px, py, pz, m_grid.sampleDepth(m_block, here));
     if (!there.valid()) return blend(m_default);
     TileBlock const b = Samples::block(m_grid, there.number);
     return blend(Samples::get(b, GridReader::sampleAt(b, there, px, py, pz)));
@@ -169,44 +181,78 @@ private:
     auto const cut = static_cast<std::int32_t>(v);
     return cut - (static_cast<float>(cut) > v);
   }
-  NANOVTT_HD bool holds(std::int32_t x, std::int32_t y, std::int32_t z) const {
-    return distance(x, m_alike.x) < m_width && distance(y, m_alike.y) < m_width &&
-           distance(z, m_alike.z) < m_width;
+  // Places are told from the lowest corner of the roots: there the corners of tiles are multiples of their
+  // widths, and places in one cube of such a width differ in lower bits alone.
+  NANOVTT_HD bool holds(std::uint32_t ux, std::uint32_t uy, std::uint32_t uz) const {
+    return ((ux ^ m_x) | (uy ^ m_y) | (uz ^ m_z)) < m_width;
   }
   NANOVTT_HD static std::uint32_t distance(std::int32_t c, std::int32_t corner) {
     return static_cast<std::uint32_t>(c) - static_cast<std::uint32_t>(corner);
   }
-  NANOVTT_HD int at(std::int32_t c, std::int32_t corner) const {
-    return static_cast<int>(distance(c, corner) >> m_shift);
-  }
-  NANOVTT_HD bool moveTo(std::int32_t x, std::int32_t y, std::int32_t z) {
-    m_width = 0;
-    if (!m_path.moveTo(x, y, z)) return false;
-    TileRef const tile = m_path.tile();
-    if (tile.number != m_tile.number) {
-      m_tile = tile;
-      m_block = Samples::block(m_grid, tile.number);
-      m_shift = kTileSpaceBits - m_grid.sampleDepth(m_block, tile) - 2;
-    }
-    // Of a tile above a refined place only the part is kept that has no deeper one.
-    int const shift = m_path.alikeShift();
-    m_width = 1u << shift;
-    m_alike = {part(x, tile.corner.x, shift), part(y, tile.corner.y, shift), part(z, tile.corner.z, shift)};
-    return true;
-  }
-  NANOVTT_HD static std::int32_t part(std::int32_t c, std::int32_t corner, int shift) {
-    return static_cast<std::int32_t>(static_cast<std::uint32_t>(corner) +
-                                     (distance(c, corner) >> shift << shift));
+  // Of the sample in the tile.
+  NANOVTT_HD int at(std::uint32_t u) const { return static_cast<int>((u & m_inTile) >> m_shift); }
+  // Of the tile.
+  NANOVTT_HD std::int32_t corner(std::int32_t lowest, std::uint32_t u) const {
+    return static_cast<std::int32_t>(static_cast<std::uint32_t>(lowest) + (u & ~m_inTile));
   }
 
+  NANOVTT_HD bool moveTo(std::int32_t x, std::int32_t y, std::int32_t z) {
+    m_width = 0;
+    std::uint32_t const ux = distance(x, m_llc.x), uy = distance(y, m_llc.y), uz = distance(z, m_llc.z);
+    std::uint32_t tile = kNoTile;
+    if (m_cells.find(ux, uy, uz, tile)) {
+      if (tile == kNoTile) return false;
+      if (tile >= m_firstOfCells && (m_cells.depth() == kMaxDepth || toChild(tile, ux, uy, uz))) {
+        take(tile, kMaxDepth);
+        keep(ux, uy, uz, kTileSpaceBits - kMaxDepth);
+        return true;
+      }
+    }
+    if (!m_path.moveTo(x, y, z)) return false;
+    take(m_path.number(), m_path.depth());
+    // Of a tile above a refined place only the part is kept that has no deeper one.
+    keep(ux, uy, uz, m_path.alikeShift());
+    return true;
+  }
+  // From a tile above the deepest ones to the one at a place.
+  NANOVTT_HD bool toChild(std::uint32_t& tile, std::uint32_t ux, std::uint32_t uy, std::uint32_t uz) const {
+    constexpr int kShift = kTileSpaceBits - kMaxDepth;
+    ContainerReader::Children const list = m_grid.container().children(tile);
+    if (list.levels != 0) return false;
+    std::uint32_t const child = list[(ux >> kShift & 1) | (uy >> kShift & 1) << 1 | (uz >> kShift & 1) << 2];
+    if (child == kNoTile) return false;
+    tile = child;
+    return true;
+  }
+  NANOVTT_HD void take(std::uint32_t tile, int depth) {
+    if (tile == m_number) return;
+    m_block = Samples::block(m_grid, tile);
+    m_number = tile, m_depth = depth;
+    m_inTile = (1u << (kTileSpaceBits - depth)) - 1;
+    m_shift = kTileSpaceBits - m_grid.sampleDepth(m_block, {tile, depth, {}}) - 2;
+  }
+  NANOVTT_HD void keep(std::uint32_t ux, std::uint32_t uy, std::uint32_t uz, int shift) {
+    m_x = ux, m_y = uy, m_z = uz;
+    m_width = 1u << shift;
+  }
+
+  // The coordinates of the last place lie apart, or the compiler reads two at once, which waits for the
+  // stores of each.
+  std::uint32_t m_x = 0;
+  std::uint32_t m_width = 0; ///< of the cube about it that may be read without a search; 0: none
+  int m_shift = 0;           ///< log2 of the width of a sample
+  std::uint32_t m_y = 0;
+  std::uint32_t m_inTile = 0; ///< bits of places in the tile
+  std::uint32_t m_number = kNoTile;
+  std::uint32_t m_z = 0;
+  int m_depth = -1;
+  TileBlock m_block;
   GridReader m_grid;
   TilePath m_path;
+  Coord m_llc;
+  CellTable m_cells; ///< of the deepest tiles or their parents
+  std::uint32_t m_firstOfCells = 0;
   Value m_default;
-  TileRef m_tile;
-  TileBlock m_block;
-  Coord m_alike;             ///< corner of what may be read without a search
-  std::uint32_t m_width = 0; ///< its width; 0: nothing may
-  int m_shift = 0;           ///< log2 of the width of a sample
 };
 
 template <GridType kType> using Cursor = CursorOf<TypedSamples<kType>>;

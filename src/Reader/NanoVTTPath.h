@@ -5,6 +5,7 @@
 //                  there
 #pragma once
 
+#include "Reader/NanoVTTCells.h"
 #include "Reader/NanoVTTReader.h"
 
 namespace nanovtt {
@@ -18,10 +19,20 @@ public:
   NANOVTT_HD explicit TilePath(ContainerReader const& tree, int maxDepth = kMaxDepth)
       : m_tree(tree)
       , m_llc(tree.lowestCorner())
-      , m_maxDepth(maxDepth) {}
+      , m_wraps(wraps(m_llc.x, tree.rootDepth()) || wraps(m_llc.y, tree.rootDepth()) ||
+                wraps(m_llc.z, tree.rootDepth()))
+      , m_lowestShift(maxDepth < kMaxDepth ? kTileSpaceBits - maxDepth : kLeastShift) {}
+  /// @param cells Where searches begin; those of a table deeper than `maxDepth` do not.
+  NANOVTT_HD TilePath(ContainerReader const& tree, CellTable const& cells, int maxDepth = kMaxDepth)
+      : TilePath(tree, maxDepth) {
+    if (cells.depth() < 0 || cells.depth() > maxDepth) return;
+    m_cells = cells;
+    m_firstOfCells = tree.tilesAbove(cells.depth());
+    m_enterAbove = kTileSpaceBits - cells.depth();
+  }
 
   NANOVTT_HD ContainerReader const& container() const { return m_tree; }
-  NANOVTT_HD int maxDepth() const { return m_maxDepth; }
+  NANOVTT_HD int maxDepth() const { return kTileSpaceBits - m_lowestShift; }
 
   /// To the deepest tile at or above `maxDepth` that holds the point, as ContainerReader::find() finds it.
   /// @return false when there is none.
@@ -29,74 +40,108 @@ public:
     std::uint32_t const ux = from(x, m_llc.x), uy = from(y, m_llc.y), uz = from(z, m_llc.z);
     std::uint32_t const differ = (ux ^ m_x) | (uy ^ m_y) | (uz ^ m_z);
     m_x = ux, m_y = uy, m_z = uz;
-    while (m_height > 0 && differ >> shift(top().depth)) --m_height;
-    // Below the lowest corner there is no root, but the difference may look like that of one.
-    bool const isBelow = x < m_llc.x || y < m_llc.y || z < m_llc.z;
-    if (isBelow) m_height = 0;
-    if (m_height == 0) {
-      if (isBelow || m_maxDepth < m_tree.rootDepth()) return false;
-      int const s = shift(m_tree.rootDepth());
-      std::uint32_t const i = ux >> s, j = uy >> s, k = uz >> s;
-      if ((i | j | k) >= kRootTableWidth) return false;
-      std::uint32_t const root = m_tree.root((k * kRootTableWidth + j) * kRootTableWidth + i);
-      if (root == kNoTile) return false;
-      push(root, m_tree.rootDepth());
+    // What the steps change is kept out of the members until they are done: so it stays in registers.
+    Level* level = m_levels + m_height;
+    while (level != m_levels && differ >> level->shift) --level;
+    m_height = 0;
+    if (m_wraps && (x < m_llc.x || y < m_llc.y || z < m_llc.z)) return false;
+    if (level->shift > m_enterAbove) {
+      Level const entry = enter(ux, uy, uz, *level);
+      if (entry.tile == kNoTile) return false;
+      if (level == m_levels || entry.shift < level->shift) m_levels[1] = entry, level = m_levels + 1;
     }
-    while (top().depth < kMaxDepth) {
-      Level const& l = top();
-      int const depth = l.depth + l.list.levels + 1;
-      if (depth > m_maxDepth) break;
-      std::uint32_t const child = l.list[slot(l.list.levels + 1, shift(depth))];
+    while (level->shift > m_lowestShift) {
+      int const levels = level->levels, down = level->shift - levels - 1;
+      if (down < m_lowestShift) break;
+      std::uint32_t const i = ux >> down, j = uy >> down, k = uz >> down;
+      std::uint32_t const slot =
+          levels == 0 ? (i & 1) | (j & 1) << 1 | (k & 1) << 2 : wideSlot(levels, i, j, k);
+      auto const child = load<std::uint32_t>(level->table + 4 * std::uint64_t(slot));
       if (child == kNoTile) break;
-      push(child, depth);
+      *++level = at(child, down);
     }
+    m_height = static_cast<int>(level - m_levels);
     return true;
   }
 
   /// The tile. @pre moveTo() found one.
   NANOVTT_HD TileRef tile() const {
-    return {top().tile, top().depth, {corner(m_llc.x, m_x), corner(m_llc.y, m_y), corner(m_llc.z, m_z)}};
+    return {number(), depth(), {corner(m_llc.x, m_x), corner(m_llc.y, m_y), corner(m_llc.z, m_z)}};
   }
+  NANOVTT_HD std::uint32_t number() const { return top().tile; }
+  NANOVTT_HD int depth() const { return kTileSpaceBits - top().shift; }
   /// log2 of the width of the cube about the point in which no deeper tile lies than this one.
   /// @pre moveTo() found a tile.
   NANOVTT_HD int alikeShift() const {
     Level const& l = top();
-    if (l.depth >= m_maxDepth || l.depth == kMaxDepth || !m_tree.hasChildren(l.tile)) return shift(l.depth);
-    int const below = l.depth + l.list.levels + 1;
-    return below > m_maxDepth ? shift(l.depth) : shift(below);
+    if (l.shift <= m_lowestShift || !m_tree.hasChildren(l.tile)) return l.shift;
+    int const below = l.shift - l.levels - 1;
+    return below < m_lowestShift ? l.shift : below;
   }
 
 private:
   struct Level {
+    unsigned char const* table; ///< of the children; of the deepest depth none
     std::uint32_t tile;
-    int depth;
-    ContainerReader::Children list;
+    std::int16_t shift;  ///< log2 of the tile's width
+    std::int16_t levels; ///< that a step into the table passes over
   };
-  NANOVTT_HD Level const& top() const { return m_levels[m_height - 1]; }
-  NANOVTT_HD void push(std::uint32_t tile, int depth) {
-    Level& l = m_levels[m_height++];
-    l.tile = tile, l.depth = depth;
-    if (depth < kMaxDepth) l.list = m_tree.children(tile);
+  static constexpr int kLeastShift = kTileSpaceBits - kMaxDepth;
+
+  NANOVTT_HD Level const& top() const { return m_levels[m_height]; }
+  NANOVTT_HD Level at(std::uint32_t tile, int shift) const {
+    if (shift == kLeastShift) return {nullptr, tile, kLeastShift, 0};
+    ContainerReader::Children const list = m_tree.children(tile);
+    return {list.table, tile, static_cast<std::int16_t>(shift), static_cast<std::int16_t>(list.levels)};
   }
-  NANOVTT_HD static int shift(int depth) { return kTileSpaceBits - depth; }
+  // A point's first tile, from a cell or the root table.
+  // @param known What is known already.
+  NANOVTT_HD Level enter(std::uint32_t ux, std::uint32_t uy, std::uint32_t uz, Level const& known) const {
+    std::uint32_t tile = kNoTile;
+    int depth = m_tree.rootDepth();
+    if (m_cells.find(ux, uy, uz, tile)) {
+      // Most cells have a tile as wide.
+      if (tile != kNoTile) depth = tile >= m_firstOfCells ? m_cells.depth() : m_tree.depthOf(tile);
+    } else {
+      if (known.tile != kNoTile) return known;
+      int const s = kTileSpaceBits - depth;
+      std::uint32_t const i = ux >> s, j = uy >> s, k = uz >> s;
+      if ((i | j | k) < kRootTableWidth && s >= m_lowestShift)
+        tile = m_tree.root((k * kRootTableWidth + j) * kRootTableWidth + i);
+    }
+    return tile == kNoTile ? kNowhere : at(tile, kTileSpaceBits - depth);
+  }
+  NANOVTT_HD static std::uint32_t wideSlot(int levels, std::uint32_t i, std::uint32_t j, std::uint32_t k) {
+    int const bits = levels + 1;
+    std::uint32_t const mask = (1u << bits) - 1;
+    return (i & mask) | (j & mask) << bits | (k & mask) << 2 * bits;
+  }
   NANOVTT_HD static std::uint32_t from(std::int32_t c, std::int32_t lowest) {
     return static_cast<std::uint32_t>(c) - static_cast<std::uint32_t>(lowest);
   }
+  // Below the lowest corner there is no root, but the difference may look like that of one: not where the
+  // roots are small beside the integers, and the corner lies in tile space.
+  NANOVTT_HD static bool wraps(std::int32_t lowest, int rootDepth) {
+    constexpr std::int32_t kEnd = std::int32_t(1) << (kTileSpaceBits - 1);
+    return rootDepth < 6 || lowest < -kEnd || lowest > kEnd;
+  }
   NANOVTT_HD std::int32_t corner(std::int32_t lowest, std::uint32_t d) const {
-    int const s = shift(top().depth);
+    int const s = top().shift;
     return static_cast<std::int32_t>(static_cast<std::uint32_t>(lowest) + (d >> s << s));
   }
-  NANOVTT_HD std::uint32_t slot(int bits, int down) const {
-    std::uint32_t const mask = (1u << bits) - 1;
-    return (m_x >> down & mask) | (m_y >> down & mask) << bits | (m_z >> down & mask) << 2 * bits;
-  }
+
+  static constexpr Level kNowhere{nullptr, kNoTile, 32, 0};
 
   ContainerReader m_tree;
   Coord m_llc;
-  int m_maxDepth = kMaxDepth;
-  int m_height = 0; ///< levels that hold the point; 0: none
+  bool m_wraps = false; ///< whether places below m_llc must be told apart
+  CellTable m_cells;
+  std::uint32_t m_firstOfCells = 0; ///< of the tiles as wide as a cell
+  int m_lowestShift = kLeastShift;  ///< that of the deepest tiles which are looked for
+  int m_enterAbove = 31;            ///< from wider tiles on, a cell is the shorter way
+  int m_height = 0;                 ///< levels that hold the point; 0: none
   std::uint32_t m_x = 0, m_y = 0, m_z = 0;
-  Level m_levels[kMaxDepth + 1];
+  Level m_levels[kMaxDepth + 2] = {kNowhere}; ///< the first one is none
 };
 
 /// Tiles by their numbers, which are those of one depth after the other: where each lies, without the

@@ -11,7 +11,9 @@
 #include <cmath>
 #include <limits>
 #include <random>
+#include <set>
 #include <string>
+#include <vector>
 
 namespace {
 
@@ -74,6 +76,65 @@ TEST(Cursor, RequirementReadsWhatLookupsRead) {
               << x + step << ' ' << y << ' ' << z << ", halo " << halo << ", coalesce " << coalesce;
       }
     }
+}
+
+// requirement: a table of cells changes no read, of cells as wide as the deepest tiles and of wider ones
+TEST(Cursor, RequirementCellsChangeNoRead) {
+  Ball const ball;
+  for (float halo : {0.0f, 1.0f})
+    for (bool coalesce : {false, true}) {
+      auto const flat = ball.flatten(halo, coalesce);
+      auto const grid = nanovtt::BufferReader(flat.data()).grid(0);
+      auto const tree = grid.container();
+      std::set<int> depths;
+      for (std::uint64_t most = 0; most < 3000000; most = 2 * most + 5) {
+        nanovtt::CellTable cells(tree, most);
+        ASSERT_LE(cells.bytes(), most);
+        ASSERT_EQ(cells.bytes() == 0, cells.depth() < 0);
+        std::vector<std::uint32_t> memory(cells.bytes() / 4 + 1, 77);
+        cells.write(tree, memory.data());
+        ASSERT_EQ(memory.back(), 77u);
+        depths.insert(cells.depth());
+        for (int maxDepth : {28, 27, 25, 23}) {
+          nanovtt::GridCursor with(grid, cells, maxDepth), without(grid, maxDepth);
+          std::mt19937 random(6);
+          auto const at = [&](int reach) { return int(random() % unsigned(2 * reach)) - reach; };
+          for (int n = 0; n < 4000; ++n) {
+            int const reach = n % 3 == 0 ? 500 : 80, x = at(reach), y = at(reach), z = at(reach);
+            for (int step = 0; step < 3; ++step) {
+              ASSERT_EQ(with.value(x + step, y, z), without.value(x + step, y, z))
+                  << x + step << ' ' << y << ' ' << z << ", depth " << cells.depth() << " of " << maxDepth;
+              float const fx = float(x) + 0.3f * float(step);
+              ASSERT_EQ(with.trilinear(fx, float(y), float(z)), without.trilinear(fx, float(y), float(z)));
+            }
+          }
+        }
+      }
+      // Eight cells are enough at depths 24 and 25.
+      if (!coalesce) { EXPECT_EQ(depths, (std::set<int>{-1, 25, 26, 27, 28})); }
+      EXPECT_GT(depths.size(), 3u);
+    }
+}
+TEST(Cursor, BoundaryCellsOfCopiesAndOfPlacesFarAway) {
+  Ball const ball;
+  auto const flat = ball.flatten(0, false);
+  auto const grid = nanovtt::BufferReader(flat.data()).grid(0);
+  nanovtt::CellTable cells(grid.container());
+  EXPECT_EQ(cells.depth(), 28);
+  std::vector<std::uint32_t> memory(cells.bytes() / 4);
+  // Without its cells a table leads nowhere.
+  nanovtt::GridCursor unwritten(grid, cells);
+  cells.write(grid.container(), memory.data());
+  std::vector<std::uint32_t> const copy = memory;
+  std::fill(memory.begin(), memory.end(), 0);
+  nanovtt::GridCursor cursor(grid, cells.at(copy.data()));
+  constexpr int kEnds[] = {INT32_MIN, INT32_MIN + 1, -(1 << 30), -(1 << 29), -1, 0, 1 << 29, INT32_MAX};
+  for (int x : kEnds)
+    for (int y : kEnds)
+      for (int z : kEnds) {
+        ASSERT_EQ(double(cursor.value(x, y, z)), grid.valueAt(x, y, z)) << x << ' ' << y << ' ' << z;
+        ASSERT_EQ(double(unwritten.value(x, y, z)), grid.valueAt(x, y, z)) << x << ' ' << y << ' ' << z;
+      }
 }
 
 // requirement: where the buffer holds the samples, blend and gradient are the library's own, bit for bit
