@@ -109,7 +109,7 @@ private:
       if ((i | j | k) < kRootTableWidth && s >= m_lowestShift)
         tile = m_tree.root((k * kRootTableWidth + j) * kRootTableWidth + i);
     }
-    return tile == kNoTile ? kNowhere : at(tile, kTileSpaceBits - depth);
+    return tile == kNoTile ? nowhere() : at(tile, kTileSpaceBits - depth);
   }
   NANOVTT_HD static std::uint32_t wideSlot(int levels, std::uint32_t i, std::uint32_t j, std::uint32_t k) {
     int const bits = levels + 1;
@@ -130,7 +130,7 @@ private:
     return static_cast<std::int32_t>(static_cast<std::uint32_t>(lowest) + (d >> s << s));
   }
 
-  static constexpr Level kNowhere{nullptr, kNoTile, 32, 0};
+  NANOVTT_HD static constexpr Level nowhere() { return {nullptr, kNoTile, 32, 0}; }
 
   ContainerReader m_tree;
   Coord m_llc;
@@ -141,7 +141,7 @@ private:
   int m_enterAbove = 31;            ///< from wider tiles on, a cell is the shorter way
   int m_height = 0;                 ///< levels that hold the point; 0: none
   std::uint32_t m_x = 0, m_y = 0, m_z = 0;
-  Level m_levels[kMaxDepth + 2] = {kNowhere}; ///< the first one is none
+  Level m_levels[kMaxDepth + 2] = {nowhere()}; ///< the first one is none
 };
 
 /// Tiles by their numbers, which are those of one depth after the other: where each lies, without the
