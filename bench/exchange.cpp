@@ -3,8 +3,8 @@
 //   topology  makes the tiles of all leaves, in the file's order or shuffled; an item is a leaf of 8 x 8 x 8
 //             voxels. touchLeaf makes room for values as well and writes them, and so does "bulk with
 //             values"; with zeros, large blocks of them come from the system when they are first used
-//   read      a million active voxels, leaf by leaf or at random; an item is a voxel. "Many at once" gives an
-//             array of values, the others their sum
+//   read      a million active voxels, leaf by leaf or at random; an item is a voxel. "Many at once" and
+//             "stored" give an array of values, the others their sum
 //   sum       all active voxels; an item is an active voxel
 //   import    an item is an active voxel. A deep copy is less work: an import arranges the values anew, fills
 //             the coarser tiles, and finds out which state is implied by the values
@@ -194,6 +194,19 @@ void readReader(benchmark::State& state, ChannelReader<Values> const& reader,
   read(state, places, [&](Coord const& c) { return values.value(c.x(), c.y(), c.z()); });
 }
 
+/// The same, but each value goes into an array: what a read of many positions at once does.
+template <class Read>
+void store(benchmark::State& state, std::vector<Coord> const& places, Read const& value) {
+  std::vector<float> values(places.size());
+  for (auto _ : state) {
+    float* to = values.data();
+    for (Coord const& c : places) *to++ = value(c);
+    benchmark::DoNotOptimize(values.data());
+    benchmark::ClobberMemory();
+  }
+  countItems(state, static_cast<double>(places.size()));
+}
+
 void readMany(benchmark::State& state, ChannelReader<Values> const& reader,
               std::vector<Coord> const& places) {
   std::vector<int3> positions;
@@ -216,6 +229,18 @@ void readNano(benchmark::State& state, nanovdb::NanoGrid<float> const& grid,
               std::vector<Coord> const& places) {
   auto const accessor = grid.getAccessor();
   read(state, places, [&](Coord const& c) { return accessor.getValue(nanovdb::Coord(c.x(), c.y(), c.z())); });
+}
+
+void storeOpenVdb(benchmark::State& state, FloatGrid const& grid, std::vector<Coord> const& places) {
+  auto const accessor = grid.getConstAccessor();
+  store(state, places, [&](Coord const& c) { return accessor.getValue(c); });
+}
+
+void storeNano(benchmark::State& state, nanovdb::NanoGrid<float> const& grid,
+               std::vector<Coord> const& places) {
+  auto const accessor = grid.getAccessor();
+  store(state, places,
+        [&](Coord const& c) { return accessor.getValue(nanovdb::Coord(c.x(), c.y(), c.z())); });
 }
 
 // --- Sums over all active voxels ---
@@ -385,6 +410,9 @@ void addAll(Subject const& s) {
     std::string const order = random ? "read/random/" : "read/coherent/";
     add(s, (order + "OpenVDB").c_str(), [&](auto& st) { readOpenVdb(st, *s.grid, places); });
     add(s, (order + "NanoVDB").c_str(), [&](auto& st) { readNano(st, *s.nano.grid<float>(), places); });
+    add(s, (order + "OpenVDB, stored").c_str(), [&](auto& st) { storeOpenVdb(st, *s.grid, places); });
+    add(s, (order + "NanoVDB, stored").c_str(),
+        [&](auto& st) { storeNano(st, *s.nano.grid<float>(), places); });
     add(s, (order + "ChannelReader").c_str(), [&](auto& st) { readReader(st, *s.reader, places); });
     add(s, (order + "ChannelReader, many at once").c_str(),
         [&](auto& st) { readMany(st, *s.reader, places); });

@@ -67,9 +67,9 @@ openvdb::GridBase::Ptr toGrid(Object& object, VdbGridRecord const& record, bool 
 // The grids of volumes in the order of their records.
 class ExportedGrids {
 public:
-  /// @param volumes Stay as they are; where they are to be released they are nobody else's.
+  /// @param release Whether grids take their channels along. Then nobody else has the volumes' objects.
   /// @param metadata Takes that of the volumes.
-  ExportedGrids(std::vector<VdbVolume> volumes, bool release, openvdb::MetaMap& metadata,
+  ExportedGrids(std::vector<VdbVolume> const& volumes, bool release, openvdb::MetaMap& metadata,
                 Progress const& progress)
       : m_progress(progress)
       , m_release(release) {
@@ -125,7 +125,8 @@ void write(std::vector<VdbVolume> volumes, bool release, std::vector<PointVolume
   OutputFile out(path);
   openvdb::MetaMap metadata;
   if (!fileMetadata.empty()) readMetadata(fileMetadata, metadata);
-  ExportedGrids exported(std::move(volumes), release, metadata, progress);
+  ExportedGrids exported(volumes, release, metadata, progress);
+  volumes.clear();
   std::vector<GridInTurn> grids;
   for (std::size_t n = 0; n < exported.size(); ++n)
     grids.push_back({exported.nameOf(n), [&exported, n] { return exported.make(n); }});
