@@ -21,8 +21,9 @@ public:
   /// @edges Of no cells where not even those of the roots fit.
   /// @cost Linear in the tiles.
   NANOVTT_HD CellTable(ContainerReader const& tree, std::uint64_t mostBytes) {
+    if (tree.tileCount() == 0) return;
     std::uint32_t low[3] = {~0u, ~0u, ~0u}, high[3] = {0, 0, 0};
-    int const deepest = tree.tileCount() ? tree.depthOf(tree.tileCount() - 1) : 0;
+    int const deepest = tree.depthOf(tree.tileCount() - 1);
     tree.forEachTile([&](TileRef const& tile) {
       if (tile.depth != deepest) return;
       Coord const llc = tree.lowestCorner();

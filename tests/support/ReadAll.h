@@ -1,9 +1,10 @@
 // Every lookup that a reader offers, over a whole buffer: what must stay inside after validate() said yes.
 #pragma once
 
-#include "Reader/NanoVTTReader.h"
+#include "Reader/NanoVTTCursor.h"
 
 #include <cstdint>
+#include <vector>
 
 namespace Support {
 
@@ -30,8 +31,20 @@ inline std::uint64_t readAll(void const* bytes) {
       sum += container.find(low.x + half, low.y + half, low.z + half, d).number;
     sum += container.find(low.x - 1, low.y + half, low.z).number;
   });
+  nanovtt::CellTable cells(container, 4096);
+  std::vector<std::uint32_t> memory(cells.bytes() / sizeof(std::uint32_t));
+  cells.write(container, memory.data());
   for (std::uint32_t g = 0; g < reader.gridCount(); ++g) {
     auto const grid = reader.grid(g);
+    if (grid.type() == nanovtt::GridType::kFloat || nanovtt::isQuantised(grid.type())) {
+      nanovtt::GridCursor cursor(grid, cells);
+      container.forEachTile([&](nanovtt::TileRef const& tile) {
+        nanovtt::Coord const c = tile.corner;
+        add(cursor.value(c.x, c.y, c.z));
+        add(cursor.trilinear(float(c.x) - 0.5f, float(c.y) + float(tile.width()) - 0.5f, float(c.z)));
+      });
+      add(cursor.value(INT32_MIN, INT32_MAX, 0));
+    }
     for (char const* c = grid.name(); *c; ++c) sum += static_cast<unsigned char>(*c);
     int const components = nanovtt::componentCount(grid.type());
     for (int c = 0; c < components; ++c) add(grid.defaultValue().getComponent(0, c));
