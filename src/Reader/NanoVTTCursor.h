@@ -13,7 +13,7 @@ template <GridType kType> struct TypedSamples {
   using Value = typename SampleOf<kType>::Value;
   using Blend = typename SampleOf<kType>::Blend;
 
-  NANOVTT_HD static TileBlock block(GridReader const& grid, std::uint32_t tile) {
+  NANOVTT_INLINE static TileBlock block(GridReader const& grid, std::uint32_t tile) {
     return grid.blockAs(kType, tile);
   }
   NANOVTT_HD static Value get(TileBlock const& block, std::uint64_t n) {
@@ -40,7 +40,9 @@ private:
 struct AnyFloatSamples {
   using Value = float;
   using Blend = float;
-  NANOVTT_HD static TileBlock block(GridReader const& grid, std::uint32_t tile) { return grid.block(tile); }
+  NANOVTT_INLINE static TileBlock block(GridReader const& grid, std::uint32_t tile) {
+    return grid.block(tile);
+  }
   NANOVTT_HD static float get(TileBlock const& block, std::uint64_t n) { return block.getFloat(n); }
 };
 
@@ -224,7 +226,7 @@ private:
     tile = child;
     return true;
   }
-  NANOVTT_HD void take(std::uint32_t tile, int depth) {
+  NANOVTT_INLINE void take(std::uint32_t tile, int depth) {
     if (tile == m_number) return;
     m_block = Samples::block(m_grid, tile);
     m_number = tile, m_depth = depth;

@@ -24,6 +24,14 @@
 #define NANOVTT_HD
 #endif
 
+// For what each step of a cursor runs: a block that comes back through memory is copied, and the copy waits
+// for the loads behind it, so that reads at random no longer wait side by side.
+#if defined(__GNUC__) && !defined(__CUDACC__)
+#define NANOVTT_INLINE __attribute__((always_inline)) inline
+#else
+#define NANOVTT_INLINE NANOVTT_HD inline
+#endif
+
 #if defined(__BYTE_ORDER__) && __BYTE_ORDER__ != __ORDER_LITTLE_ENDIAN__
 #error "NanoVTT buffers are little-endian; this machine is not"
 #endif

@@ -346,9 +346,9 @@ public:
   NANOVTT_HD unsigned char const* textureData() const { return m_bytes + kTileTableOffset + tableBytes(); }
 
   /// The samples of a tile.
-  NANOVTT_HD TileBlock block(std::uint32_t tile) const { return blockAs(m_type, tile); }
+  NANOVTT_INLINE TileBlock block(std::uint32_t tile) const { return blockAs(m_type, tile); }
   /// The same where the type is known when it is compiled. @pre It is the grid's.
-  NANOVTT_HD TileBlock blockAs(GridType type, std::uint32_t tile) const {
+  NANOVTT_INLINE TileBlock blockAs(GridType type, std::uint32_t tile) const {
     std::uint64_t const e = entry(tile);
     TileBlock block;
     block.type = type;
