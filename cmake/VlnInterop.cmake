@@ -33,7 +33,9 @@ if(sources)
     INSTALL_RPATH "$ORIGIN")
   # OpenVDB's templates have default visibility. Calls of the copies that are here need not be looked up at
   # each start, thousands of them by names of hundreds of letters.
-  target_link_options(GeometryVolumeInterop PRIVATE -Wl,-Bsymbolic-functions)
+  target_link_options(GeometryVolumeInterop PRIVATE -Wl,-Bsymbolic-functions
+    "LINKER:--version-script=${PROJECT_SOURCE_DIR}/cmake/interop_exports.map")
+  set_target_properties(GeometryVolumeInterop PROPERTIES LINK_DEPENDS "${PROJECT_SOURCE_DIR}/cmake/interop_exports.map")
 else()
   message(STATUS "src/Interop has no source yet: no target GeometryVolumeInterop")
 endif()

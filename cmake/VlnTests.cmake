@@ -49,7 +49,6 @@ foreach(room IN LISTS rooms)
   if(room STREQUAL "faults" AND TARGET GeometryVolumeInterop)
     target_link_libraries(${target} PRIVATE GeometryVolumeInterop)
     target_compile_definitions(${target} PRIVATE VLN_TEST_INTEROP)
-    set_target_properties(${target} PROPERTIES ENABLE_EXPORTS ON) # its stacks are looked at by name
   endif()
   if(room STREQUAL "interop" OR room STREQUAL "vln")
     target_link_libraries(${target} PRIVATE GeometryVolumeInterop)

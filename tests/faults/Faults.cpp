@@ -1,9 +1,9 @@
 #include "Faults.h"
 
+#include "OpenVdbCode.h"
 #include "vljemalloc/vljemalloc.h"
 
 #include <algorithm>
-#include <array>
 #include <atomic>
 #include <cerrno>
 #include <cstddef>
@@ -48,20 +48,9 @@ public:
 constinit std::atomic<bool> g_spareOpenVdb{false};
 constinit thread_local bool t_looking = false;
 
-/// Whether code belongs to OpenVDB. The room's binary exports the names that tell. Answers are remembered.
-bool isOpenVdb(void* code) {
-  static constinit std::array<std::atomic<std::uintptr_t>, 1 << 14> known{};
-  auto const address = reinterpret_cast<std::uintptr_t>(code);
-  auto& entry = known[(address * 0x9e3779b97f4a7c15u) >> 50];
-  std::uintptr_t const value = entry.load(std::memory_order_relaxed);
-  if (value >> 1 == address) return value & 1;
-  Dl_info info;
-  bool const found =
-      dladdr(code, &info) && (std::strstr(info.dli_fname, "libopenvdb") ||
-                              (info.dli_sname && (std::strncmp(info.dli_sname, "_ZN7openvdb", 11) == 0 ||
-                                                  std::strncmp(info.dli_sname, "_ZNK7openvdb", 12) == 0)));
-  entry.store(address << 1 | (found ? 1 : 0), std::memory_order_relaxed);
-  return found;
+OpenVdbCode const& openVdbCode() {
+  static OpenVdbCode const code;
+  return code;
 }
 /// Whether a function of OpenVDB's stands on the stack.
 bool insideOpenVdb() {
@@ -69,7 +58,8 @@ bool insideOpenVdb() {
   t_looking = true;
   void* frames[100];
   int const count = backtrace(frames, 100);
-  bool const found = std::any_of(frames, frames + count, &isOpenVdb);
+  bool const found =
+      std::any_of(frames, frames + count, [](void* frame) { return openVdbCode().holds(frame); });
   t_looking = false;
   return found;
 }
