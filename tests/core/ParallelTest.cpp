@@ -117,8 +117,9 @@ TEST(Parallel, SortOfRecordsIsByKeyThenValue) {
   struct Bits {
     std::uint64_t high, low;
   };
-  for (Bits const bits : {Bits{all, all}, Bits{0, 0xff}, Bits{0, 3}, Bits{0, 0}, Bits{all << 60, 0},
-                          Bits{0x249249, all << 37}}) {
+  for (Bits const bits :
+       {Bits{all, all}, Bits{0, 0xff}, Bits{0, 3}, Bits{0, 0}, Bits{all << 60, 0}, Bits{0x249249, all << 37},
+        Bits{0, 0xffffffff}, Bits{0, 0x1ffffffff}, Bits{0xff00, 0xff}, Bits{all, 0x5555}}) {
     for (std::size_t const n : {0u, 1u, 2u, 499u, 500u, 501u, 32768u, 32769u, 100000u}) {
       for (bool const valuesRise : {true, false}) {
         std::vector<SortRecord> records(n);
@@ -137,6 +138,37 @@ TEST(Parallel, SortOfRecordsIsByKeyThenValue) {
                                  [&](auto const& a, auto const& b) { return key(a) == key(b); }))
               << n << " records, bits " << std::hex << bits.high << ' ' << bits.low;
         }
+      }
+    }
+  }
+}
+
+// requirement: the same for keys of interleaved coordinates, few of whose differing bits decide
+TEST(Parallel, SortOfInterleavedCoordinates) {
+  std::mt19937 random(12);
+  for (int const width : {2, 700, 5000, 1 << 20}) {
+    for (int const step : {1, 8}) {
+      for (int const middle : {0, 1000, -77777}) {
+        std::vector<SortRecord> records(3000);
+        for (std::size_t n = 0; n < records.size(); ++n) {
+          auto& record = records[n];
+          record = {0, 0, static_cast<std::int64_t>(n)};
+          for (int axis = 0; axis < 3; ++axis) {
+            int const at =
+                middle + (static_cast<int>(random() % static_cast<unsigned>(width)) - width / 2) * step;
+            auto const offset = static_cast<std::uint64_t>(at + (1 << 29));
+            for (int bit = 0; bit < 32; ++bit)
+              (bit < 16 ? record.low : record.high) |= (offset >> bit & 1) << (3 * (bit % 16) + axis);
+          }
+        }
+        auto const key = [](SortRecord const& r) { return std::tuple(r.high, r.low, r.value); };
+        auto const less = [&](SortRecord const& a, SortRecord const& b) { return key(a) < key(b); };
+        auto expected = records;
+        std::sort(expected.begin(), expected.end(), less);
+        parallelSort(records.data(), static_cast<std::int64_t>(records.size()));
+        ASSERT_TRUE(std::equal(records.begin(), records.end(), expected.begin(), expected.end(),
+                               [&](auto const& a, auto const& b) { return key(a) == key(b); }))
+            << width << " wide by " << step << " around " << middle;
       }
     }
   }
