@@ -133,8 +133,11 @@ void ChannelData<T>::fillAdded(Internal::GrowthPlan const& plan, Internal::TileC
   plan.added.forEach(Internal::tileGrain(tileBytes()), [&](int d, std::int64_t begin, std::int64_t end) {
     if (made(d)) {
       auto const& added = plan.tiles[d];
+      if (!write) return;
       T* slot = block + added.base + (begin - count(d)) * added.stride;
-      for (auto i = begin; write && i < end; ++i, slot += added.stride)
+      if (added.stride == added.elements)
+        return Internal::fillLongRun(slot, (end - begin) * added.elements, m_defaultValue);
+      for (auto i = begin; i < end; ++i, slot += added.stride)
         Internal::fillRun(slot, added.elements, m_defaultValue);
       return;
     }

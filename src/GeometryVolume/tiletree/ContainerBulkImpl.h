@@ -24,7 +24,7 @@ inline constexpr std::int64_t kPointGrain = 4096;
 
 /// Tiles of one depth with a common parent, which need not exist.
 template <class TraitsT> struct Siblings {
-  SortRecord key; ///< of the parent's corner
+  SortRecord key; ///< of the parent's corner; the value means nothing
   int3 parent;
   std::bitset<TraitsT::kTileSize> slots;
 
@@ -78,7 +78,10 @@ public:
       auto const* const list = points[d].data();
       join(d, listed(static_cast<std::int64_t>(points[d].size()), kPointGrain,
                      [&](std::int64_t begin, std::int64_t end, Groups& to) {
-                       for (std::int64_t n = begin; n < end; ++n) add(list[n], d, to);
+                       to.reserve(static_cast<std::size_t>(end - begin) / TraitsT::kTileSize + 1);
+                       for (std::int64_t n = begin; n < end; ++n)
+                         add(list[n], d, to,
+                             [](int3 const& parent) { return mortonRecord<TraitsT>(parent, 0); });
                      }));
     }
   }
@@ -90,8 +93,8 @@ public:
   Groups const& groups(int depth) const { return m_groups[depth]; }
 
   /// Adds the tiles between a wanted one and the next coarser one above, wanted or there.
-  /// @param makeAccessor One for each thread.
-  template <class MakeAccessor> void addBetween(MakeAccessor const& makeAccessor) {
+  /// @param firstDepth The lowest at which there are tiles. @param makeAccessor One for each thread.
+  template <class MakeAccessor> void addBetween(int firstDepth, MakeAccessor const& makeAccessor) {
     for (int d = kMaxDepth; d > 1; --d) {
       Groups const& here = groups(d);
       if (here.empty()) continue;
@@ -102,19 +105,23 @@ public:
                            std::vector<CoverageQuery> queries = above;
                            for (auto n = begin; n < end; ++n) {
                              int3 const& p = here[n].parent;
-                             TreeIndex const there = accessor.treeIndex(p.x, p.y, p.z, d - 1, false);
+                             TreeIndex there;
+                             if (firstDepth < d) there = accessor.treeIndex(p.x, p.y, p.z, d - 1, false);
                              if (there.depth == d - 1) continue;
                              if (there.valid() || m_domain ||
                                  std::any_of(queries.begin(), queries.end(),
                                              [&](CoverageQuery& c) { return c.holds(p); }))
-                               add(p, d - 1, to);
+                               add(p, d - 1, to, [&](int3 const& parent) {
+                                 return keyAbove<TraitsT>(here[n].key, parent, d - 2);
+                               });
                            }
                          }));
     }
   }
 
 private:
-  static void add(int3 const& p, int depth, Groups& to) {
+  /// @param keyOf Of the corner of a tile of the depth above.
+  template <class KeyOf> static void add(int3 const& p, int depth, Groups& to, KeyOf const& keyOf) {
     if (!to.empty()) {
       Group& last = to.back();
       std::size_t const slot = slotIn<TraitsT>(last.parent, p, depth);
@@ -123,11 +130,9 @@ private:
         return;
       }
     }
-    if (TraitsT::inDomain(p)) addGroup(p, depth, to);
-  }
-  static void addGroup(int3 const& p, int depth, Groups& to) {
+    if (!TraitsT::inDomain(p)) return;
     int3 const parent = TraitsT::align(p, depth - 1);
-    to.push_back({{}, parent, {}});
+    to.push_back({keyOf(parent), parent, {}});
     to.back().slots[slotIn<TraitsT>(parent, p, depth)] = true;
   }
   /// Groups that chunks of a range make, in the range's order.
@@ -150,8 +155,7 @@ private:
       for (std::int64_t part = first; part < last; ++part) {
         std::size_t next = starts[part];
         std::int64_t value = part << kPartShift;
-        for (Group& group : parts[part])
-          group.key = order[next++] = mortonRecord<TraitsT>(group.parent, value++);
+        for (Group const& group : parts[part]) order[next++] = {group.key.high, group.key.low, value++};
       }
     });
     if (!rises(order)) parallelSort(order.data(), static_cast<std::int64_t>(order.size()));
@@ -210,22 +214,21 @@ private:
         : m_list(&list)
         , m_depth(depth) {}
     bool holds(int3 const& p) {
-      int3 const corner = TraitsT::align(p, m_depth);
-      if (m_asked && corner == m_corner) return m_answer;
-      m_asked = true, m_corner = corner;
-      int3 const parent = TraitsT::align(p, m_depth - 1);
-      Group const wanted{mortonRecord<TraitsT>(parent, 0), parent, {}};
+      if (slotIn<TraitsT>(m_above, p, m_depth) == m_slot) return m_answer;
+      m_above = TraitsT::align(p, m_depth - 1);
+      m_slot = slotIn<TraitsT>(m_above, p, m_depth);
+      Group const wanted{mortonRecord<TraitsT>(m_above, 0), m_above, {}};
       auto const at = std::lower_bound(m_list->begin(), m_list->end(), wanted, comesBefore<TraitsT>);
-      m_answer =
-          at != m_list->end() && at->parent == parent && at->slots[slotIn<TraitsT>(parent, corner, m_depth)];
+      m_answer = at != m_list->end() && at->parent == m_above && at->slots[m_slot];
       return m_answer;
     }
 
   private:
     Groups const* m_list;
     int m_depth;
-    bool m_asked = false, m_answer = false;
-    int3 m_corner{0, 0, 0};
+    bool m_answer = false;
+    int3 m_above{0, 0, 0};
+    std::size_t m_slot = TraitsT::kTileSize + 1; // no point's
   };
   std::vector<CoverageQuery> coverageAbove(int depth) const {
     std::vector<CoverageQuery> queries;
@@ -245,7 +248,9 @@ template <class TraitsT>
 void ContainerBuilder<TraitsT>::addTilesInBulk(TileLists const& corners, TileLists* newTiles) {
   m_tree.tilesAdded();
   Internal::WantedTiles<TraitsT> wanted(corners);
-  wanted.addBetween([&] { return m_tree.growthAccessor(); });
+  int firstDepth = 0;
+  while (firstDepth <= kMaxDepth && tileCount(firstDepth) == 0) ++firstDepth;
+  wanted.addBetween(firstDepth, [&] { return m_tree.growthAccessor(); });
   Growth growth(data(), newTiles);
   constexpr int kLow = TraitsT::kMinTileCoord;
   if (wanted.domain() && !m_tree.tileIndex(kLow, kLow, kLow, 0).valid()) {

@@ -7,6 +7,8 @@
 #include "GeometryVolume/core/Parallel.h"
 #include "GeometryVolume/tiletree/Tile.h"
 
+#include <bit>
+
 namespace VLN::TileTree3D {
 
 /// Spreads 16 bits so that each is followed by two zeros.
@@ -27,6 +29,19 @@ template <class TraitsT> constexpr SortRecord mortonRecord(int3 const& corner, s
     return spreadBits(i >> shift) | spreadBits(j >> shift) << 1 | spreadBits(k >> shift) << 2;
   };
   return {word(16), word(0), value};
+}
+
+/// The key of the corner of the tile of a depth that holds one whose key is known.
+/// @param corner That corner.
+template <class TraitsT> constexpr SortRecord keyAbove(SortRecord const& key, int3 const& corner, int depth) {
+  if constexpr (TraitsT::kTW != 2)
+    return mortonRecord<TraitsT>(corner, 0);
+  else {
+    int const bits = 3 * std::countr_zero(static_cast<std::uint32_t>(TraitsT::width(depth)));
+    auto const kept = [](int lost) { return ~std::uint64_t(0) << lost; };
+    return bits < 48 ? SortRecord{key.high, key.low & kept(bits), 0}
+                     : SortRecord{key.high & kept(bits - 48), 0, 0};
+  }
 }
 
 /// Whether a comes before b along a Z-shaped curve, without making keys: the axis whose coordinates differ in

@@ -6,8 +6,12 @@
 
 #include "GeometryVolume/pools/TileDataAllocator.h"
 
+#include <algorithm>
 #include <cstddef>
+#include <cstdint>
+#include <cstring>
 #include <stdexcept>
+#include <type_traits>
 #include <vector> // and iterators' categories, without all of <iterator>
 
 namespace VLN::TileTree3D::Internal {
@@ -48,6 +52,20 @@ template <class T> void fillRun(T* p, std::int64_t n, T const& value) {
   for (; n >= kBlock; n -= kBlock, p += kBlock)
     for (std::int64_t i = 0; i < kBlock; ++i) p[i] = v;
   for (; n > 0; --n) *p++ = v;
+}
+
+/// The same for a long run: from its first kilobytes on it is copied. Large copies tell the processor that
+/// whole lines are written, so it does not read them first.
+template <class T> void fillLongRun(T* p, std::int64_t n, T const& value) {
+  static_assert(std::is_trivially_copyable_v<T>);
+  constexpr auto kFirst = static_cast<std::int64_t>(4096 / sizeof(T)), kMost = 4 * kFirst;
+  std::int64_t done = std::min(n, kFirst);
+  fillRun(p, done, value);
+  while (done < n) {
+    std::int64_t const count = std::min({done, kMost, n - done});
+    std::memcpy(static_cast<void*>(p + done), p, static_cast<std::size_t>(count) * sizeof(T));
+    done += count;
+  }
 }
 
 /// Whether a vector on this allocator can take `capacity` further elements without leaving its block.
