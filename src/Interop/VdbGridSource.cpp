@@ -95,7 +95,7 @@ int rootDepth(std::vector<GridSummary> const& grids) {
 
 int cheapestRootDepth(std::vector<int3> leaves, std::vector<int3> tiles, int deepest) {
   // A few tiles more or less are not worth the search.
-  if (deepest == kMaxDepth || tiles.size() < leaves.size() / 8) return deepest;
+  if (tiles.size() < leaves.size() / 8) return deepest;
   sortCorners(leaves);
   sortCorners(tiles);
   auto const raise = [](std::vector<int3>& corners, int depth) { // stays sorted

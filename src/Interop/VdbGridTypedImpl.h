@@ -57,6 +57,7 @@ public:
   std::vector<int3> const& alsoActive() const override { return m_alsoActive; }
 
   void collectStored(std::vector<int3>& leaves, std::vector<int3>& tiles) const override {
+    leaves.reserve(leaves.size() + m_stored.leaves.size());
     for (Leaf const* leaf : m_stored.leaves) leaves.push_back(toInt3(leaf->origin()));
     for (Wide const& tile : m_stored.wide)
       if (!sameBits(tile.value, m_stored.background)) tiles.push_back(toInt3(tile.corner));
@@ -189,12 +190,6 @@ private:
     return false;
   }
 
-  /// Has the voxels of a leaf fetched: leaves are small, and mostly over before the processor sees a pattern.
-  static void fetchAhead(Value const* values) {
-    if constexpr (!std::is_same_v<Value, bool>)
-      for (std::size_t byte = 0; byte < Leaf::SIZE * sizeof(Value); byte += 64)
-        __builtin_prefetch(reinterpret_cast<char const*>(values) + byte);
-  }
   /// What a look at every voxel tells.
   struct Findings {
     GridSummary summary;
@@ -216,7 +211,8 @@ private:
         [&](std::int64_t begin, std::int64_t end) {
           Findings part = nothing;
           for (std::int64_t n = begin; n < end; ++n) {
-            if (n + 1 < end) fetchAhead(m_stored.valuesOf(*m_stored.leaves[static_cast<std::size_t>(n) + 1]));
+            if (n + 1 < end)
+              m_stored.fetch(m_stored.valuesOf(*m_stored.leaves[static_cast<std::size_t>(n) + 1]));
             lookAt(static_cast<std::size_t>(n), part);
           }
           return part;

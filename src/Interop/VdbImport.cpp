@@ -267,9 +267,12 @@ void addChannels(Group& group, Ostil::Array<VdbGridRecord> const& records, VLN::
 VdbVolume buildVolume(VdbFile const& file, Group& group, std::uint64_t& memoryLeft, Progress const& progress,
                       double from, double to) {
   report(progress, "building the tree", from);
-  std::vector<int3> leaves, wideTiles;
-  for (auto const& grid : group.grids) grid->collectStored(leaves, wideTiles);
-  int const root = cheapestRootDepth(std::move(leaves), std::move(wideTiles), rootDepth(group.summaries));
+  int root = rootDepth(group.summaries);
+  if (root < VdbTraits::kMaxDepth) {
+    std::vector<int3> leaves, wideTiles;
+    for (auto const& grid : group.grids) grid->collectStored(leaves, wideTiles);
+    root = cheapestRootDepth(std::move(leaves), std::move(wideTiles), root);
+  }
   // A half for the shells of wide tiles: ancestors take an eighth or more, and lists of corners their part.
   std::uint64_t const mostTiles = memoryLeft / 2 / bytesFor(1, group);
   TileCorners corners = collectTiles(group, root, mostTiles);

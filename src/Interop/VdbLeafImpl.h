@@ -123,17 +123,27 @@ struct ValueRange {
   bool empty() const { return minimum > maximum; }
 };
 
-/// The same of all voxels of a leaf, four at a time.
+/// The same of the active voxels of a leaf, four at a time.
 /// @edges Does not tell which zero came first.
-inline ValueRange rangeOfAll(float const* values) {
+template <class LeafT> ValueRange rangeByFours(LeafT const& leaf, float const* values) {
   using Lanes = float __attribute__((vector_size(16)));
+  using Bits = std::int32_t __attribute__((vector_size(16)));
   constexpr float kFar = std::numeric_limits<float>::infinity();
+  constexpr Bits kBit = {1, 2, 4, 8};
   Lanes low = {kFar, kFar, kFar, kFar}, high = -low;
-  for (int n = 0; n < 512; n += 4) {
-    Lanes v;
-    std::memcpy(&v, values + n, sizeof v);
-    low = v < low ? v : low;
-    high = v > high ? v : high;
+  for (int i = 0; i < kLeafWidth; ++i) {
+    std::uint64_t word = maskWord(leaf, i);
+    for (float const* at = values + 64 * i; word != 0; word >>= 4, at += 4) {
+      Bits bits;
+      std::memcpy(&bits, at, sizeof bits);
+      // What is not active becomes no number, which is neither smaller nor larger.
+      auto const four = static_cast<std::int32_t>(word & 15);
+      bits |= (Bits{four, four, four, four} & kBit) == 0;
+      Lanes v;
+      std::memcpy(&v, &bits, sizeof v);
+      low = v < low ? v : low;
+      high = v > high ? v : high;
+    }
   }
   ValueRange range;
   for (int lane = 0; lane < 4; ++lane) range.join({low[lane], high[lane]});
@@ -144,10 +154,8 @@ template <class LeafT> ValueRange activeRange(LeafT const& leaf, LeafValues<Leaf
   using Value = typename LeafT::ValueType;
   ValueRange range;
   if constexpr (std::is_same_v<Value, float>) {
-    if (leaf.getValueMask().isOn()) {
-      range = rangeOfAll(values.data());
-      if (range.minimum != 0 && range.maximum != 0) return range;
-    }
+    range = rangeByFours(leaf, values.data());
+    if (range.minimum != 0 && range.maximum != 0) return range;
     float low = std::numeric_limits<float>::infinity(), high = -low;
     for (int i = 0; i < kLeafWidth; ++i) {
       float const* const slice = values.data() + 64 * i;

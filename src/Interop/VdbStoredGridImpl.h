@@ -45,6 +45,16 @@ template <class TreeT> struct StoredGrid {
     else
       return leaf.buffer().data();
   }
+  /// Has the voxels of a leaf fetched: leaves are small, and mostly over before the processor sees a pattern.
+  static void fetch(Value const* values) {
+    if constexpr (!std::is_same_v<Value, bool>)
+      for (std::size_t byte = 0; byte < Leaf::SIZE * sizeof(Value); byte += 64)
+        __builtin_prefetch(reinterpret_cast<char const*>(values) + byte);
+  }
+  /// The same for the leaf behind one, if it is known where that lies.
+  void fetchBehind(Leaf const& leaf) const {
+    if (packed && leaf.transientData() + 1 < leaves.size()) fetch(valuesOf(leaf) + Leaf::SIZE);
+  }
   Value valueAt(PlaceSearch<TreeT>& search, Coord const& c) const {
     auto const place = search.at(c);
     if (!place.leaf) return place.value;

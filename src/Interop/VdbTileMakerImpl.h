@@ -68,9 +68,10 @@ private:
   [[gnu::noinline]] void lookUpAnew(int3 const& corner) {
     m_last.place = m_search.at(toCoord(corner));
     m_last.corner = corner;
-    if (m_last.place.leaf)
+    if (m_last.place.leaf) {
       m_last.values = m_grid.valuesOf(*m_last.place.leaf);
-    else
+      m_grid.fetchBehind(*m_last.place.leaf); // mostly the next to be looked up
+    } else
       m_last.isZero = areZeros(&m_last.place.value, 1);
   }
 

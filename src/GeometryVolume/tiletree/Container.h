@@ -284,6 +284,8 @@ protected:
   std::int64_t tileCapacity(int depth) const { return m_data->tiles(depth).capacity(); }
   void reallocateTile(std::int64_t dst, std::int64_t src, int depth);
   void addRoot(TileType const& tile);
+  /// @cost For many, about that of sorting them.
+  void addRoots(std::vector<std::int64_t> const& tiles, int depth);
   void removeRoot(TileType const& tile);
   /// Drops the derived caches after the tree grew.
   void tilesAdded();

@@ -270,11 +270,11 @@ void ContainerBuilder<TraitsT>::addTilesInBulk(TileLists const& corners, TileLis
     if (next == tileCount(d)) continue;
     above.firsts.resize(groups.size());
     allocateUninitialised(d, next - tileCount(d));
-    bool anyRoot = false;
-    for (auto const& part : makeSiblings(groups, d, parents, starts, above.firsts)) {
-      for (std::int64_t const index : part) m_tree.addRoot(tile({index, d})), anyRoot = true;
-    }
-    if (anyRoot && adoptDeeperRoots(d, growth)) above.childless = false;
+    TileIndexLists const parts = makeSiblings(groups, d, parents, starts, above.firsts);
+    std::vector<std::int64_t> roots;
+    for (auto const& part : parts) roots.insert(roots.end(), part.begin(), part.end());
+    m_tree.addRoots(roots, d);
+    if (!roots.empty() && adoptDeeperRoots(d, growth)) above.childless = false;
     listNewTiles(before, newTiles);
   }
   growth.keep();

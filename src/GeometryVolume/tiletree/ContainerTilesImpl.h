@@ -125,6 +125,27 @@ template <class TraitsT> void Container<TraitsT>::addRoot(TileType const& tile) 
     ++data().m_rootCounts[tile.depth()];
 }
 
+template <class TraitsT>
+void Container<TraitsT>::addRoots(std::vector<std::int64_t> const& tiles, int depth) {
+  // In the table's order, so that each goes behind the one before.
+  std::vector<SortRecord> order;
+  order.reserve(tiles.size());
+  for (std::int64_t const index : tiles) {
+    TileType const& root = tile(index, depth);
+    auto const word = [](int c) { return std::uint64_t(TraitsT::offset(c)); };
+    order.push_back({word(root.ti()) << 32 | word(root.tj()), word(root.tk()), index});
+  }
+  parallelSort(order.data(), static_cast<std::int64_t>(order.size()));
+  auto& roots = data().m_roots;
+  auto behind = roots.end();
+  for (SortRecord const& record : order) {
+    TileType const& root = tile(record.value, depth);
+    std::size_t const before = roots.size();
+    behind = std::next(roots.insert_or_assign(behind, root.voxelCoord(), root.treeIndex()));
+    if (roots.size() > before) ++data().m_rootCounts[depth];
+  }
+}
+
 template <class TraitsT> void Container<TraitsT>::removeRoot(TileType const& tile) {
   if (data().m_roots.erase(tile.voxelCoord()) > 0) --data().m_rootCounts[tile.depth()];
 }
