@@ -58,7 +58,8 @@ template <class T> void fillRun(T* p, std::int64_t n, T const& value) {
 /// whole lines are written, so it does not read them first.
 template <class T> void fillLongRun(T* p, std::int64_t n, T const& value) {
   static_assert(std::is_trivially_copyable_v<T>);
-  constexpr auto kFirst = static_cast<std::int64_t>(4096 / sizeof(T)), kMost = 4 * kFirst;
+  constexpr auto kFirst = static_cast<std::int64_t>(sizeof(T) < 4096 ? 4096 / sizeof(T) : 1),
+                 kMost = 4 * kFirst;
   std::int64_t done = std::min(n, kFirst);
   fillRun(p, done, value);
   while (done < n) {
