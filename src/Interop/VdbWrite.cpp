@@ -1,13 +1,13 @@
 #include "Interop/VdbWriteImpl.h"
 
 #include "Interop/FileError.h"
+#include "Reader/Hash64.h"
 
 #include <openvdb/io/Archive.h>
 #include <openvdb/io/GridDescriptor.h>
 #include <openvdb/io/io.h>
 
 #include <algorithm>
-#include <bit>
 #include <cstdio>
 #include <cstring>
 #include <map>
@@ -124,39 +124,20 @@ private:
   }
 };
 
-/// Two hashes of a stream, by eight of its bytes at a time.
-class ContentHash {
-public:
-  void add(char const* bytes, std::size_t count) {
-    for (; count >= 8; bytes += 8, count -= 8) addWord(bytes, 8);
-    if (count > 0) addWord(bytes, count);
-  }
-  std::uint64_t first() const { return mixed(m_first); }
-  std::uint64_t second() const { return mixed(m_second); }
-
-private:
-  void addWord(char const* bytes, std::size_t count) {
-    std::uint64_t word = 0;
-    std::memcpy(&word, bytes, count);
-    m_first = std::rotl(m_first ^ word, 29) * 0x9e3779b97f4a7c15u;
-    m_second = std::rotl(m_second ^ word, 31) * 0xc2b2ae3d27d4eb4fu;
-  }
-  static std::uint64_t mixed(std::uint64_t h) {
-    h = (h ^ h >> 32) * 0xd6e8feb86659fd93u;
-    return h ^ h >> 32;
-  }
-  std::uint64_t m_first = 0xcbf29ce484222325u, m_second = 0x84222325cbf29ce4u;
-};
-
 // The library gives each file an arbitrary identity; one computed from the content makes equal volumes
 // equal files. It stands behind the magic number, the versions and a flag.
 void setIdentity(FileBytes& bytes) {
   constexpr std::size_t kBegin = 8 + 4 + 4 + 4 + 1, kLength = 36;
   if (bytes.size() < kBegin + kLength) return;
-  ContentHash content;
-  bytes.forEachPiece(kBegin + kLength,
-                     [&](char const* piece, std::size_t count) { content.add(piece, count); });
-  std::uint64_t const hash[2] = {content.first(), content.second()};
+  std::vector<std::uint64_t> hashes; // of the pieces, and then of those
+  bytes.forEachPiece(kBegin + kLength, [&](char const* piece, std::size_t count) {
+    hashes.push_back(nanovtt::hash64(piece, count));
+  });
+  std::uint64_t hash[2];
+  for (std::uint64_t& h : hash) {
+    h = nanovtt::hash64(hashes.data(), hashes.size() * sizeof hashes[0]);
+    hashes.push_back(h);
+  }
   char text[kLength + 1];
   std::snprintf(text, sizeof text, "%08x-%04x-5%03x-8%03x-%012llx", unsigned(hash[0] >> 32),
                 unsigned(hash[0] >> 16 & 0xffff), unsigned(hash[0] & 0xfff), unsigned(hash[1] >> 48 & 0xfff),
